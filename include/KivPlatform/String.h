@@ -1,0 +1,201 @@
+#pragma once
+
+/// @file
+/// Owned, shared, reference-counted 8-bit and UTF-16 text.
+
+#include "KivPlatform/Export.h"
+#include "KivPlatform/StringView.h"
+
+#include <array>
+#include <atomic>
+#include <cstdint>
+#include <utility>
+
+namespace KivPlatform {
+
+/// One argument of `KivStringT::FormatInternal`: an integer or NUL-terminated text of the format's own code unit.
+template <class C>
+class FormatArgument {
+public:
+    explicit FormatArgument(const C* text) noexcept : text_(text) {}
+    template <std::integral I>
+    explicit FormatArgument(I value) noexcept : negative_(std::signed_integral<I> && value < I{}) {
+        const auto bits = static_cast<std::uint64_t>(value);
+        magnitude_ = negative_ ? std::uint64_t{0} - bits : bits;
+    }
+
+    [[nodiscard]] const C* Text() const noexcept { return text_; }
+    [[nodiscard]] std::uint64_t Magnitude() const noexcept { return magnitude_; }
+    [[nodiscard]] bool IsNegative() const noexcept { return negative_; }
+
+private:
+    const C* text_ = nullptr;
+    std::uint64_t magnitude_ = 0;
+    bool negative_ = false;
+};
+
+/// Immutable-when-shared text: copying shares the characters and allocates nothing; changing a shared text copies it first.
+///
+/// The text is NUL-terminated and may contain NULs. Lengths and positions are signed 32-bit code unit counts; a text that
+/// would be longer throws `std::length_error`. Everything that makes new text may throw `std::bad_alloc`.
+///
+/// Threads: the count is atomic, so distinct strings that share characters may be used from different threads; one string
+/// is used like any value.
+/// @tparam C `char` for 8-bit text, `char16_t` for UTF-16 text.
+template <class C>
+class KIVVCS_EXPORT KivStringT {
+public:
+    using View = KivStringViewT<C>;
+
+    constexpr KivStringT() noexcept = default;
+    KivStringT(View text);
+    /// Copies NUL-terminated text; null gives the empty text.
+    KivStringT(const C* text) : KivStringT(View(text)) {}
+    /// Copies @p length code units; null or a negative length gives the empty text.
+    KivStringT(const C* text, int length) : KivStringT(View(text, length)) {}
+    /// Widens 8-bit text, each byte to the code unit of the same value 0 to 255. For ASCII such as identifiers; text in UTF-8
+    /// is decoded by `String::ToStringW`.
+    template <std::same_as<char> Narrow>
+        requires std::same_as<C, char16_t>
+    KivStringT(KivStringT<Narrow> const& text)
+        : KivStringT(Build(text.GetLength(), [&text](C* units) {
+              for (char byte : KivStringViewT<char>(text))
+                  *units++ = static_cast<unsigned char>(byte);
+          })) {}
+
+    KivStringT(KivStringT const& other) noexcept : text_(other.text_) {
+        if (text_ != nullptr)
+            text_->references.fetch_add(1, std::memory_order_relaxed);
+    }
+    KivStringT(KivStringT&& other) noexcept : text_(std::exchange(other.text_, nullptr)) {}
+    KivStringT& operator=(KivStringT const& other) noexcept {
+        KivStringT(other).Swap(*this);
+        return *this;
+    }
+    KivStringT& operator=(KivStringT&& other) noexcept {
+        KivStringT(std::move(other)).Swap(*this);
+        return *this;
+    }
+    ~KivStringT() { Release(); }
+
+    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does: `%%s` takes
+    /// NUL-terminated text (null counts as empty), `%%.*s` a length and text, `%%d`, `%%u` and `%%lu` any integer; a width
+    /// (`%%5d`, `%%02d`) pads with blanks or zeros, `%%%%` is a percent sign. A directive without an argument writes nothing.
+    template <class... Arguments>
+    void FormatInternal(View format, Arguments const&... arguments) {
+        const std::array<FormatArgument<C>, sizeof...(arguments)> list{FormatArgument<C>(arguments)...};
+        FormatList(format, list.data(), list.size());
+    }
+
+    [[nodiscard]] int GetLength() const noexcept { return text_ == nullptr ? 0 : text_->length; }
+    [[nodiscard]] bool IsEmpty() const noexcept { return GetLength() == 0; }
+
+    /// The NUL-terminated text, never null; valid until the string is changed or destroyed.
+    [[nodiscard]] const C* GetString() const noexcept { return text_ == nullptr ? &terminator : Characters(); }
+    operator const C*() const noexcept { return GetString(); }
+
+    /// @pre 0 <= @p index <= GetLength(); the terminating NUL is at GetLength().
+    [[nodiscard]] C operator[](int index) const noexcept { return GetString()[index]; }
+    [[nodiscard]] C GetAt(int index) const noexcept { return GetString()[index]; }
+
+    /// Substrings, clipped to the text; a negative start counts as 0, a negative count gives the empty text.
+    [[nodiscard]] KivStringT Mid(int start) const { return Slice(View(*this).Mid(start)); }
+    [[nodiscard]] KivStringT Mid(int start, int count) const { return Slice(View(*this).Mid(start, count)); }
+    [[nodiscard]] KivStringT Left(int count) const { return Slice(View(*this).Left(count)); }
+
+    /// As the operations of the same name of `KivStringViewT`.
+    [[nodiscard]] int Find(View needle, int start = 0, CompareCase compareCase = CompareCase::Exact) const noexcept {
+        return View(*this).Find(needle, start, compareCase);
+    }
+    [[nodiscard]] bool StartsWith(View prefix, CompareCase compareCase = CompareCase::Exact) const noexcept {
+        return View(*this).StartsWith(prefix, compareCase);
+    }
+    [[nodiscard]] int Compare(View other, CompareCase compareCase = CompareCase::Exact) const noexcept {
+        return View(*this).Compare(other, compareCase);
+    }
+
+    /// Appends; amortized constant per code unit while the text is not shared.
+    KivStringT& operator+=(View text);
+    KivStringT& operator+=(const C* text) { return *this += View(text); }
+    KivStringT& operator+=(KivStringT const& text) { return *this += View(text); }
+    KivStringT& operator+=(C unit) { return *this += View(&unit, 1); }
+    /// Appends an 8-bit character as the code unit of the same value 0 to 255.
+    template <std::same_as<char> Narrow>
+        requires std::same_as<C, char16_t>
+    KivStringT& operator+=(Narrow character) {
+        return *this += static_cast<C>(static_cast<unsigned char>(character));
+    }
+
+    void Swap(KivStringT& other) noexcept { std::swap(text_, other.text_); }
+
+    /// Makes a text of @p length code units and lets @p fill write them through the pointer that it is given.
+    template <class Fill>
+    [[nodiscard]] static KivStringT Build(int length, Fill fill) {
+        KivStringT result;
+        if (length > 0) {
+            result.text_ = Allocate(length);
+            fill(result.Characters());
+        }
+        return result;
+    }
+
+private:
+    struct Text {
+        std::atomic<std::uint32_t> references{1};
+        std::int32_t length = 0;
+        std::int32_t capacity = 0;
+    };
+
+    static constexpr C terminator{};
+
+    /// Room for @p capacity code units and the terminator; the length is set to the capacity and terminated there.
+    static Text* Allocate(int capacity);
+    static void Destroy(Text* text) noexcept;
+
+    [[nodiscard]] C* Characters() const noexcept { return reinterpret_cast<C*>(text_ + 1); }
+    [[nodiscard]] KivStringT Slice(View part) const { return part.GetLength() == GetLength() ? *this : KivStringT(part); }
+    void FormatList(View format, const FormatArgument<C>* arguments, std::size_t count);
+
+    void Release() noexcept {
+        if (text_ != nullptr && text_->references.fetch_sub(1, std::memory_order_acq_rel) == 1)
+            Destroy(text_);
+    }
+
+    Text* text_ = nullptr;
+};
+
+template <class C>
+KivStringViewT<C>::KivStringViewT(KivStringT<C> const& text) noexcept
+    : text_(text.GetString()), length_(text.GetLength()) {}
+
+template <class C>
+KivStringT<C> KivStringViewT<C>::ToString() const {
+    return KivStringT<C>(*this);
+}
+
+/// Joins two texts.
+template <class L, class R>
+    requires TextPair<L, R, char>
+[[nodiscard]] KivStringT<char> operator+(L const& left, R const& right) {
+    KivStringT<char> result{KivStringViewT<char>(left)};
+    return result += KivStringViewT<char>(right);
+}
+
+template <class L, class R>
+    requires TextPair<L, R, char16_t>
+[[nodiscard]] KivStringT<char16_t> operator+(L const& left, R const& right) {
+    KivStringT<char16_t> result{KivStringViewT<char16_t>(left)};
+    return result += KivStringViewT<char16_t>(right);
+}
+
+extern template class KivStringT<char>;
+extern template class KivStringT<char16_t>;
+
+} // namespace KivPlatform
+
+template <class C>
+struct std::hash<KivPlatform::KivStringT<C>> {
+    std::size_t operator()(KivPlatform::KivStringT<C> const& text) const noexcept {
+        return std::hash<KivPlatform::KivStringViewT<C>>()(text);
+    }
+};

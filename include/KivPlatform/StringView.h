@@ -1,0 +1,139 @@
+#pragma once
+
+/// @file
+/// Non-owning views of 8-bit and UTF-16 text.
+
+#include <algorithm>
+#include <compare>
+#include <concepts>
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <limits>
+#include <string_view>
+
+namespace KivPlatform {
+
+template <class C>
+class KivStringT;
+
+/// How texts are compared. `Exact`, the default everywhere, orders by unsigned code unit, a prefix before the longer text.
+enum class CompareCase : std::int32_t { Exact = 0 };
+
+/// A pointer and a length: text that somebody else owns. Lengths and positions are signed 32-bit code unit counts.
+///
+/// The text need not be NUL-terminated and may contain NULs. The owner must outlive the view. Nothing here allocates but
+/// `ToString`, and nothing throws otherwise. Views are values: distinct views are independent between threads.
+/// @tparam C `char` for 8-bit text, `char16_t` for UTF-16 text.
+template <class C>
+class KivStringViewT {
+public:
+    constexpr KivStringViewT() noexcept = default;
+
+    /// Views NUL-terminated text; null gives the empty view.
+    constexpr KivStringViewT(const C* text) noexcept
+        : text_(text), length_(text == nullptr ? 0 : Clamp(std::char_traits<C>::length(text))) {}
+
+    /// Views @p length code units; null or a negative length gives the empty view.
+    constexpr KivStringViewT(const C* text, int length) noexcept
+        : text_(text), length_(text == nullptr || length < 0 ? 0 : length) {}
+
+    KivStringViewT(KivStringT<C> const& text) noexcept;
+
+    [[nodiscard]] constexpr int GetLength() const noexcept { return length_; }
+    [[nodiscard]] constexpr bool IsEmpty() const noexcept { return length_ == 0; }
+
+    /// The first code unit; not NUL-terminated, and null for a default view.
+    [[nodiscard]] constexpr const C* GetString() const noexcept { return text_; }
+
+    /// @pre 0 <= @p index < GetLength()
+    [[nodiscard]] constexpr C operator[](int index) const noexcept { return text_[index]; }
+
+    [[nodiscard]] constexpr const C* begin() const noexcept { return text_; }
+    [[nodiscard]] constexpr const C* end() const noexcept { return text_ + length_; }
+
+    /// An owned copy. @throws std::bad_alloc
+    [[nodiscard]] KivStringT<C> ToString() const;
+
+    /// The index of the first occurrence of @p needle at or after @p start, or -1. A negative start counts as 0; an empty
+    /// needle is found at the start, as long as that is not past the end.
+    [[nodiscard]] constexpr int Find(KivStringViewT needle, int start = 0,
+                                     CompareCase = CompareCase::Exact) const noexcept {
+        const auto found = Standard().find(needle.Standard(), static_cast<std::size_t>(std::max(start, 0)));
+        return found == std::basic_string_view<C>::npos ? -1 : static_cast<int>(found);
+    }
+
+    [[nodiscard]] constexpr bool StartsWith(KivStringViewT prefix, CompareCase = CompareCase::Exact) const noexcept {
+        return Standard().starts_with(prefix.Standard());
+    }
+
+    /// Negative, 0 or positive as this text comes before, equals or comes after @p other.
+    [[nodiscard]] constexpr int Compare(KivStringViewT other, CompareCase = CompareCase::Exact) const noexcept {
+        return Standard().compare(other.Standard());
+    }
+
+    /// The text from @p start on; a negative start counts as 0, one past the end gives the empty view.
+    [[nodiscard]] constexpr KivStringViewT Mid(int start) const noexcept { return Mid(start, length_); }
+
+    /// At most @p count code units from @p start on; a negative count gives the empty view.
+    [[nodiscard]] constexpr KivStringViewT Mid(int start, int count) const noexcept {
+        const int first = std::clamp(start, 0, length_);
+        return {text_ + first, std::clamp(count, 0, length_ - first)};
+    }
+
+    /// The first @p count code units, or all of them.
+    [[nodiscard]] constexpr KivStringViewT Left(int count) const noexcept { return Mid(0, count); }
+
+private:
+    static constexpr int Clamp(std::size_t length) noexcept {
+        return static_cast<int>(std::min(length, static_cast<std::size_t>(std::numeric_limits<int>::max())));
+    }
+
+    [[nodiscard]] constexpr std::basic_string_view<C> Standard() const noexcept {
+        return {text_, static_cast<std::size_t>(length_)};
+    }
+
+    const C* text_ = nullptr;
+    int length_ = 0;
+};
+
+/// Two operands that compare as texts of @p C: at least one is a string or view of the library, the other converts to a view.
+template <class L, class R, class C>
+concept TextPair = (std::same_as<L, KivStringT<C>> || std::same_as<L, KivStringViewT<C>> ||
+                    std::same_as<R, KivStringT<C>> || std::same_as<R, KivStringViewT<C>>) &&
+                   std::convertible_to<L const&, KivStringViewT<C>> && std::convertible_to<R const&, KivStringViewT<C>>;
+
+/// Equality of text, whatever the operands: strings, views, literals. Never of pointers.
+template <class L, class R>
+    requires TextPair<L, R, char>
+[[nodiscard]] bool operator==(L const& left, R const& right) noexcept {
+    return KivStringViewT<char>(left).Compare(KivStringViewT<char>(right)) == 0;
+}
+
+template <class L, class R>
+    requires TextPair<L, R, char16_t>
+[[nodiscard]] bool operator==(L const& left, R const& right) noexcept {
+    return KivStringViewT<char16_t>(left).Compare(KivStringViewT<char16_t>(right)) == 0;
+}
+
+/// The order of `Compare`.
+template <class L, class R>
+    requires TextPair<L, R, char>
+[[nodiscard]] std::strong_ordering operator<=>(L const& left, R const& right) noexcept {
+    return KivStringViewT<char>(left).Compare(KivStringViewT<char>(right)) <=> 0;
+}
+
+template <class L, class R>
+    requires TextPair<L, R, char16_t>
+[[nodiscard]] std::strong_ordering operator<=>(L const& left, R const& right) noexcept {
+    return KivStringViewT<char16_t>(left).Compare(KivStringViewT<char16_t>(right)) <=> 0;
+}
+
+} // namespace KivPlatform
+
+template <class C>
+struct std::hash<KivPlatform::KivStringViewT<C>> {
+    std::size_t operator()(KivPlatform::KivStringViewT<C> text) const noexcept {
+        return std::hash<std::basic_string_view<C>>()({text.GetString(), static_cast<std::size_t>(text.GetLength())});
+    }
+};

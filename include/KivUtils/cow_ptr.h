@@ -1,0 +1,235 @@
+#pragma once
+
+/// @file
+/// `cow_ptr`: a shared, reference-counted pointer with copy-on-write access.
+
+#include "KivPlatform/Export.h"
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <new>
+#include <type_traits>
+#include <utility>
+
+namespace KivUtils {
+
+/// Selects the constructor of `cow_ptr` that makes a new object in place.
+struct emplace_t {
+    explicit emplace_t() = default;
+};
+inline constexpr emplace_t emplace{};
+
+/// The count of the `cow_ptr`s that hold an object. A class that derives from it carries its own count and is held without a
+/// control block; any other type gets one. Copying or assigning an object never copies the count.
+class reference_counted {
+public:
+    reference_counted() noexcept = default;
+    reference_counted(reference_counted const&) noexcept {}
+    reference_counted& operator=(reference_counted const&) noexcept { return *this; }
+
+    void add_reference() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
+
+    /// True if that was the last reference; everything done through the other references happened before.
+    [[nodiscard]] bool drop_reference() const noexcept {
+        // A sole owner needs no atomic exchange: nobody else is left who could add a reference.
+        return references_.load(std::memory_order_acquire) == 1 ||
+               references_.fetch_sub(1, std::memory_order_acq_rel) == 1;
+    }
+
+    [[nodiscard]] std::uint32_t reference_count() const noexcept { return references_.load(std::memory_order_acquire); }
+
+protected:
+    ~reference_counted() = default;
+
+private:
+    mutable std::atomic<std::uint32_t> references_{0};
+};
+
+/// The control block of objects that do not count themselves: made in place, or adopted from a unique pointer.
+template <class T>
+class counted_holder final : public reference_counted {
+public:
+    template <class... Arguments>
+    explicit counted_holder(emplace_t, Arguments&&... arguments)
+        : object_(::new (static_cast<void*>(storage_)) T(std::forward<Arguments>(arguments)...)) {}
+    explicit counted_holder(std::unique_ptr<T> object) noexcept : object_(object.release()) {}
+    counted_holder(counted_holder const&) = delete;
+    counted_holder& operator=(counted_holder const&) = delete;
+    ~counted_holder() {
+        if (static_cast<void*>(object_) == static_cast<void*>(storage_))
+            object_->~T();
+        else
+            delete object_;
+    }
+
+    [[nodiscard]] T* object() const noexcept { return object_; }
+
+private:
+    T* object_;
+    alignas(T) std::byte storage_[sizeof(T)];
+};
+
+/// A pointer that shares its object with its copies and gives write access only to a sole owner, copying the object otherwise.
+///
+/// Reading (`->`, `*`, `get`) never copies. The pointer may be null. It is as large as a raw pointer; an object is one
+/// allocation.
+///
+/// Threads: the count is atomic, so that distinct pointers to one object may be copied, read through and dropped from
+/// different threads. One pointer is used like any value: `write` must not race with another use of the same pointer.
+template <class T>
+class cow_ptr {
+public:
+    using element_type = T;
+
+    constexpr cow_ptr() noexcept = default;
+    constexpr cow_ptr(std::nullptr_t) noexcept {}
+
+    /// Makes a new `T(arguments...)` and owns it alone.
+    template <class... Arguments>
+    explicit cow_ptr(emplace_t, Arguments&&... arguments) {
+        if constexpr (is_self_counted())
+            adopt(new T(std::forward<Arguments>(arguments)...));
+        else
+            adopt(new counted_holder<T>(emplace, std::forward<Arguments>(arguments)...));
+    }
+
+    /// Takes over an object made elsewhere; null gives null.
+    explicit cow_ptr(std::unique_ptr<T> object) {
+        if (object == nullptr)
+            return;
+        if constexpr (is_self_counted())
+            adopt(object.release());
+        else
+            adopt(new counted_holder<T>(std::move(object)));
+    }
+
+    /// Another pointer to an object that a `cow_ptr` holds already; null gives null. Self-counted types only.
+    [[nodiscard]] static cow_ptr share(T const* object) noexcept {
+        cow_ptr pointer;
+        if (object != nullptr)
+            pointer.adopt(object);
+        return pointer;
+    }
+
+    cow_ptr(cow_ptr const& other) noexcept : counted_(other.counted_) {
+        if (counted_ != nullptr)
+            counted_->add_reference();
+    }
+    cow_ptr(cow_ptr&& other) noexcept : counted_(std::exchange(other.counted_, nullptr)) {}
+
+    /// Shares the object as one of its base class.
+    template <class Derived>
+        requires(!std::is_same_v<Derived, T> && std::is_convertible_v<Derived*, T*>)
+    cow_ptr(cow_ptr<Derived> other) noexcept : counted_(std::exchange(other.counted_, nullptr)) {
+        static_assert(std::is_base_of_v<reference_counted, T>, "only self-counted types convert to their bases");
+    }
+
+    cow_ptr& operator=(cow_ptr const& other) noexcept {
+        cow_ptr(other).swap(*this);
+        return *this;
+    }
+    cow_ptr& operator=(cow_ptr&& other) noexcept {
+        cow_ptr(std::move(other)).swap(*this);
+        return *this;
+    }
+    ~cow_ptr() { drop(); }
+
+    [[nodiscard]] T const* get() const noexcept { return object(); }
+    T const* operator->() const noexcept { return object(); }
+    T const& operator*() const noexcept { return *object(); }
+    explicit operator bool() const noexcept { return counted_ != nullptr; }
+
+    /// The number of pointers that hold the object; 0 for null.
+    [[nodiscard]] std::uint32_t use_count() const noexcept {
+        return counted_ == nullptr ? 0 : counted_->reference_count();
+    }
+
+    void reset() noexcept { cow_ptr().swap(*this); }
+    void swap(cow_ptr& other) noexcept { std::swap(counted_, other.counted_); }
+
+    /// The object for writing: null for null; the object itself for a sole owner; otherwise a copy made with the copy
+    /// constructor of `T`, which this pointer then owns alone, the other owners keeping the unchanged object.
+    /// @throws what copying throws; the pointer is unchanged then.
+    [[nodiscard]] T* write_if_there() {
+        if (counted_ == nullptr)
+            return nullptr;
+        if (counted_->reference_count() != 1)
+            cow_ptr(emplace, *object()).swap(*this);
+        return object();
+    }
+
+    /// As `write_if_there`, but a null pointer first receives a new default-constructed `T`; never null.
+    T* write() {
+        if (counted_ == nullptr)
+            cow_ptr(emplace).swap(*this);
+        return write_if_there();
+    }
+
+    /// Gives up this pointer's share and hands the object over if it was the last one; null otherwise. Lets an owner take
+    /// an object apart before it dies. Self-counted types only.
+    [[nodiscard]] std::unique_ptr<T> release_if_last() noexcept {
+        static_assert(std::is_base_of_v<reference_counted, T>);
+        const auto* const counted = std::exchange(counted_, nullptr);
+        if (counted == nullptr || !counted->drop_reference())
+            return nullptr;
+        return std::unique_ptr<T>(static_cast<T*>(const_cast<reference_counted*>(counted)));
+    }
+
+    /// Identity of the object, not equality of content.
+    friend bool operator==(cow_ptr const& left, cow_ptr const& right) noexcept { return left.counted_ == right.counted_; }
+    friend bool operator==(cow_ptr const& pointer, std::nullptr_t) noexcept { return pointer.counted_ == nullptr; }
+
+private:
+    template <class>
+    friend class cow_ptr;
+
+    // Not a constant: T may be incomplete where the class is named.
+    [[nodiscard]] static constexpr bool is_self_counted() noexcept { return std::is_base_of_v<reference_counted, T>; }
+
+    template <class Counted>
+    void adopt(Counted* counted) noexcept {
+        counted_ = counted;
+        counted_->add_reference();
+    }
+
+    [[nodiscard]] T* object() const noexcept {
+        auto* const counted = const_cast<reference_counted*>(counted_);
+        if constexpr (is_self_counted())
+            return static_cast<T*>(counted);
+        else
+            return counted == nullptr ? nullptr : static_cast<counted_holder<T>*>(counted)->object();
+    }
+
+    void drop() noexcept {
+        if (counted_ == nullptr || !counted_->drop_reference())
+            return;
+        if constexpr (is_self_counted())
+            delete static_cast<T const*>(counted_);
+        else
+            delete static_cast<counted_holder<T> const*>(counted_);
+    }
+
+    reference_counted const* counted_ = nullptr;
+};
+
+/// Makers of objects that are only read from then on.
+namespace immu {
+
+/// A pointer that solely owns a new `T(arguments...)`.
+template <class T, class... Arguments>
+[[nodiscard]] cow_ptr<T> make(Arguments&&... arguments) {
+    return cow_ptr<T>(emplace, std::forward<Arguments>(arguments)...);
+}
+
+} // namespace immu
+
+} // namespace KivUtils
+
+template <class T>
+struct std::hash<KivUtils::cow_ptr<T>> {
+    std::size_t operator()(KivUtils::cow_ptr<T> const& pointer) const noexcept {
+        return std::hash<T const*>()(pointer.get());
+    }
+};

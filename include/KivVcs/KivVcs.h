@@ -1,0 +1,13 @@
+#pragma once
+
+/// @file
+/// Everything public. Start with `Repository.h`.
+
+#include "KivVcs/Blob.h"
+#include "KivVcs/Commit.h"
+#include "KivVcs/Foundation.h"
+#include "KivVcs/Merge.h"
+#include "KivVcs/Object.h"
+#include "KivVcs/Repository.h"
+#include "KivVcs/Storage.h"
+#include "KivVcs/Tree.h"

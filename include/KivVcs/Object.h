@@ -1,0 +1,249 @@
+#pragma once
+
+/// @file
+/// What all stored things have in common: identifiers, the packed form, its SHA-256 digest, and the helpers of every format.
+
+#include "KivVcs/Foundation.h"
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+namespace KivVcs {
+
+/// The SHA-256 digest of FIPS 180-4 over bytes fed in any number of pieces. Uses the processor's SHA instructions where it has
+/// them. A value: a copy goes on from the same state. One digest is used by one thread at a time.
+class KIVVCS_EXPORT SHADigest256 {
+public:
+    SHADigest256() noexcept;
+
+    /// Feeds @p size bytes. @return false, feeding nothing, if @p data is null although @p size is not 0.
+    bool InitData(const void* data, std::size_t size) noexcept;
+
+    /// Compresses the 64 bytes collected last. `InitData` and `FinalDigest` call it whenever a block is full.
+    void Transform() noexcept;
+
+    /// Pads, finishes and writes the 32 digest bytes to @p out; after it, feeding starts a new digest.
+    /// @return false, changing nothing, if @p out is null.
+    bool FinalDigest(void* out) noexcept;
+
+private:
+    std::array<std::uint32_t, 8> state_{};
+    std::array<std::uint8_t, 64> block_{};
+    std::uint64_t fed_ = 0;
+};
+
+/// The identifier of an object: the hexadecimal text of the SHA-256 digest of its packed form, 64 lowercase digits. The empty
+/// text is the null identifier: no object.
+///
+/// As large as a pointer; copying shares it and allocates nothing. Identifiers are equal when their texts are. Any number of
+/// threads may read one identifier.
+class KIVVCS_EXPORT Id {
+public:
+    using Digest = std::array<std::uint8_t, 32>;
+
+    /// The null identifier.
+    Id() noexcept = default;
+    /// The identifier of a packed form: hashes it. @throws std::bad_alloc
+    Id(Buffer const& packed);
+    /// The identifier with the given text, whatever it is. @throws std::bad_alloc
+    explicit Id(KivStringT<char16_t> const& text);
+    /// The identifier whose text tells @p digest. @throws std::bad_alloc
+    [[nodiscard]] static Id FromDigest(Digest const& digest);
+
+    /// The text, made on first use; valid as long as this identifier or a copy of it lives. @throws std::bad_alloc
+    [[nodiscard]] KivStringT<char16_t> const& GetText() const;
+
+    [[nodiscard]] bool IsEmpty() const noexcept { return !record_; }
+
+    /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
+    [[nodiscard]] std::size_t Hash() const noexcept { return record_ ? record_->hash : HashOfNull(); }
+
+    /// The digest that the text tells; null if it is not 64 lowercase hexadecimal digits.
+    [[nodiscard]] Digest const* GetDigest() const noexcept {
+        return record_ && record_->hasDigest ? &record_->digest : nullptr;
+    }
+
+    friend bool operator==(Id const& left, Id const& right) noexcept {
+        return left.record_ == right.record_ ||
+               (left.record_ && right.record_ && SameText(*left.record_, *right.record_));
+    }
+
+private:
+    friend class CachedId;
+
+    /// What identifiers share. The text is kept as its digest and spelled out only when somebody asks for it, since a
+    /// repository holds one record for every object.
+    struct Record final : KivUtils::reference_counted {
+        bool hasDigest = false;
+        std::size_t hash = 0;
+        Digest digest{};
+        Published<KivStringT<char16_t>> text;
+    };
+
+    explicit Id(cow_ptr<Record> record) noexcept : record_(std::move(record)) {}
+    static bool SameText(Record const& left, Record const& right) noexcept;
+    static std::size_t HashOfNull() noexcept { return static_cast<std::size_t>(0x42c52834b230ef45U); }
+
+    cow_ptr<Record> record_;
+};
+
+/// An identifier that is computed on first use, by whichever thread comes first.
+class CachedId {
+public:
+    CachedId() noexcept = default;
+    CachedId(CachedId const& other) noexcept : record_(Share(other.record_.load(std::memory_order_acquire))) {}
+    CachedId(CachedId&& other) noexcept : record_(other.record_.exchange(nullptr, std::memory_order_acquire)) {}
+    CachedId& operator=(CachedId other) noexcept {
+        Id::Record const* const mine = record_.load(std::memory_order_relaxed);
+        record_.store(other.record_.exchange(mine, std::memory_order_relaxed), std::memory_order_relaxed);
+        return *this;
+    }
+    ~CachedId() { Reset(); }
+
+    /// The identifier, or the null identifier if there is none yet.
+    [[nodiscard]] Id Get() const noexcept {
+        return Id(cow_ptr<Id::Record>::share(record_.load(std::memory_order_acquire)));
+    }
+
+    /// Whether both are there and equal; false tells nothing if one is missing.
+    [[nodiscard]] bool Equals(CachedId const& other) const noexcept {
+        Id::Record const* const mine = record_.load(std::memory_order_acquire);
+        Id::Record const* const theirs = other.record_.load(std::memory_order_acquire);
+        return mine != nullptr && (mine == theirs || (theirs != nullptr && Id::SameText(*mine, *theirs)));
+    }
+
+    [[nodiscard]] bool IsSet() const noexcept { return record_.load(std::memory_order_acquire) != nullptr; }
+
+    /// Keeps @p id unless another thread was faster, and returns what is kept.
+    Id Publish(Id id) const noexcept {
+        Id::Record const* expected = nullptr;
+        if (record_.compare_exchange_strong(expected, id.record_.get(), std::memory_order_acq_rel)) {
+            Share(id.record_.get());
+            return id;
+        }
+        return Get();
+    }
+
+    void Reset() noexcept {
+        Id::Record const* const record = record_.exchange(nullptr, std::memory_order_acquire);
+        if (record != nullptr && record->drop_reference())
+            delete record;
+    }
+
+private:
+    static Id::Record const* Share(Id::Record const* record) noexcept {
+        if (record != nullptr)
+            record->add_reference();
+        return record;
+    }
+
+    mutable std::atomic<Id::Record const*> record_{nullptr};
+};
+
+/// The interface of all stored objects. The order of its operations is part of the binary interface.
+class KIVVCS_EXPORT IObject {
+public:
+    /// Whether both objects have the same identifier, and so the same content.
+    virtual bool operator==(IObject const& other) const = 0;
+    virtual bool operator!=(IObject const& other) const = 0;
+    /// The identifier of the packed form.
+    [[nodiscard]] virtual Id GetId() const = 0;
+    /// The type word: "blob", "tree" or "commit".
+    [[nodiscard]] virtual KivStringT<char> GetHeader() const = 0;
+    /// The mode word that a tree's packed form shows for such an entry; empty for commits.
+    [[nodiscard]] virtual KivStringT<char> GetStoragePrefix() const = 0;
+    /// The type word, a blank, the size of the data in decimal, a zero byte, the data.
+    [[nodiscard]] virtual Buffer const& GetPackedData() const = 0;
+    /// The data of the packed form.
+    [[nodiscard]] virtual Buffer const& GetData() const = 0;
+    /// The packed form for display: a zero byte as `\0`, every other byte as one code unit, sign-extended.
+    [[nodiscard]] virtual KivStringT<char16_t> ToString() const = 0;
+    virtual ~IObject();
+    /// Drops what is cached of the content; to be called after every change.
+    virtual void ResetState() = 0;
+
+protected:
+    IObject() = default;
+    IObject(IObject const&) = default;
+    IObject& operator=(IObject const&) = default;
+};
+
+/// The base of blobs, trees and commits: caches the identifier and the packed form of the content.
+///
+/// What is asked for is computed on first use and kept until `ResetState`; references to packed forms and data are valid until
+/// then, or until the object dies. A copy carries the caches.
+///
+/// Threads: all `const` operations may run concurrently on one object. A change needs exclusive use of the object.
+/// @throws std::bad_alloc from everything that computes; the object is as before then.
+class KIVVCS_EXPORT Object : public IObject, public KivUtils::reference_counted {
+public:
+    bool operator==(IObject const& other) const override;
+    bool operator!=(IObject const& other) const override;
+    bool operator==(Object const& other) const { return *this == static_cast<IObject const&>(other); }
+    bool operator!=(Object const& other) const { return *this != static_cast<IObject const&>(other); }
+    [[nodiscard]] Id GetId() const override;
+    [[nodiscard]] Buffer const& GetPackedData() const override;
+    [[nodiscard]] KivStringT<char16_t> ToString() const override;
+    void ResetState() override;
+
+    /// Whether both objects have the same identifier; without touching it when they are one object.
+    [[nodiscard]] bool HasSameId(Object const& other) const;
+
+protected:
+    Object() noexcept = default;
+    Object(Object const&) = default;
+    Object(Object&&) noexcept = default;
+    Object& operator=(Object const&) = default;
+    Object& operator=(Object&&) noexcept = default;
+
+    /// The identifier of what `GetPackedData` gives. Overridden where it can be had without putting the packed form together.
+    [[nodiscard]] virtual Id ComputeId() const;
+
+private:
+    CachedId id_;
+    Published<Buffer> packedData_;
+};
+
+/// Takes over an object made by `new` on either side of the library's boundary; null gives null.
+[[nodiscard]] KIVVCS_EXPORT cow_ptr<Object> dll_wrapped_shared(std::unique_ptr<Object> object);
+
+/// What every object format uses.
+namespace Helpers {
+
+/// The SHA-256 digest of @p size bytes as 64 lowercase hexadecimal digits; the empty text if @p data is null, also for size 0.
+[[nodiscard]] KIVVCS_EXPORT KivStringT<char16_t> ComputeEncodedSHA256Hash(const void* data, std::size_t size);
+
+/// The same for the content of @p buffer, which may be empty.
+[[nodiscard]] KIVVCS_EXPORT KivStringT<char16_t> ComputeEncodedSHA256Hash(Buffer const& buffer);
+
+/// Appends the content of @p source, sharing its large chunks.
+KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, Buffer const& source);
+/// Appends the bytes of @p text.
+KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char> text);
+/// Appends the UTF-8 encoding of @p text up to its first U+0000.
+KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char16_t> text);
+
+/// The content as 8-bit text, zero bytes included; at most 2,147,483,647 bytes of it.
+[[nodiscard]] KIVVCS_EXPORT KivStringT<char> StringAFromBuffer(Buffer const& buffer);
+
+/// The rest of the stream as 8-bit text, at most 2,147,483,647 bytes of it; empty if the stream is not valid, has no rest, or
+/// cannot be read. Takes no more memory than a multiple of what the stream really holds, whatever size it claims.
+[[nodiscard]] KIVVCS_EXPORT KivStringT<char> StreamToStringA(StreamIO& stream);
+
+/// Reads the header of a packed form, its zero byte included, which leaves the stream at the first data byte.
+/// @return whether the header begins with @p expected; false if the stream is not valid or ends before a zero byte.
+[[nodiscard]] KIVVCS_EXPORT bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> expected);
+
+/// The segments between the "/" of @p path, in order, without the empty ones; views into @p path.
+[[nodiscard]] KIVVCS_EXPORT std::vector<KivStringViewT<char16_t>> SplitVcsPath(KivStringViewT<char16_t> path);
+
+} // namespace Helpers
+
+} // namespace KivVcs
+
+template <>
+struct std::hash<KivVcs::Id> {
+    std::size_t operator()(KivVcs::Id const& id) const noexcept { return id.Hash(); }
+};

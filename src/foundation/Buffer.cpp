@@ -1,0 +1,288 @@
+#include "KivUtils/Buffer.h"
+
+#include "KivUtils/cow_ptr.h"
+
+#include <algorithm>
+#include <cstring>
+#include <limits>
+#include <new>
+#include <stdexcept>
+#include <vector>
+
+namespace KivUtils::Memory {
+
+namespace {
+
+/// Smaller pieces are copied when buffers are joined: sharing one costs about as much memory as it holds.
+constexpr std::size_t smallestSharedPiece = 512;
+
+/// A single block grows by copying up to this size; beyond it new bytes go into further blocks and nothing is copied.
+constexpr std::size_t largestCopiedBlock = 65536;
+
+std::size_t RoomForGrowth(std::uint64_t content) noexcept {
+    return static_cast<std::size_t>(std::clamp<std::uint64_t>(content / 8, 4096, 1U << 20U));
+}
+
+} // namespace
+
+/// What a buffer points to: one block of bytes, or a chain of pieces of blocks.
+struct Buffer::Content : reference_counted {
+    Content(bool chain, std::uint64_t bytes) noexcept : isChain(chain), size(bytes) {}
+
+    bool isChain;
+    std::uint64_t size;
+};
+
+/// Bytes in the same allocation as their header. They are written once; what a piece shows never changes.
+struct Buffer::Block final : Content {
+    explicit Block(std::size_t room) noexcept : Content(false, 0), capacity(room) {}
+
+    static Block* Make(std::size_t capacity) {
+        if (capacity > std::numeric_limits<std::size_t>::max() / 2)
+            throw std::length_error("buffer larger than the address space");
+        auto* block = ::new (::operator new(sizeof(Block) + capacity)) Block(capacity);
+        block->add_reference();
+        return block;
+    }
+
+    [[nodiscard]] std::byte* Bytes() noexcept { return reinterpret_cast<std::byte*>(this + 1); }
+    [[nodiscard]] std::size_t Room() const noexcept { return capacity - static_cast<std::size_t>(size); }
+    [[nodiscard]] BufferChunks::Chunk Chunk() noexcept { return {Bytes(), static_cast<std::size_t>(size)}; }
+
+    void Write(const std::byte* data, std::size_t count) noexcept {
+        std::memcpy(Bytes() + size, data, count);
+        size += count;
+    }
+
+    std::size_t capacity;
+};
+
+struct Buffer::Chain final : Content {
+    Chain() noexcept : Content(true, 0) {}
+    Chain(Chain const& other) : Content(true, other.size), chunks(other.chunks), ends(other.ends), owners(other.owners) {
+        for (Block* owner : owners)
+            owner->add_reference();
+    }
+    Chain& operator=(Chain const&) = delete;
+    ~Chain() {
+        for (Block* owner : owners)
+            Drop(owner);
+    }
+
+    /// Makes room for one more piece, so that adding it cannot fail half-way.
+    void Reserve() {
+        const std::size_t count = chunks.size() + 1;
+        if (count <= chunks.capacity() && count <= ends.capacity() && count <= owners.capacity())
+            return;
+        const std::size_t room = std::max(count, 2 * chunks.size());
+        chunks.reserve(room);
+        ends.reserve(room);
+        owners.reserve(room);
+    }
+
+    /// Adds a piece and takes one reference to its block over.
+    void Add(Block* owner, BufferChunks::Chunk piece) noexcept {
+        size += piece.size();
+        chunks.push_back(piece);
+        ends.push_back(size);
+        owners.push_back(owner);
+    }
+
+    void Share(Block* owner, BufferChunks::Chunk piece) {
+        Reserve();
+        owner->add_reference();
+        Add(owner, piece);
+    }
+
+    /// The bytes that can be written behind the last piece without anybody else seeing them.
+    [[nodiscard]] std::size_t RoomAtEnd() const noexcept {
+        if (owners.empty() || owners.back()->reference_count() != 1)
+            return 0;
+        const auto* pieceEnd = chunks.back().data() + chunks.back().size();
+        return pieceEnd == owners.back()->Bytes() + owners.back()->size ? owners.back()->Room() : 0;
+    }
+
+    void WriteAtEnd(const std::byte* data, std::size_t count) noexcept {
+        owners.back()->Write(data, count);
+        chunks.back() = {chunks.back().data(), chunks.back().size() + count};
+        size += count;
+        ends.back() = size;
+    }
+
+    std::vector<BufferChunks::Chunk> chunks;
+    std::vector<std::uint64_t> ends;
+    std::vector<Block*> owners;
+};
+
+void Buffer::Drop(Content* content) noexcept {
+    if (content == nullptr || !content->drop_reference())
+        return;
+    if (content->isChain) {
+        delete static_cast<Chain*>(content);
+    } else {
+        auto* block = static_cast<Block*>(content);
+        block->~Block();
+        ::operator delete(block);
+    }
+}
+
+Buffer::Buffer(std::uint64_t size) {
+    if (size > 0)
+        std::memset(Allocate(size), 0, static_cast<std::size_t>(size));
+}
+
+Buffer::Buffer(Buffer const& other) noexcept : content_(other.content_) {
+    if (content_ != nullptr)
+        content_->add_reference();
+}
+
+Buffer::~Buffer() {
+    Drop(content_);
+}
+
+std::uint64_t Buffer::GetSize() const noexcept {
+    return content_ == nullptr ? 0 : content_->size;
+}
+
+BufferChunks Buffer::LockForRead() const noexcept {
+    if (content_ == nullptr)
+        return {};
+    if (!content_->isChain)
+        return BufferChunks(static_cast<Block*>(content_)->Chunk());
+    auto const& chain = static_cast<Chain const&>(*content_);
+    return {chain.chunks.data(), chain.chunks.size()};
+}
+
+bool Buffer::Read(std::uint64_t offset, void* destination, std::uint64_t size) const noexcept {
+    if (offset > GetSize() || size > GetSize() - offset)
+        return false;
+    if (size == 0)
+        return true;
+    auto* out = static_cast<std::byte*>(destination);
+    if (!content_->isChain) {
+        std::memcpy(out, static_cast<Block*>(content_)->Bytes() + offset, static_cast<std::size_t>(size));
+        return true;
+    }
+    auto const& chain = static_cast<Chain const&>(*content_);
+    auto piece = static_cast<std::size_t>(std::upper_bound(chain.ends.begin(), chain.ends.end(), offset) - chain.ends.begin());
+    auto rest = static_cast<std::size_t>(size);
+    for (auto skip = static_cast<std::size_t>(offset - (chain.ends[piece] - chain.chunks[piece].size())); rest > 0; ++piece) {
+        const auto chunk = chain.chunks[piece].subspan(std::exchange(skip, 0));
+        const std::size_t count = std::min(rest, chunk.size());
+        std::memcpy(out, chunk.data(), count);
+        out += count;
+        rest -= count;
+    }
+    return true;
+}
+
+std::byte* Buffer::Allocate(std::uint64_t size) {
+    if (size > std::numeric_limits<std::size_t>::max() / 2)
+        throw std::length_error("buffer larger than the address space");
+    auto* block = Block::Make(static_cast<std::size_t>(size));
+    block->size = size;
+    Drop(std::exchange(content_, block));
+    return block->Bytes();
+}
+
+void Buffer::Append(const void* data, std::uint64_t size, std::uint64_t count) {
+    if (data == nullptr || size == 0 || count == 0)
+        return;
+    if (count > std::numeric_limits<std::size_t>::max() / 2 / size)
+        throw std::length_error("buffer larger than the address space");
+    // Appended to a copy, which shares the old bytes: they stay where they are if they are the source, and nothing has
+    // happened if memory runs out. A single append needs no copy: it changes nothing before it has all that it needs.
+    if (count == 1) {
+        AppendOnce(static_cast<const std::byte*>(data), static_cast<std::size_t>(size));
+        return;
+    }
+    Buffer result(*this);
+    while (count-- > 0)
+        result.AppendOnce(static_cast<const std::byte*>(data), static_cast<std::size_t>(size));
+    Swap(result);
+}
+
+void Buffer::AppendOnce(const std::byte* data, std::size_t size) {
+    const bool unique = content_ != nullptr && content_->reference_count() == 1;
+    if (unique && !content_->isChain && static_cast<Block*>(content_)->Room() >= size) {
+        static_cast<Block*>(content_)->Write(data, size);
+        return;
+    }
+    const auto held = static_cast<std::size_t>(GetSize());
+    if ((content_ == nullptr || !content_->isChain) && held + size <= largestCopiedBlock) {
+        // The first bytes are taken as the only ones; from the second append on the room doubles.
+        auto* grown = Block::Make(held == 0 ? size : std::max(held + size, std::min(2 * held, largestCopiedBlock)));
+        if (held > 0)
+            grown->Write(static_cast<Block*>(content_)->Bytes(), held);
+        grown->Write(data, size);
+        Drop(std::exchange(content_, grown));
+        return;
+    }
+    if (content_ == nullptr) {
+        std::memcpy(Allocate(size), data, size);
+        return;
+    }
+    Chain& chain = WritableChain();
+    chain.Reserve();
+    const std::size_t fitting = std::min(size, chain.RoomAtEnd());
+    Block* further = nullptr;
+    if (size > fitting) {
+        further = Block::Make(std::max(size - fitting, RoomForGrowth(held)));
+        further->Write(data + fitting, size - fitting);
+    }
+    if (fitting > 0)
+        chain.WriteAtEnd(data, fitting);
+    if (further != nullptr)
+        chain.Add(further, further->Chunk());
+}
+
+void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t size) {
+    size = std::min(size, other.GetSize() - std::min(offset, other.GetSize()));
+    if (size == 0)
+        return;
+    const Buffer source(other);
+    if (content_ == nullptr && size == source.GetSize()) {
+        *this = source;
+        return;
+    }
+    if (!source.content_->isChain) {
+        auto* block = static_cast<Block*>(source.content_);
+        AppendPiece(block, block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));
+        return;
+    }
+    // Several pieces go to a copy, so that nothing has happened if memory runs out between two of them.
+    auto const& chain = static_cast<Chain const&>(*source.content_);
+    Buffer result(*this);
+    auto index = static_cast<std::size_t>(std::upper_bound(chain.ends.begin(), chain.ends.end(), offset) - chain.ends.begin());
+    for (auto skip = static_cast<std::size_t>(offset - (chain.ends[index] - chain.chunks[index].size())); size > 0; ++index) {
+        auto piece = chain.chunks[index].subspan(std::exchange(skip, 0));
+        piece = piece.first(static_cast<std::size_t>(std::min<std::uint64_t>(piece.size(), size)));
+        result.AppendPiece(chain.owners[index], piece);
+        size -= piece.size();
+    }
+    Swap(result);
+}
+
+void Buffer::AppendPiece(Block* owner, BufferChunks::Chunk piece) {
+    if (piece.size() >= smallestSharedPiece)
+        WritableChain().Share(owner, piece);
+    else
+        AppendOnce(piece.data(), piece.size());
+}
+
+Buffer::Chain& Buffer::WritableChain() {
+    if (content_ != nullptr && content_->isChain && content_->reference_count() == 1)
+        return static_cast<Chain&>(*content_);
+    auto chain = std::make_unique<Chain>();
+    if (content_ != nullptr && content_->isChain) {
+        chain = std::make_unique<Chain>(static_cast<Chain const&>(*content_));
+    } else if (content_ != nullptr) {
+        auto* block = static_cast<Block*>(content_);
+        chain->Share(block, block->Chunk());
+    }
+    chain->add_reference();
+    Drop(std::exchange(content_, chain.get()));
+    return *chain.release();
+}
+
+} // namespace KivUtils::Memory
