@@ -113,6 +113,18 @@ public:
         return pointer;
     }
 
+    /// Gives up the object without dropping the reference, which `attach` takes over again. Self-counted types only.
+    [[nodiscard]] T const* detach() noexcept {
+        T const* const held = get();
+        counted_ = nullptr;
+        return held;
+    }
+    [[nodiscard]] static cow_ptr attach(T const* object) noexcept {
+        cow_ptr pointer;
+        pointer.counted_ = object;
+        return pointer;
+    }
+
     cow_ptr(cow_ptr const& other) noexcept : counted_(other.counted_) {
         if (counted_ != nullptr)
             counted_->add_reference();

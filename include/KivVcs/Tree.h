@@ -20,6 +20,7 @@ namespace detail {
 
 class TableNode;
 class TableRelease;
+struct TableAccess;
 
 /// The entries of a tree: an ordered table whose copies share their nodes. Copying is O(1), an edit O(log n).
 class EntryTable {
@@ -33,11 +34,12 @@ public:
     }
     ~EntryTable();
 
+    /// Null while there are no entries.
     [[nodiscard]] TableNode const* Root() const noexcept { return root_; }
 
     /// Sets the entry @p name of the kind of @p child, which may be null; the entry of the other kind stays.
-    void Set(KivStringT<char16_t> const& name, cow_ptr<Blob> child);
-    void Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child);
+    void Set(KivStringViewT<char16_t> name, cow_ptr<Blob> child);
+    void Set(KivStringViewT<char16_t> name, cow_ptr<Tree> child);
 
     /// Removes the entries @p name of both kinds; false if there is none.
     bool Erase(KivStringViewT<char16_t> name);
@@ -159,8 +161,12 @@ protected:
     [[nodiscard]] Id ComputeId() const override;
 
 private:
-    friend class detail::EntryTable;
     friend class detail::TableRelease;
+    friend struct detail::TableAccess;
+
+    template <class T>
+    cow_ptr<T> SetLocalObject(IRepository& repo, KivStringViewT<char16_t> name, T const& object);
+    void SetLocalTree(IRepository& repo, KivStringViewT<char16_t> name, cow_ptr<Tree> tree);
 
     detail::EntryTable entries_;
     Published<Buffer> data_;

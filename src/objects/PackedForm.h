@@ -1,0 +1,26 @@
+#pragma once
+
+#include "KivVcs/Object.h"
+
+namespace KivVcs {
+
+/// What precedes the data in a packed form: the type word, a blank, the data's size in decimal, a zero byte.
+void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t size);
+
+/// Computes the identifier of a packed form that is fed piece by piece instead of being put together.
+class IdDigest {
+public:
+    /// Begins the packed form of @p size bytes of data of the type @p word.
+    IdDigest(KivStringViewT<char> word, std::uint64_t size) noexcept;
+
+    void Feed(const void* data, std::size_t size) noexcept { digest_.InitData(data, size); }
+    void Feed(Buffer const& data) noexcept;
+
+    /// @throws std::bad_alloc
+    [[nodiscard]] Id Finish();
+
+private:
+    SHADigest256 digest_;
+};
+
+} // namespace KivVcs
