@@ -1,0 +1,72 @@
+# Shared by the scripts beside it, which source it:
+#   install_packages SET...   installs with apt-get what is missing of the named sets, or says plainly what is missing
+#   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
+#   quietly COMMAND...        runs a command and shows its output only when it fails
+#   die MESSAGE               ends the script
+# Build directories are build/PRESET, or $KIVVCS_BUILD_ROOT/PRESET where that is set.
+
+set -euo pipefail
+
+source_directory=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
+build_root=${KIVVCS_BUILD_ROOT:-$source_directory/build}
+jobs=$(nproc)
+
+die() {
+    printf '%s: %s\n' "${0##*/}" "$*" >&2
+    exit 1
+}
+
+# Prints the comment at the top of the running script and ends it: with success if help was asked for.
+usage() {
+    awk 'NR > 1 { if (!/^#/) exit; sub(/^# ?/, ""); print }' "$0"
+    exit "${1:-0}"
+}
+
+quietly() {
+    local output status=0
+    output=$(mktemp)
+    "$@" >"$output" 2>&1 || status=$?
+    [ "$status" -eq 0 ] || cat "$output" >&2
+    rm -f "$output"
+    return "$status"
+}
+
+packages_of() {
+    case $1 in
+    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils ;;
+    vault) echo libsqlite3-dev libcli11-dev ;;
+    demo) echo git graphviz ;;
+    clang) echo clang-14 ;;
+    lint) echo clang-14 clang-format-14 clang-tidy-14 ;;
+    bench) echo libbenchmark-dev libssl-dev valgrind python3 python3-matplotlib ;;
+    memcheck) echo valgrind ;;
+    coverage) echo gcovr ;;
+    fuzz) echo clang-14 ;;
+    portability) echo g++-i686-linux-gnu g++-aarch64-linux-gnu g++-s390x-linux-gnu g++-mingw-w64-x86-64-posix qemu-user googletest ;;
+    *) die "there is no package set '$1'" ;;
+    esac
+}
+
+install_packages() {
+    command -v dpkg-query >/dev/null || die "this is no Debian system; install by hand what these stand for:" \
+        "$(for set in "$@"; do packages_of "$set"; done | tr '\n' ' ')"
+    local missing=() package as_root=()
+    for package in $(for set in "$@"; do packages_of "$set"; done); do
+        dpkg-query -W -f='${db:Status-Status}\n' "$package" 2>/dev/null | grep -qx installed || missing+=("$package")
+    done
+    [ ${#missing[@]} -gt 0 ] || return 0
+    if [ "$(id -u)" -ne 0 ]; then
+        command -v sudo >/dev/null || die "missing packages: ${missing[*]}; neither root nor sudo is there to install them"
+        as_root=(sudo)
+    fi
+    printf 'Installing %s\n' "${missing[*]}"
+    quietly "${as_root[@]}" apt-get update || die "missing packages: ${missing[*]}; apt-get update failed"
+    quietly "${as_root[@]}" env DEBIAN_FRONTEND=noninteractive apt-get install -y --no-install-recommends "${missing[@]}" ||
+        die "missing packages: ${missing[*]}; apt-get install failed"
+}
+
+build_preset() {
+    build_directory=$build_root/$1
+    quietly cmake -S "$source_directory" --preset "$1" -B "$build_directory" || die "configuring '$1' failed"
+    quietly cmake --build "$build_directory" --parallel "$jobs" || die "building '$1' failed"
+}
