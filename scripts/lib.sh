@@ -1,6 +1,7 @@
 # Shared by the scripts beside it, which source it:
 #   install_packages SET...   installs with apt-get what is missing of the named sets, or says plainly what is missing
 #   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
+#   run_tests                 runs the tests of the directory built last, and shows only the summary when all pass
 #   quietly COMMAND...        runs a command and shows its output only when it fails
 #   die MESSAGE               ends the script
 # Build directories are build/PRESET, or $KIVVCS_BUILD_ROOT/PRESET where that is set.
@@ -39,9 +40,10 @@ packages_of() {
     clang) echo clang-14 ;;
     lint) echo clang-14 clang-format-14 clang-tidy-14 ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 python3-matplotlib ;;
-    memcheck) echo valgrind ;;
+    valgrind) echo valgrind ;;
     coverage) echo gcovr ;;
     fuzz) echo clang-14 ;;
+    googletest) echo googletest ;;
     portability) echo g++-i686-linux-gnu g++-aarch64-linux-gnu g++-s390x-linux-gnu g++-mingw-w64-x86-64-posix qemu-user googletest ;;
     *) die "there is no package set '$1'" ;;
     esac
@@ -69,4 +71,21 @@ build_preset() {
     build_directory=$build_root/$1
     quietly cmake -S "$source_directory" --preset "$1" -B "$build_directory" || die "configuring '$1' failed"
     quietly cmake --build "$build_directory" --parallel "$jobs" || die "building '$1' failed"
+}
+
+run_tests() {
+    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs") output status=0
+    if [ -t 1 ]; then
+        "${tests[@]}" --progress
+        return
+    fi
+    output=$(mktemp)
+    "${tests[@]}" >"$output" 2>&1 || status=$?
+    if [ "$status" -eq 0 ]; then
+        sed -n '/% tests passed/,$p' "$output"
+    else
+        cat "$output"
+    fi
+    rm -f "$output"
+    return "$status"
 }

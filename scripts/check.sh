@@ -1,0 +1,20 @@
+#!/bin/bash
+# usage: scripts/check.sh PRESET...
+# Installs what is missing, then builds each preset of CMakePresets.json and runs its tests: release, debug, clang, static,
+# asan, tsan, glibcxx-debug, valgrind, and clang-tidy, which only builds.
+
+. "$(dirname "$0")/lib.sh"
+[ $# -gt 0 ] || usage 1
+[ "$1" != -h ] && [ "$1" != --help ] || usage
+
+install_packages build vault
+for preset in "$@"; do
+    case $preset in
+    clang | clang-tidy) install_packages lint ;;
+    tsan | glibcxx-debug) install_packages googletest ;;
+    valgrind) install_packages valgrind ;;
+    esac
+    printf '%s:\n' "$preset"
+    build_preset "$preset"
+    [ "$preset" = clang-tidy ] || run_tests
+done

@@ -1,0 +1,14 @@
+#!/bin/bash
+# usage: scripts/format.sh [--check]
+# Formats the sources with clang-format; with --check, only tells which files would change, and fails if there are any.
+
+. "$(dirname "$0")/lib.sh"
+case ${1:-} in
+'') mode=(-i) ;;
+--check) mode=(--dry-run --Werror) ;;
+*) usage $(($1 != -h)) ;;
+esac
+
+install_packages lint
+cd "$source_directory"
+find include src tests examples bench fuzz \( -name '*.h' -o -name '*.cpp' \) -print0 | xargs -0 clang-format-14 "${mode[@]}"

@@ -1,0 +1,10 @@
+#!/bin/bash
+# usage: scripts/test.sh
+# Installs what is missing, builds the library, its examples and its tests with warnings as errors, and runs every test.
+
+. "$(dirname "$0")/lib.sh"
+[ $# -eq 0 ] || usage $(($1 != -h))
+
+install_packages build vault
+build_preset release
+run_tests
