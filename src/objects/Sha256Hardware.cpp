@@ -1,11 +1,10 @@
 #include "objects/Sha256Compression.h"
 
-#include <utility>
-
 #if defined(__GNUC__) && (defined(__x86_64__) || defined(__i386__))
 
 #include <cpuid.h>
 #include <immintrin.h>
+#include <utility>
 
 namespace KivVcs::Sha256 {
 
@@ -80,9 +79,8 @@ Compression FindHardwareCompression() noexcept {
 
 } // namespace KivVcs::Sha256
 
-// Clang before 16 declares the intrinsics only where the whole file is compiled for processors that have the instructions.
-#elif defined(__AARCH64EL__) && (defined(__ARM_FEATURE_SHA2) || defined(__ARM_FEATURE_CRYPTO) || \
-                                 (defined(__linux__) && (!defined(__clang__) || __clang_major__ >= 16)))
+// Clang offers the intrinsics only where everything is compiled for processors that have the instructions.
+#elif defined(__AARCH64EL__) && (defined(__ARM_FEATURE_SHA2) || (defined(__linux__) && !defined(__clang__)))
 
 #include <arm_neon.h>
 
@@ -91,36 +89,29 @@ Compression FindHardwareCompression() noexcept {
 #include <sys/auxv.h>
 #endif
 
-#if defined(__clang__)
-#pragma clang attribute push(__attribute__((target("sha2"))), apply_to = function)
-#else
+#if !defined(__clang__)
 #pragma GCC push_options
-#pragma GCC target("+sha2")
+#pragma GCC target("+crypto")
 #endif
 
 namespace KivVcs::Sha256 {
 
 namespace {
 
-template <std::size_t group>
-[[gnu::always_inline]]
-inline void FourRounds(uint32x4_t& abcd, uint32x4_t& efgh, uint32x4_t (&message)[4]) noexcept {
-    uint32x4_t& current = message[group % 4];
-    uint32x4_t const scheduled = vaddq_u32(current, vld1q_u32(&roundConstants[4 * group]));
-    if constexpr (group < 12) {
-        uint32x4_t const extended = vsha256su0q_u32(current, message[(group + 1) % 4]);
-        current = vsha256su1q_u32(extended, message[(group + 2) % 4], message[(group + 3) % 4]);
-    }
+inline void FourRounds(uint32x4_t& abcd, uint32x4_t& efgh, uint32x4_t message, const std::uint32_t* constants) noexcept {
+    uint32x4_t const scheduled = vaddq_u32(message, vld1q_u32(constants));
     uint32x4_t const abcdBefore = abcd;
     abcd = vsha256hq_u32(abcd, efgh, scheduled);
     efgh = vsha256h2q_u32(efgh, abcdBefore, scheduled);
 }
 
-template <std::size_t... groups>
-[[gnu::always_inline]]
-inline void AllRounds(uint32x4_t& abcd, uint32x4_t& efgh, uint32x4_t (&message)[4],
-                      std::index_sequence<groups...>) noexcept {
-    (FourRounds<groups>(abcd, efgh, message), ...);
+/// The four words that follow the sixteen given.
+inline uint32x4_t Extend(uint32x4_t first, uint32x4_t second, uint32x4_t third, uint32x4_t fourth) noexcept {
+    return vsha256su1q_u32(vsha256su0q_u32(first, second), third, fourth);
+}
+
+inline uint32x4_t LoadBigEndian(const std::uint8_t* bytes) noexcept {
+    return vreinterpretq_u32_u8(vrev32q_u8(vld1q_u8(bytes)));
 }
 
 void CompressByInstructions(State& state, const std::uint8_t* blocks, std::size_t count) noexcept {
@@ -129,10 +120,25 @@ void CompressByInstructions(State& state, const std::uint8_t* blocks, std::size_
     for (; count != 0; --count, blocks += blockSize) {
         uint32x4_t const abcdBefore = abcd;
         uint32x4_t const efghBefore = efgh;
-        uint32x4_t message[4];
-        for (std::size_t i = 0; i < 4; ++i)
-            message[i] = vreinterpretq_u32_u8(vrev32q_u8(vld1q_u8(blocks + 16 * i)));
-        AllRounds(abcd, efgh, message, std::make_index_sequence<16>());
+        uint32x4_t first = LoadBigEndian(blocks);
+        uint32x4_t second = LoadBigEndian(blocks + 16);
+        uint32x4_t third = LoadBigEndian(blocks + 32);
+        uint32x4_t fourth = LoadBigEndian(blocks + 48);
+        const std::uint32_t* constants = roundConstants.data();
+        for (int round = 0; round < 48; round += 16, constants += 16) {
+            FourRounds(abcd, efgh, first, constants);
+            first = Extend(first, second, third, fourth);
+            FourRounds(abcd, efgh, second, constants + 4);
+            second = Extend(second, third, fourth, first);
+            FourRounds(abcd, efgh, third, constants + 8);
+            third = Extend(third, fourth, first, second);
+            FourRounds(abcd, efgh, fourth, constants + 12);
+            fourth = Extend(fourth, first, second, third);
+        }
+        FourRounds(abcd, efgh, first, constants);
+        FourRounds(abcd, efgh, second, constants + 4);
+        FourRounds(abcd, efgh, third, constants + 8);
+        FourRounds(abcd, efgh, fourth, constants + 12);
         abcd = vaddq_u32(abcd, abcdBefore);
         efgh = vaddq_u32(efgh, efghBefore);
     }
@@ -144,23 +150,17 @@ void CompressByInstructions(State& state, const std::uint8_t* blocks, std::size_
 
 } // namespace KivVcs::Sha256
 
-#if defined(__clang__)
-#pragma clang attribute pop
-#else
+#if !defined(__clang__)
 #pragma GCC pop_options
 #endif
 
-namespace KivVcs::Sha256 {
-
-Compression FindHardwareCompression() noexcept {
+KivVcs::Sha256::Compression KivVcs::Sha256::FindHardwareCompression() noexcept {
 #if defined(__linux__)
-    return (getauxval(AT_HWCAP) & HWCAP_SHA2) != 0 ? CompressByInstructions : nullptr;
-#else
-    return CompressByInstructions;
+    if ((getauxval(AT_HWCAP) & HWCAP_SHA2) == 0)
+        return nullptr;
 #endif
+    return CompressByInstructions;
 }
-
-} // namespace KivVcs::Sha256
 
 #else
 
