@@ -44,8 +44,9 @@ public:
     [[nodiscard]] KivStringT<char16_t> const& GetDescription() const noexcept { return description_; }
     [[nodiscard]] Time GetCommitTime() const noexcept { return commitTime_; }
     [[nodiscard]] TimeDelta GetCommitTimezoneBias() const noexcept { return timezoneBias_; }
-    [[nodiscard]] cow_ptr<Commit> GetParent() const noexcept { return parent_; }
-    [[nodiscard]] cow_ptr<CommitTree> GetCommitTree() const noexcept { return tree_; }
+    /// References into the commit, so that long histories are walked without touching use counts.
+    [[nodiscard]] cow_ptr<Commit> const& GetParent() const noexcept { return parent_; }
+    [[nodiscard]] cow_ptr<CommitTree> const& GetCommitTree() const noexcept { return tree_; }
     [[nodiscard]] bool IsAmend() const noexcept { return amend_; }
 
     /// Setters; each calls `ResetState`.

@@ -107,6 +107,9 @@ public:
         return Id(cow_ptr<Id::Record>::share(record_.load(std::memory_order_acquire)));
     }
 
+    /// The hash of the identifier. @pre IsSet()
+    [[nodiscard]] std::size_t Hash() const noexcept { return record_.load(std::memory_order_acquire)->hash; }
+
     /// Whether both are there and equal; false tells nothing if one is missing.
     [[nodiscard]] bool Equals(CachedId const& other) const noexcept {
         Id::Record const* const mine = record_.load(std::memory_order_acquire);
@@ -190,6 +193,9 @@ public:
 
     /// Whether both objects have the same identifier; without touching it when they are one object.
     [[nodiscard]] bool HasSameId(Object const& other) const;
+
+    /// `GetId().Hash()`, without a copy of the identifier.
+    [[nodiscard]] std::size_t GetIdHash() const { return id_.IsSet() ? id_.Hash() : GetId().Hash(); }
 
 protected:
     Object() noexcept = default;

@@ -1,0 +1,37 @@
+#include "KivVcs/Repository.h"
+
+namespace KivVcs {
+
+namespace {
+
+cow_ptr<Tree> RootTreeOf(cow_ptr<Commit> const& commit) {
+    return commit && commit->GetCommitTree() ? commit->GetCommitTree()->GetRoot() : nullptr;
+}
+
+} // namespace
+
+bool Repository::Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) {
+    if (!commit)
+        return false;
+    const auto head = GetHead();
+    if (!head)
+        return false;
+    const auto base = GetCommonBase(head, commit);
+    auto merged = ThreeWayMerge(this, {RootTreeOf(head), RootTreeOf(base), RootTreeOf(commit)}, std::move(resolvers));
+    if (!merged)
+        return false;
+    Commit mergeCommit(head, false);
+    mergeCommit.ReplaceRoot(this, std::move(merged));
+    return DoCommit(mergeCommit) != nullptr;
+}
+
+bool Repository::Merge(cow_ptr<Commit> commit, Resolvers resolvers) {
+    if (!commit)
+        return false;
+    if (!GetHead())
+        return MoveBranchTo(GetCurentBranch(), std::move(commit));
+    // Directly: a merge means what this class does, whatever a host makes of the two operations on their own.
+    return Repository::FastForwardMerge(commit) || Repository::Merge3Way(std::move(commit), std::move(resolvers));
+}
+
+} // namespace KivVcs

@@ -1,0 +1,68 @@
+#include "KivVcs/Repository.h"
+
+#include <algorithm>
+
+namespace KivVcs {
+
+namespace {
+
+/// The commits above @p base up to @p commit, oldest first; @p commit itself in any case.
+std::vector<cow_ptr<Commit>> LineAbove(cow_ptr<Commit> const& base, cow_ptr<Commit> const& commit) {
+    std::vector<cow_ptr<Commit>> line{commit};
+    if (commit == base)
+        return line;
+    while (line.back()->GetParent() && !(line.back()->GetParent() == base))
+        line.push_back(line.back()->GetParent());
+    std::ranges::reverse(line);
+    return line;
+}
+
+} // namespace
+
+cow_ptr<Commit> Repository::MergelessRebase(cow_ptr<Commit> commit, cow_ptr<Commit> base, cow_ptr<Commit> onto) {
+    if (!commit || !onto)
+        return nullptr;
+    auto line = LineAbove(base, commit);
+    cow_ptr<Commit> parent = std::move(onto);
+    for (auto& moved : line) {
+        if (moved->GetParent() == parent)
+            return commit;
+        moved.write()->SetParent(std::move(parent));
+        parent = SyncWithStorage(std::move(moved));
+    }
+    return parent;
+}
+
+cow_ptr<Commit> Repository::MergelessRebase(KivStringViewT<char16_t> branch, KivStringViewT<char16_t> ontoBranch) {
+    auto head = GetHead(branch);
+    auto ontoHead = GetHead(ontoBranch);
+    auto base = GetCommonBase(head, ontoHead);
+    return MergelessRebase(std::move(head), std::move(base), std::move(ontoHead));
+}
+
+bool Repository::EnsureCommonRootFor(KivStringViewT<char16_t> first, KivStringViewT<char16_t> second,
+                                     KivStringViewT<char16_t> rootBranch) {
+    const auto firstHead = GetHead(first);
+    const auto secondHead = GetHead(second);
+    if (firstHead && secondHead && GetCommonBase(firstHead, secondHead))
+        return true;
+    auto root = GetHead(rootBranch);
+    if (!root) {
+        root.write()->SetDescription(u"Root commit");
+        if (!CreateBranch(rootBranch, SyncWithStorage(std::move(root))))
+            return false;
+        root = GetHead(rootBranch);
+    }
+    return AttachToRoot(first, root) && AttachToRoot(second, root);
+}
+
+bool Repository::AttachToRoot(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& root) {
+    auto head = GetHead(branch);
+    if (!head)
+        return CreateBranch(branch, root) || MoveBranchTo(branch, root);
+    if (GetCommonBase(head, root))
+        return true;
+    return MoveBranchTo(branch, MergelessRebase(std::move(head), nullptr, root));
+}
+
+} // namespace KivVcs

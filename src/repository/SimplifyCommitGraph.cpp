@@ -1,0 +1,164 @@
+#include "KivVcs/Repository.h"
+
+#include "repository/CommitSet.h"
+
+#include <typeinfo>
+#include <unordered_map>
+
+namespace KivVcs {
+
+namespace {
+
+struct Branch {
+    KivStringT<char16_t> name;
+    cow_ptr<Commit> head;
+};
+
+/// What is known of a commit of the simplified graph.
+struct KeptCommit {
+    /// The branches whose head it is.
+    std::vector<KivStringT<char16_t>> branches;
+    /// The kept commits whose nearest kept ancestor it is.
+    std::vector<Id> children;
+    bool hasParent = false;
+    /// Whether its own nearest kept ancestor has been looked for.
+    bool isLinked = false;
+};
+
+using KeptCommits = std::unordered_map<Id, KeptCommit>;
+
+/// Rewrites the history of a repository's branches. Nothing of it may be alive when the storage is purged.
+class GraphSimplification {
+public:
+    /// @param repository called for whatever its hosts may override
+    GraphSimplification(IRepository& repository, IObjectsStorage& storage)
+        : repository_(repository), storage_(storage) {
+        for (auto const& [name, head] : storage.GetRefs())
+            branches_.push_back({name, head});
+        for (auto const& [name, head] : branches_) {
+            if (head)
+                kept_[head->GetId()].branches.push_back(name);
+        }
+    }
+
+    /// Keeps the common base of every two heads, as `GetCommonBase` gives it.
+    void KeepCommonBasesOfPairs() {
+        for (auto first = branches_.begin(); first != branches_.end(); ++first) {
+            for (auto second = std::next(first); second != branches_.end(); ++second) {
+                if (const auto base = repository_.GetCommonBase(first->head, second->head))
+                    kept_.try_emplace(base->GetId());
+            }
+        }
+    }
+
+    /// Keeps the same commits by one walk over every parent link. An identifier determines the identifiers of all
+    /// ancestors, so that histories that meet stay together: two heads have their base where their paths meet, and
+    /// every commit at which a path arrives that another one has passed is the base of two heads.
+    void KeepCommitsWherePathsMeet() {
+        CommitSet visited;
+        for (auto const& branch : branches_) {
+            Commit const* commit = branch.head.get();
+            while (commit != nullptr && visited.Insert(*commit))
+                commit = commit->GetParent().get();
+            if (commit != nullptr)
+                kept_.try_emplace(commit->GetId());
+        }
+    }
+
+    /// Links every kept commit on the way down from a stored head to the nearest kept one below it.
+    void Link() {
+        for (auto kept = kept_.begin(); kept != kept_.end(); ++kept) {
+            if (kept->second.branches.empty())
+                continue;
+            if (const auto head = storage_.GetCommit(kept->first))
+                LinkChain(kept, *head);
+        }
+    }
+
+    /// Stores the kept commits anew, each with the nearest kept ancestor as parent, and moves the branches.
+    void Rebuild() const {
+        for (auto const& [id, kept] : kept_) {
+            if (!kept.hasParent)
+                RebuildFrom(id);
+        }
+    }
+
+private:
+    void LinkChain(KeptCommits::iterator child, Commit const& head) {
+        for (Commit const* commit = head.GetParent().get(); commit != nullptr && !child->second.isLinked;
+             commit = commit->GetParent().get()) {
+            const auto kept = kept_.find(commit->GetId());
+            if (kept == kept_.end())
+                continue;
+            kept->second.children.push_back(child->first);
+            child->second.hasParent = true;
+            child->second.isLinked = true;
+            child = kept;
+        }
+        child->second.isLinked = true;
+    }
+
+    /// Depth-first, on a stack of its own since a chain may keep any number of commits.
+    void RebuildFrom(Id const& root) const {
+        struct Level {
+            KeptCommit const* kept;
+            cow_ptr<Commit> rebuilt;
+            std::size_t nextChild = 0;
+        };
+        std::vector<Level> levels;
+        const auto open = [this, &levels](Id const& id, cow_ptr<Commit> const& parent) {
+            if (auto commit = storage_.GetCommit(id)) {
+                auto const& kept = kept_.at(id);
+                levels.push_back({&kept, RebuildCommit(std::move(commit), parent, kept)});
+            }
+        };
+        open(root, nullptr);
+        while (!levels.empty()) {
+            Level& level = levels.back();
+            if (level.nextChild == level.kept->children.size())
+                levels.pop_back();
+            else
+                open(level.kept->children[level.nextChild++], level.rebuilt);
+        }
+    }
+
+    cow_ptr<Commit> RebuildCommit(cow_ptr<Commit> commit, cow_ptr<Commit> const& parent, KeptCommit const& kept) const {
+        commit.write()->SetParent(parent);
+        auto rebuilt = repository_.SyncWithStorage(std::move(commit));
+        for (auto const& branch : kept.branches) {
+            if (repository_.BranchExist(branch))
+                repository_.MoveBranchTo(branch, rebuilt);
+            else
+                repository_.CreateBranch(branch, rebuilt);
+        }
+        return rebuilt;
+    }
+
+    IRepository& repository_;
+    IObjectsStorage& storage_;
+    std::vector<Branch> branches_;
+    KeptCommits kept_;
+};
+
+} // namespace
+
+bool Repository::SimplifyCommitGraph(bool purge) {
+    if (storage_ == nullptr)
+        return false;
+    {
+        GraphSimplification simplification(*this, *storage_);
+        // Where no host can have overridden `GetCommonBase`, nobody can tell that it is not asked about every pair,
+        // which would take time in proportion to the pairs times the length of the histories.
+        if (typeid(*this) == typeid(Repository))
+            simplification.KeepCommitsWherePathsMeet();
+        else
+            simplification.KeepCommonBasesOfPairs();
+        simplification.Link();
+        simplification.Rebuild();
+    }
+    if (purge)
+        UpdateStorage();
+    return true;
+}
+
+} // namespace KivVcs
