@@ -38,7 +38,7 @@ packages_of() {
     vault) echo libsqlite3-dev libcli11-dev ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
-    lint) echo clang-14 clang-format-14 clang-tidy-14 ;;
+    lint) echo clang-14 clang-format-16 clang-tidy-14 ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 python3-matplotlib ;;
     valgrind) echo valgrind ;;
     coverage) echo gcovr ;;
