@@ -32,8 +32,8 @@ alignas(16) inline constexpr std::array<std::uint32_t, 64> roundConstants{
     0x748f82ee, 0x78a5636f, 0x84c87814, 0x8cc70208, 0x90befffa, 0xa4506ceb, 0xbef9a3f7, 0xc67178f2};
 
 /// One round; instead of moving all eight variables along, the callers rotate the arguments.
-constexpr void Round(std::uint32_t a, std::uint32_t b, std::uint32_t c, std::uint32_t& d, std::uint32_t e, std::uint32_t f,
-                     std::uint32_t g, std::uint32_t& h, std::uint32_t scheduled) noexcept {
+constexpr void Round(std::uint32_t a, std::uint32_t b, std::uint32_t c, std::uint32_t& d, std::uint32_t e,
+                     std::uint32_t f, std::uint32_t g, std::uint32_t& h, std::uint32_t scheduled) noexcept {
     h += (std::rotr(e, 6) ^ std::rotr(e, 11) ^ std::rotr(e, 25)) + (g ^ (e & (f ^ g))) + scheduled;
     d += h;
     h += (std::rotr(a, 2) ^ std::rotr(a, 13) ^ std::rotr(a, 22)) + ((a & b) | (c & (a | b)));
@@ -45,13 +45,14 @@ constexpr void CompressPortably(State& state, const std::uint8_t* blocks, std::s
         std::array<std::uint32_t, 64> schedule{};
         for (std::size_t i = 0; i < 16; ++i) {
             const std::uint8_t* const bytes = blocks + 4 * i;
-            schedule[i] = std::uint32_t{bytes[0]} << 24 | std::uint32_t{bytes[1]} << 16 | std::uint32_t{bytes[2]} << 8 | bytes[3];
+            schedule[i] =
+                std::uint32_t{bytes[0]} << 24 | std::uint32_t{bytes[1]} << 16 | std::uint32_t{bytes[2]} << 8 | bytes[3];
         }
         for (std::size_t i = 16; i < schedule.size(); ++i) {
             std::uint32_t const early = schedule[i - 15];
             std::uint32_t const late = schedule[i - 2];
-            schedule[i] = schedule[i - 16] + (std::rotr(early, 7) ^ std::rotr(early, 18) ^ early >> 3) + schedule[i - 7] +
-                          (std::rotr(late, 17) ^ std::rotr(late, 19) ^ late >> 10);
+            schedule[i] = schedule[i - 16] + (std::rotr(early, 7) ^ std::rotr(early, 18) ^ early >> 3) +
+                          schedule[i - 7] + (std::rotr(late, 17) ^ std::rotr(late, 19) ^ late >> 10);
         }
         auto [a, b, c, d, e, f, g, h] = state;
         for (std::size_t i = 0; i < schedule.size(); i += 8) {

@@ -98,7 +98,8 @@ namespace KivVcs::Sha256 {
 
 namespace {
 
-inline void FourRounds(uint32x4_t& abcd, uint32x4_t& efgh, uint32x4_t message, const std::uint32_t* constants) noexcept {
+inline void FourRounds(uint32x4_t& abcd, uint32x4_t& efgh, uint32x4_t message,
+                       const std::uint32_t* constants) noexcept {
     uint32x4_t const scheduled = vaddq_u32(message, vld1q_u32(constants));
     uint32x4_t const abcdBefore = abcd;
     abcd = vsha256hq_u32(abcd, efgh, scheduled);
