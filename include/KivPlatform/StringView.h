@@ -3,6 +3,8 @@
 /// @file
 /// Non-owning views of 8-bit and UTF-16 text.
 
+#include "KivPlatform/Export.h"
+
 #include <algorithm>
 #include <compare>
 #include <concepts>
@@ -15,7 +17,7 @@
 namespace KivPlatform {
 
 template <class C>
-class KivStringT;
+class KIVVCS_EXPORT KivStringT;
 
 /// How texts are compared. `Exact`, the default everywhere, orders by unsigned code unit, a prefix before the longer text.
 enum class CompareCase : std::int32_t { Exact = 0 };
