@@ -70,7 +70,10 @@ install_packages() {
 build_preset() {
     build_directory=$build_root/$1
     quietly cmake -S "$source_directory" --preset "$1" -B "$build_directory" || die "configuring '$1' failed"
-    quietly cmake --build "$build_directory" --parallel "$jobs" || die "building '$1' failed"
+    local build=(cmake --build "$build_directory" --parallel "$jobs")
+    # On a terminal the build tool keeps to one line, which shows how far it is.
+    [ -t 1 ] || build=(quietly "${build[@]}")
+    "${build[@]}" || die "building '$1' failed"
 }
 
 run_tests() {
