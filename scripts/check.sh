@@ -5,7 +5,6 @@
 
 . "$(dirname "$0")/lib.sh"
 [ $# -gt 0 ] || usage 1
-[ "$1" != -h ] && [ "$1" != --help ] || usage
 
 install_packages build vault
 for preset in "$@"; do

@@ -6,7 +6,7 @@
 case ${1:-} in
 '') mode=(-i) ;;
 --check) mode=(--dry-run --Werror) ;;
-*) usage $(($1 != -h)) ;;
+*) usage 1 ;;
 esac
 
 install_packages lint

@@ -1,9 +1,11 @@
+# shellcheck shell=bash disable=SC2119,SC2120
 # Shared by the scripts beside it, which source it:
 #   install_packages SET...   installs with apt-get what is missing of the named sets, or says plainly what is missing
 #   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
 #   run_tests                 runs the tests of the directory built last, and shows only the summary when all pass
 #   quietly COMMAND...        runs a command and shows its output only when it fails
 #   die MESSAGE               ends the script
+#   usage [STATUS]            shows the comment at the top of the script and ends it; -h and --help do so by themselves
 # Build directories are build/PRESET, or $KIVVCS_BUILD_ROOT/PRESET where that is set.
 
 set -euo pipefail
@@ -17,11 +19,14 @@ die() {
     exit 1
 }
 
-# Prints the comment at the top of the running script and ends it: with success if help was asked for.
 usage() {
     awk 'NR > 1 { if (!/^#/) exit; sub(/^# ?/, ""); print }' "$0"
     exit "${1:-0}"
 }
+
+case ${1:-} in
+-h | --help) usage ;;
+esac
 
 quietly() {
     local output status=0
@@ -38,7 +43,7 @@ packages_of() {
     vault) echo libsqlite3-dev libcli11-dev ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
-    lint) echo clang-14 clang-format-16 clang-tidy-14 ;;
+    lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 python3-matplotlib ;;
     valgrind) echo valgrind ;;
     coverage) echo gcovr ;;

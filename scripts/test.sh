@@ -3,7 +3,7 @@
 # Installs what is missing, builds the library, its examples and its tests with warnings as errors, and runs every test.
 
 . "$(dirname "$0")/lib.sh"
-[ $# -eq 0 ] || usage $(($1 != -h))
+[ $# -eq 0 ] || usage 1
 
 install_packages build vault
 build_preset release
