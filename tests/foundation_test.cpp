@@ -1,0 +1,389 @@
+#include "KivVcs/Foundation.h"
+#include "HostStream.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <limits>
+#include <random>
+#include <stdexcept>
+#include <string>
+#include <tuple>
+#include <vector>
+
+using namespace KivVcs;
+
+namespace {
+
+using Text = KivStringT<char>;
+using Wide = KivStringT<char16_t>;
+
+Wide Units(std::initializer_list<int> units) {
+    Wide text;
+    for (int unit : units)
+        text += static_cast<char16_t>(unit);
+    return text;
+}
+
+TEST(Text, CopiesShareTheirCharactersUntilOneChanges) {
+    Text original("branch");
+    Text copy = original;
+    EXPECT_EQ(static_cast<const void*>(copy.GetString()), original.GetString());
+    EXPECT_EQ(static_cast<const void*>(copy.Mid(-3, 99).GetString()), original.GetString());
+    copy += '/';
+    copy += copy;
+    copy += copy.GetString() + 7;
+    EXPECT_EQ(copy, "branch/branch/branch/");
+    EXPECT_EQ(original, "branch");
+    const Text moved = std::move(copy);
+    EXPECT_EQ(moved.GetLength(), 21);
+    copy = original;
+    copy = *&copy;
+    EXPECT_EQ(copy + "/" + moved.Left(1), "branch/b");
+
+    Wide wide(Text("\x01z\x80\xFF"));
+    wide += '\xE9';
+    EXPECT_EQ(wide, Units({1, 'z', 0x80, 0xFF, 0xE9}));
+    for (int count = 0; count < 100'000; ++count)
+        wide += u'x';
+    EXPECT_EQ(wide.GetLength(), 100'005);
+    EXPECT_EQ(wide[100'005], u'\0');
+    EXPECT_EQ(Text(nullptr, 5) + Text("abc", -1) + static_cast<const char*>(nullptr), "");
+}
+
+TEST(Text, ComparesTextsAndNeverPointers) {
+    const std::string elsewhere = "name";
+    const Text name("name");
+    EXPECT_TRUE(name == elsewhere.c_str() && elsewhere.c_str() == name && name == "name" && "name" == name);
+    EXPECT_TRUE(KivStringViewT<char>("name") == name && name != "Name" && "nam" != name && !name.IsEmpty());
+    EXPECT_TRUE(Wide(u"name") == u"name" && u"name" == Wide(Text("name")) && u"names" > Wide(u"name"));
+    EXPECT_FALSE(name != elsewhere.c_str());
+    EXPECT_NE(Text("a\0b", 3), Text("a\0c", 3));
+
+    // Ascending by unsigned code units, a prefix first; U+1F600 starts with 0xD83D.
+    const Text narrow[] = {"", "A", "Ab", "B", "a", "\x7F", "\x80", "\xC3\xA9", "\xFF"};
+    const Wide wide[] = {Units({0}), u"a", u"\u00E9", u"\u20AC", u"\U0001F600", u"\uFFFD"};
+    for (std::size_t i = 0; i < std::size(narrow); ++i)
+        for (std::size_t j = 0; j < std::size(narrow); ++j)
+            EXPECT_EQ(narrow[i].Compare(narrow[j]) <=> 0, i <=> j) << i << ' ' << j;
+    for (std::size_t i = 0; i < std::size(wide); ++i)
+        for (std::size_t j = 0; j < std::size(wide); ++j)
+            EXPECT_EQ(wide[i] <=> wide[j], i <=> j) << i << ' ' << j;
+    EXPECT_EQ(std::hash<Wide>()(u"name"), std::hash<KivStringViewT<char16_t>>()(Wide(u"name")));
+}
+
+TEST(Text, SearchesAndSubstringsClipTheirArguments) {
+    constexpr int most = std::numeric_limits<int>::max();
+    const Text text("a/bb/a/");
+    const std::tuple<const char*, int, int> searches[] = {{"/", 0, 1},  {"/", 2, 4},  {"/", -9, 1},
+                                                          {"/", 7, -1}, {"a/", 1, 5}, {"b", most, -1},
+                                                          {"", 7, 7},   {"", 8, -1},  {"a/bb/a//", 0, -1}};
+    for (auto const& [needle, start, found] : searches)
+        EXPECT_EQ(text.Find(needle, start), found) << needle << ' ' << start;
+    const std::tuple<int, int, const char*> parts[] = {{-5, 3, "a/b"},     {5, 99, "a/"}, {7, 1, ""},
+                                                       {most, most, ""},   {1, -1, ""},   {1, 0, ""},
+                                                       {2, most, "bb/a/"}, {0, 1, "a"}};
+    for (auto const& [start, count, part] : parts)
+        EXPECT_EQ(text.Mid(start, count), part) << start << ' ' << count;
+    EXPECT_EQ(text.Mid(5) + text.Left(-1), "a/");
+    EXPECT_TRUE(text.StartsWith("a/bb") && !text.StartsWith("a/bb/a//") && !text.StartsWith("b"));
+}
+
+TEST(Text, FormatsLikePrintf) {
+    const auto narrow = [](KivStringViewT<char> format, auto... arguments) {
+        Text text("before");
+        text.FormatInternal(format, arguments...);
+        return text;
+    };
+    EXPECT_EQ(narrow("%.*s %lu", 4, "blobby", std::uint64_t{18446744073709551615U}), "blob 18446744073709551615");
+    EXPECT_EQ(narrow("%.*s|", 9, "blob"), "blob|");
+    EXPECT_EQ(narrow("%d %d", std::numeric_limits<std::int64_t>::min(), 0), "-9223372036854775808 0");
+    EXPECT_EQ(narrow("%%%s%", "s"), "%s");
+    EXPECT_EQ(narrow("%s-%d"), "-");
+    Wide wide;
+    wide.FormatInternal(u"%s <%s> %d %02d%02d %03d %4d", Wide(u"\u00E9"), u"b", 1700000000, 5, -7, -7, 42);
+    EXPECT_EQ(wide, u"\u00E9 <b> 1700000000 05-7 -07   42");
+    wide.FormatInternal(u"%s!", static_cast<const char16_t*>(wide));
+    EXPECT_EQ(wide, u"\u00E9 <b> 1700000000 05-7 -07   42!");
+}
+
+TEST(Encoding, EveryTextSurvivesUtf8) {
+    Wide text;
+    for (int unit = 0; unit < 0x10000; ++unit)
+        text += static_cast<char16_t>(unit);
+    text += u"\U00010000 \U0001F600 \U0010FFFF ";
+    text += Units({0xDC00, 0xD800, 'x', 0xD800, 0xD800, 0xDC00, 0xDBFF});
+    const Text encoded = DataEncoding::Utf8Encode(text);
+    EXPECT_EQ(static_cast<std::size_t>(encoded.GetLength()), DataEncoding::Utf8Length(text));
+    EXPECT_EQ(String::ToStringW(encoded), text);
+    EXPECT_EQ(DataEncoding::Utf8Encode(u"a\u00E9\u20AC\U0001F600"), "a\xC3\xA9\xE2\x82\xAC\xF0\x9F\x98\x80");
+    EXPECT_EQ(DataEncoding::Utf8Encode(Units({0xDC00, 0xD83D})), "\xED\xB0\x80\xED\xA0\xBD");
+}
+
+TEST(Encoding, EveryByteOutsideAWellFormedSequenceDecodesToAReplacement) {
+    EXPECT_EQ(String::ToStringW("a\x80z|\xC0\x80|\xC1\xBF|\xC3|\xE0\x80\x80|\xE2\x82|\xE2(\xA1|\xF0\x8F\xBF\xBF|"
+                                "\xF4\x90\x80\x80|\xF0\x9F\x98|\xFF\xFE|\xC3\xA9|\xF0\x9F\x98\x80\xE2\x82"),
+              u"a\uFFFDz|\uFFFD\uFFFD|\uFFFD\uFFFD|\uFFFD|\uFFFD\uFFFD\uFFFD|\uFFFD\uFFFD|\uFFFD(\uFFFD|"
+              u"\uFFFD\uFFFD\uFFFD\uFFFD|\uFFFD\uFFFD\uFFFD\uFFFD|\uFFFD\uFFFD\uFFFD|\uFFFD\uFFFD|\u00E9|"
+              u"\U0001F600\uFFFD\uFFFD");
+}
+
+TEST(Encoding, NumbersStopAtTheFirstOtherCharacterAndAreClamped) {
+    for (const char* text : {"", "-", "x1", " 1", "--1", "-0"})
+        EXPECT_TRUE(String::Int64FromString(Wide(Text(text))) == 0 && String::IntFromString(Wide(Text(text))) == 0)
+            << text;
+    using limits = std::numeric_limits<std::int64_t>;
+    const std::pair<const char*, std::int64_t> cases[] = {{"+07x9", 7},
+                                                          {"-12.5", -12},
+                                                          {"2147483647", 2147483647},
+                                                          {"2147483648", 2147483648},
+                                                          {"-2147483648", -2147483648LL},
+                                                          {"-2147483649", -2147483649LL},
+                                                          {"9223372036854775807", limits::max()},
+                                                          {"9223372036854775808", limits::max()},
+                                                          {"-9223372036854775808", limits::min()},
+                                                          {"-99999999999999999999", limits::min()}};
+    for (auto const& [text, number] : cases) {
+        EXPECT_EQ(String::Int64FromString(Wide(Text(text))), number) << text;
+        EXPECT_EQ(String::IntFromString(Wide(Text(text))), std::clamp<std::int64_t>(number, -2147483648LL, 2147483647))
+            << text;
+    }
+    EXPECT_EQ(DataEncoding::HexEncode("\x00\x9F\xF0\x0A", 4) + DataEncoding::HexEncode(nullptr, 4), u"009ff00a");
+}
+
+/// Counts living objects; a copy of a fragile one throws.
+struct Tracked {
+    explicit Tracked(int number = 7) : value(number) { ++alive; }
+    Tracked(Tracked const& other) : value(other.value) {
+        if (fragile)
+            throw std::runtime_error("no copy");
+        ++alive;
+    }
+    Tracked& operator=(Tracked const&) = default;
+    ~Tracked() { --alive; }
+    int value;
+    static inline int alive = 0;
+    static inline bool fragile = false;
+};
+struct Uncounted : Tracked {
+    using Tracked::Tracked;
+};
+struct Counted : KivUtils::reference_counted, Tracked {
+    using Tracked::Tracked;
+    virtual ~Counted() = default;
+};
+struct Derived : Counted {
+    using Counted::Counted;
+    Tracked more{1};
+};
+
+template <class T>
+class CowPointer : public testing::Test {};
+using Held = testing::Types<Uncounted, Counted, Derived>;
+TYPED_TEST_SUITE(CowPointer, Held);
+
+TYPED_TEST(CowPointer, CopiesItsObjectOnlyForASharedWriter) {
+    using Pointer = cow_ptr<TypeParam>;
+    {
+        Pointer null;
+        EXPECT_EQ(null.write_if_there(), nullptr);
+        EXPECT_TRUE(null == nullptr && null.use_count() == 0);
+        EXPECT_EQ(null.write()->value, 7);
+
+        auto first = immu::make<TypeParam>(1);
+        const auto* const object = first.get();
+        EXPECT_EQ(first.write_if_there(), object);
+        Pointer second = first;
+        EXPECT_EQ(second.use_count(), 2U);
+        Tracked::fragile = true;
+        EXPECT_THROW(second.write()->value = 2, std::runtime_error);
+        Tracked::fragile = false;
+        EXPECT_EQ(second, first);
+        second.write()->value = 2;
+        EXPECT_TRUE(first->value == 1 && first.get() == object && first.use_count() == 1 && second.use_count() == 1);
+        second = *&second;
+        first = std::move(second);
+        EXPECT_EQ(first->value, 2);
+
+        const Pointer adopted(std::make_unique<TypeParam>(3));
+        EXPECT_EQ(Pointer(adopted)->value, 3);
+        EXPECT_EQ(Pointer(std::unique_ptr<TypeParam>()), nullptr);
+    }
+    EXPECT_EQ(Tracked::alive, 0);
+}
+
+TEST(CowPointer, ConvertsToTheBaseAndHandsItsObjectToTheLastOwner) {
+    auto derived = immu::make<Derived>(4);
+    cow_ptr<Counted> base = derived;
+    EXPECT_EQ(base.get(), derived.get());
+    EXPECT_EQ(cow_ptr<Counted>::share(base.get()).use_count(), 3U);
+    EXPECT_EQ(derived.release_if_last(), nullptr);
+    EXPECT_EQ(derived, nullptr);
+    EXPECT_EQ(base.release_if_last()->value, 4);
+    EXPECT_EQ(Tracked::alive, 0);
+}
+
+using Bytes = std::vector<std::byte>;
+
+Bytes ContentOf(Buffer const& buffer) {
+    Bytes content;
+    for (auto const& chunk : buffer.LockForRead())
+        content.insert(content.end(), chunk.begin(), chunk.end());
+    return content;
+}
+
+TEST(Buffer, BehavesLikeAVectorOfBytesWhateverIsShared) {
+    std::mt19937 random(20);
+    const auto below = [&random](std::size_t limit) { return static_cast<std::ptrdiff_t>(random() % limit); };
+    std::array<Buffer, 4> buffers;
+    std::array<Bytes, 4> models;
+    for (int step = 0; step < 3000; ++step) {
+        const auto target = static_cast<std::size_t>(below(4));
+        const auto other = static_cast<std::size_t>(below(4));
+        Bytes& model = models[target];
+        Bytes added;
+        const Bytes source = models[other];
+        const std::ptrdiff_t offset = below(source.size() + 2);
+        const std::ptrdiff_t size = below(source.size() + 2);
+        const std::ptrdiff_t end = std::min(offset + size, std::ssize(source));
+        switch (below(5)) {
+        case 0: {
+            const std::size_t sizes[] = {1, 40, 511, 512, 5000, 70'000};
+            const Bytes bytes(static_cast<std::size_t>(1 + below(sizes[below(6)])), static_cast<std::byte>(random()));
+            buffers[target].Append(bytes.data(), bytes.size(), static_cast<std::uint64_t>(1 + step % 2));
+            for (int round = 0; round <= step % 2; ++round)
+                added.insert(added.end(), bytes.begin(), bytes.end());
+            break;
+        }
+        case 1:
+            buffers[target].Append(buffers[other], static_cast<std::uint64_t>(offset),
+                                   static_cast<std::uint64_t>(size));
+            if (offset < end)
+                added.assign(source.begin() + offset, source.begin() + end);
+            break;
+        case 2:
+            if (auto chunks = buffers[target].LockForRead(); chunks.size() != 0) {
+                const auto own = *(chunks.begin() + below(chunks.size()));
+                added.assign(own.begin(), own.end());
+                buffers[target].Append(own.data(), own.size());
+            }
+            break;
+        case 3: {
+            Bytes part(static_cast<std::size_t>(size));
+            const bool there = buffers[other].Read(static_cast<std::uint64_t>(offset), part.data(), part.size());
+            ASSERT_EQ(there, offset + size <= std::ssize(source));
+            ASSERT_TRUE(!there || std::equal(part.begin(), part.end(), source.begin() + offset));
+            break;
+        }
+        default:
+            buffers[target] = buffers[other];
+            model = source;
+        }
+        model.insert(model.end(), added.begin(), added.end());
+        if (model.size() > 200'000) {
+            buffers[target] = Buffer(3);
+            model.assign(3, std::byte{0});
+        }
+        for (std::size_t index = 0; index < buffers.size(); ++index)
+            ASSERT_TRUE(buffers[index].GetSize() == models[index].size() && ContentOf(buffers[index]) == models[index])
+                << step;
+    }
+}
+
+TEST(Buffer, SharesLargeChunksAndNeverMovesThem) {
+    const Bytes large(100'000, std::byte{'L'});
+    Buffer original;
+    original.Append(large.data(), large.size());
+    const auto* const bytes = original.LockForRead().begin()->data();
+    Buffer framed;
+    framed.Append("head", 4);
+    framed.Append(original);
+    Buffer copy = original;
+    original.Append("more", 4);
+    copy.Append("another", 7);
+    EXPECT_EQ((framed.LockForRead().end() - 1)->data(), bytes);
+    EXPECT_EQ(original.LockForRead().begin()->data(), bytes);
+    EXPECT_EQ(copy.LockForRead().begin()->data(), bytes);
+    EXPECT_EQ(framed.GetSize(), 100'004U);
+    EXPECT_EQ(ContentOf(original).back(), std::byte{'e'});
+    EXPECT_EQ(ContentOf(copy).back(), std::byte{'r'});
+    EXPECT_THROW(copy.Append("x", 1, std::numeric_limits<std::uint64_t>::max()), std::length_error);
+    EXPECT_THROW(Buffer(std::numeric_limits<std::uint64_t>::max()), std::length_error);
+    copy.Append(nullptr, 5);
+    EXPECT_EQ(copy.GetSize(), 100'007U);
+}
+
+TEST(Stream, ReadsAndAppendsAtIndependentPositions) {
+    Buffer buffer;
+    StreamIO reader(MemStream::CreateOnRef(buffer));
+    const Stream writer = MemStream::CreateOnRef(buffer);
+    IStream* const sink = writer;
+    std::array<char, 8> bytes{};
+    EXPECT_TRUE(reader && reader.Read(bytes.data(), 0) && !reader.Read(bytes.data(), 1));
+    EXPECT_TRUE(sink->Write("abcdef", 6));
+    EXPECT_TRUE(reader.Read(bytes.data(), 4));
+    EXPECT_FALSE(reader.Read(bytes.data(), 3));
+    EXPECT_TRUE(reader.GetPosition() == 4 && reader.GetSize() == 6 && sink->GetPosition() == 0);
+    std::uint64_t copied = 0;
+    EXPECT_TRUE(reader.CopyTo(sink, &copied));
+    EXPECT_EQ(copied, 2U);
+    EXPECT_TRUE(reader.Read(bytes.data() + 4, 2));
+    EXPECT_STREQ(bytes.data(), "abcdef");
+    EXPECT_EQ(buffer.GetSize(), 8U);
+
+    StreamIO invalid;
+    EXPECT_FALSE(invalid || invalid.Read(bytes.data(), 0) || invalid.CopyTo(sink, &copied) || Stream());
+    EXPECT_EQ(invalid.GetSize() + invalid.GetPosition() + copied, 0U);
+}
+
+TEST(Stream, CopiesWhatAHostHoldsWhateverSizeItClaims) {
+    constexpr std::uint64_t most = std::numeric_limits<std::uint64_t>::max();
+    const std::tuple<std::size_t, std::uint64_t, std::size_t, bool, std::size_t> cases[] = {
+        {50'000, 50'000, 50'000, true, 50'000},
+        {50'000, 7, 50'000, true, 7},
+        {3, most, 9, false, 0},
+        {50'000, 50'000, 49'999, false, 49'152}};
+    for (auto const& [held, claimed, room, success, expected] : cases) {
+        StreamIO reader = ReaderOf(std::string(held, 'x'), claimed);
+        HostStream destination("", 0, room);
+        std::uint64_t copied = 99;
+        EXPECT_EQ(reader.CopyTo(&destination, &copied), success) << claimed;
+        EXPECT_EQ(copied, expected);
+        EXPECT_EQ(destination.Bytes(), std::string(expected, 'x'));
+    }
+    EXPECT_FALSE(ReaderOf("abc").CopyTo(nullptr, nullptr));
+}
+
+TEST(Time, CountsWholeSecondsAlsoBefore1970AndBeyond2038) {
+    const auto at = [](std::int64_t seconds) { return Time::FromTimeT(seconds, TimeZone::Utc); };
+    const auto secondsOf = [](Time time) { return time.ToTimeT(TimeZone::Utc); };
+    for (std::int64_t seconds : {0LL, 1LL, -1LL, -2208988800LL, 253402300800LL, 922337203685LL, -922337203685LL})
+        EXPECT_EQ(secondsOf(at(seconds)), seconds);
+    EXPECT_EQ(secondsOf(at(std::numeric_limits<std::int64_t>::min())), -922337203685);
+    EXPECT_TRUE(at(1) == Time(10'000'000) && secondsOf(Time(19'999'999)) == 1 && at(-1) > at(4102444800));
+    EXPECT_EQ(secondsOf(Time(static_cast<std::uint64_t>(-1))), -1);
+    EXPECT_NEAR(static_cast<double>(secondsOf(Time::Now())), static_cast<double>(std::time(nullptr)), 2.0);
+}
+
+#if !defined(_WIN32)
+TEST(Time, KnowsTheLocalOffsetOfAnyTime) {
+    const std::int64_t times[] = {-2208988800, -14182940, 1700000000, 1720000000, 2147483648, 4118083200};
+    const std::pair<const char*, std::array<std::int64_t, 6>> cases[] = {
+        {"UTC", {}},
+        {"Asia/Kathmandu", {20476, 19800, 20700, 20700, 20700, 20700}},
+        {"America/St_Johns", {-12652, -9000, -12600, -9000, -12600, -9000}},
+        {"Pacific/Kiritimati", {-37760, -38400, 50400, 50400, 50400, 50400}}};
+    const char* const zoneBefore = std::getenv("TZ");
+    const std::string restored = zoneBefore == nullptr ? "" : zoneBefore;
+    for (auto const& [zone, offsets] : cases) {
+        setenv("TZ", zone, 1);
+        for (std::size_t index = 0; index < std::size(times); ++index)
+            EXPECT_EQ(DateTime::GetCurrentTimezoneBias(Time::FromTimeT(times[index], TimeZone::Utc)).GetTicks(),
+                      offsets[index] * 10'000'000)
+                << zone << ' ' << times[index];
+    }
+    zoneBefore == nullptr ? unsetenv("TZ") : setenv("TZ", restored.c_str(), 1);
+}
+#endif
+
+} // namespace
