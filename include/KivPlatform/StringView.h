@@ -131,6 +131,20 @@ template <class L, class R>
     return KivStringViewT<char16_t>(left).Compare(KivStringViewT<char16_t>(right)) <=> 0;
 }
 
+/// The same order once more: without this operator, `std::less<>` and `std::ranges::less` compare two strings as the
+/// pointers that they convert to.
+template <class L, class R>
+    requires TextPair<L, R, char>
+[[nodiscard]] bool operator<(L const& left, R const& right) noexcept {
+    return KivStringViewT<char>(left).Compare(KivStringViewT<char>(right)) < 0;
+}
+
+template <class L, class R>
+    requires TextPair<L, R, char16_t>
+[[nodiscard]] bool operator<(L const& left, R const& right) noexcept {
+    return KivStringViewT<char16_t>(left).Compare(KivStringViewT<char16_t>(right)) < 0;
+}
+
 } // namespace KivPlatform
 
 template <class C>
