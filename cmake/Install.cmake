@@ -19,7 +19,7 @@ write_basic_package_version_file(${CMAKE_CURRENT_BINARY_DIR}/KivVcsConfigVersion
 install(FILES ${CMAKE_CURRENT_BINARY_DIR}/KivVcsConfig.cmake ${CMAKE_CURRENT_BINARY_DIR}/KivVcsConfigVersion.cmake
         DESTINATION ${kivvcs_package_directory})
 
-file(RELATIVE_PATH kivvcs_prefix_from_pkgconfig ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig ${CMAKE_INSTALL_PREFIX})
+file(RELATIVE_PATH kivvcs_headers_from_pkgconfig ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig ${CMAKE_INSTALL_FULL_INCLUDEDIR})
 if(BUILD_SHARED_LIBS)
     set(kivvcs_pkgconfig_cflags "")
     set(kivvcs_pkgconfig_libs "")
