@@ -1,0 +1,283 @@
+#include "RecordingRepository.h"
+
+#include <gtest/gtest.h>
+
+#include <random>
+
+namespace KivVcs {
+namespace {
+
+class Histories : public testing::Test {
+protected:
+    IObjectsStorage& Storage() { return *repo.GetStorage(); }
+
+    RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
+    History history{repo};
+};
+
+TEST_F(Histories, TheCommonBaseIsWhereTheChainsMeet) {
+    history.Grow("r a:r b:a c:b d:c s:a t:s alone");
+    const struct {
+        const char *first, *second, *base;
+    } cases[] = {{"d", "s", "a"}, {"s", "d", "a"}, {"d", "t", "a"}, {"d", "b", "b"},
+                 {"b", "d", "b"}, {"c", "c", "c"}, {"r", "t", "r"}, {"d", "alone", "-"}};
+    for (auto const& [first, second, base] : cases)
+        EXPECT_EQ(NameOf(repo.GetCommonBase(history[first], history[second])), base) << first << " " << second;
+    EXPECT_FALSE(repo.GetCommonBase(nullptr, history["a"]) || repo.GetCommonBase(history["a"], nullptr));
+
+    // Equal commits meet whatever their objects; of two met together the second one's counts.
+    const auto twin = immu::make<Commit>(*history["a"]);
+    Commit above(twin, false);
+    EXPECT_TRUE(repo.GetCommonBase(history["a"], twin) == twin);
+    EXPECT_TRUE(repo.GetCommonBase(twin, history["a"]) == history["a"]);
+    EXPECT_TRUE(repo.GetCommonBase(history["a"], immu::make<Commit>(above)) == twin);
+    EXPECT_TRUE(repo.GetCommonBase(immu::make<Commit>(above), history["c"]) == history["a"]);
+}
+
+TEST_F(Histories, ABranchGoesForwardOnlyOverItsOwnHead) {
+    history.Grow("a b:a side:a");
+    EXPECT_FALSE(repo.FastForwardMerge(nullptr));
+    EXPECT_TRUE(repo.FastForwardMerge(history["a"]));
+    EXPECT_TRUE(repo.FastForwardMerge(history["a"]));
+    repo.TakeCalls();
+    EXPECT_TRUE(repo.FastForwardMerge(history["b"]));
+    EXPECT_EQ(repo.TakeCalls(), "FastForwardMerge GetHead() GetHead(master) GetCommonBase(a,b) MoveBranchTo(master,b)");
+    EXPECT_FALSE(repo.FastForwardMerge(history["side"]));
+    EXPECT_FALSE(repo.FastForwardMerge(history["a"]));
+    const Commit onTwin(immu::make<Commit>(*history["b"]), false);
+    EXPECT_FALSE(repo.FastForwardMerge(immu::make<Commit>(onTwin)));
+    EXPECT_EQ(history.Branches(), "master=b/a");
+}
+
+TEST_F(Histories, APurgeRemovesExactlyWhatNobodyHolds) {
+    history.Grow("r a:r b:a s:a x:s");
+    history.Point("master=b side=x");
+    history.Forget();
+    Storage().PurgeUnusedObjects();
+    EXPECT_EQ(history.Counts(), "5 5 5");
+    Storage().RemoveBranch(u"side");
+    auto held = repo.GetHead()->GetParent();
+    auto clone = Storage().Clone();
+    for (auto* storage : {&Storage(), clone.get(), &Storage()})
+        storage->PurgeUnusedObjects();
+    EXPECT_EQ(history.Counts(), "5 5 5");
+    clone.reset();
+    Storage().PurgeUnusedObjects();
+    EXPECT_EQ(history.Counts(), "3 3 3");
+
+    Storage().RemoveBranch(u"master");
+    Storage().PurgeUnusedObjects();
+    EXPECT_EQ(history.Counts(), "2 2 2");
+    held.reset();
+    repo.UpdateStorage();
+    EXPECT_EQ(history.Counts(), "0 0 0");
+}
+
+TEST_F(Histories, APurgeGetsPastWhatIsNotStoredOrHiddenByAName) {
+    history.Grow("a b:a c:b d:c e:d");
+    for (const char* taken : {"b", "d"})
+        Storage().DeleteCommit(history[taken]);
+    history.Forget();
+    // Held by a commit that is not in the table, "c" lives on with it.
+    EXPECT_EQ(history.Counts(), "3 5 5");
+    auto outer = MakeTree(repo, "outer/name/deep/f=1 outer/name=2");
+    repo.SyncWithStorage(outer);
+    EXPECT_EQ(history.Counts(), "3 10 7");
+    repo.UpdateStorage();
+    EXPECT_EQ(history.Counts(), "0 4 2");
+    outer.reset();
+    repo.UpdateStorage();
+    EXPECT_EQ(history.Counts(), "0 0 0");
+}
+
+TEST_F(Histories, RewritingKeepsWhatBranchesNeedAndLetsGoOfTheRest) {
+    const struct {
+        const char *graph, *branches, *deleted, *after, *counts;
+    } cases[] = {
+        {"a b:a c:b d:c", "master=d", "d", "master=d", "1 1 4"},
+        {"a b:a c:b d:c", "master=d topic=b twin=b", "d", "master=d/b topic=b twin=b", "2 2 4"},
+        {"a b:a c:b d:c", "master=d topic=b", "b", "master=d/c/b/a topic=b", "3 4 4"},
+        {"a b:a c:b d:c", "master=d", "c", "master=d/c/b/a", "1 4 4"},
+        {"a b:a c:b d:c", "master=d", "a", "master=d/c/b/a", "4 4 4"},
+        // Nothing deleted: simplified.
+        {"r a:r b:a c:b", "master=c", nullptr, "master=c", "1 1 4"},
+        {"r a:r b:a c:b d:c", "master=d topic=b", nullptr, "master=d/b topic=b", "2 2 5"},
+        {"r m:r a:m b:a x:m y:x", "master=b topic=y", nullptr, "master=b/m topic=y/m", "3 3 6"},
+        {"r a:r x y:x", "master=a topic=y", nullptr, "master=a topic=y", "2 2 4"},
+        {"r a:r", "master=a topic=a", nullptr, "master=a topic=a", "1 1 2"},
+        {"r a:r b:a c:a d:b e:b", "master=c one=d two=e", nullptr, "master=c/a one=d/b/a two=e/b/a", "5 5 6"},
+        {"r", "", nullptr, "master=", "0 0 0"},
+    };
+    for (auto const& [graph, branches, deleted, after, counts] : cases) {
+        SCOPED_TRACE(std::string(graph) + " | " + branches);
+        Repository each(std::make_unique<MemObjectsStorage>());
+        History line(each);
+        line.Grow(graph);
+        line.Point(branches);
+        auto commit = deleted == nullptr ? nullptr : line[deleted];
+        line.Forget();
+        EXPECT_TRUE(deleted == nullptr ? each.SimplifyCommitGraph(true) : each.DeleteCommits(std::move(commit)));
+        EXPECT_EQ(line.Branches(), after);
+        EXPECT_EQ(line.Counts(), counts);
+    }
+    EXPECT_TRUE(repo.DeleteCommits(nullptr));
+    EXPECT_FALSE(Repository(nullptr).DeleteCommits(nullptr));
+    EXPECT_FALSE(Repository(nullptr).SimplifyCommitGraph(true));
+}
+
+TEST_F(Histories, DeletingMovesBranchesNewestFirstAndSurvivesAFailure) {
+    history.Grow("a b:a c:b");
+    history.Point("master=c topic=b");
+    const auto tree = history["c"]->GetCommitTree()->GetRoot();
+    repo.TakeCalls();
+    repo.Break("MoveBranchTo");
+    EXPECT_THROW(repo.DeleteCommits(history["c"]), std::runtime_error);
+    EXPECT_EQ(history.Branches(), "master=c/b/a topic=b/a");
+    EXPECT_EQ(repo.TakeCalls(), "Sync(b) Sync(c)");
+    repo.Break("");
+    EXPECT_TRUE(repo.DeleteCommits(history["c"]));
+    EXPECT_EQ(repo.TakeCalls(), "Sync(b) Sync(c) MoveBranchTo(master,c) MoveBranchTo(topic,b) UpdateStorage");
+    EXPECT_EQ(history.Branches(), "master=c/b topic=b");
+    EXPECT_TRUE(repo.GetHead()->GetCommitTree()->GetRoot() == tree);
+}
+
+TEST_F(Histories, SimplifyingAsksAboutPairsAndMakesRemovedBranchesAgain) {
+    class Removing : public RecordingRepository {
+    public:
+        using RecordingRepository::RecordingRepository;
+        cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const override {
+            (void)RecordingRepository::GetCommonBase(first, second);
+            storage->RemoveBranch(u"topic");
+            return kept;
+        }
+        IObjectsStorage* storage = GetStorage();
+        cow_ptr<Commit> kept;
+    };
+    Removing removing(std::make_unique<MemObjectsStorage>());
+    History line(removing);
+    line.Grow("r a:r b:a");
+    line.Point("topic=b");
+    removing.kept = line["a"];
+    removing.TakeCalls();
+    EXPECT_TRUE(removing.SimplifyCommitGraph(false));
+    const std::string calls = removing.TakeCalls();
+    // The branch "master" has no head, and is asked about all the same, in whichever order.
+    EXPECT_TRUE(calls == "GetCommonBase(b,-) Sync(a) Sync(b) CreateBranch(topic,b)" ||
+                calls == "GetCommonBase(-,b) Sync(a) Sync(b) CreateBranch(topic,b)")
+        << calls;
+    EXPECT_EQ(line.Branches(), "master= topic=b/a");
+    EXPECT_EQ(line.Counts(), "5 3 3");
+
+    // What is kept but not stored stops the rebuild above it.
+    history.Grow("r m:r a:m b:m c:r");
+    history.Point("master=a topic=b other=c");
+    Storage().DeleteCommit(history["m"]);
+    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
+    EXPECT_EQ(history.Branches(), "master=a/m/r other=c/r topic=b/m/r");
+}
+
+TEST(RandomHistories, WalkingOnceKeepsWhatAskingAboutAllPairsKeeps) {
+    for (unsigned seed = 0; seed < 60; ++seed) {
+        std::mt19937 random(seed);
+        const auto below = [&random](unsigned limit) { return static_cast<unsigned>(random() % limit); };
+        std::string graph = "0";
+        std::string branches = "master=0";
+        for (unsigned commit = 1; commit < 60; ++commit) {
+            const auto name = std::to_string(commit);
+            graph += " " + name;
+            if (const unsigned back = below(8); back < 7)
+                graph += ":" + std::to_string(commit - 1 - std::min(back * back / 4, commit - 1));
+            if (below(6) == 0)
+                branches += " b" + name + "=" + std::to_string(below(commit + 1));
+        }
+        Repository plain(std::make_unique<MemObjectsStorage>());
+        RecordingRepository asked(std::make_unique<MemObjectsStorage>());
+        const auto simplified = [&](Repository& each) {
+            History line(each);
+            line.Grow(graph);
+            line.Point(branches);
+            line.Forget();
+            EXPECT_TRUE(each.SimplifyCommitGraph(true));
+            return line.Branches() + " | " + line.Counts();
+        };
+        ASSERT_EQ(simplified(plain), simplified(asked)) << "seed " << seed;
+    }
+}
+
+TEST_F(Histories, ARebaseChangesParentsOnly) {
+    history.Grow("r a:r b:a c:b onto:r");
+    history.Point("master=c two=onto");
+    const auto rebased = [this](std::string const& commit, cow_ptr<Commit> const& base) {
+        const auto tip = repo.MergelessRebase(history[commit], base, history["onto"]);
+        EXPECT_TRUE(tip->GetCommitTree()->GetRoot() == history[commit]->GetCommitTree()->GetRoot());
+        Storage().CreateBranch(u"moved", tip);
+        Storage().UpdateBranch(u"moved", tip);
+        return history.Branches();
+    };
+    EXPECT_EQ(rebased("c", history["r"]), "master=c/b/a/r moved=c/b/a/onto/r two=onto/r");
+    EXPECT_EQ(rebased("b", history["b"]), "master=c/b/a/r moved=b/onto/r two=onto/r");
+    EXPECT_EQ(rebased("a", nullptr), "master=c/b/a/r moved=a/r/onto/r two=onto/r");
+    EXPECT_TRUE(repo.MergelessRebase(history["c"], history["a"], history["a"]) == history["c"]);
+    // An equal, but separate, object in the base's place: the moved commits are the stored ones again.
+    EXPECT_TRUE(repo.MergelessRebase(history["c"], history["r"], immu::make<Commit>(*history["r"])) == history["c"]);
+    EXPECT_FALSE(repo.MergelessRebase(history["a"], history["r"], nullptr));
+    EXPECT_FALSE(repo.MergelessRebase(nullptr, nullptr, history["r"]));
+    repo.TakeCalls();
+    EXPECT_EQ(NameOf(repo.MergelessRebase(KivStringViewT<char16_t>(u"master"), u"two")), "c");
+    EXPECT_EQ(repo.TakeCalls(), "GetHead(master) GetHead(two) GetCommonBase(c,onto) Sync(a) Sync(b) Sync(c)");
+}
+
+TEST_F(Histories, UnrelatedBranchesGetACommonRoot) {
+    history.Grow("a b:a x y:x");
+    history.Point("one=b two=y");
+    repo.TakeCalls();
+    EXPECT_TRUE(repo.EnsureCommonRootFor(u"one", u"two", u"root"));
+    EXPECT_EQ(repo.TakeCalls(), "GetHead(one) GetHead(two) GetCommonBase(b,y) GetHead(root) Sync(Root commit) "
+                                "CreateBranch(root,Root commit) GetHead(root) "
+                                "GetHead(one) GetCommonBase(b,Root commit) Sync(a) Sync(b) MoveBranchTo(one,b) "
+                                "GetHead(two) GetCommonBase(y,Root commit) Sync(x) Sync(y) MoveBranchTo(two,y)");
+    EXPECT_EQ(history.Branches(), "master= one=b/a/Root commit root=Root commit two=y/x/Root commit");
+    // sha256 of "commit 60", a zero byte, and "tree \nauthor  <> 0 +0000\ncommitter  <> 0 +0000\n\nRoot commit\n"
+    EXPECT_EQ(Narrow(repo.GetHead(u"root")->GetId().GetText()),
+              "2181c8f28ee8418b1478fddf0ee42f5611b4bfaafd9f39a96b756bf50f9cb6fc");
+
+    repo.TakeCalls();
+    EXPECT_TRUE(repo.EnsureCommonRootFor(u"one", u"two", u"root"));
+    EXPECT_EQ(repo.TakeCalls(), "GetHead(one) GetHead(two) GetCommonBase(b,y)");
+    EXPECT_TRUE(repo.EnsureCommonRootFor(u"one", u"new", u"root"));
+    EXPECT_TRUE(repo.EnsureCommonRootFor(u"master", u"one", u"root"));
+    EXPECT_EQ(history.Branches(), "master=Root commit new=Root commit one=b/a/Root commit root=Root commit "
+                                  "two=y/x/Root commit");
+    // A root branch that exists without a head cannot be made.
+    Storage().CreateBranch(u"bare", nullptr);
+    EXPECT_FALSE(repo.EnsureCommonRootFor(u"one", u"absent", u"bare"));
+    EXPECT_FALSE(repo.EnsureCommonRootFor(u"one", u"", u"root"));
+}
+
+TEST(LongHistories, AHundredThousandCommitsUnderAThousandBranchesAreRewritten) {
+    constexpr int commitCount = 100'000;
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    cow_ptr<Commit> first;
+    cow_ptr<Commit> tip;
+    cow_ptr<Commit> middle;
+    for (int index = 0; index < commitCount; ++index) {
+        Commit commit(std::move(tip), false);
+        commit.SetCommitTime(Time(static_cast<std::uint64_t>(index) * 10'000'000));
+        tip = repo.SyncWithStorage(immu::make<Commit>(commit));
+        first = index == 0 ? tip : first;
+        middle = index == commitCount / 2 ? tip : middle;
+        if (index % 100 == 99)
+            repo.CreateBranch(Wide("b" + std::to_string(index)), tip);
+    }
+    EXPECT_TRUE(repo.GetCommonBase(tip, middle) == middle);
+    EXPECT_TRUE(repo.GetCommonBase(repo.MergelessRebase(middle, first, tip), tip) == tip);
+    EXPECT_EQ(repo.GetCommitCount(), 150'000U);
+    tip.reset();
+    EXPECT_TRUE(repo.DeleteCommits(std::move(middle)));
+    EXPECT_TRUE(repo.SimplifyCommitGraph(false));
+    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
+    EXPECT_EQ(repo.GetCommitCount(), 1000U);
+}
+
+} // namespace
+} // namespace KivVcs
