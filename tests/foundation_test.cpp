@@ -33,10 +33,13 @@ TEST(Text, CopiesShareTheirCharactersUntilOneChanges) {
     copy += '/';
     copy += copy;
     copy += copy.GetString() + 7;
-    EXPECT_EQ(copy, "branch/branch/branch/");
     EXPECT_EQ(original, "branch");
+    copy += '!';
+    const Text withRoomToGrow = copy;
+    copy += '?';
+    EXPECT_EQ(withRoomToGrow, "branch/branch/branch/!");
     const Text moved = std::move(copy);
-    EXPECT_EQ(moved.GetLength(), 21);
+    EXPECT_EQ(moved, "branch/branch/branch/!?");
     copy = original;
     copy = *&copy;
     EXPECT_EQ(copy + "/" + moved.Left(1), "branch/b");
