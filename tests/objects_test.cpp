@@ -120,6 +120,7 @@ TEST(Id, IsTheTextOfADigestAndHashesASampleOfIt) {
         {u"\u03B1\uFFFE\uFFFF", 0xf0771853c9063b3c},
         {Wide(emptyDigest), 0x2396d33c32c3f403},
         {Wide(helloId), 0x792c634526131e09},
+        {Wide(helloId.substr(0, 63) + "g"), 0x792c634526131e72},
         {u"8AEC4E4876F854F688D0EBFC8F37598F38E5FD6903CCCC850CA36591175AEB60", 0x792bcb13b9d80262}};
     for (auto const& [text, hash] : hashes) {
         EXPECT_EQ(std::hash<Id>()(Id(text)), static_cast<std::size_t>(hash)) << Narrow(text);
@@ -220,6 +221,7 @@ TEST(Helpers, HashAppendAndReadTexts) {
     Buffer buffer;
     Helpers::AppendToBuffer(buffer, KivStringViewT<char>("a\0b", 3));
     Helpers::AppendToBuffer(buffer, KivStringViewT<char16_t>(u"\u00E9\0z", 3));
+    Helpers::AppendToBuffer(buffer, KivStringViewT<char16_t>(u"\0z", 2));
     Helpers::AppendToBuffer(buffer, BufferOf("!"));
     const std::string content("a\0b\xC3\xA9!", 6);
     EXPECT_EQ(ContentOf(buffer), content);
