@@ -232,7 +232,7 @@ TEST_F(Merging, TheLaterStampWinsAtTheFirstLevelThatDecides) {
         {"d/stamp=4 stamp=2", "d/stamp=4 stamp=1", "d/f", Left},
         {"d/f/stamp=3 d/stamp=1", "d/stamp=2", "d/f", Left},
         {"time=4", "stamp=3", "f", Left},
-        {"stamp=none time=1", "stamp=2", "f", Right},
+        {"stamp=none time=3", "stamp=2", "f", Left},
         {"meta/stamp=8", "stamp=3", "f", Left},
         {"stamp=18446744073709551615", "stamp=5", "f", Left},
         {"-", "stamp=1", "f", Right},
