@@ -74,6 +74,11 @@ public:
         return Standard().compare(other.Standard());
     }
 
+    /// Whether `Compare` gives 0, without looking at the texts if their lengths differ.
+    [[nodiscard]] constexpr bool HasSameText(KivStringViewT other) const noexcept {
+        return length_ == other.length_ && std::equal(begin(), end(), other.begin());
+    }
+
     /// The text from @p start on; a negative start counts as 0, one past the end gives the empty view.
     [[nodiscard]] constexpr KivStringViewT Mid(int start) const noexcept { return Mid(start, length_); }
 
@@ -109,13 +114,13 @@ concept TextPair = (std::same_as<L, KivStringT<C>> || std::same_as<L, KivStringV
 template <class L, class R>
     requires TextPair<L, R, char>
 [[nodiscard]] bool operator==(L const& left, R const& right) noexcept {
-    return KivStringViewT<char>(left).Compare(KivStringViewT<char>(right)) == 0;
+    return KivStringViewT<char>(left).HasSameText(KivStringViewT<char>(right));
 }
 
 template <class L, class R>
     requires TextPair<L, R, char16_t>
 [[nodiscard]] bool operator==(L const& left, R const& right) noexcept {
-    return KivStringViewT<char16_t>(left).Compare(KivStringViewT<char16_t>(right)) == 0;
+    return KivStringViewT<char16_t>(left).HasSameText(KivStringViewT<char16_t>(right));
 }
 
 /// The order of `Compare`.

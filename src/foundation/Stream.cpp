@@ -63,7 +63,8 @@ bool StreamIO::CopyTo(IStream* destination, std::uint64_t* copied) {
         total = static_cast<MemStream&>(*stream).ShareRest(static_cast<MemStream&>(*destination));
         return finish(true);
     }
-    std::array<std::byte, 16384> piece;
+    // As large as what a buffer keeps in one block of exact size.
+    std::array<std::byte, 65536> piece;
     for (std::uint64_t position = GetPosition(), size = GetSize(); position < size;) {
         const std::uint64_t count = std::min<std::uint64_t>(piece.size(), size - position);
         if (!stream->Read(piece.data(), count) || !destination->Write(piece.data(), count))

@@ -95,6 +95,8 @@ bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> expected) {
 
 std::vector<KivStringViewT<char16_t>> SplitVcsPath(KivStringViewT<char16_t> path) {
     std::vector<KivStringViewT<char16_t>> segments;
+    // Deeper paths are rare, and growing from nothing would allocate at every other segment.
+    segments.reserve(8);
     for (int start = 0; start < path.GetLength();) {
         const int separator = path.Find(u"/", start);
         const int end = separator < 0 ? path.GetLength() : separator;
