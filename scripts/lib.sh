@@ -40,7 +40,7 @@ quietly() {
 packages_of() {
     case $1 in
     build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils ;;
-    vault) echo libsqlite3-dev libcli11-dev ;;
+    vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
     lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck ;;

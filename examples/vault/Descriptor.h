@@ -1,0 +1,44 @@
+#pragma once
+
+#include <string>
+#include <unistd.h>
+#include <utility>
+#include <vector>
+
+namespace vault {
+
+/// Owns a file descriptor.
+class Descriptor {
+public:
+    explicit Descriptor(int descriptor = -1) noexcept : descriptor_(descriptor) {}
+    Descriptor(Descriptor&& other) noexcept : descriptor_(std::exchange(other.descriptor_, -1)) {}
+    Descriptor& operator=(Descriptor&& other) noexcept {
+        std::swap(descriptor_, other.descriptor_);
+        return *this;
+    }
+    ~Descriptor() {
+        if (IsOpen())
+            close(descriptor_);
+    }
+
+    [[nodiscard]] bool IsOpen() const noexcept { return descriptor_ >= 0; }
+    [[nodiscard]] int Get() const noexcept { return descriptor_; }
+    /// Somebody else closes it from now on.
+    void Release() noexcept { descriptor_ = -1; }
+    /// Closes it now and tells whether everything written arrived.
+    [[nodiscard]] bool Close() noexcept { return close(std::exchange(descriptor_, -1)) == 0; }
+
+private:
+    int descriptor_;
+};
+
+/// @throws Problem with the reason that the last system call left
+[[noreturn]] void ThrowSystemProblem(std::string const& what, std::string const& path);
+
+/// Opens a directory to go on from, not through a link unless @p followLink. Not open if that fails.
+[[nodiscard]] Descriptor OpenDirectory(int parent, char const* name, bool followLink = false);
+
+/// The names in a directory, sorted, without "." and "..".
+[[nodiscard]] std::vector<std::string> ReadNames(Descriptor const& directory, std::string const& path);
+
+} // namespace vault

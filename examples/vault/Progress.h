@@ -1,0 +1,38 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace vault {
+
+/// Tells on standard error how far long work has come, on one line that disappears at the end; silent unless that is a
+/// terminal.
+class Progress {
+public:
+    explicit Progress(std::string label);
+    Progress(Progress const&) = delete;
+    Progress& operator=(Progress const&) = delete;
+    ~Progress();
+
+    /// One more thing done, of @p bytes bytes.
+    void Step(std::uint64_t bytes = 0);
+
+    /// Writes a lasting line to standard error, terminal or not.
+    void Say(std::string_view line);
+
+private:
+    using Clock = std::chrono::steady_clock;
+
+    void Erase() const;
+
+    std::string label_;
+    bool isTerminal_;
+    bool isShown_ = false;
+    std::uint64_t steps_ = 0;
+    std::uint64_t bytes_ = 0;
+    Clock::time_point nextShow_;
+};
+
+} // namespace vault

@@ -1,0 +1,32 @@
+#pragma once
+
+#include <KivVcs/KivVcs.h>
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace vault {
+
+/// The library's text is UTF-16; files, terminals and the vault file speak UTF-8.
+using Text = KivVcs::KivStringT<char16_t>;
+using TextView = KivVcs::KivStringViewT<char16_t>;
+
+[[nodiscard]] std::string ToUtf8(TextView text);
+/// The digits of an identifier.
+[[nodiscard]] std::string ToUtf8(KivVcs::Id const& id);
+
+/// Nothing if @p bytes are not UTF-8 or would not read back the same.
+[[nodiscard]] std::optional<Text> FromUtf8(std::string_view bytes);
+
+/// @throws Problem that names @p what if @p bytes are not UTF-8
+[[nodiscard]] Text RequireUtf8(std::string_view bytes, std::string_view what);
+
+/// The same for a text that must also be one line, because only the first line is read back.
+[[nodiscard]] Text RequireLine(std::string_view bytes, std::string_view what);
+
+/// UTF-8 with control characters escaped: names and messages of other people cannot steer the terminal or fake a line.
+[[nodiscard]] std::string Printable(std::string_view utf8);
+[[nodiscard]] std::string Printable(TextView text);
+
+} // namespace vault
