@@ -4,6 +4,7 @@
 
 namespace KivVcs::detail {
 
+// NOLINTNEXTLINE(misc-redundant-expression): that both sides are the same number is what is claimed
 static_assert(sizeof(Entry) == sizeof(Branch) && alignof(Entry) == alignof(Branch));
 static_assert(sizeof(TableNode) % alignof(Entry) == 0);
 
@@ -81,8 +82,8 @@ int TableNode::EntryFor(KivStringViewT<char16_t> name, bool isTree) const noexce
 }
 
 template <class Element>
-void TableNode::InsertElement(int index, Element&& element) noexcept {
-    Element* const elements = Elements<Element>();
+void TableNode::InsertElement(int index, Element element) noexcept {
+    auto* const elements = Elements<Element>();
     if (index == count_) {
         std::construct_at(elements + index, std::move(element));
     } else {
@@ -95,14 +96,14 @@ void TableNode::InsertElement(int index, Element&& element) noexcept {
 
 template <class Element>
 void TableNode::EraseElements(int from, int to) noexcept {
-    Element* const elements = Elements<Element>();
+    auto* const elements = Elements<Element>();
     Element* const end = std::move(elements + to, elements + count_, elements + from);
     std::destroy(end, elements + count_);
     count_ = static_cast<std::uint8_t>(end - elements);
 }
 
-template void TableNode::InsertElement(int, Entry&&) noexcept;
-template void TableNode::InsertElement(int, Branch&&) noexcept;
+template void TableNode::InsertElement(int, Entry) noexcept;
+template void TableNode::InsertElement(int, Branch) noexcept;
 template void TableNode::EraseElements<Entry>(int, int) noexcept;
 template void TableNode::EraseElements<Branch>(int, int) noexcept;
 

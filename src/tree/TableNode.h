@@ -150,7 +150,7 @@ private:
     friend class TableRelease;
 
     TableNode(int height, int capacity) noexcept
-        : count_(0), capacity_(static_cast<std::uint8_t>(capacity)), height_(static_cast<std::uint8_t>(height)) {}
+        : capacity_(static_cast<std::uint8_t>(capacity)), height_(static_cast<std::uint8_t>(height)) {}
     ~TableNode() = default;
 
     [[nodiscard]] static std::size_t Bytes(int capacity) noexcept;
@@ -165,11 +165,11 @@ private:
         return reinterpret_cast<Element const*>(this + 1);
     }
     template <class Element>
-    void InsertElement(int index, Element&& element) noexcept;
+    void InsertElement(int index, Element element) noexcept;
     template <class Element>
     void EraseElements(int from, int to) noexcept;
 
-    std::uint8_t count_;
+    std::uint8_t count_ = 0;
     std::uint8_t capacity_;
     std::uint8_t height_;
     Tally total_;
@@ -181,8 +181,9 @@ private:
 /// The entry (@p name, @p isTree) of the table with the given root, or null.
 [[nodiscard]] Entry const* FindEntry(TableNode const* root, KivStringViewT<char16_t> name, bool isTree) noexcept;
 
-/// Hands every leaf below @p node, which may be null, to @p visit in order. Recurses only with the height.
+/// Hands every leaf below @p node, which may be null, to @p visit in order.
 template <class Visit>
+// NOLINTNEXTLINE(misc-no-recursion): as deep as the table is high
 void ForEachLeaf(TableNode const* node, Visit const& visit) {
     if (node == nullptr)
         return;
