@@ -8,6 +8,8 @@
 
 namespace KivVcs {
 
+class CommonBaseIndex;
+
 /// What objects and merges call back on while they are edited, read or merged, and what hosts program against. Higher
 /// operations call lower ones through this interface, so overriding a lower one changes the higher ones too. The order of the
 /// operations is part of the binary interface.
@@ -145,6 +147,8 @@ private:
 
     std::unique_ptr<IObjectsStorage> storage_;
     KivStringT<char16_t> currentBranch_;
+    /// What `GetCommonBase` looks at first while the commit graph is being simplified; null otherwise.
+    CommonBaseIndex const* commonBases_ = nullptr;
 };
 
 } // namespace KivVcs

@@ -17,17 +17,18 @@ public:
     CommitSet(CommitSet const&) = delete;
     CommitSet& operator=(CommitSet const&) = delete;
 
-    /// @return false if a commit of the same identifier is there already.
+    /// @return the commit of the same identifier that is there already; null if there was none, and @p commit is there
+    /// now.
     /// @pre @p commit outlives the set
-    bool Insert(Commit const& commit) {
+    Commit const* Insert(Commit const& commit) {
         const std::size_t hash = commit.GetIdHash();
         Slot* const slot = Find(hash, commit);
         if (slot->commit != nullptr)
-            return false;
+            return slot->commit;
         *slot = {hash, &commit};
         if (++count_ > mask_ - mask_ / 4)
             Grow();
-        return true;
+        return nullptr;
     }
 
 private:
@@ -39,7 +40,7 @@ private:
     static constexpr std::size_t slotsAtFirst = 32;
 
     /// The slot of the commit with that identifier, or the empty one where it belongs.
-    Slot* Find(std::size_t hash, Commit const& commit) noexcept(false) {
+    Slot* Find(std::size_t hash, Commit const& commit) {
         for (std::size_t index = Spread(hash) & mask_;; index = (index + 1) & mask_) {
             Slot& slot = slots_[index];
             if (slot.commit == nullptr || (slot.hash == hash && slot.commit->HasSameId(commit)))

@@ -1,8 +1,7 @@
 #include "KivVcs/Repository.h"
 
-#include "repository/CommitSet.h"
+#include "repository/CommonBaseIndex.h"
 
-#include <typeinfo>
 #include <unordered_map>
 
 namespace KivVcs {
@@ -41,27 +40,20 @@ public:
         }
     }
 
+    [[nodiscard]] std::vector<cow_ptr<Commit>> Heads() const {
+        std::vector<cow_ptr<Commit>> heads;
+        for (auto const& branch : branches_)
+            heads.push_back(branch.head);
+        return heads;
+    }
+
     /// Keeps the common base of every two heads, as `GetCommonBase` gives it.
-    void KeepCommonBasesOfPairs() {
+    void KeepCommonBases() {
         for (auto first = branches_.begin(); first != branches_.end(); ++first) {
             for (auto second = std::next(first); second != branches_.end(); ++second) {
                 if (const auto base = repository_.GetCommonBase(first->head, second->head))
                     kept_.try_emplace(base->GetId());
             }
-        }
-    }
-
-    /// Keeps the same commits by one walk over every parent link. An identifier determines the identifiers of all
-    /// ancestors, so that histories that meet stay together: two heads have their base where their paths meet, and
-    /// every commit at which a path arrives that another one has passed is the base of two heads.
-    void KeepCommitsWherePathsMeet() {
-        CommitSet visited;
-        for (auto const& branch : branches_) {
-            Commit const* commit = branch.head.get();
-            while (commit != nullptr && visited.Insert(*commit))
-                commit = commit->GetParent().get();
-            if (commit != nullptr)
-                kept_.try_emplace(commit->GetId());
         }
     }
 
@@ -140,6 +132,20 @@ private:
     KeptCommits kept_;
 };
 
+/// Lets a repository answer from an index while this lives.
+class CommonBaseLease {
+public:
+    CommonBaseLease(CommonBaseIndex const*& current, CommonBaseIndex const& index) noexcept
+        : current_(current), former_(std::exchange(current, &index)) {}
+    CommonBaseLease(CommonBaseLease const&) = delete;
+    CommonBaseLease& operator=(CommonBaseLease const&) = delete;
+    ~CommonBaseLease() { current_ = former_; }
+
+private:
+    CommonBaseIndex const*& current_;
+    CommonBaseIndex const* former_;
+};
+
 } // namespace
 
 bool Repository::SimplifyCommitGraph(bool purge) {
@@ -147,12 +153,13 @@ bool Repository::SimplifyCommitGraph(bool purge) {
         return false;
     {
         GraphSimplification simplification(*this, *storage_);
-        // Where no host can have overridden `GetCommonBase`, nobody can tell that it is not asked about every pair,
-        // which would take time in proportion to the pairs times the length of the histories.
-        if (typeid(*this) == typeid(Repository))
-            simplification.KeepCommitsWherePathsMeet();
-        else
-            simplification.KeepCommonBasesOfPairs();
+        {
+            // Every pair is asked about, but following each pair's histories would take time in proportion to their
+            // length.
+            const CommonBaseIndex index(simplification.Heads());
+            const CommonBaseLease lease(commonBases_, index);
+            simplification.KeepCommonBases();
+        }
         simplification.Link();
         simplification.Rebuild();
     }
