@@ -110,6 +110,27 @@ DamagedObjectsAreNamedAndNothingIsWritten() {
     refused 1 'damaged' log
 }
 
+AnyDamagedByteIsFoundOrHarmless() {
+    local size status noticed=0
+    for i in $(seq 12); do write d/sub/"$i" "$(seq $((i * 100)))"; done
+    "$vault" save d >out
+    cp vault.db whole.db
+    size=$(stat -c %s vault.db)
+    for _ in $(seq 40); do
+        cp whole.db vault.db
+        printf '\x%x' $((RANDOM % 256)) | dd of=vault.db bs=1 seek=$((RANDOM * RANDOM % size)) conv=notrunc status=none
+        status=0
+        "$vault" verify >out 2>err || status=$?
+        if [ "$status" -eq 0 ]; then
+            rm -rf restored && "$vault" restore master restored && diff -r d restored
+        else
+            [ "$status" -le 2 ] || fail "verify ended with $status"
+            noticed=$((noticed + 1))
+        fi
+    done
+    [ "$noticed" -gt 0 ] || fail "no damage was noticed"
+}
+
 LinksAndSpecialFilesAreLeftOut() {
     write d/f one outside/secret secret
     ln -s ../outside d/link

@@ -53,12 +53,13 @@ Text RequireLine(std::string_view bytes, std::string_view what) {
 
 std::string Printable(std::string_view utf8) {
     constexpr std::string_view digits = "0123456789abcdef";
+    const bool isUtf8 = FromUtf8(utf8).has_value();
     std::string result;
     for (std::size_t i = 0; i < utf8.size(); ++i) {
         const auto byte = static_cast<unsigned char>(utf8[i]);
         const bool isLateControl =
             byte == 0xC2 && i + 1 < utf8.size() && static_cast<unsigned char>(utf8[i + 1]) < 0xA0;
-        if (byte < 0x20 || byte == 0x7F || isLateControl)
+        if (byte < 0x20 || byte == 0x7F || isLateControl || (byte >= 0x80 && !isUtf8))
             (result += "\\x") += {digits[byte >> 4U], digits[byte & 0xFU]};
         else
             result += utf8[i];

@@ -211,6 +211,8 @@ void VaultFile::Check(int result) {
         throw Problem(name + " is locked by another process");
     case SQLITE_NOTADB:
         throw Problem(name + " is not a vault file");
+    // No statement here is wrong in itself: one that fails does not find the tables that it expects.
+    case SQLITE_ERROR:
     case SQLITE_CORRUPT:
         throw Problem(name + " is damaged: " + sqlite3_errmsg(database_.get()), findingsExitStatus);
     case SQLITE_NOMEM:
