@@ -118,7 +118,7 @@ AnyDamagedByteIsFoundOrHarmless() {
     size=$(stat -c %s vault.db)
     for _ in $(seq 40); do
         cp whole.db vault.db
-        printf '\x%x' $((RANDOM % 256)) | dd of=vault.db bs=1 seek=$((RANDOM * RANDOM % size)) conv=notrunc status=none
+        printf '%b' "\\x$(printf %x $((RANDOM % 256)))" | dd of=vault.db bs=1 seek=$((RANDOM * RANDOM % size)) conv=notrunc status=none
         status=0
         "$vault" verify >out 2>err || status=$?
         if [ "$status" -eq 0 ]; then
@@ -171,19 +171,20 @@ KilledSaves() {
     mkdir d && mv d_* d
     start=$(date +%s%N)
     "$vault" save d -m 0 >out
+    # How long a save takes, more or less: corrected so that about half of the kills come too late.
     took=$((($(date +%s%N) - start) / 1000))
     for round in $(seq "$kills"); do
         for i in $(seq 150); do echo "$round" >>d/d_"$i"; done
         old=$(root_of master)
         "$vault" save d -m "$round" >out 2>&1 &
-        sleep "$(printf '0.%06d' $((RANDOM * RANDOM % (took * 3))))"
+        sleep "$(printf '0.%06d' $((RANDOM * RANDOM % (took * 2))))"
         kill -9 $! 2>/dev/null && hit=$((hit + 1))
         wait $! 2>/dev/null || true
         "$vault" verify >out || fail "damaged in round $round"
         if [ "$(root_of master)" = "$old" ]; then
-            before=$((before + 1))
+            before=$((before + 1)) took=$((took * 10 / 9))
         else
-            after=$((after + 1)) versions=$((versions + 1))
+            after=$((after + 1)) took=$((took * 9 / 10)) versions=$((versions + 1))
             rm -rf restored && "$vault" restore master restored && diff -r d restored
         fi
         equal "$("$vault" log | wc -l)" "$versions"
