@@ -77,7 +77,7 @@ build_preset() {
     quietly cmake -S "$source_directory" --preset "$1" -B "$build_directory" || die "configuring '$1' failed"
     local build=(cmake --build "$build_directory" --parallel "$jobs")
     # On a terminal the build tool keeps to one line, which shows how far it is.
-    [ -t 1 ] || build=(quietly "${build[@]}")
+    [ -t 1 ] || build=(quietly "${build[@]}" -- --quiet)
     "${build[@]}" || die "building '$1' failed"
 }
 
