@@ -3,7 +3,6 @@
 #include <string>
 #include <unistd.h>
 #include <utility>
-#include <vector>
 
 namespace vault {
 
@@ -32,13 +31,7 @@ private:
     int descriptor_;
 };
 
-/// @throws Problem with the reason that the last system call left
+/// @throws Problem that tells the reason why the last system call failed
 [[noreturn]] void ThrowSystemProblem(std::string const& what, std::string const& path);
-
-/// Opens a directory to go on from, not through a link unless @p followLink. Not open if that fails.
-[[nodiscard]] Descriptor OpenDirectory(int parent, char const* name, bool followLink = false);
-
-/// The names in a directory, sorted, without "." and "..".
-[[nodiscard]] std::vector<std::string> ReadNames(Descriptor const& directory, std::string const& path);
 
 } // namespace vault

@@ -6,7 +6,6 @@
 #include <iostream>
 #include <map>
 #include <new>
-#include <sys/resource.h>
 
 namespace vault {
 
@@ -133,19 +132,9 @@ void DescribeHistoryCommands(CommandLine& line) {
     sync->callback([&] { Sync(line.file, line.directory); });
 }
 
-/// Every level of nested directories that is worked on takes one descriptor.
-void AllowDeepDirectories() {
-    rlimit limit{};
-    if (getrlimit(RLIMIT_NOFILE, &limit) == 0) {
-        limit.rlim_cur = limit.rlim_max;
-        setrlimit(RLIMIT_NOFILE, &limit);
-    }
-}
-
 void Run(CommandLine& line, int argumentCount, char** arguments) {
     DescribeCommands(line);
     DescribeHistoryCommands(line);
-    AllowDeepDirectories();
     line.app.parse(argumentCount, arguments);
     if (!std::cout.flush())
         throw Problem("the output could not be written");

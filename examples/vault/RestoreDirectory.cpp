@@ -1,9 +1,10 @@
-#include "Descriptor.h"
+#include "DirectoryPath.h"
 #include "Problem.h"
 #include "Workspace.h"
 
 #include <cerrno>
 #include <fcntl.h>
+#include <span>
 #include <string>
 #include <sys/stat.h>
 #include <vector>
@@ -19,10 +20,8 @@ namespace {
 constexpr mode_t fileMode = 0666;
 constexpr mode_t directoryMode = 0777;
 
-/// A directory on the way from the top to where the restoring is.
+/// What is known of a directory on the way from the top to where the restoring is.
 struct Level {
-    Descriptor directory;
-    std::string path;
     cow_ptr<Tree> tree;
     KivVcs::PathList subtrees;
     std::size_t next = 0;
@@ -36,82 +35,80 @@ std::string SafeName(TextView entry) {
     return name;
 }
 
-void WriteAll(Descriptor const& file, std::span<const std::byte> bytes, std::string const& path) {
+bool WriteAll(Descriptor const& file, std::span<const std::byte> bytes) {
     while (!bytes.empty()) {
         const auto count = write(file.Get(), bytes.data(), bytes.size());
         if (count < 0 && errno != EINTR)
-            ThrowSystemProblem("cannot write", path);
+            return false;
         bytes = bytes.subspan(static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
     }
+    return true;
 }
 
-void WriteFile(Level const& level, TextView entry, Blob const& blob) {
+void WriteFile(DirectoryPath const& directory, TextView entry, Blob const& blob) {
     const auto name = SafeName(entry);
-    const auto path = level.path + name;
     // Never written through: what is there may be a link, or the same file as one elsewhere.
-    if (unlinkat(level.directory.Get(), name.c_str(), 0) != 0 && errno != ENOENT)
-        ThrowSystemProblem("cannot replace", path);
+    if (unlinkat(directory.Get(), name.c_str(), 0) != 0 && errno != ENOENT)
+        ThrowSystemProblem("cannot replace", directory.PathOf(name));
     Descriptor file(
-        openat(level.directory.Get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, fileMode));
-    if (!file.IsOpen())
-        ThrowSystemProblem("cannot write", path);
+        openat(directory.Get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, fileMode));
+    bool isWritten = file.IsOpen();
     for (auto const& chunk : blob.GetData().LockForRead())
-        WriteAll(file, chunk, path);
-    if (!file.Close())
-        ThrowSystemProblem("cannot write", path);
+        isWritten = isWritten && WriteAll(file, chunk);
+    if (!isWritten || !file.Close())
+        ThrowSystemProblem("cannot write", directory.PathOf(name));
 }
 
-Descriptor EnterSubdirectory(Level const& level, std::string const& name) {
-    const int parent = level.directory.Get();
-    if (mkdirat(parent, name.c_str(), directoryMode) != 0 && errno == EEXIST) {
-        if (auto existing = OpenDirectory(parent, name.c_str()); existing.IsOpen())
-            return existing;
-        // A file or a link is in the way.
-        if (unlinkat(parent, name.c_str(), 0) != 0 || mkdirat(parent, name.c_str(), directoryMode) != 0)
-            ThrowSystemProblem("cannot make directory", level.path + name);
-    }
-    auto made = OpenDirectory(parent, name.c_str());
-    if (!made.IsOpen())
-        ThrowSystemProblem("cannot make directory", level.path + name);
-    return made;
+void MakeDirectory(DirectoryPath const& directory, std::string const& name) {
+    if (mkdirat(directory.Get(), name.c_str(), directoryMode) == 0)
+        return;
+    struct stat status {};
+    const bool isThere = errno == EEXIST && fstatat(directory.Get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0;
+    if (isThere && S_ISDIR(status.st_mode))
+        return;
+    // A file or a link is in the way.
+    if (!isThere || unlinkat(directory.Get(), name.c_str(), 0) != 0 ||
+        mkdirat(directory.Get(), name.c_str(), directoryMode) != 0)
+        ThrowSystemProblem("cannot make directory", directory.PathOf(name));
 }
 
-Level WriteLevel(Descriptor directory, std::string path, cow_ptr<Tree> tree, Progress& progress) {
-    Level level{std::move(directory), std::move(path), tree, tree->GetLocalSubtreePaths(), 0};
+Level WriteLevel(DirectoryPath const& directory, cow_ptr<Tree> const& tree, Progress& progress) {
     for (auto const& name : tree->GetLocalBlobPaths()) {
         const auto blob = tree->GetLocalBlob(name);
-        WriteFile(level, name, *blob);
+        WriteFile(directory, name, *blob);
         progress.Step(blob->GetData().GetSize());
     }
-    return level;
+    return {tree, tree->GetLocalSubtreePaths()};
 }
 
 } // namespace
 
-void RestoreDirectory(cow_ptr<Tree> const& tree, std::filesystem::path const& directory, bool force,
-                      Progress& progress) {
-    std::error_code error;
-    std::filesystem::create_directories(directory, error);
-    auto top = OpenDirectory(AT_FDCWD, directory.c_str(), true);
-    if (!top.IsOpen())
-        ThrowSystemProblem("cannot open directory", directory.native());
-    if (!force && !ReadNames(top, directory.native()).empty())
-        throw Problem(Printable(directory.native()) + " is not empty (--force writes into it all the same)");
+void RestoreDirectory(cow_ptr<Tree> const& tree, std::filesystem::path const& top, bool force, Progress& progress) {
+    // What this cannot make is told when it is opened.
+    std::error_code ignored;
+    std::filesystem::create_directories(top, ignored);
+    DirectoryPath directory(top.native());
+    if (!force && !directory.ReadNames().empty())
+        throw Problem(Printable(top.native()) + " is not empty (--force writes into it all the same)");
     if (!tree)
         return;
 
     std::vector<Level> levels;
-    levels.push_back(WriteLevel(std::move(top), directory.native() + '/', tree, progress));
-    while (!levels.empty()) {
+    levels.push_back(WriteLevel(directory, tree, progress));
+    for (;;) {
         auto& level = levels.back();
-        if (level.next == level.subtrees.size()) {
-            levels.pop_back();
+        if (level.next < level.subtrees.size()) {
+            auto const& entry = level.subtrees[level.next++];
+            const auto name = SafeName(entry);
+            MakeDirectory(directory, name);
+            directory.Enter(name);
+            levels.push_back(WriteLevel(directory, level.tree->GetLocalTree(entry), progress));
             continue;
         }
-        auto const& entry = level.subtrees[level.next++];
-        const auto name = SafeName(entry);
-        levels.push_back(WriteLevel(EnterSubdirectory(level, name), level.path + name + '/',
-                                    level.tree->GetLocalTree(entry), progress));
+        levels.pop_back();
+        if (levels.empty())
+            return;
+        directory.Leave();
     }
 }
 

@@ -1,4 +1,4 @@
-#include "Descriptor.h"
+#include "DirectoryPath.h"
 #include "Problem.h"
 #include "VaultFile.h"
 #include "Workspace.h"
@@ -18,25 +18,24 @@ using KivVcs::Tree;
 
 namespace {
 
-/// A directory on the way from the top to where the scan is.
+/// What is known of a directory on the way from the top to where the scan is.
 struct Level {
-    Descriptor directory;
-    std::string name;
     std::vector<std::string> entries;
     std::size_t next = 0;
-    Tree tree;
+    Tree tree{};
     cow_ptr<Tree> previous;
 };
 
 class Scanner {
 public:
-    Scanner(ScanOptions const& options, KivVcs::IRepository& repository, Progress& progress)
-        : options_(options), repository_(repository), progress_(progress) {
+    Scanner(std::filesystem::path const& directory, ScanOptions const& options, KivVcs::IRepository& repository,
+            Progress& progress)
+        : path_(directory.native()), options_(options), repository_(repository), progress_(progress) {
         hasVaultFile_ = stat(options.vaultFile.c_str(), &vaultFile_) == 0;
     }
 
-    cow_ptr<Tree> Scan(std::filesystem::path const& directory) {
-        Enter(OpenDirectory(AT_FDCWD, directory.c_str(), true), directory.native(), options_.previous);
+    cow_ptr<Tree> Scan() {
+        Begin(options_.previous);
         // The levels are kept here and not in recursive calls, so that any depth is fine.
         for (;;) {
             auto& level = levels_.back();
@@ -53,31 +52,34 @@ public:
     }
 
 private:
-    void Enter(Descriptor directory, std::string const& name, cow_ptr<Tree> previous) {
-        const auto path = PathOf(name);
-        if (!directory.IsOpen())
-            ThrowSystemProblem("cannot open directory", path);
-        auto entries = ReadNames(directory, path);
-        levels_.push_back({std::move(directory), name, std::move(entries), 0, Tree(), std::move(previous)});
+    void Begin(cow_ptr<Tree> previous) {
+        levels_.push_back({.entries = path_.ReadNames(), .previous = std::move(previous)});
+    }
+
+    void Enter(std::string const& name, Text const& text) {
+        path_.Enter(name);
+        auto const& previous = levels_.back().previous;
+        Begin(previous ? previous->GetLocalTree(text) : nullptr);
     }
 
     void Leave() {
         const auto finished = std::move(levels_.back());
         levels_.pop_back();
-        levels_.back().tree.AddTree(&repository_, *FromUtf8(finished.name), finished.tree);
+        path_.Leave();
+        auto& level = levels_.back();
+        level.tree.AddTree(&repository_, *FromUtf8(level.entries[level.next - 1]), finished.tree);
     }
 
     void Add(std::string const& name) {
         auto& level = levels_.back();
         struct stat status {};
-        if (fstatat(level.directory.Get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0)
-            ThrowSystemProblem("cannot read", PathOf(name));
+        if (fstatat(path_.Get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0)
+            ThrowSystemProblem("cannot read", path_.PathOf(name));
         const auto text = FromUtf8(name);
         if (!text)
             Skip(name, "its name is not UTF-8");
         else if (S_ISDIR(status.st_mode))
-            Enter(OpenDirectory(level.directory.Get(), name.c_str()), name,
-                  level.previous ? level.previous->GetLocalTree(*text) : nullptr);
+            Enter(name, *text);
         else if (IsVault(name, status))
             Skip(name, "it is the vault");
         else if (S_ISREG(status.st_mode))
@@ -88,16 +90,15 @@ private:
 
     Buffer ReadFile(std::string const& name) {
         // Not blocking matters only if the file has been exchanged for a pipe since its kind was looked at.
-        const Descriptor file(
-            openat(levels_.back().directory.Get(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+        const Descriptor file(openat(path_.Get(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
         struct stat status {};
         if (!file.IsOpen() || fstat(file.Get(), &status) != 0)
-            ThrowSystemProblem("cannot read", PathOf(name));
+            ThrowSystemProblem("cannot read", path_.PathOf(name));
         if (!S_ISREG(status.st_mode))
-            throw Problem("changed while it was read: " + Printable(PathOf(name)));
+            throw Problem("changed while it was read: " + Printable(path_.PathOf(name)));
         const auto size = static_cast<std::uint64_t>(status.st_size);
         if (size > VaultFile::largestObject)
-            throw Problem("larger than a vault can hold: " + Printable(PathOf(name)));
+            throw Problem("larger than a vault can hold: " + Printable(path_.PathOf(name)));
         auto content = Buffer::Build(size, [&](std::byte* to) { ReadExactly(file, to, size, name); });
         progress_.Step(size);
         return content;
@@ -107,9 +108,9 @@ private:
         for (std::uint64_t done = 0; done < size;) {
             const auto count = read(file.Get(), to + done, size - done);
             if (count < 0 && errno != EINTR)
-                ThrowSystemProblem("cannot read", PathOf(name));
+                ThrowSystemProblem("cannot read", path_.PathOf(name));
             if (count == 0)
-                throw Problem("changed while it was read: " + Printable(PathOf(name)));
+                throw Problem("changed while it was read: " + Printable(path_.PathOf(name)));
             done += static_cast<std::uint64_t>(std::max<ssize_t>(count, 0));
         }
     }
@@ -139,16 +140,10 @@ private:
     }
 
     void Skip(std::string const& name, std::string const& reason) {
-        progress_.Say("skipped " + Printable(PathOf(name)) + ": " + reason);
+        progress_.Say("skipped " + Printable(path_.PathOf(name)) + ": " + reason);
     }
 
-    [[nodiscard]] std::string PathOf(std::string const& name) const {
-        std::string path;
-        for (auto const& level : levels_)
-            path += level.name + '/';
-        return path + name;
-    }
-
+    DirectoryPath path_;
     ScanOptions const& options_;
     KivVcs::IRepository& repository_;
     Progress& progress_;
@@ -161,7 +156,7 @@ private:
 
 cow_ptr<Tree> ScanDirectory(std::filesystem::path const& directory, ScanOptions const& options,
                             KivVcs::IRepository& repository, Progress& progress) {
-    return Scanner(options, repository, progress).Scan(directory);
+    return Scanner(directory, options, repository, progress).Scan();
 }
 
 } // namespace vault
