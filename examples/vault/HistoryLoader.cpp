@@ -2,7 +2,6 @@
 
 #include "Text.h"
 
-#include <ranges>
 #include <unordered_set>
 #include <vector>
 
@@ -68,12 +67,12 @@ cow_ptr<Commit> HistoryLoader::Load(Id const& head) {
         newestFirst.push_back({next, std::move(commit)});
         next = parentId.GetText().IsEmpty() ? Id() : parentId;
     }
-    for (auto& unlinked : newestFirst | std::views::reverse) {
-        unlinked.commit.write()->SetParent(parent);
-        if (unlinked.commit->GetId() != unlinked.id)
+    for (auto unlinked = newestFirst.rbegin(); unlinked != newestFirst.rend(); ++unlinked) {
+        unlinked->commit.write()->SetParent(parent);
+        if (unlinked->commit->GetId() != unlinked->id)
             return nullptr;
-        repository_.AddCommitToStorage(unlinked.commit);
-        parent = unlinked.commit;
+        repository_.AddCommitToStorage(unlinked->commit);
+        parent = unlinked->commit;
     }
     return parent;
 }
