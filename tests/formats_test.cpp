@@ -63,10 +63,12 @@ TEST(Formats, DocumentedExamplesAreExact) {
         {*root, files, "tree 159\0"s + "100644 blob a.txt\0"s + hello + "40000 tree d\0"s + directory},
         {one, first,
          "commit 172\0tree "s + files +
-             "\nauthor Ada <ada@example.org> 1700000000 +0100\ncommitter Ada <ada@example.org> 1700000000 +0100\n\nStart\n"},
+             "\nauthor Ada <ada@example.org> 1700000000 +0100\ncommitter Ada <ada@example.org> 1700000000 "
+             "+0100\n\nStart\n"},
         {two, "f2212c3c905dfd34b2ce7ccdc9d6975843cc2b072b28b13a8479e34c4e8f6172",
          "commit 245\0tree "s + directory + "\nparent " + first +
-             "\nauthor Ada <ada@example.org> 1700003600 -0530\ncommitter Ada <ada@example.org> 1700003600 -0530\n\nKeep d\n"},
+             "\nauthor Ada <ada@example.org> 1700003600 -0530\ncommitter Ada <ada@example.org> 1700003600 "
+             "-0530\n\nKeep d\n"},
     };
     for (auto const& example : examples) {
         EXPECT_EQ(PackedForm(example.object), example.packed);

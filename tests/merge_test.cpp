@@ -16,8 +16,8 @@ std::string Joined(Path path) {
     return text;
 }
 
-/// Resolvers that note what they are asked as "d:directory" and "f:file" and check that they are given the whole trees. The
-/// top is always merged; of the files, one that is not answered for itself gets the general answer.
+/// Resolvers that note what they are asked as "d:directory" and "f:file" and check that they are given the whole trees.
+/// The top is always merged; of the files, one that is not answered for itself gets the general answer.
 struct Host {
     ConflictChoice file = ConflictChoice::Left;
     TreeConflictChoice directory = TreeConflictChoice::Merge;

@@ -22,8 +22,8 @@ struct MergeOptions {
     std::string author;
 };
 
-// The commands, each from opening the vault file to the last line of output. They throw `Problem` if they cannot be carried out,
-// and the vault file is unchanged then.
+// The commands, each from opening the vault file to the last line of output. They throw `Problem` if they cannot be
+// carried out, and the vault file is unchanged then.
 
 void Save(Path const& file, SaveOptions const& options);
 void Log(Path const& file, std::string const& revision);

@@ -12,7 +12,8 @@ enum class ConflictPolicy {
     Left,
     Right,
     Base,
-    /// The side whose nearest stamp file tells the later time; where stamps do not tell, the side whose head was saved later.
+    /// The side whose nearest stamp file tells the later time; where stamps do not tell, the side whose head was saved
+    /// later.
     Newest,
     /// Nobody: the merge is called off.
     Stop,
@@ -24,11 +25,13 @@ public:
     /// @p base may be null.
     Conflicts(ConflictPolicy policy, CommitHandle const& left, CommitHandle const& base, CommitHandle const& right);
 
-    /// Resolvers for the merge; they refer to this object. With `Stop` they go on as with `Left`, so that every conflict is found.
+    /// Resolvers for the merge; they refer to this object. With `Stop` they go on as with `Left`, so that every
+    /// conflict is found.
     [[nodiscard]] KivVcs::Resolvers MakeResolvers();
 
-    /// Gives the entries their owner that are a file on one side and a directory on the other. No resolver is asked about all of
-    /// them: the merge takes files and directories one after the other, so that the later change would win unnoticed.
+    /// Gives the entries their owner that are a file on one side and a directory on the other. No resolver is asked
+    /// about all of them: the merge takes files and directories one after the other, so that the later change would win
+    /// unnoticed.
     void SettleKinds(KivVcs::Commit& merged, KivVcs::IRepository& repository);
 
     [[nodiscard]] bool IsEmpty() const noexcept { return paths_.empty(); }

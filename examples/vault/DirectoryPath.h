@@ -11,7 +11,8 @@ namespace vault {
 
 /// The way from a top directory down to the one that is being worked on, of any depth: only the innermost one is open.
 ///
-/// Links are followed at the top only. A directory that is moved meanwhile is noticed; the way never leads out of the top.
+/// Links are followed at the top only. A directory that is moved meanwhile is noticed; the way never leads out of the
+/// top.
 /// @throws Problem from every operation that cannot be carried out
 class DirectoryPath {
 public:

@@ -45,7 +45,8 @@ void StoreReachableCommits(KivVcs::Repository& repository) {
         repository.AddCommitToStorage(commit);
 }
 
-/// The library deletes a history with its top; a branch at the top makes it survive, and what lies above is put on top again.
+/// The library deletes a history with its top; a branch at the top makes it survive, and what lies above is put on top
+/// again.
 void ForgetBelow(KivVcs::Repository& repository, CommitHandle const& commit) {
     const auto above = BranchesAbove(repository, commit);
     repository.CreateBranch(forgetMark, commit);

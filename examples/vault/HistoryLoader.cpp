@@ -19,8 +19,8 @@ struct UnlinkedCommit {
     cow_ptr<Commit> commit;
 };
 
-// The library finds a parent line wherever its key comes next in a commit's text, in the description too. A root commit gets an
-// empty parent line before it is read, so that nothing else can be taken for one.
+// The library finds a parent line wherever its key comes next in a commit's text, in the description too. A root commit
+// gets an empty parent line before it is read, so that nothing else can be taken for one.
 Buffer WithParentLine(Buffer packed) {
     constexpr std::string_view commitHeader = "commit ";
     constexpr std::string_view parentKey = "parent ";
@@ -41,7 +41,8 @@ Buffer WithParentLine(Buffer packed) {
 
 HistoryLoader::HistoryLoader(VaultFile& file, KivVcs::Repository& repository, Progress& progress, Visit visit)
     : file_(file), repository_(repository), progress_(progress), visit_(std::move(visit)) {
-    // An empty tree has no data, and a tree without data does not load. One that the repository holds need not be loaded.
+    // An empty tree has no data, and a tree without data does not load. One that the repository holds need not be
+    // loaded.
     const auto emptyTree = KivVcs::immu::make<KivVcs::Tree>();
     repository_.AddTreeToStorage(emptyTree);
     if (file_.ReadObject(ToUtf8(emptyTree->GetId())))

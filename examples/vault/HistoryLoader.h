@@ -9,8 +9,8 @@
 
 namespace vault {
 
-/// Reads histories from a vault file into a repository: commits through `Commit::Deserialize`, which brings their trees and
-/// blobs along, linked to their real parents.
+/// Reads histories from a vault file into a repository: commits through `Commit::Deserialize`, which brings their trees
+/// and blobs along, linked to their real parents.
 ///
 /// The repository's current branch must not have a head while this works: commits that are read back start from it.
 class HistoryLoader {

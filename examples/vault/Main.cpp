@@ -13,7 +13,8 @@ namespace {
 
 constexpr auto revisionHelp = "a branch, an identifier, or the beginning of one";
 
-/// The command line, as the library that reads it sees it: each command stores its arguments here and is run when all are read.
+/// The command line, as the library that reads it sees it: each command stores its arguments here and is run when all
+/// are read.
 struct CommandLine {
     CLI::App app{"Keeps versions of directories in one file.", "vault"};
     Path file = "vault.db";

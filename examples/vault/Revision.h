@@ -8,7 +8,8 @@ namespace vault {
 
 using CommitHandle = KivVcs::cow_ptr<KivVcs::Commit>;
 
-/// The commit that @p revision names: the head of a branch of that name, otherwise the commit whose identifier it is, or begins.
+/// The commit that @p revision names: the head of a branch of that name, otherwise the commit whose identifier it is,
+/// or begins.
 /// @throws Problem if there is none or more than one
 [[nodiscard]] CommitHandle FindRevision(KivVcs::Repository const& repository, std::string const& revision);
 

@@ -25,8 +25,8 @@ using TextView = KivVcs::KivStringViewT<char16_t>;
 /// The same for a text that must also be one line, because only the first line is read back.
 [[nodiscard]] Text RequireLine(std::string_view bytes, std::string_view what);
 
-/// The text with control characters, and bytes that are not UTF-8, escaped: names and messages of other people cannot steer
-/// the terminal or fake a line.
+/// The text with control characters, and bytes that are not UTF-8, escaped: names and messages of other people cannot
+/// steer the terminal or fake a line.
 [[nodiscard]] std::string Printable(std::string_view utf8);
 [[nodiscard]] std::string Printable(TextView text);
 

@@ -23,7 +23,8 @@ public:
     /// Brings in a history from another file, or finds that it is here already.
     [[nodiscard]] KivVcs::cow_ptr<KivVcs::Commit> Import(VaultFile& from, std::string const& head);
 
-    /// Writes the objects that the file lacks and the branches, as one transaction, and returns the number of those objects.
+    /// Writes the objects that the file lacks and the branches, as one transaction, and returns the number of those
+    /// objects.
     std::size_t Write();
     /// The same, and deletes the objects that no branch reaches.
     void WriteAndPrune();

@@ -18,8 +18,8 @@ namespace vault {
 
 /// The file that keeps packed forms by identifier, the branches and the name of the current branch: an SQLite database.
 ///
-/// An open file is one transaction. Nothing of what was written is in the file before `Commit`, and everything is after it,
-/// whenever the process dies. Readers see one state; one process at a time can have the file open for writing.
+/// An open file is one transaction. Nothing of what was written is in the file before `Commit`, and everything is after
+/// it, whenever the process dies. Readers see one state; one process at a time can have the file open for writing.
 /// @throws Problem from every operation
 class VaultFile {
 public:

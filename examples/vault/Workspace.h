@@ -22,16 +22,16 @@ struct ScanOptions {
 
 /// Makes the tree of everything below @p directory and stores it in @p repository.
 ///
-/// Symbolic links, special files and names that are not UTF-8 are reported and left out. Links are never followed, even if they
-/// appear while this works; @p directory itself may be one.
+/// Symbolic links, special files and names that are not UTF-8 are reported and left out. Links are never followed, even
+/// if they appear while this works; @p directory itself may be one.
 /// @throws Problem if something cannot be read
 [[nodiscard]] KivVcs::cow_ptr<KivVcs::Tree> ScanDirectory(std::filesystem::path const& directory,
                                                           ScanOptions const& options, KivVcs::IRepository& repository,
                                                           Progress& progress);
 
-/// Writes the files of @p tree below @p directory, which is made if it is missing and must be empty unless @p force. Replaces
-/// what is in the way, except that it removes no directories; leaves everything else alone. Writes nowhere else: links are
-/// replaced, not followed.
+/// Writes the files of @p tree below @p directory, which is made if it is missing and must be empty unless @p force.
+/// Replaces what is in the way, except that it removes no directories; leaves everything else alone. Writes nowhere
+/// else: links are replaced, not followed.
 /// @throws Problem if something cannot be written
 void RestoreDirectory(KivVcs::cow_ptr<KivVcs::Tree> const& tree, std::filesystem::path const& directory, bool force,
                       Progress& progress);

@@ -1,8 +1,8 @@
 #pragma once
 
 /// @file
-/// Symbol visibility of the shared library. `KIVVCS_STATIC` is defined by the build when the library is linked statically,
-/// `KIVVCS_BUILDING` only while the library itself is compiled.
+/// Symbol visibility of the shared library. `KIVVCS_STATIC` is defined by the build when the library is linked
+/// statically, `KIVVCS_BUILDING` only while the library itself is compiled.
 
 #if defined(KIVVCS_STATIC)
 #define KIVVCS_EXPORT

@@ -34,13 +34,14 @@ private:
     bool negative_ = false;
 };
 
-/// Immutable-when-shared text: copying shares the characters and allocates nothing; changing a shared text copies it first.
+/// Immutable-when-shared text: copying shares the characters and allocates nothing; changing a shared text copies it
+/// first.
 ///
-/// The text is NUL-terminated and may contain NULs. Lengths and positions are signed 32-bit code unit counts; a text that
-/// would be longer throws `std::length_error`. Everything that makes new text may throw `std::bad_alloc`.
+/// The text is NUL-terminated and may contain NULs. Lengths and positions are signed 32-bit code unit counts; a text
+/// that would be longer throws `std::length_error`. Everything that makes new text may throw `std::bad_alloc`.
 ///
-/// Threads: the count is atomic, so distinct strings that share characters may be used from different threads; one string
-/// is used like any value.
+/// Threads: the count is atomic, so distinct strings that share characters may be used from different threads; one
+/// string is used like any value.
 /// @tparam C `char` for 8-bit text, `char16_t` for UTF-16 text.
 template <class C>
 class KIVVCS_EXPORT KivStringT {
@@ -53,8 +54,8 @@ public:
     KivStringT(const C* text) : KivStringT(View(text)) {}
     /// Copies @p length code units; null or a negative length gives the empty text.
     KivStringT(const C* text, int length) : KivStringT(View(text, length)) {}
-    /// Widens 8-bit text, each byte to the code unit of the same value 0 to 255. For ASCII such as identifiers; text in UTF-8
-    /// is decoded by `String::ToStringW`.
+    /// Widens 8-bit text, each byte to the code unit of the same value 0 to 255. For ASCII such as identifiers; text in
+    /// UTF-8 is decoded by `String::ToStringW`.
     template <std::same_as<char> Narrow>
         requires std::same_as<C, char16_t>
     KivStringT(KivStringT<Narrow> const& text)
@@ -78,9 +79,10 @@ public:
     }
     ~KivStringT() { Release(); }
 
-    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does: `%%s` takes
-    /// NUL-terminated text (null counts as empty), `%%.*s` a length and text, `%%d`, `%%u` and `%%lu` any integer; a width
-    /// (`%%5d`, `%%02d`) pads with blanks or zeros, `%%%%` is a percent sign. A directive without an argument writes nothing.
+    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does: `%%s`
+    /// takes NUL-terminated text (null counts as empty), `%%.*s` a length and text, `%%d`, `%%u` and `%%lu` any
+    /// integer; a width (`%%5d`, `%%02d`) pads with blanks or zeros, `%%%%` is a percent sign. A directive without an
+    /// argument writes nothing.
     template <class... Arguments>
     void FormatInternal(View format, Arguments const&... arguments) {
         const std::array<FormatArgument<C>, sizeof...(arguments)> list{FormatArgument<C>(arguments)...};
@@ -153,7 +155,9 @@ private:
     static void Destroy(Text* text) noexcept;
 
     [[nodiscard]] C* Characters() const noexcept { return reinterpret_cast<C*>(text_ + 1); }
-    [[nodiscard]] KivStringT Slice(View part) const { return part.GetLength() == GetLength() ? *this : KivStringT(part); }
+    [[nodiscard]] KivStringT Slice(View part) const {
+        return part.GetLength() == GetLength() ? *this : KivStringT(part);
+    }
     void FormatList(View format, const FormatArgument<C>* arguments, std::size_t count);
 
     void Release() noexcept {

@@ -19,13 +19,14 @@ namespace KivPlatform {
 template <class C>
 class KIVVCS_EXPORT KivStringT;
 
-/// How texts are compared. `Exact`, the default everywhere, orders by unsigned code unit, a prefix before the longer text.
+/// How texts are compared. `Exact`, the default everywhere, orders by unsigned code unit, a prefix before the longer
+/// text.
 enum class CompareCase : std::int32_t { Exact = 0 };
 
 /// A pointer and a length: text that somebody else owns. Lengths and positions are signed 32-bit code unit counts.
 ///
-/// The text need not be NUL-terminated and may contain NULs. The owner must outlive the view. Nothing here allocates but
-/// `ToString`, and nothing throws otherwise. Views are values: distinct views are independent between threads.
+/// The text need not be NUL-terminated and may contain NULs. The owner must outlive the view. Nothing here allocates
+/// but `ToString`, and nothing throws otherwise. Views are values: distinct views are independent between threads.
 /// @tparam C `char` for 8-bit text, `char16_t` for UTF-16 text.
 template <class C>
 class KivStringViewT {
@@ -57,8 +58,8 @@ public:
     /// An owned copy. @throws std::bad_alloc
     [[nodiscard]] KivStringT<C> ToString() const;
 
-    /// The index of the first occurrence of @p needle at or after @p start, or -1. A negative start counts as 0; an empty
-    /// needle is found at the start, as long as that is not past the end.
+    /// The index of the first occurrence of @p needle at or after @p start, or -1. A negative start counts as 0; an
+    /// empty needle is found at the start, as long as that is not past the end.
     [[nodiscard]] constexpr int Find(KivStringViewT needle, int start = 0,
                                      CompareCase = CompareCase::Exact) const noexcept {
         const auto found = Standard().find(needle.Standard(), static_cast<std::size_t>(std::max(start, 0)));
@@ -104,11 +105,13 @@ private:
     int length_ = 0;
 };
 
-/// Two operands that compare as texts of @p C: at least one is a string or view of the library, the other converts to a view.
+/// Two operands that compare as texts of @p C: at least one is a string or view of the library, the other converts to a
+/// view.
 template <class L, class R, class C>
-concept TextPair = (std::same_as<L, KivStringT<C>> || std::same_as<L, KivStringViewT<C>> ||
-                    std::same_as<R, KivStringT<C>> || std::same_as<R, KivStringViewT<C>>) &&
-                   std::convertible_to<L const&, KivStringViewT<C>> && std::convertible_to<R const&, KivStringViewT<C>>;
+concept TextPair =
+    std::convertible_to<L const&, KivStringViewT<C>> && std::convertible_to<R const&, KivStringViewT<C>> &&
+    (std::same_as<L, KivStringT<C>> || std::same_as<L, KivStringViewT<C>> || std::same_as<R, KivStringT<C>> ||
+     std::same_as<R, KivStringViewT<C>>);
 
 /// Equality of text, whatever the operands: strings, views, literals. Never of pointers.
 template <class L, class R>

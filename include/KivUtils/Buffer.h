@@ -12,8 +12,8 @@
 
 namespace KivUtils::Memory {
 
-/// The chunks of a buffer in order; their concatenation is its content. Each has `data()` and `size()`. Valid until the buffer
-/// is changed or destroyed.
+/// The chunks of a buffer in order; their concatenation is its content. Each has `data()` and `size()`. Valid until the
+/// buffer is changed or destroyed.
 class BufferChunks {
 public:
     using Chunk = std::span<const std::byte>;
@@ -32,14 +32,14 @@ private:
     std::size_t count_ = 0;
 };
 
-/// A value of bytes, as large as a pointer: copying it shares its chunks and allocates nothing, appending one buffer to another
-/// shares large chunks and copies only small ones, and bytes once appended never move while they are shared.
+/// A value of bytes, as large as a pointer: copying it shares its chunks and allocates nothing, appending one buffer to
+/// another shares large chunks and copies only small ones, and bytes once appended never move while they are shared.
 ///
-/// Everything that appends may throw `std::bad_alloc`, or `std::length_error` for a size that memory cannot hold; the buffer is
-/// unchanged then.
+/// Everything that appends may throw `std::bad_alloc`, or `std::length_error` for a size that memory cannot hold; the
+/// buffer is unchanged then.
 ///
-/// Threads: the counts of shared chunks are atomic, so that distinct buffers may be used from different threads whatever they
-/// share; one buffer is used like any value.
+/// Threads: the counts of shared chunks are atomic, so that distinct buffers may be used from different threads
+/// whatever they share; one buffer is used like any value.
 class KIVVCS_EXPORT Buffer {
 public:
     Buffer() noexcept = default;
@@ -57,8 +57,8 @@ public:
     }
     ~Buffer();
 
-    /// Appends the @p size bytes at @p data, @p count times over. Memory is taken in exact size for the first bytes and grows by
-    /// a bounded share of the content afterwards. The bytes may be the buffer's own.
+    /// Appends the @p size bytes at @p data, @p count times over. Memory is taken in exact size for the first bytes and
+    /// grows by a bounded share of the content afterwards. The bytes may be the buffer's own.
     void Append(const void* data, std::uint64_t size, std::uint64_t count = 1);
 
     /// Appends the content of @p other, which may be this buffer; proportional to its chunks, not to its bytes.
@@ -67,7 +67,8 @@ public:
     /// Appends the @p size bytes of @p other that begin at @p offset, or as many as there are.
     void Append(Buffer const& other, std::uint64_t offset, std::uint64_t size);
 
-    /// Makes the content one chunk of @p size bytes and lets @p fill write them through the `std::byte*` that it is given.
+    /// Makes the content one chunk of @p size bytes and lets @p fill write them through the `std::byte*` that it is
+    /// given.
     template <class Fill>
     [[nodiscard]] static Buffer Build(std::uint64_t size, Fill fill) {
         Buffer result;

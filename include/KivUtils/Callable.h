@@ -39,8 +39,8 @@ using Delegate = std::function<Signature>;
 
 namespace helpers {
 
-/// Removes from @p container, a map or set, every element for which @p predicate holds; elements are visited in iteration
-/// order, each once. @throws what the predicate throws; the elements visited before stay removed.
+/// Removes from @p container, a map or set, every element for which @p predicate holds; elements are visited in
+/// iteration order, each once. @throws what the predicate throws; the elements visited before stay removed.
 template <class Container, class Predicate>
 void remove_erase_if_helper(Container& container, Predicate predicate) {
     for (auto element = container.begin(); element != container.end();)

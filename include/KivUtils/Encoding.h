@@ -12,7 +12,8 @@ namespace KivUtils {
 
 namespace DataEncoding {
 
-/// The UTF-8 encoding of @p text, NULs included where the view holds them. A lone surrogate is written as its three-byte form, so that no two texts share an encoding.
+/// The UTF-8 encoding of @p text, NULs included where the view holds them. A lone surrogate is written as its
+/// three-byte form, so that no two texts share an encoding.
 /// @throws std::bad_alloc; std::length_error if the result is longer than a string can be
 [[nodiscard]] KIVVCS_EXPORT KivPlatform::KivStringT<char> Utf8Encode(KivPlatform::KivStringViewT<char16_t> text);
 
@@ -30,12 +31,13 @@ KIVVCS_EXPORT char* Utf8Write(KivPlatform::KivStringViewT<char16_t> text, char* 
 
 namespace String {
 
-/// The text that a UTF-8 encoding stands for; the inverse of `DataEncoding::Utf8Encode` for every text. The three-byte form of
-/// a surrogate decodes to that surrogate; every other byte that is not part of a well-formed sequence decodes to U+FFFD.
+/// The text that a UTF-8 encoding stands for; the inverse of `DataEncoding::Utf8Encode` for every text. The three-byte
+/// form of a surrogate decodes to that surrogate; every other byte that is not part of a well-formed sequence decodes
+/// to U+FFFD.
 [[nodiscard]] KIVVCS_EXPORT KivPlatform::KivStringT<char16_t> ToStringW(KivPlatform::KivStringViewT<char> text);
 
-/// The number that @p text begins with: an optional sign and decimal digits. No digits give 0; a number out of range gives the
-/// nearest one in range.
+/// The number that @p text begins with: an optional sign and decimal digits. No digits give 0; a number out of range
+/// gives the nearest one in range.
 [[nodiscard]] KIVVCS_EXPORT int IntFromString(KivPlatform::KivStringViewT<char16_t> text) noexcept;
 [[nodiscard]] KIVVCS_EXPORT std::int64_t Int64FromString(KivPlatform::KivStringViewT<char16_t> text) noexcept;
 

@@ -32,7 +32,8 @@ public:
     /// The value, or null if there is none yet.
     [[nodiscard]] const T* Get() const noexcept { return value_.load(std::memory_order_acquire); }
 
-    /// The value, made by @p make if there is none yet; the reference is valid until `Reset`, assignment or destruction.
+    /// The value, made by @p make if there is none yet; the reference is valid until `Reset`, assignment or
+    /// destruction.
     template <class Make>
     T const& GetOrMake(Make make) const {
         if (const T* value = Get())

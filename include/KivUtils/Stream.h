@@ -42,7 +42,8 @@ private:
     std::unique_ptr<IStream> stream_;
 };
 
-/// A stream on a buffer that somebody else owns and that must outlive it: reads it from its beginning, appends at its end.
+/// A stream on a buffer that somebody else owns and that must outlive it: reads it from its beginning, appends at its
+/// end.
 class KIVVCS_EXPORT MemStream final : public IStream {
 public:
     [[nodiscard]] static Stream CreateOnRef(Memory::Buffer& buffer);
@@ -53,8 +54,8 @@ public:
     [[nodiscard]] std::uint64_t GetSize() const override { return buffer_.GetSize(); }
     [[nodiscard]] std::uint64_t GetPosition() const override { return position_; }
 
-    /// Moves everything from the position on to the end of @p destination's buffer, sharing large chunks with it, and returns
-    /// the number of bytes. @throws std::bad_alloc
+    /// Moves everything from the position on to the end of @p destination's buffer, sharing large chunks with it, and
+    /// returns the number of bytes. @throws std::bad_alloc
     std::uint64_t ShareRest(MemStream& destination);
 
 private:
@@ -66,8 +67,8 @@ private:
 
 namespace Serialization {
 
-/// A sequential reader that owns its stream. Move-only. Test its validity before anything else: on an invalid reader every
-/// operation fails or gives 0.
+/// A sequential reader that owns its stream. Move-only. Test its validity before anything else: on an invalid reader
+/// every operation fails or gives 0.
 class KIVVCS_EXPORT StreamIO {
 public:
     StreamIO() noexcept = default;
@@ -81,8 +82,8 @@ public:
     [[nodiscard]] std::uint64_t GetSize() const;
     [[nodiscard]] std::uint64_t GetPosition() const;
 
-    /// Copies everything from the position to the end into @p destination, in pieces, so that a stream that claims more than
-    /// it holds costs no more memory than what it holds.
+    /// Copies everything from the position to the end into @p destination, in pieces, so that a stream that claims more
+    /// than it holds costs no more memory than what it holds.
     /// @param copied receives the number of bytes copied, unless null.
     /// @return false if there is no stream or destination, or if reading or writing failed on the way.
     bool CopyTo(IStream* destination, std::uint64_t* copied);

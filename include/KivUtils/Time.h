@@ -38,8 +38,8 @@ public:
     /// The current time.
     [[nodiscard]] static Time Now() noexcept;
 
-    /// The time @p seconds after (before, if negative) 1970; seconds that ticks cannot tell (beyond the year 31197) give the
-    /// nearest time that they can.
+    /// The time @p seconds after (before, if negative) 1970; seconds that ticks cannot tell (beyond the year 31197)
+    /// give the nearest time that they can.
     [[nodiscard]] static Time FromTimeT(std::int64_t seconds, TimeZone) noexcept;
 
     /// Whole seconds since 1970, rounded down.
@@ -55,8 +55,8 @@ private:
 
 namespace DateTime {
 
-/// The offset from UTC that the local time zone has at @p time (positive east of Greenwich), to the second; zero where the
-/// platform cannot tell.
+/// The offset from UTC that the local time zone has at @p time (positive east of Greenwich), to the second; zero where
+/// the platform cannot tell.
 [[nodiscard]] KIVVCS_EXPORT TimeDelta GetCurrentTimezoneBias(Time time) noexcept;
 
 } // namespace DateTime

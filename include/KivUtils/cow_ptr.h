@@ -21,8 +21,8 @@ struct emplace_t {
 };
 inline constexpr emplace_t emplace{};
 
-/// The count of the `cow_ptr`s that hold an object. A class that derives from it carries its own count and is held without a
-/// control block; any other type gets one. Copying or assigning an object never copies the count.
+/// The count of the `cow_ptr`s that hold an object. A class that derives from it carries its own count and is held
+/// without a control block; any other type gets one. Copying or assigning an object never copies the count.
 class reference_counted {
 public:
     reference_counted() noexcept = default;
@@ -53,7 +53,7 @@ class counted_holder final : public reference_counted {
 public:
     template <class... Arguments>
     explicit counted_holder(emplace_t, Arguments&&... arguments)
-        : object_(::new (static_cast<void*>(storage_)) T(std::forward<Arguments>(arguments)...)) {}
+        : object_(::new(static_cast<void*>(storage_)) T(std::forward<Arguments>(arguments)...)) {}
     explicit counted_holder(std::unique_ptr<T> object) noexcept : object_(object.release()) {}
     counted_holder(counted_holder const&) = delete;
     counted_holder& operator=(counted_holder const&) = delete;
@@ -71,7 +71,8 @@ private:
     alignas(T) std::byte storage_[sizeof(T)];
 };
 
-/// A pointer that shares its object with its copies and gives write access only to a sole owner, copying the object otherwise.
+/// A pointer that shares its object with its copies and gives write access only to a sole owner, copying the object
+/// otherwise.
 ///
 /// Reading (`->`, `*`, `get`) never copies. The pointer may be null. It is as large as a raw pointer; an object is one
 /// allocation.
@@ -179,8 +180,8 @@ public:
         return write_if_there();
     }
 
-    /// Gives up this pointer's share and hands the object over if it was the last one; null otherwise. Lets an owner take
-    /// an object apart before it dies. Self-counted types only.
+    /// Gives up this pointer's share and hands the object over if it was the last one; null otherwise. Lets an owner
+    /// take an object apart before it dies. Self-counted types only.
     [[nodiscard]] std::unique_ptr<T> release_if_last() noexcept {
         static_assert(std::is_base_of_v<reference_counted, T>);
         const auto* const counted = std::exchange(counted_, nullptr);
@@ -190,7 +191,9 @@ public:
     }
 
     /// Identity of the object, not equality of content.
-    friend bool operator==(cow_ptr const& left, cow_ptr const& right) noexcept { return left.counted_ == right.counted_; }
+    friend bool operator==(cow_ptr const& left, cow_ptr const& right) noexcept {
+        return left.counted_ == right.counted_;
+    }
     friend bool operator==(cow_ptr const& pointer, std::nullptr_t) noexcept { return pointer.counted_ == nullptr; }
 
 private:

@@ -9,19 +9,20 @@ namespace KivVcs {
 
 /// A root tree, at most one parent, author, description, and the time and time-zone bias of committing.
 ///
-/// A commit is built on its parent or in its parent's place, edited, handed to `IRepository::DoCommit`, which stamps and stores
-/// a copy, and from then on read through shared pointers. Every edit of the files stores the new trees at once.
+/// A commit is built on its parent or in its parent's place, edited, handed to `IRepository::DoCommit`, which stamps
+/// and stores a copy, and from then on read through shared pointers. Every edit of the files stores the new trees at
+/// once.
 ///
-/// Exceptions: nothing throws for bad data. What allocation and the repository throw passes through; the commit then has its
-/// former content, or the complete new one.
+/// Exceptions: nothing throws for bad data. What allocation and the repository throw passes through; the commit then
+/// has its former content, or the complete new one.
 ///
 /// Threads: all `const` operations may run concurrently on one commit. A change needs exclusive use of the commit.
 class KIVVCS_EXPORT Commit : public Object {
 public:
     /// Everything empty, null or zero; unlike after the other constructors there is no tree holder either.
     Commit() noexcept = default;
-    /// A new commit on top of @p parent, sharing its tree; or, if @p amend, one in its place: with its parent, tree, author and
-    /// description. A missing tree becomes an empty holder. A null parent makes a root commit.
+    /// A new commit on top of @p parent, sharing its tree; or, if @p amend, one in its place: with its parent, tree,
+    /// author and description. A missing tree becomes an empty holder. A null parent makes a root commit.
     Commit(cow_ptr<Commit> parent, bool amend);
     /// The same with the head of the current branch as parent; a null repository counts as no parent.
     Commit(IRepository* repository, bool amend);
@@ -61,9 +62,10 @@ public:
     /// Takes author and description over from @p other; time and bias stay.
     void ResetPropertiesForAmend(Commit const& other);
 
-    /// Adds to, or removes from, the commit's files, as the operations of `CommitTree`; then replaces the root by the storage's
-    /// instance of it and calls `ResetState`. On failure the commit's content and caches stay as they are.
-    /// @return null, or false, if nothing was added or removed: no repository, a path that cannot be, an unknown identifier.
+    /// Adds to, or removes from, the commit's files, as the operations of `CommitTree`; then replaces the root by the
+    /// storage's instance of it and calls `ResetState`. On failure the commit's content and caches stay as they are.
+    /// @return null, or false, if nothing was added or removed: no repository, a path that cannot be, an unknown
+    /// identifier.
     cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
     cow_ptr<Tree> AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree);
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
@@ -73,33 +75,37 @@ public:
     /// A new holder of the subtree at @p path; null if there is none.
     [[nodiscard]] cow_ptr<CommitTree> GetTree(KivStringViewT<char16_t> path) const;
 
-    /// Replaces the whole root tree, then `RebuildTree`. The cached identifier and text stay until the next `ResetState`.
+    /// Replaces the whole root tree, then `RebuildTree`. The cached identifier and text stay until the next
+    /// `ResetState`.
     void ReplaceRoot(IRepository* repo, cow_ptr<Tree> root);
-    /// Makes the root the storage's instance of itself, storing it if the storage has none. A null @p repo changes nothing.
+    /// Makes the root the storage's instance of itself, storing it if the storage has none. A null @p repo changes
+    /// nothing.
     void RebuildTree(IRepository* repo);
 
-    /// Links a line of history, newest first: makes every commit's parent its successor in @p commits, and every element the
-    /// stored instance of its commit, oldest first. The last element keeps its own parent. A null element is skipped, and so is
-    /// the one before it. Commits held elsewhere are copied, not changed.
+    /// Links a line of history, newest first: makes every commit's parent its successor in @p commits, and every
+    /// element the stored instance of its commit, oldest first. The last element keeps its own parent. A null element
+    /// is skipped, and so is the one before it. Commits held elsewhere are copied, not changed.
     /// @return false, changing nothing, if @p repo is null or the list empty.
     static bool MakeCommitLinksInOrder(std::vector<cow_ptr<Commit>>& commits, IRepository* repo);
 
-    /// A signature line: "ROLE NAME <EMAIL> SECONDS +HHMM". Seconds are written as a signed 32-bit number. Each text ends at its
-    /// first U+0000. The sign is that of the whole hours, so that a bias between minus one hour and zero is written with "+".
-    [[nodiscard]] static KivStringT<char16_t> GetAuthorInfo(KivStringViewT<char16_t> role, KivStringViewT<char16_t> name,
+    /// A signature line: "ROLE NAME <EMAIL> SECONDS +HHMM". Seconds are written as a signed 32-bit number. Each text
+    /// ends at its first U+0000. The sign is that of the whole hours, so that a bias between minus one hour and zero is
+    /// written with "+".
+    [[nodiscard]] static KivStringT<char16_t> GetAuthorInfo(KivStringViewT<char16_t> role,
+                                                            KivStringViewT<char16_t> name,
                                                             KivStringViewT<char16_t> email, Time time, TimeDelta bias);
 
-    /// What follows @p key in @p text up to the next line break, found anywhere at or after @p position, which moves to that
-    /// line break; nothing, leaving @p position, if the key is not there. A value without line break is empty, and
+    /// What follows @p key in @p text up to the next line break, found anywhere at or after @p position, which moves to
+    /// that line break; nothing, leaving @p position, if the key is not there. A value without line break is empty, and
     /// @p position moves to the end of the text.
-    [[nodiscard]] static optional<KivStringT<char>> ParseCommitInfo(KivStringT<char> const& text, KivStringViewT<char> key,
-                                                                    int& position);
+    [[nodiscard]] static optional<KivStringT<char>> ParseCommitInfo(KivStringT<char> const& text,
+                                                                    KivStringViewT<char> key, int& position);
 
-    /// The commit of identifier @p id: the one that @p repository holds, otherwise read through @p loader with its tree. It has
-    /// the repository's head as parent; the caller links the real one, whose identifier goes to @p parentId (untouched if the
-    /// commit is held already). Only the first line of a description is read.
-    /// @return null if @p repository is null, @p id or @p loader is empty, the header does not begin with "commit ", or there is
-    /// no tree line.
+    /// The commit of identifier @p id: the one that @p repository holds, otherwise read through @p loader with its
+    /// tree. It has the repository's head as parent; the caller links the real one, whose identifier goes to @p
+    /// parentId (untouched if the commit is held already). Only the first line of a description is read.
+    /// @return null if @p repository is null, @p id or @p loader is empty, the header does not begin with "commit ", or
+    /// there is no tree line.
     /// @throws what @p loader and @p repository throw
     [[nodiscard]] static cow_ptr<Commit> Deserialize(Id const& id, Id& parentId, IRepository* repository,
                                                      PortableVersion::Delegate<StreamIO(Id const&)> loader);

@@ -40,14 +40,14 @@ enum class TreeConflictChoice : std::int32_t {
     Undecided = 4,
 };
 
-/// Settles a conflict. It is given the path of the disputed entry as components, counted from the top of the merge, and the
-/// three whole trees of the merge, in which it can look the entry up. The path is valid during the call.
+/// Settles a conflict. It is given the path of the disputed entry as components, counted from the top of the merge, and
+/// the three whole trees of the merge, in which it can look the entry up. The path is valid during the call.
 using BlobConflictResolver = std::function<ConflictChoice(array_view<KivStringViewT<char16_t> const>, MergeTrees)>;
 /// The same for directories; the path is empty for the trees of the merge themselves.
 using TreeConflictResolver = std::function<TreeConflictChoice(array_view<KivStringViewT<char16_t> const>, MergeTrees)>;
 
-/// Both kinds of resolver. An empty one makes a merge give up at the first conflict of its kind. The tree resolver is asked for
-/// the top-level trees too, whenever the sides differ: for an ordinary merge it answers `Merge`.
+/// Both kinds of resolver. An empty one makes a merge give up at the first conflict of its kind. The tree resolver is
+/// asked for the top-level trees too, whenever the sides differ: for an ordinary merge it answers `Merge`.
 struct Resolvers {
     BlobConflictResolver blobResolver;
     TreeConflictResolver treeResolver;
@@ -58,26 +58,30 @@ struct Resolvers {
 [[nodiscard]] KIVVCS_EXPORT BlobConflictResolver AlwaysChooseLeft();
 [[nodiscard]] KIVVCS_EXPORT BlobConflictResolver AlwaysChooseRight();
 
-/// A resolver that asks @p first and, only if that is undecided, @p second, whose answer is final. Asking an empty member throws
-/// `std::bad_function_call`.
-[[nodiscard]] KIVVCS_EXPORT BlobConflictResolver ChainResolvers(BlobConflictResolver first, BlobConflictResolver second);
-[[nodiscard]] KIVVCS_EXPORT TreeConflictResolver ChainResolvers(TreeConflictResolver first, TreeConflictResolver second);
+/// A resolver that asks @p first and, only if that is undecided, @p second, whose answer is final. Asking an empty
+/// member throws `std::bad_function_call`.
+[[nodiscard]] KIVVCS_EXPORT BlobConflictResolver ChainResolvers(BlobConflictResolver first,
+                                                                BlobConflictResolver second);
+[[nodiscard]] KIVVCS_EXPORT TreeConflictResolver ChainResolvers(TreeConflictResolver first,
+                                                                TreeConflictResolver second);
 
-/// A resolver that lets the side with the later time win. A side's time is read by @p getTime from the first of the blobs
-/// @p names (relative paths, in order of preference) that tells one, looked up in the directory of the disputed entry and, while
-/// that decides nothing, in each directory above it. The path of the entry itself is tried as a directory first.
+/// A resolver that lets the side with the later time win. A side's time is read by @p getTime from the first of the
+/// blobs @p names (relative paths, in order of preference) that tells one, looked up in the directory of the disputed
+/// entry and, while that decides nothing, in each directory above it. The path of the entry itself is tried as a
+/// directory first.
 ///
-/// The answer is never `Root`, and `Undecided` if no level decides. Times compare as unsigned ticks. An empty @p getTime throws
-/// `std::bad_function_call` when the first time-stamp blob is found.
-[[nodiscard]] KIVVCS_EXPORT BlobConflictResolver
-TimeBasedConflictResolver(std::vector<KivStringT<char16_t>> names, std::function<optional<Time>(cow_ptr<Blob>)> getTime);
+/// The answer is never `Root`, and `Undecided` if no level decides. Times compare as unsigned ticks. An empty @p
+/// getTime throws `std::bad_function_call` when the first time-stamp blob is found.
+[[nodiscard]] KIVVCS_EXPORT BlobConflictResolver TimeBasedConflictResolver(
+    std::vector<KivStringT<char16_t>> names, std::function<optional<Time>(cow_ptr<Blob>)> getTime);
 
 /// Merges the changes that @p trees make on both sides of their root, entry by entry.
 ///
-/// Resolvers are asked only where both sides changed one entry, or directory, to different states: in ascending name order,
-/// the blobs of a directory before its subdirectories. Contents are never merged. Unchanged subtrees are shared with the inputs,
-/// which stay as they are. New trees are stored in @p repo as they are made.
-/// @return the merged tree; null if @p repo is null, a resolver that was needed is empty or undecided, or no side has a tree.
+/// Resolvers are asked only where both sides changed one entry, or directory, to different states: in ascending name
+/// order, the blobs of a directory before its subdirectories. Contents are never merged. Unchanged subtrees are shared
+/// with the inputs, which stay as they are. New trees are stored in @p repo as they are made.
+/// @return the merged tree; null if @p repo is null, a resolver that was needed is empty or undecided, or no side has a
+/// tree.
 /// @complexity proportional to the entries that differ and to the size of the directories that hold them.
 /// @throws what resolvers and @p repo throw; nothing is committed then.
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Tree> ThreeWayMerge(IRepository* repo, MergeTrees trees, Resolvers resolvers);

@@ -1,7 +1,8 @@
 #pragma once
 
 /// @file
-/// What all stored things have in common: identifiers, the packed form, its SHA-256 digest, and the helpers of every format.
+/// What all stored things have in common: identifiers, the packed form, its SHA-256 digest, and the helpers of every
+/// format.
 
 #include "KivVcs/Foundation.h"
 
@@ -12,8 +13,8 @@
 
 namespace KivVcs {
 
-/// The SHA-256 digest of FIPS 180-4 over bytes fed in any number of pieces. Uses the processor's SHA instructions where it has
-/// them. A value: a copy goes on from the same state. One digest is used by one thread at a time.
+/// The SHA-256 digest of FIPS 180-4 over bytes fed in any number of pieces. Uses the processor's SHA instructions where
+/// it has them. A value: a copy goes on from the same state. One digest is used by one thread at a time.
 class KIVVCS_EXPORT SHADigest256 {
 public:
     SHADigest256() noexcept;
@@ -34,11 +35,11 @@ private:
     std::uint64_t fed_ = 0;
 };
 
-/// The identifier of an object: the hexadecimal text of the SHA-256 digest of its packed form, 64 lowercase digits. The empty
-/// text is the null identifier: no object.
+/// The identifier of an object: the hexadecimal text of the SHA-256 digest of its packed form, 64 lowercase digits. The
+/// empty text is the null identifier: no object.
 ///
-/// As large as a pointer; copying shares it and allocates nothing. Identifiers are equal when their texts are. Any number of
-/// threads may read one identifier.
+/// As large as a pointer; copying shares it and allocates nothing. Identifiers are equal when their texts are. Any
+/// number of threads may read one identifier.
 class KIVVCS_EXPORT Id {
 public:
     using Digest = std::array<std::uint8_t, 32>;
@@ -175,8 +176,8 @@ protected:
 
 /// The base of blobs, trees and commits: caches the identifier and the packed form of the content.
 ///
-/// What is asked for is computed on first use and kept until `ResetState`; references to packed forms and data are valid until
-/// then, or until the object dies. A copy carries the caches.
+/// What is asked for is computed on first use and kept until `ResetState`; references to packed forms and data are
+/// valid until then, or until the object dies. A copy carries the caches.
 ///
 /// Threads: all `const` operations may run concurrently on one object. A change needs exclusive use of the object.
 /// @throws std::bad_alloc from everything that computes; the object is as before then.
@@ -204,7 +205,8 @@ protected:
     Object& operator=(Object const&) = default;
     Object& operator=(Object&&) noexcept = default;
 
-    /// The identifier of what `GetPackedData` gives. Overridden where it can be had without putting the packed form together.
+    /// The identifier of what `GetPackedData` gives. Overridden where it can be had without putting the packed form
+    /// together.
     [[nodiscard]] virtual Id ComputeId() const;
 
 private:
@@ -218,7 +220,8 @@ private:
 /// What every object format uses.
 namespace Helpers {
 
-/// The SHA-256 digest of @p size bytes as 64 lowercase hexadecimal digits; the empty text if @p data is null, also for size 0.
+/// The SHA-256 digest of @p size bytes as 64 lowercase hexadecimal digits; the empty text if @p data is null, also for
+/// size 0.
 [[nodiscard]] KIVVCS_EXPORT KivStringT<char16_t> ComputeEncodedSHA256Hash(const void* data, std::size_t size);
 
 /// The same for the content of @p buffer, which may be empty.
@@ -234,8 +237,9 @@ KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char16_t> 
 /// The content as 8-bit text, zero bytes included; at most 2,147,483,647 bytes of it.
 [[nodiscard]] KIVVCS_EXPORT KivStringT<char> StringAFromBuffer(Buffer const& buffer);
 
-/// The rest of the stream as 8-bit text, at most 2,147,483,647 bytes of it; empty if the stream is not valid, has no rest, or
-/// cannot be read. Takes no more memory than a multiple of what the stream really holds, whatever size it claims.
+/// The rest of the stream as 8-bit text, at most 2,147,483,647 bytes of it; empty if the stream is not valid, has no
+/// rest, or cannot be read. Takes no more memory than a multiple of what the stream really holds, whatever size it
+/// claims.
 [[nodiscard]] KIVVCS_EXPORT KivStringT<char> StreamToStringA(StreamIO& stream);
 
 /// Reads the header of a packed form, its zero byte included, which leaves the stream at the first data byte.

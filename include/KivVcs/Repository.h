@@ -11,17 +11,17 @@ namespace KivVcs {
 class CommonBaseIndex;
 
 /// What objects and merges call back on while they are edited, read or merged, and what hosts program against. Higher
-/// operations call lower ones through this interface, so overriding a lower one changes the higher ones too. The order of the
-/// operations is part of the binary interface.
+/// operations call lower ones through this interface, so overriding a lower one changes the higher ones too. The order
+/// of the operations is part of the binary interface.
 ///
-/// A null pointer is the interface's "none" in both directions; nothing throws for a missing object or branch. Nothing owns a
-/// repository through this interface.
+/// A null pointer is the interface's "none" in both directions; nothing throws for a missing object or branch. Nothing
+/// owns a repository through this interface.
 ///
 /// Threads: the `const` operations may run concurrently; everything else needs exclusive use.
 class KIVVCS_EXPORT IRepository {
 public:
-    /// Stamps @p commit with the current time, in whole seconds, and the local time-zone bias, stores a copy of it unless an
-    /// identical commit is stored, and moves the current branch, if it exists, to the stored commit.
+    /// Stamps @p commit with the current time, in whole seconds, and the local time-zone bias, stores a copy of it
+    /// unless an identical commit is stored, and moves the current branch, if it exists, to the stored commit.
     /// @return the stored commit; null without storage, or (before stamping) if an amend finds no head.
     virtual cow_ptr<Commit> DoCommit(Commit& commit) = 0;
     /// The head of the current branch, or null.
@@ -40,13 +40,13 @@ public:
     [[nodiscard]] virtual std::uint64_t GetCommitCount() const = 0;
     [[nodiscard]] virtual std::uint64_t GetTreeCount() const = 0;
     [[nodiscard]] virtual std::uint64_t GetBlobCount() const = 0;
-    /// Deletes @p commit and everything below it on its chain, but for the commits that are branch heads: those are stored anew,
-    /// linked to each other in their old order, their branches moved, and unused objects purged. A root commit, and null, are
-    /// left alone. Descendants of @p commit keep their old parents in memory.
+    /// Deletes @p commit and everything below it on its chain, but for the commits that are branch heads: those are
+    /// stored anew, linked to each other in their old order, their branches moved, and unused objects purged. A root
+    /// commit, and null, are left alone. Descendants of @p commit keep their old parents in memory.
     /// @return false without storage, or if the kept commits could not be linked.
     virtual bool DeleteCommits(cow_ptr<Commit> commit) = 0;
-    /// Rewrites the history of all branches so that it keeps only their heads and the common bases of every two heads, each
-    /// linked to the nearest kept ancestor; purges unused objects at the end if @p purge. Content stays.
+    /// Rewrites the history of all branches so that it keeps only their heads and the common bases of every two heads,
+    /// each linked to the nearest kept ancestor; purges unused objects at the end if @p purge. Content stays.
     /// @return false without storage.
     virtual bool SimplifyCommitGraph(bool purge) = 0;
     /// Purges the objects that nothing references.
@@ -54,8 +54,9 @@ public:
     /// The storage, which stays the repository's; may be null.
     [[nodiscard]] virtual IObjectsStorage* GetStorage() = 0;
     [[nodiscard]] virtual IObjectsStorage const* GetStorage() const = 0;
-    /// The commit at which the histories of both commits meet, compared by identifier; null if they never do. Follows parent
-    /// links, one step on each side in turn; when both arrive together the result is the object on the second one's chain.
+    /// The commit at which the histories of both commits meet, compared by identifier; null if they never do. Follows
+    /// parent links, one step on each side in turn; when both arrive together the result is the object on the second
+    /// one's chain.
     [[nodiscard]] virtual cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const = 0;
     /// Makes an existing branch current; false if there is none of that name.
     virtual bool Checkout(KivStringViewT<char16_t> branch) = 0;
@@ -66,19 +67,22 @@ public:
     virtual bool MoveBranchTo(KivStringViewT<char16_t> branch, cow_ptr<Commit> commit) = 0;
     /// Removes an existing branch, the current one too, which stays current by name.
     virtual bool RemoveBranch(KivStringViewT<char16_t> branch) = 0;
-    /// Makes two branches share an ancestor: unless they do, puts each history that does not contain it on top of the head of
-    /// @p rootBranch, which is made with an empty commit "Root commit" if it has no head. A branch without commits is put at the
-    /// root itself.
-    /// @return false if the root branch cannot be made or a branch cannot be moved; what was stored before stays stored.
+    /// Makes two branches share an ancestor: unless they do, puts each history that does not contain it on top of the
+    /// head of @p rootBranch, which is made with an empty commit "Root commit" if it has no head. A branch without
+    /// commits is put at the root itself.
+    /// @return false if the root branch cannot be made or a branch cannot be moved; what was stored before stays
+    /// stored.
     virtual bool EnsureCommonRootFor(KivStringViewT<char16_t> first, KivStringViewT<char16_t> second,
                                      KivStringViewT<char16_t> rootBranch) = 0;
-    /// Moves the current branch forward to @p commit; false if the current head is not on its history (as the same object).
+    /// Moves the current branch forward to @p commit; false if the current head is not on its history (as the same
+    /// object).
     virtual bool FastForwardMerge(cow_ptr<Commit> commit) = 0;
     /// Merges the tree of @p commit into the current branch by a new commit on top of its head.
-    /// @return false, changing nothing, if @p commit or the head is null, the merge gave up, or nothing could be committed.
+    /// @return false, changing nothing, if @p commit or the head is null, the merge gave up, or nothing could be
+    /// committed.
     virtual bool Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) = 0;
-    /// Brings @p commit into the current branch the cheapest way: points an empty branch at it, moves the branch forward, or
-    /// merges. @return false, changing nothing, if none of them can be done.
+    /// Brings @p commit into the current branch the cheapest way: points an empty branch at it, moves the branch
+    /// forward, or merges. @return false, changing nothing, if none of them can be done.
     virtual bool Merge(cow_ptr<Commit> commit, Resolvers resolvers) = 0;
 
 protected:
@@ -88,8 +92,8 @@ protected:
     ~IRepository() = default;
 };
 
-/// The repository: owns one storage and knows which branch is current. There is no working copy; the head of a branch is always
-/// read from the storage. Without a storage, lookups give null, counts 0 and everything else false.
+/// The repository: owns one storage and knows which branch is current. There is no working copy; the head of a branch
+/// is always read from the storage. Without a storage, lookups give null, counts 0 and everything else false.
 class KIVVCS_EXPORT Repository : public IRepository {
 public:
     /// Takes the storage over, which may be null, and makes "master" the current branch, whether or not it exists.
@@ -134,9 +138,9 @@ public:
     void AddTreeToStorage(cow_ptr<Tree> tree);
     void AddBlobToStorage(cow_ptr<Blob> blob);
 
-    /// Puts the line of commits from @p commit down to, but without, @p base on top of @p onto: the same trees, authors and times
-    /// with new parents. A null @p base moves the whole history; if @p commit is @p base, that commit alone is moved. Commits are
-    /// compared as objects. No branch moves, and the old commits stay.
+    /// Puts the line of commits from @p commit down to, but without, @p base on top of @p onto: the same trees, authors
+    /// and times with new parents. A null @p base moves the whole history; if @p commit is @p base, that commit alone
+    /// is moved. Commits are compared as objects. No branch moves, and the old commits stay.
     /// @return the new tip; @p commit itself if it sits on @p onto already; null if @p commit or @p onto is null.
     cow_ptr<Commit> MergelessRebase(cow_ptr<Commit> commit, cow_ptr<Commit> base, cow_ptr<Commit> onto);
     /// The same for the head of @p branch, from its common base with the head of @p ontoBranch.

@@ -10,9 +10,9 @@
 
 namespace KivVcs {
 
-/// A keyed container of objects and the table of branches. It never computes content: an object is filed under the identifier
-/// that it reports when it is added, and handed back by shared reference. The order of the operations is part of the binary
-/// interface.
+/// A keyed container of objects and the table of branches. It never computes content: an object is filed under the
+/// identifier that it reports when it is added, and handed back by shared reference. The order of the operations is
+/// part of the binary interface.
 ///
 /// Threads: the `const` operations may run concurrently; everything else needs exclusive use.
 class KIVVCS_EXPORT IObjectsStorage {
@@ -42,7 +42,8 @@ public:
     [[nodiscard]] virtual TreeTable const& GetTrees() const = 0;
     [[nodiscard]] virtual BlobTable const& GetBlobs() const = 0;
     [[nodiscard]] virtual ReferenceTable const& GetRefs() const = 0;
-    /// Takes the commit of that identifier out of the table; branches that point at it keep it. Null and unknown do nothing.
+    /// Takes the commit of that identifier out of the table; branches that point at it keep it. Null and unknown do
+    /// nothing.
     virtual void DeleteCommit(cow_ptr<Commit> commit) = 0;
     /// Removes every object that only the storage's own tables hold.
     virtual void PurgeUnusedObjects() = 0;
@@ -64,8 +65,8 @@ protected:
     IObjectsStorage& operator=(IObjectsStorage const&) = default;
 };
 
-/// The storage in memory. It holds one reference to each object, and computes an object's identifier when it stores it, which
-/// makes stored objects safe and cheap to read from several threads.
+/// The storage in memory. It holds one reference to each object, and computes an object's identifier when it stores it,
+/// which makes stored objects safe and cheap to read from several threads.
 class KIVVCS_EXPORT MemObjectsStorage : public IObjectsStorage {
 public:
     /// No objects and one branch, "master", without a head.
@@ -91,8 +92,8 @@ public:
     [[nodiscard]] BlobTable const& GetBlobs() const override;
     [[nodiscard]] ReferenceTable const& GetRefs() const override;
     void DeleteCommit(cow_ptr<Commit> commit) override;
-    /// One pass over the tables, commits, trees, blobs, plus the objects removed. Use counts are the whole rule: an object stays
-    /// as long as a branch, another object, another storage or the host holds it.
+    /// One pass over the tables, commits, trees, blobs, plus the objects removed. Use counts are the whole rule: an
+    /// object stays as long as a branch, another object, another storage or the host holds it.
     void PurgeUnusedObjects() override;
     [[nodiscard]] bool BranchExist(KivStringViewT<char16_t> name) const override;
     bool CreateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) override;

@@ -54,18 +54,19 @@ private:
 
 /// A directory: names mapped to blobs and to subtrees.
 ///
-/// Names are single path components. One name may be held both as a blob and as a subtree; lookups by name and the packed form
-/// then see the blob. Paths are split at "/", empty components dropped. Every object that is added is reconciled with the
-/// repository's storage, so that equal content is held once.
+/// Names are single path components. One name may be held both as a blob and as a subtree; lookups by name and the
+/// packed form then see the blob. Paths are split at "/", empty components dropped. Every object that is added is
+/// reconciled with the repository's storage, so that equal content is held once.
 ///
-/// A copy shares all entries and costs O(1); an edit below a path copies only the trees on that path, and of a large tree only
-/// the nodes that change. Trees shared with others never change: edit through `cow_ptr::write`.
+/// A copy shares all entries and costs O(1); an edit below a path copies only the trees on that path, and of a large
+/// tree only the nodes that change. Trees shared with others never change: edit through `cow_ptr::write`.
 ///
-/// Nothing throws for a bad path or a missing object; running out of memory throws `std::bad_alloc`, after which this tree is as
-/// before (trees below it may have been stored already). What the repository's operations throw passes through likewise.
+/// Nothing throws for a bad path or a missing object; running out of memory throws `std::bad_alloc`, after which this
+/// tree is as before (trees below it may have been stored already). What the repository's operations throw passes
+/// through likewise.
 ///
-/// Threads: all `const` operations may run concurrently on one tree, whether or not its identifier has been computed. An edit
-/// needs exclusive use of the tree.
+/// Threads: all `const` operations may run concurrently on one tree, whether or not its identifier has been computed.
+/// An edit needs exclusive use of the tree.
 class KIVVCS_EXPORT Tree : public Object {
 public:
     Tree() noexcept;
@@ -79,7 +80,8 @@ public:
     [[nodiscard]] KivStringT<char> GetHeader() const override;
     /// "40000"
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
-    /// The entries in name order, each as mode, blank, type, blank, name in UTF-8, a zero byte and 64 digits of identifier.
+    /// The entries in name order, each as mode, blank, type, blank, name in UTF-8, a zero byte and 64 digits of
+    /// identifier.
     [[nodiscard]] Buffer const& GetData() const override;
     void ResetState() override;
 
@@ -91,25 +93,29 @@ public:
     /// The number of blob entries at any depth; proportional to the number of subtrees.
     [[nodiscard]] std::uint64_t GetDeepBlobCount() const;
 
-    /// Adds a blob under @p path, making the trees on the way that are missing and replacing a blob of that name. A subtree of
-    /// that name stays beside it, and a blob on the way stays beside the tree that is made.
+    /// Adds a blob under @p path, making the trees on the way that are missing and replacing a blob of that name. A
+    /// subtree of that name stays beside it, and a blob on the way stays beside the tree that is made.
     ///
-    /// Asks @p repo, from the bottom up, for each object by its identifier (`GetBlobFromStorage`, `GetTreeFromStorage`) and
-    /// hands it to `SyncWithStorage`; the handle that this returns becomes the entry.
+    /// Asks @p repo, from the bottom up, for each object by its identifier (`GetBlobFromStorage`, `GetTreeFromStorage`)
+    /// and hands it to `SyncWithStorage`; the handle that this returns becomes the entry.
     /// @return the handle that was entered; null, changing nothing, if @p repo is null or the path has no components.
     /// @complexity O(log n) in each tree on the path, plus hashing those trees.
     cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
     /// The same for a subtree.
     cow_ptr<Tree> AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree);
-    /// The same for an object that the storage holds, a blob before a tree of that identifier; null if it holds neither.
+    /// The same for an object that the storage holds, a blob before a tree of that identifier; null if it holds
+    /// neither.
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
 
-    /// `AddBlob` and `AddTree` with the path given as components. An empty last component adds nothing and returns null, although
-    /// the trees on the way have been made; an empty one before it makes a tree that is attached nowhere.
+    /// `AddBlob` and `AddTree` with the path given as components. An empty last component adds nothing and returns
+    /// null, although the trees on the way have been made; an empty one before it makes a tree that is attached
+    /// nowhere.
     template <class T>
-    cow_ptr<T> AddObjectToTree(IRepository* repo, array_view<KivStringViewT<char16_t> const> components, T const& object);
+    cow_ptr<T> AddObjectToTree(IRepository* repo, array_view<KivStringViewT<char16_t> const> components,
+                               T const& object);
 
-    /// Removes what is held under @p path, of both kinds, and the trees on the way that this leaves empty (never this tree).
+    /// Removes what is held under @p path, of both kinds, and the trees on the way that this leaves empty (never this
+    /// tree).
     /// @return false, changing nothing, if nothing is there.
     bool RemoveObject(IRepository* repo, KivStringViewT<char16_t> path);
     bool RemoveObjectFromTree(IRepository* repo, array_view<KivStringViewT<char16_t> const> components);
@@ -121,7 +127,8 @@ public:
     [[nodiscard]] cow_ptr<Blob> GetLocalBlob(KivStringViewT<char16_t> name) const noexcept;
     [[nodiscard]] cow_ptr<Tree> GetLocalTree(KivStringViewT<char16_t> name) const noexcept;
 
-    /// What is held under a path: all but the last component lead through subtrees. Null if there is nothing, or no component.
+    /// What is held under a path: all but the last component lead through subtrees. Null if there is nothing, or no
+    /// component.
     [[nodiscard]] cow_ptr<Object> GetDeepObject(KivStringViewT<char16_t> path) const;
     [[nodiscard]] cow_ptr<Object> GetDeepObject(array_view<KivStringViewT<char16_t> const> components) const noexcept;
     [[nodiscard]] cow_ptr<Blob> GetDeepBlob(KivStringViewT<char16_t> path) const;
@@ -139,20 +146,21 @@ public:
     /// The paths of the blobs at any depth, sorted, each once.
     [[nodiscard]] PathList GetDeepBlobPaths() const;
 
-    /// Names of the blob entries (subtree entries) of either tree that the other does not hold with the same identifier, looked
-    /// up there with `GetLocalObject`; sorted, each once. All of this tree's for a null @p other.
-    /// @complexity proportional to what differs where one tree was made from the other by edits, to the entries otherwise.
+    /// Names of the blob entries (subtree entries) of either tree that the other does not hold with the same
+    /// identifier, looked up there with `GetLocalObject`; sorted, each once. All of this tree's for a null @p other.
+    /// @complexity proportional to what differs where one tree was made from the other by edits, to the entries
+    /// otherwise.
     [[nodiscard]] PathList GetLocalBlobDiffs(cow_ptr<Tree> const& other) const;
     [[nodiscard]] PathList GetLocalTreeDiffs(cow_ptr<Tree> const& other) const;
-    /// The paths of the blobs at any depth that were added, removed or changed between the two trees; sorted, each once. Subtrees
-    /// with equal identifiers are not descended into.
+    /// The paths of the blobs at any depth that were added, removed or changed between the two trees; sorted, each
+    /// once. Subtrees with equal identifiers are not descended into.
     [[nodiscard]] PathList GetDeepBlobDiffs(cow_ptr<Tree> const& other) const;
 
-    /// The tree of identifier @p id: the one that @p repo holds already, otherwise read through @p loader with everything below
-    /// it. Blobs and subtrees that cannot be loaded are left out. A tree that names itself, directly or not, or that lies deeper
-    /// than `deepestLoadedNesting`, counts as not loadable.
-    /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not begin with
-    /// "tree", no entries, or an entry that is neither tree nor blob.
+    /// The tree of identifier @p id: the one that @p repo holds already, otherwise read through @p loader with
+    /// everything below it. Blobs and subtrees that cannot be loaded are left out. A tree that names itself, directly
+    /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable.
+    /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not
+    /// begin with "tree", no entries, or an entry that is neither tree nor blob.
     /// @throws what @p loader and @p repo throw
     [[nodiscard]] static cow_ptr<Tree> Deserialize(Id const& id, IRepository* repo,
                                                    PortableVersion::Delegate<StreamIO(Id const&)> loader);
@@ -172,17 +180,18 @@ private:
     Published<Buffer> data_;
 };
 
-extern template KIVVCS_EXPORT cow_ptr<Blob> Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>,
-                                                                  Blob const&);
-extern template KIVVCS_EXPORT cow_ptr<Tree> Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>,
-                                                                  Tree const&);
+extern template KIVVCS_EXPORT cow_ptr<Blob>
+Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>, Blob const&);
+extern template KIVVCS_EXPORT cow_ptr<Tree>
+Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>, Tree const&);
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Tree> dll_wrapped_shared(std::unique_ptr<Tree> tree);
 
-/// The holder of a commit's root tree, which may be absent. Everything forwards to the root; without one, lookups find nothing.
+/// The holder of a commit's root tree, which may be absent. Everything forwards to the root; without one, lookups find
+/// nothing.
 ///
-/// The first add makes the root; once there it stays, even when removals empty it. A root that is shared with another holder is
-/// copied before it is changed.
+/// The first add makes the root; once there it stays, even when removals empty it. A root that is shared with another
+/// holder is copied before it is changed.
 class KIVVCS_EXPORT CommitTree {
 public:
     /// No root.
@@ -205,8 +214,8 @@ public:
     /// The root's identifier; the null identifier without a root.
     [[nodiscard]] Id GetRootId() const;
 
-    /// Takes the tree that @p repo holds under the identifier of @p root, or @p root itself if there is none or @p repo is null;
-    /// null clears the root. Stores nothing.
+    /// Takes the tree that @p repo holds under the identifier of @p root, or @p root itself if there is none or @p repo
+    /// is null; null clears the root. Stores nothing.
     void ReplaceRoot(IRepository* repo, cow_ptr<Tree> root);
 
     /// Whether there is no root, or one without entries.

@@ -59,7 +59,8 @@ struct Buffer::Block final : Content {
 
 struct Buffer::Chain final : Content {
     Chain() noexcept : Content(true, 0) {}
-    Chain(Chain const& other) : Content(true, other.size), chunks(other.chunks), ends(other.ends), owners(other.owners) {
+    Chain(Chain const& other)
+        : Content(true, other.size), chunks(other.chunks), ends(other.ends), owners(other.owners) {
         for (Block* owner : owners)
             owner->add_reference();
     }
@@ -164,9 +165,11 @@ bool Buffer::Read(std::uint64_t offset, void* destination, std::uint64_t size) c
         return true;
     }
     auto const& chain = static_cast<Chain const&>(*content_);
-    auto piece = static_cast<std::size_t>(std::upper_bound(chain.ends.begin(), chain.ends.end(), offset) - chain.ends.begin());
+    auto piece =
+        static_cast<std::size_t>(std::upper_bound(chain.ends.begin(), chain.ends.end(), offset) - chain.ends.begin());
     auto rest = static_cast<std::size_t>(size);
-    for (auto skip = static_cast<std::size_t>(offset - (chain.ends[piece] - chain.chunks[piece].size())); rest > 0; ++piece) {
+    for (auto skip = static_cast<std::size_t>(offset - (chain.ends[piece] - chain.chunks[piece].size())); rest > 0;
+         ++piece) {
         const auto chunk = chain.chunks[piece].subspan(std::exchange(skip, 0));
         const std::size_t count = std::min(rest, chunk.size());
         std::memcpy(out, chunk.data(), count);
@@ -253,8 +256,10 @@ void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t siz
     // Several pieces go to a copy, so that nothing has happened if memory runs out between two of them.
     auto const& chain = static_cast<Chain const&>(*source.content_);
     Buffer result(*this);
-    auto index = static_cast<std::size_t>(std::upper_bound(chain.ends.begin(), chain.ends.end(), offset) - chain.ends.begin());
-    for (auto skip = static_cast<std::size_t>(offset - (chain.ends[index] - chain.chunks[index].size())); size > 0; ++index) {
+    auto index =
+        static_cast<std::size_t>(std::upper_bound(chain.ends.begin(), chain.ends.end(), offset) - chain.ends.begin());
+    for (auto skip = static_cast<std::size_t>(offset - (chain.ends[index] - chain.chunks[index].size())); size > 0;
+         ++index) {
         auto piece = chain.chunks[index].subspan(std::exchange(skip, 0));
         piece = piece.first(static_cast<std::size_t>(std::min<std::uint64_t>(piece.size(), size)));
         result.AppendPiece(chain.owners[index], piece);

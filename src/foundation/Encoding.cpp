@@ -149,21 +149,21 @@ KivStringT<char16_t> DataEncoding::HexEncode(const void* data, std::size_t size)
     if (data == nullptr || size == 0)
         return {};
     const auto* bytes = static_cast<const unsigned char*>(data);
-    return KivStringT<char16_t>::Build(CheckedLength(size > std::numeric_limits<std::size_t>::max() / 2 ? size : size * 2),
-                                       [bytes, size](char16_t* digits) {
-                                           for (std::size_t index = 0; index < size; ++index) {
-                                               *digits++ = u"0123456789abcdef"[bytes[index] >> 4];
-                                               *digits++ = u"0123456789abcdef"[bytes[index] & 15];
-                                           }
-                                       });
+    return KivStringT<char16_t>::Build(
+        CheckedLength(size > std::numeric_limits<std::size_t>::max() / 2 ? size : size * 2),
+        [bytes, size](char16_t* digits) {
+            for (std::size_t index = 0; index < size; ++index) {
+                *digits++ = u"0123456789abcdef"[bytes[index] >> 4];
+                *digits++ = u"0123456789abcdef"[bytes[index] & 15];
+            }
+        });
 }
 
 KivStringT<char16_t> String::ToStringW(KivStringViewT<char> text) {
     int length = 0;
     ForEachCodeUnit(text, [&length](char16_t) { ++length; });
-    return KivStringT<char16_t>::Build(length, [text](char16_t* units) {
-        ForEachCodeUnit(text, [&units](char16_t unit) { *units++ = unit; });
-    });
+    return KivStringT<char16_t>::Build(
+        length, [text](char16_t* units) { ForEachCodeUnit(text, [&units](char16_t unit) { *units++ = unit; }); });
 }
 
 int String::IntFromString(KivStringViewT<char16_t> text) noexcept {

@@ -31,8 +31,8 @@ KivStringT<C>& KivStringT<C>::operator+=(View text) {
         return *this;
     }
     // A first append is taken as the only one; from the second on the room grows by half, so that loops stay linear.
-    const int room = text_ == nullptr || length > std::numeric_limits<int>::max() / 2 ? joined
-                                                                                        : std::max(joined, length / 2 * 3);
+    const int room =
+        text_ == nullptr || length > std::numeric_limits<int>::max() / 2 ? joined : std::max(joined, length / 2 * 3);
     KivStringT grown;
     grown.text_ = Allocate(room);
     std::copy_n(GetString(), length, grown.Characters());
@@ -133,9 +133,8 @@ void KivStringT<C>::FormatList(View format, const FormatArgument<C>* arguments, 
         if (conversion == C{'s'} && arguments->Text() != nullptr) {
             // With a length given the text need not be terminated, so no more than that much of it may be read.
             const C* const text = arguments->Text();
-            const int length = directive.takesLength
-                                   ? static_cast<int>(std::find(text, text + limit, C{}) - text)
-                                   : View(text).GetLength();
+            const int length = directive.takesLength ? static_cast<int>(std::find(text, text + limit, C{}) - text)
+                                                     : View(text).GetLength();
             result += View(text, length);
         } else if (conversion == C{'d'} || conversion == C{'u'}) {
             result += View(WriteNumber(directive, *arguments));

@@ -39,7 +39,8 @@ constexpr void Round(std::uint32_t a, std::uint32_t b, std::uint32_t c, std::uin
     h += (std::rotr(a, 2) ^ std::rotr(a, 13) ^ std::rotr(a, 22)) + ((a & b) | (c & (a | b)));
 }
 
-/// The compression in plain C++, for processors of either byte order. Inline so that tests can hold it against the hardware's.
+/// The compression in plain C++, for processors of either byte order. Inline so that tests can hold it against the
+/// hardware's.
 constexpr void CompressPortably(State& state, const std::uint8_t* blocks, std::size_t count) noexcept {
     for (; count != 0; --count, blocks += blockSize) {
         std::array<std::uint32_t, 64> schedule{};

@@ -10,8 +10,8 @@ namespace KivVcs::Sha256 {
 
 namespace {
 
-/// Four rounds, and the part of the message schedule that later rounds need: the unit behind `_mm_sha256rnds2_epu32` is slow,
-/// so the schedule's instructions run in its shadow.
+/// Four rounds, and the part of the message schedule that later rounds need: the unit behind `_mm_sha256rnds2_epu32` is
+/// slow, so the schedule's instructions run in its shadow.
 template <std::size_t group>
 [[gnu::target("sha,sse4.1,ssse3"), gnu::always_inline]]
 inline void FourRounds(__m128i& abef, __m128i& cdgh, __m128i (&message)[4]) noexcept {

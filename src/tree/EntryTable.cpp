@@ -4,8 +4,8 @@
 
 namespace KivVcs::detail {
 
-/// Drops nodes and, when they were the last owners, everything below: nested trees too, one after the other, so that releasing
-/// a tree takes no more stack the deeper it is nested.
+/// Drops nodes and, when they were the last owners, everything below: nested trees too, one after the other, so that
+/// releasing a tree takes no more stack the deeper it is nested.
 class TableRelease {
 public:
     static void Drop(TableNode* root) noexcept {
@@ -47,18 +47,19 @@ private:
 
 namespace {
 
-/// Fewer elements than this make a node a candidate for being joined with its neighbour, up to the size below, so that the
-/// joined node does not split again at the next insertion.
+/// Fewer elements than this make a node a candidate for being joined with its neighbour, up to the size below, so that
+/// the joined node does not split again at the next insertion.
 constexpr int fewElements = TableNode::mostElements / 4;
 constexpr int mostJoinedElements = TableNode::mostElements * 3 / 4;
 
-/// Makes the node in @p slot changeable, with room for @p room more elements: as it is if it has one owner and room, otherwise
-/// as a copy. Content stays as it is, also when this throws.
+/// Makes the node in @p slot changeable, with room for @p room more elements: as it is if it has one owner and room,
+/// otherwise as a copy. Content stays as it is, also when this throws.
 void MakeWritable(TableNode*& slot, int room) {
     const bool sole = slot->reference_count() == 1;
     if (sole && slot->Room() >= room)
         return;
-    // A version that is shared is likely to be shared again at once, so it gets no spare room; one that is being built does.
+    // A version that is shared is likely to be shared again at once, so it gets no spare room; one that is being built
+    // does.
     const int spare = sole ? std::clamp(slot->Count() / 2, room, TableNode::mostElements - slot->Count()) : room;
     TableNode* copy = nullptr;
     if (sole) {
@@ -93,8 +94,8 @@ struct Path {
     }
 };
 
-/// Where a full leaf is split for a new entry: in the middle, or at its end for a new last entry, so that names added in
-/// ascending order fill their leaves. Both entries of a doubled name stay together.
+/// Where a full leaf is split for a new entry: in the middle, or at its end for a new last entry, so that names added
+/// in ascending order fill their leaves. Both entries of a doubled name stay together.
 int LeafSplitPoint(TableNode const& leaf, KivStringViewT<char16_t> name) noexcept {
     const auto entries = leaf.Entries();
     const int order = name.Compare(entries.back().Name());
@@ -211,8 +212,8 @@ void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, Entry entry) {
     if (!exists && root->IsFull())
         RaiseRoot(root);
 
-    // Everything that can fail happens on the way down and leaves the content as it is: nodes are copied, and split where they
-    // are full, so that the insertion itself finds room.
+    // Everything that can fail happens on the way down and leaves the content as it is: nodes are copied, and split
+    // where they are full, so that the insertion itself finds room.
     Path path;
     TableNode** slot = &root;
     while (!(*slot)->IsLeaf()) {

@@ -65,19 +65,17 @@ TableNode* TableNode::CopyOf(int from, int to, int room) const {
 
 int TableNode::BranchFor(KivStringViewT<char16_t> name) const noexcept {
     const auto branches = Branches();
-    const auto after = std::upper_bound(branches.begin() + 1, branches.end(), name,
-                                        [](KivStringViewT<char16_t> wanted, Branch const& branch) {
-                                            return wanted.Compare(branch.first) < 0;
-                                        });
+    const auto after = std::upper_bound(
+        branches.begin() + 1, branches.end(), name,
+        [](KivStringViewT<char16_t> wanted, Branch const& branch) { return wanted.Compare(branch.first) < 0; });
     return static_cast<int>(after - branches.begin()) - 1;
 }
 
 int TableNode::EntryFor(KivStringViewT<char16_t> name, bool isTree) const noexcept {
     const auto entries = Entries();
-    const auto found = std::lower_bound(entries.begin(), entries.end(), name,
-                                        [isTree](Entry const& entry, KivStringViewT<char16_t> wanted) {
-                                            return entry.ComesBefore(wanted, isTree);
-                                        });
+    const auto found = std::lower_bound(
+        entries.begin(), entries.end(), name,
+        [isTree](Entry const& entry, KivStringViewT<char16_t> wanted) { return entry.ComesBefore(wanted, isTree); });
     return static_cast<int>(found - entries.begin());
 }
 

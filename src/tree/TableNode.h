@@ -9,8 +9,8 @@
 
 namespace KivVcs::detail {
 
-/// One entry of a tree: a name and a blob or a subtree, either of which may be null. The kind is kept in the lowest bit of the
-/// child's address, since a repository holds an entry for every file of every directory.
+/// One entry of a tree: a name and a blob or a subtree, either of which may be null. The kind is kept in the lowest bit
+/// of the child's address, since a repository holds an entry for every file of every directory.
 class Entry {
 public:
     Entry(KivStringT<char16_t> name, cow_ptr<Blob> child) noexcept
@@ -33,8 +33,12 @@ public:
     [[nodiscard]] KivStringT<char16_t> const& Name() const noexcept { return name_; }
     [[nodiscard]] bool IsTree() const noexcept { return (child_ & treeBit) != 0; }
     [[nodiscard]] Object const* Child() const noexcept { return reinterpret_cast<Object const*>(child_ & ~treeBit); }
-    [[nodiscard]] Blob const* BlobChild() const noexcept { return IsTree() ? nullptr : static_cast<Blob const*>(Child()); }
-    [[nodiscard]] Tree const* TreeChild() const noexcept { return IsTree() ? static_cast<Tree const*>(Child()) : nullptr; }
+    [[nodiscard]] Blob const* BlobChild() const noexcept {
+        return IsTree() ? nullptr : static_cast<Blob const*>(Child());
+    }
+    [[nodiscard]] Tree const* TreeChild() const noexcept {
+        return IsTree() ? static_cast<Tree const*>(Child()) : nullptr;
+    }
 
     /// Exchanges the child, and only that, for one of the same kind.
     void TakeChildOf(Entry& other) noexcept { std::swap(child_, other.child_); }
@@ -91,15 +95,16 @@ struct Tally {
 /// What @p entries add up to; both entries of a doubled name must be among them, or neither.
 [[nodiscard]] Tally TallyOf(std::span<Entry const> entries) noexcept;
 
-/// A reference to a child node of an inner node and a name that no entry of the child comes before (but for the first child,
-/// which takes all smaller names) and all entries of the children to its left do.
+/// A reference to a child node of an inner node and a name that no entry of the child comes before (but for the first
+/// child, which takes all smaller names) and all entries of the children to its left do.
 struct Branch {
     KivStringT<char16_t> first;
     TableNode* child;
 };
 
-/// A node of a persistent B-tree, in one allocation with its elements: a leaf has entries, an inner node branches. Both entries
-/// of a doubled name are always in one leaf. A node is changed only while it has one owner; owners count themselves.
+/// A node of a persistent B-tree, in one allocation with its elements: a leaf has entries, an inner node branches. Both
+/// entries of a doubled name are always in one leaf. A node is changed only while it has one owner; owners count
+/// themselves.
 class TableNode final : public KivUtils::reference_counted {
 public:
     static constexpr int mostElements = 32;
