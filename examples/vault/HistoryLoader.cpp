@@ -2,6 +2,7 @@
 
 #include "Text.h"
 
+#include <algorithm>
 #include <unordered_set>
 #include <vector>
 
@@ -50,7 +51,7 @@ HistoryLoader::HistoryLoader(VaultFile& file, KivVcs::Repository& repository, Pr
 }
 
 cow_ptr<Commit> HistoryLoader::Load(Id const& head) {
-    std::vector<UnlinkedCommit> newestFirst;
+    std::vector<UnlinkedCommit> commits;
     std::unordered_set<Id> seen;
     cow_ptr<Commit> parent;
     for (Id next = head; !next.IsEmpty();) {
@@ -65,15 +66,16 @@ cow_ptr<Commit> HistoryLoader::Load(Id const& head) {
         // Identifiers of a damaged file can lead in a circle.
         if (!commit || !seen.insert(next).second)
             return nullptr;
-        newestFirst.push_back({next, std::move(commit)});
+        commits.push_back({next, std::move(commit)});
         next = parentId.GetText().IsEmpty() ? Id() : parentId;
     }
-    for (auto unlinked = newestFirst.rbegin(); unlinked != newestFirst.rend(); ++unlinked) {
-        unlinked->commit.write()->SetParent(parent);
-        if (unlinked->commit->GetId() != unlinked->id)
+    std::reverse(commits.begin(), commits.end());
+    for (auto& unlinked : commits) {
+        unlinked.commit.write()->SetParent(parent);
+        if (unlinked.commit->GetId() != unlinked.id)
             return nullptr;
-        repository_.AddCommitToStorage(unlinked->commit);
-        parent = unlinked->commit;
+        repository_.AddCommitToStorage(unlinked.commit);
+        parent = unlinked.commit;
     }
     return parent;
 }
