@@ -23,7 +23,27 @@ private:
     char* end_;
 };
 
+using DigitPair = std::array<char, 2>;
+
+constexpr std::array<DigitPair, 256> digitPairs = [] {
+    std::array<DigitPair, 256> pairs{};
+    for (std::size_t byte = 0; byte < pairs.size(); ++byte)
+        pairs[byte] = {"0123456789abcdef"[byte >> 4], "0123456789abcdef"[byte & 15]};
+    return pairs;
+}();
+
 } // namespace
+
+char* WriteDigits(Id const& id, char* out) noexcept {
+    static constexpr Id::Digest none{};
+    Id::Digest const* const digest = id.GetDigest();
+    for (const std::uint8_t byte : digest == nullptr ? none : *digest) {
+        const DigitPair pair = digitPairs[byte];
+        *out++ = pair[0];
+        *out++ = pair[1];
+    }
+    return out;
+}
 
 void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t size) {
     const SizeField field(size);

@@ -1,6 +1,7 @@
 #include "tree/PackedEntries.h"
 
-#include <array>
+#include "objects/PackedForm.h"
+
 #include <string_view>
 
 namespace KivVcs::detail {
@@ -16,26 +17,6 @@ KivStringViewT<char16_t> PackedName(Entry const& entry) noexcept {
     const KivStringViewT<char16_t> name = entry.Name();
     const char16_t* const end = std::find(name.begin(), name.end(), u'\0');
     return name.Left(static_cast<int>(end - name.begin()));
-}
-
-using DigitPair = std::array<char, 2>;
-
-constexpr std::array<DigitPair, 256> digitPairs = [] {
-    std::array<DigitPair, 256> pairs{};
-    for (std::size_t byte = 0; byte < pairs.size(); ++byte)
-        pairs[byte] = {"0123456789abcdef"[byte >> 4], "0123456789abcdef"[byte & 15]};
-    return pairs;
-}();
-
-char* WriteIdentifier(Id const& id, char* out) noexcept {
-    static constexpr Id::Digest none{};
-    Id::Digest const* const digest = id.GetDigest();
-    for (const std::uint8_t byte : digest == nullptr ? none : *digest) {
-        const DigitPair pair = digitPairs[byte];
-        *out++ = pair[0];
-        *out++ = pair[1];
-    }
-    return out;
 }
 
 } // namespace
@@ -55,7 +36,7 @@ char* PackEntry(Entry const& entry, char* out) {
     out = std::copy(prefix.begin(), prefix.end(), out);
     out = DataEncoding::Utf8Write(PackedName(entry), out);
     *out++ = '\0';
-    return WriteIdentifier(id, out);
+    return WriteDigits(id, out);
 }
 
 } // namespace KivVcs::detail

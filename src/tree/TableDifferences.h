@@ -111,6 +111,7 @@ private:
 /// Hands every name of two tables (either may be null) to @p visit, in order, with what both sides hold under it, but for runs
 /// of entries that both tables share and that no lookup can tell apart. Recurses only with the height.
 template <class Visit>
+// NOLINTNEXTLINE(misc-no-recursion): as deep as the table is high
 void ForEachDifference(TableNode const* left, TableNode const* right, Visit const& visit) {
     if (left == right && (left == nullptr || left->Total().doubled == 0))
         return;

@@ -1,0 +1,158 @@
+#include "KivVcs/Repository.h"
+#include "objects/PackedForm.h"
+
+#include <cstdlib>
+
+namespace KivVcs {
+
+namespace {
+
+constexpr std::int64_t ticksPerHour = 36'000'000'000;
+constexpr std::int64_t ticksPerMinute = 600'000'000;
+
+/// The bias that an offset such as "+0545" tells.
+TimeDelta BiasFromOffset(KivStringT<char16_t> const& offset) {
+    const std::int64_t sign = offset.StartsWith(u"+") ? 1 : -1;
+    const std::int64_t hours = String::IntFromString(offset.Mid(1, 2));
+    const std::int64_t minutes = String::IntFromString(offset.Mid(3, 4));
+    return TimeDelta(hours * sign * ticksPerHour + minutes * sign * ticksPerMinute);
+}
+
+/// What the line of an author tells.
+struct Signature {
+    explicit Signature(KivStringT<char> const& line) {
+        const int emailStart = line.Find("<");
+        const int emailEnd = line.Find(">", emailStart);
+        const KivStringT<char16_t> rest = line.Mid(emailEnd + 2);
+        const int blank = rest.Find(u" ");
+        name = String::ToStringW(line.Left(emailStart - 1));
+        email = String::ToStringW(line.Mid(emailStart + 1, emailEnd - emailStart - 1));
+        time = Time::FromTimeT(String::Int64FromString(rest.Left(blank)), TimeZone::Utc);
+        bias = BiasFromOffset(rest.Mid(blank + 1));
+    }
+
+    KivStringT<char16_t> name;
+    KivStringT<char16_t> email;
+    Time time;
+    TimeDelta bias;
+};
+
+/// An identifier as the lines of a commit show it.
+KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
+    KivStringT<char> line = key.ToString();
+    if (!id.IsEmpty())
+        line += KivStringT<char>::Build(64, [&id](char* digits) { WriteDigits(id, digits); });
+    return line += "\n";
+}
+
+/// The text of @p commit.
+KivStringT<char> TextOf(Commit const& commit) {
+    const KivStringT<char16_t> author =
+        Commit::GetAuthorInfo(u"author", commit.GetAuthorName(), commit.GetAuthorEmail(), commit.GetCommitTime(),
+                              commit.GetCommitTimezoneBias());
+    // The committer is always the author, at the same time.
+    const KivStringT<char> signature = DataEncoding::Utf8Encode(author.Mid(6));
+    KivStringViewT<char16_t> description = commit.GetDescription();
+    if (const int end = description.Find(KivStringViewT<char16_t>(u"", 1)); end >= 0)
+        description = description.Left(end);
+
+    KivStringT<char> text = LineOfId("tree ", commit.GetCommitTree() ? commit.GetCommitTree()->GetRootId() : Id());
+    if (commit.GetParent())
+        text += LineOfId("parent ", commit.GetParent()->GetId());
+    for (KivStringViewT<char> role : {"author", "committer"}) {
+        text += role;
+        text += signature;
+        text += "\n";
+    }
+    text += "\n";
+    text += DataEncoding::Utf8Encode(description);
+    return text += "\n";
+}
+
+} // namespace
+
+KivStringT<char> Commit::GetHeader() const {
+    return "commit";
+}
+
+KivStringT<char> Commit::GetStoragePrefix() const {
+    return {};
+}
+
+Buffer const& Commit::GetData() const {
+    return data_.GetOrMake([this] {
+        Buffer data;
+        Helpers::AppendToBuffer(data, TextOf(*this));
+        return data;
+    });
+}
+
+Id Commit::ComputeId() const {
+    // The text is not kept: it is asked for far less often than the identifier, and every commit of a history has one.
+    const KivStringT<char> text = TextOf(*this);
+    const auto size = static_cast<std::size_t>(text.GetLength());
+    IdDigest digest("commit", size);
+    digest.Feed(text.GetString(), size);
+    return digest.Finish();
+}
+
+KivStringT<char16_t> Commit::GetAuthorInfo(KivStringViewT<char16_t> role, KivStringViewT<char16_t> name,
+                                           KivStringViewT<char16_t> email, Time time, TimeDelta bias) {
+    const std::int64_t hours = bias.GetTicks() / ticksPerHour;
+    const std::int64_t minutes = std::abs(bias.GetTicks() / ticksPerMinute) % 60;
+    KivStringT<char16_t> line;
+    line.FormatInternal(u"%s %s <%s> %d %s%02d%02d", role.ToString(), name.ToString(), email.ToString(),
+                        static_cast<std::int32_t>(time.ToTimeT(TimeZone::Utc)), hours < 0 ? u"-" : u"+",
+                        std::abs(hours), minutes);
+    return line;
+}
+
+optional<KivStringT<char>> Commit::ParseCommitInfo(KivStringT<char> const& text, KivStringViewT<char> key,
+                                                   int& position) {
+    const int found = text.Find(key, position);
+    if (found < 0)
+        return std::nullopt;
+    const int start = found + key.GetLength();
+    const int end = text.Find("\n", start);
+    position = end < 0 ? text.GetLength() : end;
+    return end < 0 ? KivStringT<char>() : text.Mid(start, end - start);
+}
+
+cow_ptr<Commit> Commit::Deserialize(Id const& id, Id& parentId, IRepository* repository,
+                                    PortableVersion::Delegate<StreamIO(Id const&)> loader) {
+    if (repository == nullptr || id.IsEmpty())
+        return nullptr;
+    if (cow_ptr<Commit> stored = repository->GetCommitFromStorage(id))
+        return stored;
+    if (!loader)
+        return nullptr;
+    StreamIO stream = loader(id);
+    if (!Helpers::ShiftObjectIdentifier(stream, "commit "))
+        return nullptr;
+    const KivStringT<char> text = Helpers::StreamToStringA(stream);
+    int position = 0;
+    const auto next = [&text, &position](KivStringViewT<char> key) {
+        return ParseCommitInfo(text, key, position).value_or(KivStringT<char>());
+    };
+    const auto treeLine = ParseCommitInfo(text, "tree ", position);
+    if (!treeLine)
+        return nullptr;
+    const Id treeId{KivStringT<char16_t>(*treeLine)};
+    parentId = Id(KivStringT<char16_t>(next("parent ")));
+    const Signature author(next("author "));
+    const KivStringT<char16_t> description = String::ToStringW(next("\n\n"));
+
+    Commit commit(repository, false);
+    commit.SetAuthorName(author.name);
+    commit.SetAuthorEmail(author.email);
+    commit.SetDescription(description);
+    commit.SetCommitTime(author.time);
+    commit.SetCommitTimezoneBias(author.bias);
+    if (!treeId.IsEmpty())
+        commit.tree_ = CommitTree::Deserialize(treeId, repository, std::move(loader));
+    commit.RebuildTree(repository);
+    commit.ResetState();
+    return immu::make<Commit>(std::move(commit));
+}
+
+} // namespace KivVcs
