@@ -30,7 +30,9 @@ public:
     }
 
     [[nodiscard]] bool AtEnd() const noexcept { return atEnd_; }
-    [[nodiscard]] Entry const& Get() const noexcept { return nodes_[0]->Entries()[static_cast<std::size_t>(positions_[0])]; }
+    [[nodiscard]] Entry const& Get() const noexcept {
+        return nodes_[0]->Entries()[static_cast<std::size_t>(positions_[0])];
+    }
     void Next() noexcept { Advance(0); }
 
     /// Moves both cursors past the largest node that both are at the beginning of; false if there is none that may be skipped.

@@ -86,7 +86,8 @@ cow_ptr<T> Tree::AddObjectToTree(IRepository* repo, Components components, T con
     std::vector<cow_ptr<Tree>> way(components.size() - 1);
     Tree const* above = this;
     for (std::size_t level = 0; level < way.size(); ++level) {
-        detail::Entry const* const entry = above == nullptr ? nullptr : FindEntry(above->entries_.Root(), components[level], true);
+        detail::Entry const* const entry =
+            above == nullptr ? nullptr : FindEntry(above->entries_.Root(), components[level], true);
         above = entry == nullptr ? nullptr : entry->TreeChild();
         Tree* const copy = way[level].write();
         if (above != nullptr)

@@ -29,9 +29,8 @@ public:
         const std::uint64_t size = PackedSize(entry);
         if (size > bytes_.size()) {
             Flush();
-            digest_.Feed(Buffer::Build(size, [&entry](std::byte* bytes) {
-                detail::PackEntry(entry, reinterpret_cast<char*>(bytes));
-            }));
+            digest_.Feed(Buffer::Build(
+                size, [&entry](std::byte* bytes) { detail::PackEntry(entry, reinterpret_cast<char*>(bytes)); }));
             return;
         }
         if (size > bytes_.size() - used_)

@@ -80,13 +80,14 @@ TableNode const* RootOf(Tree const* tree) noexcept {
 /// Adds the paths that differ right in a pair of directories, and returns the pairs of subdirectories that differ.
 std::vector<DirectoryPair> CompareDirectories(Tree const* mine, Tree const* theirs, PathCollector& paths) {
     std::vector<DirectoryPair> below;
-    detail::ForEachDifference(RootOf(mine), RootOf(theirs),
-                              [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
-                                  if (BlobDiffers(here, there))
-                                      paths.Add(name);
-                                  if (!name.IsEmpty() && TreeDiffers(here, there))
-                                      below.push_back({name, here.tree, there.tree});
-                              });
+    detail::ForEachDifference(
+        RootOf(mine), RootOf(theirs),
+        [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
+            if (BlobDiffers(here, there))
+                paths.Add(name);
+            if (!name.IsEmpty() && TreeDiffers(here, there))
+                below.push_back({name, here.tree, there.tree});
+        });
     return below;
 }
 
@@ -127,11 +128,12 @@ PathList LocalPaths(Tree const& tree, bool wantTrees) {
 template <class Differs>
 PathList LocalDiffs(Tree const& mine, Tree const* theirs, Differs differs) {
     PathList names;
-    detail::ForEachDifference(TableAccess::Root(mine), RootOf(theirs),
-                              [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
-                                  if (differs(here, there))
-                                      names.push_back(name);
-                              });
+    detail::ForEachDifference(
+        TableAccess::Root(mine), RootOf(theirs),
+        [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
+            if (differs(here, there))
+                names.push_back(name);
+        });
     return names;
 }
 
