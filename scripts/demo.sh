@@ -1,11 +1,12 @@
 #!/bin/bash
 # usage: scripts/demo.sh [PICTURE]
-# Installs what is missing, builds the example host `vault`, and shows what it does with this project: versions its history (or,
-# where there is none, its tree), lists and compares versions and verifies them; then lets two people work apart and brings
-# their work together. Draws the history that comes out of it to PICTURE, an SVG file, by default beside the vaults.
+# Installs what is missing, builds the example host `vault`, and shows what it does with this project: versions its
+# history (or, where there is none, its tree), lists and compares versions and verifies them; then lets two people work
+# apart and brings their work together. Draws the history that comes out of it to PICTURE, an SVG file, by default beside
+# the vaults.
 
 . "$(dirname "$0")/lib.sh"
-[ $# -le 1 ] || usage 1
+[[ $# -le 1 && ${1:-} != -* ]] || usage 1
 versions_shown=36
 content_size=0
 
