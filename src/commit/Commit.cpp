@@ -9,7 +9,9 @@ Commit::Commit(cow_ptr<Commit> parent, bool amend) : amend_(amend) {
         tree_ = parent->tree_;
         if (amend) {
             parent_ = parent->parent_;
-            ResetPropertiesForAmend(*parent);
+            description_ = parent->description_;
+            authorName_ = parent->authorName_;
+            authorEmail_ = parent->authorEmail_;
         } else {
             parent_ = std::move(parent);
         }
