@@ -166,6 +166,11 @@ int JoinSmallChild(TableNode& parent, int index) {
     TableNode*& neighbour = branches[static_cast<std::size_t>(left) + 1].child;
     TableNode* const joined = slot->CopyOf(0, slot->Count(), neighbour->Count());
     joined->Absorb(*neighbour);
+    if (!joined->IsLeaf()) {
+        // The neighbour's first child took all smaller names of the neighbour, down to the parent's division.
+        const auto from = static_cast<std::size_t>(slot->Count());
+        joined->Branches()[from].first = branches[static_cast<std::size_t>(left) + 1].first;
+    }
     TableRelease::Drop(std::exchange(slot, joined));
     TableRelease::Drop(neighbour);
     parent.EraseBranches(left + 1, left + 2);
