@@ -149,14 +149,14 @@ private:
 
     enum class Opened { Finished, Pushed };
 
-    /// Finds the tree @p id, or begins to read it. Trees that did not turn out to be what they were asked for are remembered, so
-    /// that a loader that gives out such trees again and again makes each of them be read once only; those being read count as
-    /// not loadable, which ends cycles.
+    /// Finds the tree @p id, or begins to read it. What was read is remembered, since a repository need not store it nor
+    /// under the identifier that was asked for: every tree is read once only, however often it is named. Those being read
+    /// count as not loadable, which ends cycles.
     Opened Open(Id const& id, cow_ptr<Tree>& result) {
         result = id.IsEmpty() ? nullptr : repo_.GetTreeFromStorage(id);
         if (id.IsEmpty() || result || !loader_)
             return Opened::Finished;
-        if (const auto known = unlikeTheirIds_.find(id); known != unlikeTheirIds_.end()) {
+        if (const auto known = opened_.find(id); known != opened_.end()) {
             result = known->second;
             return Opened::Finished;
         }
@@ -168,7 +168,7 @@ private:
         KivStringT<char> data = Helpers::StreamToStringA(stream);
         if (data.IsEmpty())
             return Opened::Finished;
-        unlikeTheirIds_.emplace(id, nullptr);
+        opened_.emplace(id, nullptr);
         open_.push_back({id, std::move(data), 0, {}, {}});
         return Opened::Pushed;
     }
@@ -203,12 +203,8 @@ private:
 
     /// Ends the innermost tree with @p read as its result, which goes to its parent, or to @p result for the outermost one.
     void Close(cow_ptr<Tree> read, cow_ptr<Tree>& result) {
-        const Id id = std::move(open_.back().id);
+        opened_[open_.back().id] = read;
         open_.pop_back();
-        if (read && read->GetId() == id)
-            unlikeTheirIds_.erase(id);
-        else
-            unlikeTheirIds_[id] = read;
         if (open_.empty())
             result = std::move(read);
         else
@@ -218,7 +214,7 @@ private:
     IRepository& repo_;
     Loader const& loader_;
     std::vector<OpenTree> open_;
-    std::unordered_map<Id, cow_ptr<Tree>> unlikeTheirIds_;
+    std::unordered_map<Id, cow_ptr<Tree>> opened_;
 };
 
 } // namespace
