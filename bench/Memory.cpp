@@ -1,0 +1,64 @@
+#include "Memory.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <fstream>
+#include <malloc.h>
+#include <new>
+#include <string>
+
+namespace {
+
+// Plain integers: the benchmarks run on one thread, and an atomic would be paid for in every time measured.
+std::int64_t live = 0;
+std::int64_t peak = 0;
+
+} // namespace
+
+void* operator new(std::size_t size) {
+    void* const block = std::malloc(size);
+    if (block == nullptr)
+        throw std::bad_alloc();
+    live += static_cast<std::int64_t>(malloc_usable_size(block));
+    peak = std::max(peak, live);
+    return block;
+}
+
+void operator delete(void* block) noexcept {
+    live -= static_cast<std::int64_t>(malloc_usable_size(block));
+    std::free(block);
+}
+
+void operator delete(void* block, std::size_t) noexcept {
+    operator delete(block);
+}
+
+namespace KivVcs::Bench {
+
+std::int64_t LiveBytes() noexcept {
+    return live;
+}
+
+std::int64_t PeakBytes() noexcept {
+    return peak;
+}
+
+void ForgetPeak() noexcept {
+    peak = live;
+}
+
+std::int64_t PeakResidentBytes() {
+    std::ifstream status("/proc/self/status");
+    for (std::string line; std::getline(status, line);) {
+        if (line.starts_with("VmHWM:"))
+            return std::stoll(line.substr(6)) * 1024;
+    }
+    return 0;
+}
+
+void ForgetResidentPeak() {
+    malloc_trim(0);
+    std::ofstream("/proc/self/clear_refs") << "5";
+}
+
+} // namespace KivVcs::Bench
