@@ -1,16 +1,13 @@
-#include "HostStream.h"
+#include "PackedForms.h"
 #include "RecordingRepository.h"
 
 #include <gtest/gtest.h>
 
-#include <functional>
 #include <random>
 #include <set>
 
 namespace KivVcs {
 namespace {
-
-using Names = std::vector<std::string>;
 
 /// What a tree should hold, kept in the plainest way.
 struct Model {
@@ -19,19 +16,6 @@ struct Model {
 
     [[nodiscard]] bool IsEmpty() const { return blobs.empty() && trees.empty(); }
 };
-
-std::string Identifier(std::string const& type, std::string const& data) {
-    static std::map<std::string, std::string> known;
-    const std::string packed = type + " " + std::to_string(data.size()) + '\0' + data;
-    std::string& id = known[packed];
-    if (id.empty())
-        id = Narrow(Helpers::ComputeEncodedSHA256Hash(packed.data(), packed.size()));
-    return id;
-}
-
-std::string Entry(std::string const& type, std::string const& name, std::string const& id) {
-    return (type == "tree" ? "40000 " : "100644 ") + type + " " + name + '\0' + id;
-}
 
 std::string Data(Model const& model) {
     std::map<std::string, std::string> entries;
@@ -93,20 +77,8 @@ bool Remove(Model& model, std::span<std::string const> path) {
     return model.blobs.erase(path[0]) + model.trees.erase(path[0]) > 0;
 }
 
-Names ToNames(PathList const& paths) {
-    Names names;
-    for (auto const& path : paths)
-        names.push_back(Narrow(path));
-    return names;
-}
-
-Names ToNames(std::set<std::string> const& names) {
+Names Sorted(std::set<std::string> const& names) {
     return {names.begin(), names.end()};
-}
-
-std::string Bytes(Buffer const& buffer) {
-    const KivStringT<char> text = Helpers::StringAFromBuffer(buffer);
-    return {text.GetString(), static_cast<std::size_t>(text.GetLength())};
 }
 
 /// A tree together with what it should hold.
@@ -134,14 +106,14 @@ struct Version {
         ASSERT_EQ(ToNames(tree->GetLocalBlobPaths()), blobs);
         objects.insert(objects.end(), blobs.begin(), blobs.end());
         ASSERT_EQ(ToNames(tree->GetLocalObjectPaths()), objects);
-        ASSERT_EQ(ToNames(tree->GetDeepBlobPaths()), ToNames(DeepDiffs(model, {})));
+        ASSERT_EQ(ToNames(tree->GetDeepBlobPaths()), Sorted(DeepDiffs(model, {})));
         ASSERT_EQ(tree->GetDeepBlobDiffs(nullptr), tree->GetDeepBlobPaths());
     }
 
     void CheckAgainst(Version const& other) const {
-        ASSERT_EQ(ToNames(tree->GetLocalBlobDiffs(other.tree)), ToNames(LocalDiffs(model, other.model, false)));
-        ASSERT_EQ(ToNames(tree->GetLocalTreeDiffs(other.tree)), ToNames(LocalDiffs(model, other.model, true)));
-        ASSERT_EQ(ToNames(tree->GetDeepBlobDiffs(other.tree)), ToNames(DeepDiffs(model, other.model)));
+        ASSERT_EQ(ToNames(tree->GetLocalBlobDiffs(other.tree)), Sorted(LocalDiffs(model, other.model, false)));
+        ASSERT_EQ(ToNames(tree->GetLocalTreeDiffs(other.tree)), Sorted(LocalDiffs(model, other.model, true)));
+        ASSERT_EQ(ToNames(tree->GetDeepBlobDiffs(other.tree)), Sorted(DeepDiffs(model, other.model)));
     }
 };
 

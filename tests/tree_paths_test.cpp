@@ -1,0 +1,245 @@
+#include "PackedForms.h"
+#include "RecordingRepository.h"
+
+#include <gtest/gtest.h>
+
+namespace KivVcs {
+namespace {
+
+/// Tells which objects trees ask for and hand over, and answers what it is told to.
+class TreeCalls : public Repository {
+public:
+    TreeCalls() : Repository(std::make_unique<MemObjectsStorage>()) {}
+
+    std::string Take() { return Joined(std::exchange(calls_, {})); }
+
+    using Repository::SyncWithStorage;
+    cow_ptr<Tree> GetTreeFromStorage(Id const& id) const override {
+        calls_.emplace_back("tree?");
+        return Repository::GetTreeFromStorage(id);
+    }
+    cow_ptr<Blob> GetBlobFromStorage(Id const& id) const override {
+        calls_.emplace_back("blob?");
+        return Repository::GetBlobFromStorage(id);
+    }
+    cow_ptr<Tree> SyncWithStorage(cow_ptr<Tree> tree) override {
+        calls_.push_back("[" + Files(tree) + "]");
+        return treeAnswer ? *treeAnswer : Repository::SyncWithStorage(tree);
+    }
+    cow_ptr<Blob> SyncWithStorage(cow_ptr<Blob> blob) override {
+        calls_.push_back(Bytes(blob->GetData()));
+        return blobAnswer ? *blobAnswer : Repository::SyncWithStorage(blob);
+    }
+
+    optional<cow_ptr<Tree>> treeAnswer;
+    optional<cow_ptr<Blob>> blobAnswer;
+
+private:
+    mutable Names calls_;
+};
+
+class TreePaths : public testing::Test {
+protected:
+    using Components = std::vector<KivStringViewT<char16_t>>;
+
+    cow_ptr<Tree> Of(std::string const& files) {
+        auto tree = MakeTree(repo, files);
+        repo.Take();
+        return tree;
+    }
+
+    TreeCalls repo;
+};
+
+TEST_F(TreePaths, TreesAreStoredFromTheBottomUp) {
+    auto tree = Of("a/k=1");
+    EXPECT_TRUE(tree.write()->AddBlob(&repo, u"/a//b/c/", MakeBlob("2")));
+    EXPECT_EQ(repo.Take(), "blob? 2 blob? tree? [c=2] tree? tree? [b/c=2 k=1] tree?");
+    EXPECT_TRUE(tree.write()->RemoveObject(&repo, u"a/b/c"));
+    EXPECT_EQ(repo.Take(), "tree? [k=1] tree?");
+    EXPECT_TRUE(tree.write()->AddObject(&repo, u"x/y", tree->GetLocalTree(u"a")->GetId()));
+    EXPECT_EQ(repo.Take(), "blob? tree? tree? [k=1] tree? tree? [y/k=1] tree?");
+    EXPECT_TRUE(tree.write()->RemoveObject(&repo, u"x/y/k"));
+    EXPECT_EQ(repo.Take() + Files(tree), "a/k=1");
+}
+
+TEST_F(TreePaths, WhatCannotBeDoneChangesNothing) {
+    auto tree = Of("a/k=1 b=2");
+    const Id before = tree->GetId();
+    EXPECT_FALSE(tree.write()->AddBlob(nullptr, u"c", MakeBlob("3")));
+    EXPECT_FALSE(tree.write()->AddObject(nullptr, u"c", before));
+    EXPECT_FALSE(tree.write()->AddBlob(&repo, u"//", MakeBlob("3")));
+    EXPECT_FALSE(tree.write()->AddObject(&repo, u"c", Commit(nullptr, false).GetId()));
+    for (auto const* path : {u"", u"/", u"c", u"b/k", u"a/c", u"a/k/l"})
+        EXPECT_FALSE(tree.write()->RemoveObject(&repo, path)) << Narrow(path);
+    for (auto const* path : {u"", u"c", u"b/k", u"a/c"})
+        EXPECT_FALSE(tree->GetDeepObject(path) || tree->GetDeepTree(path) || tree->GetIdByPath(path)) << Narrow(path);
+    EXPECT_TRUE(tree->GetDeepBlob(u"a/k") && tree->GetDeepObject(u"a") == tree->GetDeepTree(u"/a/"));
+    EXPECT_EQ(Files(tree), "a/k=1 b=2");
+    EXPECT_TRUE(tree->GetId() == before);
+}
+
+TEST_F(TreePaths, EmptyComponentsMakeTreesOnTheWayOnly) {
+    const struct {
+        Components path;
+        bool entered;
+        const char* files;
+    } cases[] = {{{}, false, "k=1"},
+                 {{u""}, false, "k=1"},
+                 {{u"a", u""}, false, "a/ k=1"},
+                 {{u"a", u"", u"b"}, true, "a/ k=1"},
+                 {{u"", u"b"}, true, "k=1"},
+                 {{u"a", u"b", u"", u""}, false, "a/b/ k=1"}};
+    for (auto const& [path, entered, files] : cases) {
+        auto tree = Of("k=1");
+        EXPECT_EQ(bool{tree.write()->AddObjectToTree(&repo, path, MakeBlob("2"))}, entered) << files;
+        EXPECT_EQ(Files(tree), files);
+        EXPECT_FALSE(tree.write()->RemoveObjectFromTree(&repo, path)) << files;
+    }
+}
+
+TEST_F(TreePaths, ABlobAndASubtreeMayShareAName) {
+    auto tree = Of("a=1 a/b=2");
+    EXPECT_EQ(tree->GetLocalObjectCount(), 2U);
+    EXPECT_TRUE(tree->GetLocalObject(u"a") == tree->GetLocalBlob(u"a"));
+    EXPECT_EQ(Bytes(tree->GetData()), Entry("blob", "a", Identifier("blob", "1")));
+    EXPECT_EQ(Files(tree), "a/b=2 a=1");
+    // A hidden subtree differs even from itself.
+    EXPECT_EQ(tree->GetLocalTreeDiffs(tree).size(), 1U);
+    EXPECT_TRUE(tree->GetDeepBlobDiffs(tree).empty());
+    // Pruning a directory takes the file of that name along.
+    EXPECT_TRUE(tree.write()->RemoveObject(&repo, u"a/b"));
+    EXPECT_TRUE(tree->IsEmpty());
+}
+
+TEST_F(TreePaths, ARepositorysAnswerBecomesTheEntryWhateverItIs) {
+    auto tree = Of("a/k=1 b=2");
+    repo.blobAnswer = immu::make<Blob>(MakeBlob("other"));
+    EXPECT_TRUE(tree.write()->AddBlob(&repo, u"b", MakeBlob("3")) == *repo.blobAnswer);
+    EXPECT_EQ(Files(tree), "a/k=1 b=other");
+
+    repo.blobAnswer = cow_ptr<Blob>();
+    EXPECT_FALSE(tree.write()->AddBlob(&repo, u"a", MakeBlob("3")));
+    EXPECT_FALSE(tree.write()->AddBlob(&repo, u"c", MakeBlob("3")));
+    EXPECT_TRUE(tree->LocalObjectExists(u"c") && !tree->GetLocalObject(u"c"));
+    EXPECT_EQ(tree->GetLocalObjectCount(), 4U);
+    EXPECT_EQ(tree->GetDeepBlobCount(), 4U);
+    EXPECT_EQ(Joined(ToNames(tree->GetLocalObjectPaths())), "a b");
+    EXPECT_TRUE(tree->GetLocalObject(u"a") == tree->GetLocalTree(u"a"));
+    EXPECT_EQ(Bytes(tree->GetData()), Entry("blob", "b", Identifier("blob", "other")));
+
+    repo.treeAnswer = cow_ptr<Tree>();
+    EXPECT_FALSE(tree.write()->AddTree(&repo, u"b", Tree()));
+    EXPECT_TRUE(tree.write()->RemoveObject(&repo, u"c"));
+    EXPECT_EQ(Joined(ToNames(tree->GetDeepBlobPaths())), "a/k b");
+}
+
+class ReadingTrees : public testing::Test {
+protected:
+    Repository repo{std::make_unique<MemObjectsStorage>()};
+    Packed packed;
+    const std::string one = packed.Add("blob", "1");
+};
+
+TEST_F(ReadingTrees, GivesTheTreeThatWasPacked) {
+    // In UTF-16 a surrogate comes before U+FFFD, in UTF-8 it is the other way round.
+    auto const tree = repo.SyncWithStorage(MakeTree(repo, "a/b/c=1 a/d=2 e=3 a.b=4"));
+    const std::string late = "\xEF\xBF\xBD";
+    const std::string early = "\xF0\x9F\x98\x80";
+    const std::string data = Entry("blob", early, one) + Entry("tree", late, Narrow(tree->GetId().GetText()));
+    const auto read = packed.Read(packed.Add("tree", data), &repo);
+    ASSERT_TRUE(read);
+    EXPECT_EQ(Bytes(read->GetData()), data);
+    EXPECT_EQ(Bytes(read->GetDeepBlob(u"\xD83D\xDE00")->GetData()), "1");
+    EXPECT_EQ(Files(read->GetLocalTree(u"\xFFFD")), "a.b=4 a/b/c=1 a/d=2 e=3");
+    EXPECT_EQ(packed.loads, 1);
+    EXPECT_TRUE(packed.Read(Narrow(read->GetId().GetText()), &repo) == read);
+    EXPECT_EQ(packed.loads, 1);
+    EXPECT_FALSE(packed.Read(one, nullptr) || packed.Read("", &repo));
+    EXPECT_FALSE(Tree::Deserialize(Id(Wide(one)), &repo, nullptr));
+}
+
+TEST_F(ReadingTrees, LeavesOutWhatCannotBeLoaded) {
+    const std::string missing(64, 'f');
+    const std::string good = Entry("blob", "x", one);
+    const std::string odd = packed.Add("tree", good + Entry("link", "y", one));
+    const struct {
+        std::string data;
+        const char* files;
+    } cases[] = {{good, "x=1"},
+                 {"", "-"},
+                 {good + Entry("blob", "y", missing) + Entry("tree", "z", missing), "x=1"},
+                 {good + Entry("tree", "z", odd) + Entry("tree", "z", one) + Entry("tree", "z", ""), "x=1"},
+                 {good + Entry("link", "y", one), "-"},
+                 {Entry("blob", "d/e", one) + Entry("blob", "", one) + good, "d/e=1 x=1"},
+                 {"1 blob y" + std::string(1, '\0') + one + good, "x=1 y=1"}};
+    for (auto const& [data, files] : cases)
+        EXPECT_EQ(Files(packed.Read(packed.Add("tree", data), &repo)), files) << data;
+    packed.forms["other"] = packed.forms[one];
+    packed.forms["long"] = std::string("treehouse\0", 10) + good;
+    EXPECT_EQ(Files(packed.Read("other", &repo)), "-");
+    EXPECT_EQ(Files(packed.Read("long", &repo)), "x=1");
+}
+
+TEST_F(ReadingTrees, EveryTruncationGivesTheEntriesBeforeItOrNothing) {
+    const std::string first = Entry("blob", "x", one);
+    const std::string whole = first + Entry("blob", "y", one);
+    for (std::size_t length = 1; length <= whole.size(); ++length) {
+        const std::string files = Files(packed.Read(packed.Add("tree", whole.substr(0, length)), &repo));
+        const char* const expected = length < first.size() ? "" : length < whole.size() ? "x=1" : "x=1 y=1";
+        const std::size_t inEntry = length % first.size();
+        // Before the blank behind the type, the type is not what it should be.
+        EXPECT_EQ(files, inEntry > 0 && inEntry < std::string("100644 blob").size() ? "-" : expected) << length;
+    }
+}
+
+TEST_F(ReadingTrees, EndsWhereTreesNameThemselvesOrEachOther) {
+    const std::string header("tree 1\0", 7);
+    packed.forms["self"] = header + Entry("blob", "x", one) + "40000 tree s" + std::string(1, '\0') + "self";
+    EXPECT_EQ(Files(packed.Read("self", &repo)), "x=1");
+    const std::string left(64, 'a');
+    const std::string right(64, 'b');
+    packed.forms[left] = header + Entry("tree", "r", right) + Entry("blob", "x", one);
+    packed.forms[right] = header + Entry("tree", "l", left) + Entry("blob", "y", one);
+    EXPECT_EQ(Files(packed.Read(left, &repo)), "r/y=1 x=1");
+
+    // Every level names the level below twice.
+    Repository none(nullptr);
+    std::string id = packed.Add("tree", Entry("blob", "x", one));
+    for (int level = 0; level < 60; ++level)
+        id = packed.Add("tree", Entry("tree", "a", id) + Entry("tree", "b", id));
+    packed.loads = 0;
+    EXPECT_EQ(Narrow(packed.Read(id, &none)->GetId().GetText()), id);
+    EXPECT_EQ(packed.loads, 62);
+}
+
+TEST_F(ReadingTrees, NestingTakesNoStack) {
+    std::string path;
+    for (int level = 0; level < 20'000; ++level)
+        path += "d/";
+    auto tree = MakeTree(repo, path + "x=1");
+    auto const former = tree;
+    tree.write()->AddBlob(&repo, Wide(path + "y"), MakeBlob("2"));
+    EXPECT_EQ(ToNames(tree->GetDeepBlobDiffs(former)), Names{path + "y"});
+    EXPECT_EQ(ToNames(former->GetDeepBlobPaths()), Names{path + "x"});
+    repo.SyncWithStorage(former);
+    for (auto const& [id, stored] : std::as_const(repo).GetStorage()->GetTrees())
+        packed.forms[Narrow(id.GetText())] = Bytes(stored->GetPackedData());
+    Repository other(std::make_unique<MemObjectsStorage>());
+    auto const read = packed.Read(Narrow(former->GetId().GetText()), &other);
+    EXPECT_TRUE(read && read->GetId() == former->GetId());
+    EXPECT_TRUE(tree.write()->RemoveObject(&repo, Wide(path + "x")) && tree->GetDeepBlobCount() == 1);
+    EXPECT_TRUE(tree.write()->RemoveObject(&repo, Wide(path + "y")) && tree->IsEmpty());
+
+    Repository none(nullptr);
+    for (int level = 0; level < 100'000; ++level) {
+        Tree above;
+        above.AddTree(&none, u"d", *tree);
+        tree = immu::make<Tree>(std::move(above));
+    }
+    EXPECT_EQ(tree->GetDeepBlobCount(), 0U);
+    tree.reset();
+}
+
+} // namespace
+} // namespace KivVcs
