@@ -118,7 +118,8 @@ AnyDamagedByteIsFoundOrHarmless() {
     size=$(stat -c %s vault.db)
     for _ in $(seq 40); do
         cp whole.db vault.db
-        printf '%b' "\\x$(printf %x $((RANDOM % 256)))" | dd of=vault.db bs=1 seek=$((RANDOM * RANDOM % size)) conv=notrunc status=none
+        printf '%b' "\\x$(printf %x $((RANDOM % 256)))" |
+            dd of=vault.db bs=1 seek=$((RANDOM * RANDOM % size)) conv=notrunc status=none
         status=0
         "$vault" verify >out 2>err || status=$?
         if [ "$status" -eq 0 ]; then

@@ -2,6 +2,7 @@
 
 #include "Problem.h"
 
+#include <algorithm>
 #include <array>
 #include <pwd.h>
 #include <unistd.h>

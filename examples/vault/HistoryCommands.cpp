@@ -3,6 +3,7 @@
 #include "Revision.h"
 #include "Vault.h"
 
+#include <algorithm>
 #include <iostream>
 #include <set>
 
@@ -123,12 +124,14 @@ void Join(Path const& file, std::string const& first, std::string const& second,
 
 void Forget(Path const& file, std::string const& revision) {
     Vault vault(file, Access::Write);
-    if (const auto commit = FindRevision(vault.Repository(), revision); commit->GetParent()) {
-        ForgetBelow(vault.Repository(), commit);
-    } else {
+    auto commit = FindRevision(vault.Repository(), revision);
+    if (!commit->GetParent()) {
         std::cout << "there is nothing below " << Printable(revision) << '\n';
         return;
     }
+    ForgetBelow(vault.Repository(), commit);
+    // Whatever is still held stays in the storage, and so in the file.
+    commit.reset();
     vault.WriteAndPrune();
 }
 

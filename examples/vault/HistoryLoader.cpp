@@ -67,6 +67,7 @@ cow_ptr<Commit> HistoryLoader::Load(Id const& head) {
         if (!commit || !seen.insert(next).second)
             return nullptr;
         commits.push_back({next, std::move(commit)});
+        // The empty parent line of a root commit reads as an identifier without text.
         next = parentId.GetText().IsEmpty() ? Id() : parentId;
     }
     std::reverse(commits.begin(), commits.end());

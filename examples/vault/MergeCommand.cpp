@@ -36,6 +36,7 @@ std::vector<std::string> MergeIntoCurrent(KivVcs::Repository& repository, MergeO
     Conflicts conflicts(options.policy, head, base, other);
     if (!repository.Merge(other, conflicts.MakeResolvers()))
         throw Problem("the merge was given up; nothing was changed", findingsExitStatus);
+    // Only now are all conflicts known. What was made of them is dropped with the repository if the user wants none.
     Finish(repository, conflicts, options);
     if (options.policy == ConflictPolicy::Stop && !conflicts.IsEmpty()) {
         for (auto const& line : conflicts.Describe(nullptr))

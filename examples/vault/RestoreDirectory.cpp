@@ -2,6 +2,7 @@
 #include "Problem.h"
 #include "Workspace.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <fcntl.h>
 #include <span>

@@ -3,6 +3,7 @@
 #include "VaultFile.h"
 #include "Workspace.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <fcntl.h>
 #include <string>

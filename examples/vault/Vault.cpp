@@ -44,6 +44,7 @@ Vault::Vault(std::filesystem::path const& path, VaultFile::Access access)
 }
 
 Vault::CommitHandle Vault::Import(VaultFile& from, std::string const& head) {
+    // While commits are loaded the current branch must have no head; it gets it back afterwards.
     const auto current = repository_.GetCurentBranch();
     const auto currentHead = repository_.GetHead();
     Storage().RemoveBranch(current);

@@ -2,6 +2,7 @@
 
 #include "Text.h"
 
+#include <algorithm>
 #include <unordered_map>
 #include <unordered_set>
 
