@@ -209,6 +209,9 @@ protected:
     /// together.
     [[nodiscard]] virtual Id ComputeId() const;
 
+    /// Whether the identifier has been computed since the last change.
+    [[nodiscard]] bool IsIdentified() const noexcept { return id_.IsSet(); }
+
 private:
     CachedId id_;
     Published<Buffer> packedData_;
@@ -255,5 +258,7 @@ KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char16_t> 
 
 template <>
 struct std::hash<KivVcs::Id> {
-    std::size_t operator()(KivVcs::Id const& id) const noexcept { return id.Hash(); }
+    // Not declared noexcept, though it never throws: tables then keep the hash beside the key, and finding or moving an
+    // element does not visit the identifiers of its neighbours.
+    std::size_t operator()(KivVcs::Id const& id) const { return id.Hash(); }
 };
