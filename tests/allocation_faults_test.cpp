@@ -1,0 +1,467 @@
+#include "RecordingRepository.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <new>
+#include <set>
+
+namespace {
+
+/// What this program's operators `new` and `delete` do. The tests run on one thread.
+struct Allocations {
+    long living = 0;
+    /// The allocation that fails, counted from 1; none for 0.
+    long failing = 0;
+    long made = 0;
+    bool laterOnesFailToo = false;
+    long faults = 0;
+};
+Allocations allocations;
+
+bool Fails() {
+    if (allocations.failing == 0)
+        return false;
+    ++allocations.made;
+    return allocations.made == allocations.failing ||
+           (allocations.laterOnesFailToo && allocations.made > allocations.failing);
+}
+
+} // namespace
+
+// Inlined, they would look mismatched to the compiler.
+[[gnu::noinline]] void* operator new(std::size_t size) {
+    if (Fails()) {
+        ++allocations.faults;
+        throw std::bad_alloc();
+    }
+    void* const memory = std::malloc(size == 0 ? 1 : size);
+    if (memory == nullptr)
+        throw std::bad_alloc();
+    ++allocations.living;
+    return memory;
+}
+
+[[gnu::noinline]] void operator delete(void* memory) noexcept {
+    allocations.living -= memory == nullptr ? 0 : 1;
+    std::free(memory);
+}
+
+[[gnu::noinline]] void operator delete(void* memory, std::size_t) noexcept {
+    operator delete(memory);
+}
+
+namespace KivVcs {
+namespace {
+
+/// A repository with every kind of history and object, and places for what the operations give.
+struct World {
+    World() {
+        Grow("r", "", "f1=1 f2=2 f3=3 d/x=1 d/e/y=1 d/e/z=1 s/t/u=1 s/v=1");
+        Grow("a", "r", "d/x=2 n=1");
+        Grow("b", "a", "m=1");
+        Grow("c", "b", "d/e/y=3 k/l=4 f1=9");
+        Grow("t", "a", "d/x=9 d/e/z=2 f2=7");
+        Grow("v", "t", "d/e/y=7 s/q/w=1 k=5 f1=8");
+        Grow("i", "", "d/x=1 o=1");
+        Grow("j", "i", "p=1");
+        Grow("g", "c", "garbage/g=1");
+        repository.MoveBranchTo(u"master", commits["c"]);
+        for (auto const& [branch, head] : {std::pair(u"topic", "v"), {u"side", "b"}, {u"twin", "c"}, {u"island", "j"}})
+            repository.CreateBranch(branch, commits[head]);
+        draft = Commit(commits["c"], false);
+        draft.SetDescription(u"draft");
+        edited = *commits["c"]->GetCommitTree()->GetRoot();
+        edited.AddTree(&repository, u"many", *Many());
+        sole.AddBlob(&repository, u"d/x", blob);
+        packed = commits["v"]->GetPackedData();
+    }
+
+    /// A directory large enough for a table of several nodes; made once, since every fault takes a new world.
+    static cow_ptr<Tree> const& Many() {
+        static Repository repository(std::make_unique<MemObjectsStorage>());
+        static const cow_ptr<Tree> many = [] {
+            std::string files;
+            for (int index = 100; index < 140; ++index)
+                files += std::to_string(index) + "=blob ";
+            return MakeTree(repository, files);
+        }();
+        return many;
+    }
+
+    void Grow(std::string const& name, std::string const& parent, std::string const& files) {
+        Commit grown(commits[parent], false);
+        grown.SetDescription(Wide(name));
+        grown.SetAuthorName(u"J\u00f8rn");
+        std::istringstream words(files);
+        for (std::string word; words >> word;) {
+            const auto equals = word.find('=');
+            grown.AddBlob(&repository, Wide(word.substr(0, equals)), MakeBlob(word.substr(equals + 1)));
+        }
+        commits[name] = repository.SyncWithStorage(immu::make<Commit>(grown));
+    }
+
+    /// Branches, histories and what the caller edits. Nothing of it may change while an operation fails.
+    std::string State(bool onlyHeads = false) {
+        std::map<std::string, std::string> lines;
+        for (auto const& [name, head] : repository.GetStorage()->GetRefs()) {
+            std::string& line = lines[Narrow(name)];
+            for (Commit const* each = head.get(); each != nullptr; each = onlyHeads ? nullptr : each->GetParent().get())
+                line += "/" + Narrow(each->GetDescription()) + "{" + Files(each->GetCommitTree()) + "}";
+        }
+        std::string state = Narrow(repository.GetCurentBranch());
+        for (auto const& [name, line] : lines)
+            state += "\n" + name + "=" + line;
+        return state + "\n" + Narrow(draft.GetDescription()) + Narrow(draft.GetAuthorName()) + " on " +
+               NameOf(draft.GetParent()) + "{" + Files(draft.GetCommitTree()) + "}\n" +
+               KivVcs::Files(immu::make<Tree>(edited)) + "\n" + KivVcs::Files(immu::make<Tree>(sole)) + "\n" +
+               Narrow(text) + "\n" + Helpers::StringAFromBuffer(data).GetString();
+    }
+
+    /// The state and what the last operation gave.
+    std::string Outcome() {
+        std::string outcome = State() + "\n" + std::to_string(done) + " " + narrow.GetString() + " " +
+                              KivVcs::Files(tree) + " " + NameOf(commit) + " " + Files(holder);
+        for (auto const& path : paths)
+            outcome += " " + Narrow(path);
+        commits.clear();
+        commit.reset();
+        repository.UpdateStorage();
+        for (Repository* each : {&repository, &mirror})
+            outcome += " " + std::to_string(each->GetCommitCount()) + " " + std::to_string(each->GetTreeCount()) + " " +
+                       std::to_string(each->GetBlobCount());
+        return outcome;
+    }
+
+    static std::string Files(cow_ptr<CommitTree> const& tree) { return tree ? KivVcs::Files(tree->GetRoot()) : "-"; }
+
+    StreamIO Load(Id const& id) {
+        Buffer* found = nullptr;
+        if (auto const& stored = repository.GetTreeFromStorage(id))
+            found = &(loaded[id] = stored->GetPackedData());
+        else if (auto const& leaf = repository.GetBlobFromStorage(id))
+            found = &(loaded[id] = leaf->GetPackedData());
+        else if (auto const& version = repository.GetCommitFromStorage(id))
+            found = &(loaded[id] = version->GetPackedData());
+        return found == nullptr ? StreamIO() : StreamIO(MemStream::CreateOnRef(*found));
+    }
+
+    Repository repository{std::make_unique<MemObjectsStorage>()};
+    Repository mirror{std::make_unique<MemObjectsStorage>()};
+    std::map<std::string, cow_ptr<Commit>> commits;
+    std::unordered_map<Id, Buffer> loaded;
+    Commit draft;
+    Tree edited, sole;
+    Blob blob = MakeBlob("blob");
+    Buffer packed, data;
+    KivStringT<char16_t> text;
+    KivStringT<char> narrow;
+    bool done = false;
+    cow_ptr<Tree> tree;
+    cow_ptr<Commit> commit;
+    cow_ptr<CommitTree> holder;
+    PathList paths;
+};
+
+/// The identifier of a tree by its listing, of everything else by a copy without caches.
+Id Recomputed(Tree const& tree) {
+    std::map<std::string, Object const*> entries;
+    for (auto const& name : tree.GetLocalObjectPaths())
+        entries[Narrow(name)] = tree.GetLocalObject(name).get();
+    std::string data;
+    for (auto const& [name, child] : entries)
+        data += std::string(child->GetStoragePrefix()) + " " + child->GetHeader().GetString() + " " + name + '\0' +
+                Narrow(child->GetId().GetText());
+    return MakeBlob("tree " + std::to_string(data.size()) + '\0' + data).GetData();
+}
+
+template <class T>
+Id Recomputed(T copy) {
+    copy.ResetState();
+    return copy.GetPackedData();
+}
+
+class SoundnessCheck {
+public:
+    explicit SoundnessCheck(World& world) {
+        for (Repository* repository : {&world.repository, &world.mirror}) {
+            CheckTable(repository->GetStorage()->GetCommits());
+            CheckTable(repository->GetStorage()->GetTrees());
+            CheckTable(repository->GetStorage()->GetBlobs());
+            for (auto const& [name, head] : repository->GetStorage()->GetRefs())
+                Check(head.get());
+        }
+        Check(&world.draft);
+        Check(&world.edited);
+        Check(&world.sole);
+    }
+
+private:
+    template <class Table>
+    void CheckTable(Table const& table) {
+        for (auto const& [id, object] : table) {
+            EXPECT_EQ(id, object->GetId());
+            Check(object.get());
+        }
+    }
+
+    bool IsNew(Object const* object) { return object != nullptr && checked_.insert(object).second; }
+
+    template <class T>
+    static void Compare(T const& object) {
+        EXPECT_EQ(object.GetId(), Recomputed(object));
+        EXPECT_EQ(Id(object.GetPackedData()), object.GetId());
+    }
+
+    void Check(Blob const* blob) {
+        if (IsNew(blob))
+            Compare(*blob);
+    }
+    void Check(Tree const* tree) {
+        if (!IsNew(tree))
+            return;
+        Compare(*tree);
+        for (auto const& name : tree->GetLocalSubtreePaths())
+            Check(tree->GetLocalTree(name).get());
+        for (auto const& name : tree->GetLocalBlobPaths())
+            Check(tree->GetLocalBlob(name).get());
+    }
+    void Check(Commit const* commit) {
+        if (!IsNew(commit))
+            return;
+        Compare(*commit);
+        Check(commit->GetParent().get());
+        Check(commit->GetCommitTree() ? commit->GetCommitTree()->GetRoot().get() : nullptr);
+    }
+
+    std::set<Object const*> checked_;
+};
+
+struct Operation {
+    const char* name;
+    void (*run)(World&);
+    /// Made of several changes, each of them whole, between which a fault may stop it.
+    bool hasSteps = false;
+};
+
+cow_ptr<Tree> RootOf(World& world, const char* commit) {
+    return world.commits[commit]->GetCommitTree()->GetRoot();
+}
+
+Resolvers AskTimesThenRight() {
+    const auto getTime = [](cow_ptr<Blob> const& blob) { return optional<Time>(Time(blob->GetData().GetSize())); };
+    return {ChainResolvers(TimeBasedConflictResolver({u"absent", u"f1"}, getTime), AlwaysChooseRight()),
+            [](auto const&, auto const&) { return TreeConflictChoice::Merge; }};
+}
+
+// clang-format off
+const Operation operations[] = {
+    {"Tree::AddBlob", [](World& w) { w.done = !!w.edited.AddBlob(&w.repository, u"d/e/new/deep", w.blob); }},
+    {"Tree::AddBlob many", [](World& w) { w.edited.AddBlob(&w.repository, u"many/110a", w.blob); }},
+    {"Tree::AddBlob replacing", [](World& w) { w.sole.AddBlob(&w.repository, u"d/x", MakeBlob("other")); }},
+    {"Tree::AddTree", [](World& w) { w.tree = w.edited.AddTree(&w.repository, u"d/copy", w.sole); }},
+    {"Tree::AddObject", [](World& w) { w.sole.AddObject(&w.repository, u"q/r", RootOf(w, "t")->GetId()); }},
+    {"Tree::RemoveObject", [](World& w) { w.done = w.edited.RemoveObject(&w.repository, u"s/t/u"); }},
+    {"Tree::RemoveObject many", [](World& w) { w.done = w.edited.RemoveObject(&w.repository, u"many/101"); }},
+    {"a wide tree", [](World& w) {
+         Tree wide;
+         for (char16_t name[] = u"aa"; name[0] < u'z'; name[1] == u'z' ? (++name[0], name[1] = u'a') : ++name[1])
+             wide.AddBlob(&w.repository, name, w.blob);
+         w.tree = immu::make<Tree>(wide);
+     }},
+    {"emptying a tree", [](World& w) {
+         Tree shrinking(w.edited);
+         for (char16_t name[] = u"many/100"; name[6] < u'4'; name[7] == u'9' ? (++name[6], name[7] = u'0') : ++name[7])
+             shrinking.RemoveObject(&w.repository, name);
+         w.tree = immu::make<Tree>(shrinking);
+     }},
+    {"a line of commits", [](World& w) {
+         for (char16_t name[] = u"A"; name[0] < u'P'; ++name[0]) {
+             Commit next(&w.repository, false);
+             next.SetDescription(name);
+             next.AddBlob(&w.repository, name, w.blob);
+             w.repository.DoCommit(next);
+         }
+     }, true},
+    {"Tree listings", [](World& w) { w.paths = w.edited.GetDeepBlobPaths(); }},
+    {"Tree local listings", [](World& w) {
+         w.paths = w.edited.GetLocalObjectPaths();
+         w.done = w.edited.GetLocalBlobPaths().size() + w.edited.GetLocalSubtreePaths().size() == w.paths.size();
+     }},
+    {"Tree differences", [](World& w) { w.paths = w.edited.GetDeepBlobDiffs(RootOf(w, "v")); }},
+    {"Tree local differences", [](World& w) {
+         w.paths = w.edited.GetLocalBlobDiffs(RootOf(w, "v"));
+         w.done = w.edited.GetLocalTreeDiffs(RootOf(w, "r")).size() == 2;
+     }},
+    {"Tree lookups", [](World& w) {
+         w.done = w.edited.GetDeepObject(u"d/e/y") && w.edited.GetDeepTree(u"d/e") && w.edited.GetDeepBlob(u"d/x") &&
+                  w.edited.GetIdByPath(u"d/e") && w.edited.GetDeepBlobCount() > 40;
+     }},
+    {"packed forms", [](World& w) {
+         w.edited.ResetState();
+         w.draft.ResetState();
+         w.done = !w.edited.GetId().GetText().IsEmpty() && w.draft.GetId() == Id(w.draft.GetPackedData());
+         w.narrow = Helpers::StringAFromBuffer(w.edited.GetData());
+     }},
+    {"ToString", [](World& w) { w.done = w.edited.ToString().GetLength() > w.blob.ToString().GetLength(); }},
+    {"Commit::AddBlob", [](World& w) { w.draft.AddBlob(&w.repository, u"d/e/fresh", MakeBlob("fresh")); }},
+    {"Commit::AddTree", [](World& w) { w.tree = w.draft.AddTree(&w.repository, u"trees/one", w.edited); }},
+    {"Commit::AddObject", [](World& w) { w.draft.AddObject(&w.repository, u"z", RootOf(w, "v")->GetId()); }},
+    {"Commit::RemoveObject", [](World& w) { w.done = w.draft.RemoveObject(&w.repository, u"d/e/y"); }},
+    {"Commit::ReplaceRoot", [](World& w) {
+         w.draft.ReplaceRoot(&w.repository, immu::make<Tree>(w.edited));
+         w.draft.ResetState();
+     }},
+    {"Commit::SetDescription", [](World& w) { w.draft.SetDescription(u"another description"); }},
+    {"Commit::GetTree", [](World& w) { w.holder = w.draft.GetTree(u"d/e"); }},
+    {"CommitTree", [](World& w) {
+         cow_ptr<CommitTree> holder = w.draft.GetCommitTree();
+         holder.write()->AddBlob(&w.repository, u"only/here", w.blob);
+         w.paths = holder->GetBlobDiffs(w.draft.GetCommitTree());
+         w.holder = holder;
+     }},
+    {"author lines", [](World& w) {
+         int position = 0;
+         const auto line = Commit::GetAuthorInfo(u"author", u"J\u00f8rn", u"j@x", Time(), TimeDelta(-1));
+         const KivStringT<char> utf8 = DataEncoding::Utf8Encode(line) + "\n";
+         w.text = String::ToStringW(*Commit::ParseCommitInfo(utf8, "author ", position));
+     }},
+    {"DoCommit", [](World& w) { w.commit = w.repository.DoCommit(w.draft); }},
+    {"amending", [](World& w) {
+         Commit amended(&w.repository, true);
+         amended.AddBlob(&w.repository, u"amended/file", w.blob);
+         w.commit = w.repository.DoCommit(amended);
+     }},
+    {"Commit::MakeCommitLinksInOrder", [](World& w) {
+         std::vector<cow_ptr<Commit>> line{w.commits["j"], w.commits["b"], w.commits["v"]};
+         w.done = Commit::MakeCommitLinksInOrder(line, &w.repository);
+         w.commit = line.front();
+     }},
+    {"Commit::Deserialize", [](World& w) {
+         Id parent;
+         w.commit =
+             Commit::Deserialize(w.commits["v"]->GetId(), parent, &w.mirror, [&w](Id const& id) { return w.Load(id); });
+         w.done = parent == w.commits["t"]->GetId();
+     }},
+    {"Tree::Deserialize", [](World& w) {
+         w.repository.SyncWithStorage(immu::make<Tree>(w.edited));
+         w.tree = Tree::Deserialize(w.edited.GetId(), &w.mirror, [&w](Id const& id) { return w.Load(id); });
+     }},
+    {"Blob::Deserialize", [](World& w) {
+         Buffer large(0);
+         large.Append("blob 1", 7);
+         large.Append("0123456789", 10, 1'000);
+         StreamIO stream(MemStream::CreateOnRef(large));
+         w.done = Blob::Deserialize(stream)->GetData().GetSize() == 10'000;
+     }},
+    {"CreateBranch", [](World& w) { w.done = w.repository.CreateBranch(u"new", nullptr); }},
+    {"RemoveBranch", [](World& w) { w.done = w.repository.RemoveBranch(u"twin"); }},
+    {"Checkout", [](World& w) { w.done = w.repository.Checkout(u"island"); }},
+    {"MoveBranchTo", [](World& w) { w.done = w.repository.MoveBranchTo(u"side", w.commits["v"]); }},
+    {"fast forward", [](World& w) { w.done = w.repository.Merge(w.commits["g"], {}); }},
+    {"three-way merge", [](World& w) { w.done = w.repository.Merge(w.commits["v"], AskTimesThenRight()); }},
+    {"unrelated merge", [](World& w) { w.done = w.repository.Merge3Way(w.commits["j"], AskTimesThenRight()); }},
+    {"ThreeWayMerge", [](World& w) {
+         w.tree = ThreeWayMerge(&w.repository, {RootOf(w, "v"), RootOf(w, "a"), RootOf(w, "c")}, AskTimesThenRight());
+     }},
+    {"GetCommonBase", [](World& w) { w.commit = w.repository.GetCommonBase(w.commits["c"], w.commits["v"]); }},
+    {"DeleteCommits", [](World& w) { w.done = w.repository.DeleteCommits(w.commits["c"]); }, true},
+    {"SimplifyCommitGraph", [](World& w) { w.done = w.repository.SimplifyCommitGraph(true); }, true},
+    {"SimplifyCommitGraph without purge", [](World& w) { w.done = w.repository.SimplifyCommitGraph(false); }, true},
+    {"MergelessRebase", [](World& w) { w.commit = w.repository.MergelessRebase(u"topic", u"master"); }},
+    {"EnsureCommonRootFor by a branch", [](World& w) {
+         w.done = w.repository.EnsureCommonRootFor(u"topic", u"island", u"side");
+     }},
+    {"EnsureCommonRootFor", [](World& w) { w.done = w.repository.EnsureCommonRootFor(u"topic", u"island", u"root"); }, true},
+    {"purge", [](World& w) {
+         w.commits.clear();
+         w.repository.UpdateStorage();
+     }},
+    {"clone", [](World& w) { w.done = w.repository.GetStorage()->Clone()->GetRefs().size() == 5; }},
+    {"strings", [](World& w) {
+         KivStringT<char16_t> text = u"one";
+         text += u" two three four five";
+         text = text.Mid(1) + KivStringT<char16_t>(u"six").Left(2);
+         w.narrow.FormatInternal("%s %05d", "made", 42);
+         w.text = text + DataEncoding::HexEncode("abc", 3) + KivStringT<char16_t>(w.narrow);
+     }},
+    {"string +=", [](World& w) { w.text += u"appended once"; }},
+    {"Buffer::Append", [](World& w) { w.data.Append("appended four times.", 20, 4); }},
+    {"Buffer::Append large", [](World& w) {
+         Buffer large(70'000);
+         large.Append(large);
+         large.Append("end", 3);
+         Buffer all(large);
+         all.Append(large, 5, 100'000);
+         StreamIO stream(MemStream::CreateOnRef(all));
+         Buffer copy(0);
+         Stream destination = MemStream::CreateOnRef(copy);
+         w.done = stream.CopyTo(destination, nullptr) && copy.GetSize() == 240'003;
+     }},
+};
+// clang-format on
+
+/// Runs @p operation with its allocation @p failing; false if it completed without a fault.
+bool Disturb(Operation const& operation, World& world, long failing, bool laterOnesFailToo) {
+    const long before = allocations.faults;
+    allocations.made = 0;
+    allocations.laterOnesFailToo = laterOnesFailToo;
+    allocations.failing = failing;
+    try {
+        operation.run(world);
+    } catch (std::bad_alloc const&) {
+        allocations.failing = 0;
+    }
+    allocations.failing = 0;
+    return allocations.faults > before;
+}
+
+void RunWithEveryFault(Operation const& operation, bool laterOnesFailToo) {
+    const std::string before = World().State();
+    std::string headsAfterwards;
+    std::string undisturbed;
+    {
+        World world;
+        operation.run(world);
+        SoundnessCheck{world};
+        headsAfterwards = world.State(true);
+        undisturbed = world.Outcome();
+    }
+    auto const& findings = *testing::UnitTest::GetInstance()->current_test_info()->result();
+    const int findingsBefore = findings.total_part_count();
+    bool faulty = true;
+    for (long failing = 1; faulty && findings.total_part_count() == findingsBefore; ++failing) {
+        SCOPED_TRACE(operation.name + std::string(", fault ") + std::to_string(failing));
+        const long living = allocations.living;
+        {
+            World world;
+            faulty = Disturb(operation, world, failing, laterOnesFailToo);
+            if (faulty) {
+                if (!operation.hasSteps) {
+                    EXPECT_EQ(world.State(), before);
+                }
+                SoundnessCheck{world};
+                operation.run(world);
+            }
+            SoundnessCheck{world};
+            if (faulty && operation.hasSteps) {
+                EXPECT_EQ(world.State(true), headsAfterwards);
+            } else {
+                EXPECT_EQ(world.Outcome(), undisturbed);
+            }
+        }
+        EXPECT_EQ(allocations.living, living) << "leaked";
+    }
+}
+
+TEST(AllocationFaults, LeaveEverythingAsItWasAndLeakNothing) {
+    for (Operation const& operation : operations) {
+        RunWithEveryFault(operation, false);
+        RunWithEveryFault(operation, true);
+    }
+    RecordProperty("faults", std::to_string(allocations.faults));
+    EXPECT_GE(allocations.faults, 10'000);
+}
+
+} // namespace
+} // namespace KivVcs
