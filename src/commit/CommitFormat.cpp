@@ -88,6 +88,8 @@ Buffer const& Commit::GetData() const {
 }
 
 Id Commit::ComputeId() const {
+    if (data_.Get() != nullptr)
+        return Object::ComputeId();
     // The text is not kept: it is asked for far less often than the identifier, and every commit of a history has one.
     const KivStringT<char> text = TextOf(*this);
     const auto size = static_cast<std::size_t>(text.GetLength());
