@@ -1,5 +1,6 @@
 #include "KivUtils/Encoding.h"
 
+#include <algorithm>
 #include <limits>
 #include <stdexcept>
 
@@ -32,6 +33,15 @@ void ForEachCodePoint(KivStringViewT<char16_t> text, Take take) {
         }
         take(codePoint);
     }
+}
+
+/// Whether every code unit is ASCII, as those of most names are. Looks at all of them, since that is faster than to stop
+/// at the first that is not.
+bool IsAscii(KivStringViewT<char16_t> text) noexcept {
+    unsigned bits = 0;
+    for (const char16_t unit : text)
+        bits |= unit;
+    return bits < 0x80;
 }
 
 constexpr std::size_t EncodedLength(char32_t codePoint) noexcept {
@@ -112,12 +122,17 @@ Number NumberFromString(KivStringViewT<char16_t> text) noexcept {
 } // namespace
 
 std::size_t DataEncoding::Utf8Length(KivStringViewT<char16_t> text) noexcept {
+    if (IsAscii(text))
+        return static_cast<std::size_t>(text.GetLength());
     std::size_t length = 0;
     ForEachCodePoint(text, [&length](char32_t codePoint) { length += EncodedLength(codePoint); });
     return length;
 }
 
 char* DataEncoding::Utf8Write(KivStringViewT<char16_t> text, char* destination) noexcept {
+    if (IsAscii(text))
+        return std::transform(text.begin(), text.end(), destination,
+                              [](char16_t unit) { return static_cast<char>(unit); });
     ForEachCodePoint(text, [&destination](char32_t codePoint) {
         const auto continuation = [codePoint](unsigned shift) {
             return static_cast<char>(0x80 | ((codePoint >> shift) & 0x3F));

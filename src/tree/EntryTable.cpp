@@ -209,9 +209,11 @@ struct NameRange {
     int to;
 };
 
-void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, Entry entry) {
-    const bool isTree = entry.IsTree();
+template <class Child>
+void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, bool isTree, cow_ptr<Child> child) {
     const bool exists = FindEntry(root, name, isTree) != nullptr;
+    // An entry that is replaced keeps its name, which its other versions share.
+    Entry entry(exists ? KivStringT<char16_t>() : name.ToString(), std::move(child));
     if (root == nullptr)
         root = TableNode::Make(0, 1);
     if (!exists && root->IsFull())
@@ -239,13 +241,18 @@ void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, Entry entry) {
     path.Add(*slot, 0);
 
     TableNode& leaf = **slot;
-    const Tally before = NameRange(leaf, name).TallyIn(leaf);
+    leaf.DropPackedRun();
     const int index = leaf.EntryFor(name, isTree);
+    if (exists && entry.Child() != nullptr && leaf.Entries()[static_cast<std::size_t>(index)].Child() != nullptr) {
+        // The same name, kind and size as before: no total changes.
+        leaf.Entries()[static_cast<std::size_t>(index)].TakeChildOf(entry);
+        return;
+    }
+    const Tally before = NameRange(leaf, name).TallyIn(leaf);
     if (exists)
         leaf.Entries()[static_cast<std::size_t>(index)].TakeChildOf(entry);
     else
         leaf.Insert(index, std::move(entry));
-    leaf.DropPackedRun();
     path.AddToTotals(NameRange(leaf, name).TallyIn(leaf), before);
 }
 
@@ -261,14 +268,11 @@ EntryTable::~EntryTable() {
 }
 
 void EntryTable::Set(KivStringViewT<char16_t> name, cow_ptr<Blob> child) {
-    // An entry that is replaced keeps its name, which its other versions share.
-    const bool exists = FindEntry(root_, name, false) != nullptr;
-    SetEntry(root_, name, Entry(exists ? KivStringT<char16_t>() : name.ToString(), std::move(child)));
+    SetEntry(root_, name, false, std::move(child));
 }
 
 void EntryTable::Set(KivStringViewT<char16_t> name, cow_ptr<Tree> child) {
-    const bool exists = FindEntry(root_, name, true) != nullptr;
-    SetEntry(root_, name, Entry(exists ? KivStringT<char16_t>() : name.ToString(), std::move(child)));
+    SetEntry(root_, name, true, std::move(child));
 }
 
 bool EntryTable::Erase(KivStringViewT<char16_t> name) {
