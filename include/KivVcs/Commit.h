@@ -116,6 +116,7 @@ protected:
 private:
     template <class Add>
     auto EditTree(IRepository* repo, Add add);
+    void IdentifyAncestors() const;
     void ReleaseHistory() noexcept;
 
     cow_ptr<CommitTree> tree_;

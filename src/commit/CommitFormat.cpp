@@ -79,7 +79,18 @@ KivStringT<char> Commit::GetStoragePrefix() const {
     return {};
 }
 
+void Commit::IdentifyAncestors() const {
+    // Oldest first: asked from the newest on, each commit would ask its parent in turn, one call deeper for every commit.
+    std::vector<Commit const*> unidentified;
+    for (Commit const* ancestor = parent_.get(); ancestor != nullptr && !ancestor->IsIdentified();
+         ancestor = ancestor->parent_.get())
+        unidentified.push_back(ancestor);
+    for (; !unidentified.empty(); unidentified.pop_back())
+        static_cast<void>(unidentified.back()->GetId());
+}
+
 Buffer const& Commit::GetData() const {
+    IdentifyAncestors();
     return data_.GetOrMake([this] {
         Buffer data;
         Helpers::AppendToBuffer(data, TextOf(*this));
@@ -88,6 +99,7 @@ Buffer const& Commit::GetData() const {
 }
 
 Id Commit::ComputeId() const {
+    IdentifyAncestors();
     if (data_.Get() != nullptr)
         return Object::ComputeId();
     // The text is not kept: it is asked for far less often than the identifier, and every commit of a history has one.
