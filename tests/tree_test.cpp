@@ -209,9 +209,11 @@ TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
         // Some keep a few entries, so that sparse leaves are left behind; some add to what an erasure left.
         const bool add = round == 0 || Below(5) < 2;
         const int kept = Below(2) * (Below(9) + 2);
-        for (int number : numbers)
-            if (kept == 0 || Below(kept) != 0)
+        for (int number : numbers) {
+            if (kept == 0 || Below(kept) != 0) {
                 ASSERT_NO_FATAL_FAILURE(edit(number, add));
+            }
+        }
         ASSERT_NO_FATAL_FAILURE(now.Check()) << round;
         ASSERT_NO_FATAL_FAILURE(now.CheckAgainst(former[random() % former.size()])) << round;
         if (Below(3) == 0)
