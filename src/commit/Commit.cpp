@@ -136,7 +136,7 @@ cow_ptr<CommitTree> Commit::GetTree(KivStringViewT<char16_t> path) const {
 void Commit::ReplaceRoot(IRepository* repo, cow_ptr<Tree> root) {
     // The identifier stays until the state is reset, and so does the text that it tells.
     if (IsIdentified())
-        GetPackedData();
+        static_cast<void>(GetPackedData());
     cow_ptr<CommitTree> edited = tree_;
     edited.write()->ReplaceRoot(repo, std::move(root));
     if (repo != nullptr)
