@@ -136,13 +136,29 @@ TEST_F(Histories, DeletingMovesBranchesNewestFirstAndSurvivesAFailure) {
     repo.TakeCalls();
     repo.Break("MoveBranchTo");
     EXPECT_THROW(repo.DeleteCommits(history["c"]), std::runtime_error);
-    EXPECT_EQ(history.Branches(), "master=c/b/a topic=b/a");
     EXPECT_EQ(repo.TakeCalls(), "Sync(b) Sync(c)");
     repo.Break("");
     EXPECT_TRUE(repo.DeleteCommits(history["c"]));
     EXPECT_EQ(repo.TakeCalls(), "Sync(b) Sync(c) MoveBranchTo(master,c) MoveBranchTo(topic,b) UpdateStorage");
     EXPECT_EQ(history.Branches(), "master=c/b topic=b");
     EXPECT_TRUE(repo.GetHead()->GetCommitTree()->GetRoot() == tree);
+}
+
+TEST_F(Histories, BranchesAreWhereTheyWereWhenAnExceptionEndsTheirMoves) {
+    history.Grow("r a:r b:a c:b x y:x");
+    history.Point("master=c topic=a island=y");
+    const std::string before = history.Branches();
+    const auto expectUnmoved = [&](const char* broken, auto const& operation) {
+        repo.Break(broken);
+        EXPECT_THROW(operation(), std::runtime_error) << broken;
+        EXPECT_EQ(history.Branches(), before) << broken;
+    };
+    // The order of the branches, and with it how many of them have been moved, is the tables' own.
+    for (const char* broken : {"MoveBranchTo(topic", "Sync(c)", "MoveBranchTo(master", "MoveBranchTo(island"})
+        expectUnmoved(broken, [this] { repo.SimplifyCommitGraph(true); });
+    expectUnmoved("MoveBranchTo(topic", [this] { repo.DeleteCommits(history["c"]); });
+    for (const char* broken : {"Sync(y)", "MoveBranchTo(island"})
+        expectUnmoved(broken, [this] { repo.EnsureCommonRootFor(u"master", u"island", u"new"); });
 }
 
 TEST_F(Histories, SimplifyingAsksAboutPairsAndMakesRemovedBranchesAgain) {

@@ -197,9 +197,31 @@ extern template class KivStringT<char16_t>;
 
 } // namespace KivPlatform
 
+// Both transparent, so that tables of strings are searched by views and literals without making a string of them.
+
 template <class C>
 struct std::hash<KivPlatform::KivStringT<C>> {
+    using is_transparent = void;
+
     std::size_t operator()(KivPlatform::KivStringT<C> const& text) const noexcept {
         return std::hash<KivPlatform::KivStringViewT<C>>()(text);
+    }
+    template <std::convertible_to<KivPlatform::KivStringViewT<C>> T>
+    std::size_t operator()(T const& text) const noexcept {
+        return std::hash<KivPlatform::KivStringViewT<C>>()(text);
+    }
+};
+
+template <class C>
+struct std::equal_to<KivPlatform::KivStringT<C>> {
+    using is_transparent = void;
+
+    bool operator()(KivPlatform::KivStringT<C> const& left, KivPlatform::KivStringT<C> const& right) const noexcept {
+        return left == right;
+    }
+    template <class L, class R>
+        requires KivPlatform::TextPair<L, R, C>
+    bool operator()(L const& left, R const& right) const noexcept {
+        return left == right;
     }
 };

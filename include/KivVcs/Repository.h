@@ -44,10 +44,12 @@ public:
     /// stored anew, linked to each other in their old order, their branches moved, and unused objects purged. A root
     /// commit, and null, are left alone. Descendants of @p commit keep their old parents in memory.
     /// @return false without storage, or if the kept commits could not be linked.
+    /// @throws what allocation and the host's operations throw; unless that is the purge, no branch has moved then.
     virtual bool DeleteCommits(cow_ptr<Commit> commit) = 0;
     /// Rewrites the history of all branches so that it keeps only their heads and the common bases of every two heads,
     /// each linked to the nearest kept ancestor; purges unused objects at the end if @p purge. Content stays.
     /// @return false without storage.
+    /// @throws as `DeleteCommits`
     virtual bool SimplifyCommitGraph(bool purge) = 0;
     /// Purges the objects that nothing references.
     virtual void UpdateStorage() = 0;
@@ -71,7 +73,8 @@ public:
     /// head of @p rootBranch, which is made with an empty commit "Root commit" if it has no head. A branch without
     /// commits is put at the root itself.
     /// @return false if the root branch cannot be made or a branch cannot be moved; what was stored before stays
-    /// stored.
+    /// stored, and a branch that was moved before stays there.
+    /// @throws as `DeleteCommits`, and no branch has been made; one without commits may stay at the root
     virtual bool EnsureCommonRootFor(KivStringViewT<char16_t> first, KivStringViewT<char16_t> second,
                                      KivStringViewT<char16_t> rootBranch) = 0;
     /// Moves the current branch forward to @p commit; false if the current head is not on its history (as the same
@@ -147,8 +150,6 @@ public:
     cow_ptr<Commit> MergelessRebase(KivStringViewT<char16_t> branch, KivStringViewT<char16_t> ontoBranch);
 
 private:
-    bool AttachToRoot(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& root);
-
     std::unique_ptr<IObjectsStorage> storage_;
     KivStringT<char16_t> currentBranch_;
     /// What `GetCommonBase` looks at first while the commit graph is being simplified; null otherwise.

@@ -93,7 +93,8 @@ public:
     [[nodiscard]] ReferenceTable const& GetRefs() const override;
     void DeleteCommit(cow_ptr<Commit> commit) override;
     /// One pass over the tables, commits, trees, blobs, plus the objects removed. Use counts are the whole rule: an
-    /// object stays as long as a branch, another object, another storage or the host holds it.
+    /// object stays as long as a branch, another object, another storage or the host holds it. Does not fail for want of
+    /// memory, but is slower then.
     void PurgeUnusedObjects() override;
     [[nodiscard]] bool BranchExist(KivStringViewT<char16_t> name) const override;
     bool CreateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) override;

@@ -1,5 +1,7 @@
 #include "KivVcs/Repository.h"
 
+#include "repository/BranchMoves.h"
+
 #include <algorithm>
 
 namespace KivVcs {
@@ -40,29 +42,44 @@ cow_ptr<Commit> Repository::MergelessRebase(KivStringViewT<char16_t> branch, Kiv
     return MergelessRebase(std::move(head), std::move(base), std::move(ontoHead));
 }
 
+namespace {
+
+bool AttachToRoot(Repository& repository, KivStringViewT<char16_t> branch, cow_ptr<Commit> const& root,
+                  BranchMoves& moves) {
+    const auto head = repository.GetHead(branch);
+    if (!head) {
+        if (!repository.CreateBranch(branch, root))
+            return repository.MoveBranchTo(branch, root);
+        moves.NoteNew(branch);
+        return true;
+    }
+    if (repository.GetCommonBase(head, root))
+        return true;
+    auto rebased = repository.MergelessRebase(head, nullptr, root);
+    moves.NoteMove(branch, head);
+    return repository.MoveBranchTo(branch, std::move(rebased));
+}
+
+} // namespace
+
 bool Repository::EnsureCommonRootFor(KivStringViewT<char16_t> first, KivStringViewT<char16_t> second,
                                      KivStringViewT<char16_t> rootBranch) {
     const auto firstHead = GetHead(first);
     const auto secondHead = GetHead(second);
     if (firstHead && secondHead && GetCommonBase(firstHead, secondHead))
         return true;
+    BranchMoves moves(storage_.get(), 3);
     auto root = GetHead(rootBranch);
     if (!root) {
         root.write()->SetDescription(u"Root commit");
         if (!CreateBranch(rootBranch, SyncWithStorage(std::move(root))))
             return false;
+        moves.NoteNew(rootBranch);
         root = GetHead(rootBranch);
     }
-    return AttachToRoot(first, root) && AttachToRoot(second, root);
-}
-
-bool Repository::AttachToRoot(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& root) {
-    auto head = GetHead(branch);
-    if (!head)
-        return CreateBranch(branch, root) || MoveBranchTo(branch, root);
-    if (GetCommonBase(head, root))
-        return true;
-    return MoveBranchTo(branch, MergelessRebase(std::move(head), nullptr, root));
+    const bool attached = AttachToRoot(*this, first, root, moves) && AttachToRoot(*this, second, root, moves);
+    moves.Keep();
+    return attached;
 }
 
 } // namespace KivVcs

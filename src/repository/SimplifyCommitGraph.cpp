@@ -1,5 +1,6 @@
 #include "KivVcs/Repository.h"
 
+#include "repository/BranchMoves.h"
 #include "repository/CommonBaseIndex.h"
 
 #include <unordered_map>
@@ -16,7 +17,7 @@ struct Branch {
 /// What is known of a commit of the simplified graph.
 struct KeptCommit {
     /// The branches whose head it is.
-    std::vector<KivStringT<char16_t>> branches;
+    std::vector<Branch const*> branches;
     /// The kept commits whose nearest kept ancestor it is.
     std::vector<Id> children;
     bool hasParent = false;
@@ -34,9 +35,9 @@ public:
         : repository_(repository), storage_(storage) {
         for (auto const& [name, head] : storage.GetRefs())
             branches_.push_back({name, head});
-        for (auto const& [name, head] : branches_) {
-            if (head)
-                kept_[head->GetId()].branches.push_back(name);
+        for (auto const& branch : branches_) {
+            if (branch.head)
+                kept_[branch.head->GetId()].branches.push_back(&branch);
         }
     }
 
@@ -69,10 +70,12 @@ public:
 
     /// Stores the kept commits anew, each with the nearest kept ancestor as parent, and moves the branches.
     void Rebuild() const {
+        BranchMoves moves(&storage_, branches_.size());
         for (auto const& [id, kept] : kept_) {
             if (!kept.hasParent)
-                RebuildFrom(id);
+                RebuildFrom(id, moves);
         }
+        moves.Keep();
     }
 
 private:
@@ -91,17 +94,17 @@ private:
     }
 
     /// Depth-first, on a stack of its own since a chain may keep any number of commits.
-    void RebuildFrom(Id const& root) const {
+    void RebuildFrom(Id const& root, BranchMoves& moves) const {
         struct Level {
             KeptCommit const* kept;
             cow_ptr<Commit> rebuilt;
             std::size_t nextChild = 0;
         };
         std::vector<Level> levels;
-        const auto open = [this, &levels](Id const& id, cow_ptr<Commit> const& parent) {
+        const auto open = [&](Id const& id, cow_ptr<Commit> const& parent) {
             if (auto commit = storage_.GetCommit(id)) {
                 auto const& kept = kept_.at(id);
-                levels.push_back({&kept, RebuildCommit(std::move(commit), parent, kept)});
+                levels.push_back({&kept, RebuildCommit(std::move(commit), parent, kept, moves)});
             }
         };
         open(root, nullptr);
@@ -114,14 +117,17 @@ private:
         }
     }
 
-    cow_ptr<Commit> RebuildCommit(cow_ptr<Commit> commit, cow_ptr<Commit> const& parent, KeptCommit const& kept) const {
+    cow_ptr<Commit> RebuildCommit(cow_ptr<Commit> commit, cow_ptr<Commit> const& parent, KeptCommit const& kept,
+                                  BranchMoves& moves) const {
         commit.write()->SetParent(parent);
         auto rebuilt = repository_.SyncWithStorage(std::move(commit));
-        for (auto const& branch : kept.branches) {
-            if (repository_.BranchExist(branch))
-                repository_.MoveBranchTo(branch, rebuilt);
-            else
-                repository_.CreateBranch(branch, rebuilt);
+        for (Branch const* const branch : kept.branches) {
+            if (repository_.BranchExist(branch->name)) {
+                moves.NoteMove(branch->name, branch->head);
+                repository_.MoveBranchTo(branch->name, rebuilt);
+            } else if (repository_.CreateBranch(branch->name, rebuilt)) {
+                moves.NoteNew(branch->name);
+            }
         }
         return rebuilt;
     }

@@ -4,8 +4,8 @@ namespace KivVcs {
 
 namespace {
 
-template <class Table>
-typename Table::mapped_type FindIn(Table const& table, typename Table::key_type const& key) {
+template <class Table, class Key>
+typename Table::mapped_type FindIn(Table const& table, Key const& key) {
     const auto found = table.find(key);
     return found == table.end() ? nullptr : found->second;
 }
@@ -91,7 +91,7 @@ void MemObjectsStorage::DeleteCommit(cow_ptr<Commit> commit) {
 }
 
 bool MemObjectsStorage::BranchExist(KivStringViewT<char16_t> name) const {
-    return references_.contains(name.ToString());
+    return references_.contains(name);
 }
 
 bool MemObjectsStorage::CreateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) {
@@ -99,13 +99,17 @@ bool MemObjectsStorage::CreateBranch(KivStringViewT<char16_t> name, cow_ptr<Comm
 }
 
 bool MemObjectsStorage::RemoveBranch(KivStringViewT<char16_t> name) {
-    return references_.erase(name.ToString()) > 0;
+    const auto branch = references_.find(name);
+    if (branch == references_.end())
+        return false;
+    references_.erase(branch);
+    return true;
 }
 
 bool MemObjectsStorage::UpdateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) {
     if (name.IsEmpty() || !commit)
         return false;
-    const auto branch = references_.find(name.ToString());
+    const auto branch = references_.find(name);
     if (branch == references_.end())
         return false;
     branch->second = std::move(commit);
@@ -113,7 +117,7 @@ bool MemObjectsStorage::UpdateBranch(KivStringViewT<char16_t> name, cow_ptr<Comm
 }
 
 cow_ptr<Commit> MemObjectsStorage::GetHead(KivStringViewT<char16_t> name) const {
-    return FindIn(references_, name.ToString());
+    return FindIn(references_, name);
 }
 
 std::vector<KivStringT<char16_t>> MemObjectsStorage::GetCommitBranches(cow_ptr<Commit> commit) const {

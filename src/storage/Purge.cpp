@@ -62,7 +62,12 @@ private:
     /// is not may die with it and release stored objects further down, which only another sweep finds.
     void ListReleased(T const& dying) {
         const std::size_t listedBefore = released_.size();
-        AddVcsDependencies(dying, released_);
+        try {
+            AddVcsDependencies(dying, released_);
+        } catch (std::bad_alloc const&) {
+            // The list saves sweeps, nothing else: what did not get into it is found by the next one.
+            missedRelease_ = true;
+        }
         for (std::size_t index = listedBefore; index < released_.size(); ++index)
             missedRelease_ = missedRelease_ || !table_.contains(released_[index]);
     }
