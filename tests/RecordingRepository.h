@@ -72,6 +72,28 @@ inline std::string NameOf(cow_ptr<Commit> const& commit) {
     return commit ? Narrow(commit->GetDescription()) : "-";
 }
 
+/// A host that hands out the packed forms of what a repository stores.
+class PackedFormsOf {
+public:
+    explicit PackedFormsOf(Repository const& repo) : repo_(repo) {}
+
+    PortableVersion::Delegate<StreamIO(Id const&)> Loader() {
+        return [this](Id const& id) {
+            for (cow_ptr<Object> const& stored :
+                 {cow_ptr<Object>(repo_.GetTreeFromStorage(id)), cow_ptr<Object>(repo_.GetBlobFromStorage(id)),
+                  cow_ptr<Object>(repo_.GetCommitFromStorage(id))}) {
+                if (stored)
+                    return StreamIO(MemStream::CreateOnRef(lent_[id] = stored->GetPackedData()));
+            }
+            return StreamIO();
+        };
+    }
+
+private:
+    Repository const& repo_;
+    std::unordered_map<Id, Buffer> lent_;
+};
+
 /// Tells in order which overridable operations are called, and fails on request.
 class RecordingRepository : public Repository {
 public:
