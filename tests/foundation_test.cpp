@@ -32,7 +32,7 @@ TEST(Text, CopiesShareTheirCharactersUntilOneChanges) {
     EXPECT_EQ(static_cast<const void*>(copy.Mid(-3, 99).GetString()), original.GetString());
     copy += '/';
     copy += copy;
-    copy += copy.GetString() + 7;
+    copy += copy.GetString() + copy.GetLength() / 2;
     EXPECT_EQ(original, "branch");
     copy += '!';
     const Text withRoomToGrow = copy;
