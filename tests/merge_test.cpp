@@ -241,11 +241,13 @@ TEST_F(Merging, TheLaterStampWinsAtTheFirstLevelThatDecides) {
         {"stamp=3", "stamp=3", "d/f", Undecided},
         {"-", "-", "d/f", Undecided},
     };
-    const auto timeOf = [](cow_ptr<Blob> blob) -> optional<Time> {
+    std::string read;
+    const auto timeOf = [&read](cow_ptr<Blob> blob) -> optional<Time> {
         const auto text = Helpers::StringAFromBuffer(blob->GetData());
+        read += text.GetString();
         std::uint64_t ticks = 0;
-        const auto read = std::from_chars(text.GetString(), text.GetString() + text.GetLength(), ticks);
-        return read.ec == std::errc() ? optional<Time>(Time(ticks)) : std::nullopt;
+        const auto end = std::from_chars(text.GetString(), text.GetString() + text.GetLength(), ticks);
+        return end.ec == std::errc() ? optional<Time>(Time(ticks)) : std::nullopt;
     };
     const auto resolver = TimeBasedConflictResolver({u"stamp", u"time", u"meta/stamp"}, timeOf);
     for (auto const& [left, right, path, choice] : cases) {
@@ -254,6 +256,9 @@ TEST_F(Merging, TheLaterStampWinsAtTheFirstLevelThatDecides) {
         EXPECT_EQ(resolver(Helpers::SplitVcsPath(text), Trees("-", left, right)), choice);
     }
     const auto stamped = Trees("-", "stamp=1", "stamp=2");
+    read.clear();
+    EXPECT_EQ(resolver({}, stamped), Right);
+    EXPECT_EQ(read, "12") << "the left side is read first";
     EXPECT_EQ(TimeBasedConflictResolver({}, timeOf)({}, stamped), Undecided);
     EXPECT_THROW(TimeBasedConflictResolver({u"stamp"}, nullptr)({}, stamped), std::bad_function_call);
 }

@@ -31,7 +31,9 @@ public:
         const auto left = TreesAlong(std::move(trees.left), path);
         const auto right = TreesAlong(std::move(trees.right), path);
         for (std::size_t depth = path.size() + 1; depth-- > 0;) {
-            const ConflictChoice choice = Compare(TimeAt(left, depth), TimeAt(right, depth));
+            // The left side first: arguments would be evaluated in any order, and hosts see which stamp is read when.
+            const auto leftTime = TimeAt(left, depth);
+            const ConflictChoice choice = Compare(leftTime, TimeAt(right, depth));
             if (choice != ConflictChoice::Undecided)
                 return choice;
         }
