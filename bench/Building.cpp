@@ -5,7 +5,8 @@ namespace KivVcs::Bench {
 
 namespace {
 
-Round Blobs(std::int64_t count, std::int64_t size, bool fromReadyBuffers) {
+/// Blobs of buffers that are ready, or are copied from the host's memory as part of the work.
+Round Blobs(std::int64_t count, std::int64_t size, bool copied) {
     auto content = std::make_shared<std::vector<char>>(static_cast<std::size_t>(count * size), 'c');
     for (std::int64_t blob = 0; blob < count; ++blob) {
         const std::string number = std::to_string(blob);
@@ -16,78 +17,67 @@ Round Blobs(std::int64_t count, std::int64_t size, bool fromReadyBuffers) {
         buffer.Append(content->data() + blob * size, static_cast<std::uint64_t>(size));
         return buffer;
     };
-    const auto operations = static_cast<std::uint64_t>(count);
-    if (!fromReadyBuffers)
-        return Storing(
-            operations,
-            [=](Repository& repo) {
-                for (std::int64_t blob = 0; blob < count; ++blob)
-                    repo.SyncWithStorage(immu::make<Blob>(contentOf(blob)));
-            },
-            content.get());
-    return [=, floor = HashFloor()]() mutable {
-        Measurement result{.operations = operations};
-        const std::int64_t before = LiveBytes();
-        auto repo = MakeRepository();
-        for (std::int64_t blob = 0; blob < count; ++blob) {
-            Buffer buffer = contentOf(blob);
-            result.seconds += SecondsOf([&] { repo->SyncWithStorage(immu::make<Blob>(std::move(buffer))); });
-        }
-        result.keptBytes = LiveBytes() - before;
-        if (floor.IsEmpty())
-            floor.AddStored(*repo);
-        repo.reset();
-        result.floorSeconds = floor.Run(content.get());
-        return result;
+    const auto bring = [=] {
+        std::vector<Buffer> buffers;
+        for (std::int64_t blob = 0; blob < (copied ? 0 : count); ++blob)
+            buffers.push_back(contentOf(blob));
+        return buffers;
     };
+    const auto store = [=](Repository& repo, std::vector<Buffer>& buffers) {
+        for (std::int64_t blob = 0; blob < count; ++blob) {
+            Buffer buffer = copied ? contentOf(blob) : std::move(buffers[static_cast<std::size_t>(blob)]);
+            repo.SyncWithStorage(immu::make<Blob>(std::move(buffer)));
+        }
+    };
+    return Storing(static_cast<std::uint64_t>(count), bring, store, content);
 }
 
 Round FilesByPath(std::int64_t count, std::vector<int> const& directories) {
-    auto files = MakeFiles(FilePaths(count, directories));
-    return Storing(static_cast<std::uint64_t>(count), [files = std::move(files)](Repository& repo) {
+    const auto bring = [count] { return SmallContents(count); };
+    const auto add = [paths = FilePaths(count, directories)](Repository& repo, std::vector<Buffer>& contents) {
         Commit commit(&repo, false);
-        for (auto const& [path, text] : files)
-            commit.AddBlob(&repo, path, MakeBlob(text));
+        for (std::size_t file = 0; file < paths.size(); ++file)
+            commit.AddBlob(&repo, paths[file], Blob(std::move(contents[file])));
         repo.DoCommit(commit);
-    });
+    };
+    return Storing(static_cast<std::uint64_t>(count), bring, add);
 }
 
 Round LocalTrees(std::int64_t count) {
-    auto files = MakeFiles(FilePaths(count, {}));
-    auto directories = DirectoryNames(count / 100);
-    return Storing(static_cast<std::uint64_t>(count), [=](Repository& repo) {
+    const auto bring = [count] { return SmallContents(count); };
+    const auto build = [files = FilePaths(count, {}),
+                        directories = DirectoryNames(count / 100)](Repository& repo, std::vector<Buffer>& contents) {
         Commit commit(&repo, false);
-        commit.ReplaceRoot(&repo, MakeTwoLevels(repo, files, directories));
+        commit.ReplaceRoot(&repo, MakeTwoLevels(repo, files, contents, directories));
         repo.DoCommit(commit);
-    });
+    };
+    return Storing(static_cast<std::uint64_t>(count), bring, build);
 }
 
 Round SmallCommits(std::int64_t count) {
-    const auto paths = FilePaths(1000, {10, 10});
-    std::vector<std::string> texts;
-    for (std::int64_t number = 0; number < count; ++number)
-        texts.push_back(SmallText(number, 1));
-    return [=, floor = HashFloor()]() mutable {
+    return [count, paths = FilePaths(1000, {10, 10}), floor = HashFloor()]() mutable {
         auto repo = MakeRepository();
         Commit first(repo.get(), false);
         for (Path const& path : paths)
-            first.AddBlob(repo.get(), path, MakeBlob("first"));
+            first.AddBlob(repo.get(), path, Blob(SmallContent(0)));
         repo->DoCommit(first);
         repo->UpdateStorage();
+        const auto known = floor.IsEmpty() ? StoredIds(*repo) : std::unordered_set<Id>();
 
         Measurement result{.operations = static_cast<std::uint64_t>(count)};
-        const std::int64_t before = LiveBytes();
-        result.seconds = SecondsOf([&] {
-            for (std::size_t number = 0; number < texts.size(); ++number) {
+        const MemoryTaken taken;
+        auto contents = SmallContents(count, 1);
+        result.seconds = LibrarySecondsOf([&] {
+            for (std::size_t number = 0; number < contents.size(); ++number) {
                 Commit commit(repo.get(), false);
-                commit.AddBlob(repo.get(), paths[number * 37 % paths.size()], MakeBlob(texts[number]));
+                commit.AddBlob(repo.get(), paths[number * 37 % paths.size()], Blob(std::move(contents[number])));
                 repo->DoCommit(commit);
             }
         });
-        result.keptBytes = LiveBytes() - before;
-        // About a hundred trees of the first commit more than was hashed, which is less than one in a hundred.
+        contents = {};
+        taken.WriteTo(result);
         if (floor.IsEmpty())
-            floor.AddStored(*repo);
+            floor.AddStored(*repo, known);
         repo.reset();
         result.floorSeconds = floor.Run();
         return result;
@@ -100,15 +90,15 @@ Round OneFileOfMany(std::int64_t count) {
     commit.ReplaceRoot(repo.get(), MakeTwoLevels(*repo, count, count)->GetLocalTree(u"directory-000000"));
     repo->DoCommit(commit);
     HashFloor floor;
-    floor.AddTree(*commit.GetCommitTree()->GetRoot());
+    floor.AddForm(*commit.GetCommitTree()->GetRoot());
     return [=, number = std::int64_t{0}]() mutable {
         Measurement result;
         const Path path = Numbered("file-", ++number * 7919 % count);
-        const Blob blob = MakeBlob(SmallText(number, 1));
-        const std::int64_t before = LiveBytes();
+        const MemoryTaken taken;
+        const Blob blob(SmallContent(number, 1));
         Commit next(repo.get(), false);
-        result.seconds = SecondsOf([&] { next.AddBlob(repo.get(), path, blob); });
-        result.keptBytes = LiveBytes() - before;
+        result.seconds = LibrarySecondsOf([&] { next.AddBlob(repo.get(), path, blob); });
+        taken.WriteTo(result);
         result.floorSeconds = floor.Run();
         return result;
     };
@@ -116,26 +106,33 @@ Round OneFileOfMany(std::int64_t count) {
 
 } // namespace
 
-void AddBuildingWorkloads(std::vector<Workload>& workloads, bool quick) {
-    const auto add = [&](char const* name, std::int64_t whole, double ratio, double bytes, auto rounds,
-                         int roundsInOne = 1) {
-        for (const std::int64_t size : Sizes(quick, whole))
-            workloads.push_back({name, size, ratio, bytes, [=] { return rounds(size); }, roundsInOne});
+void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
+    const auto add = [&](std::string const& name, std::int64_t whole, Limits limits, auto rounds, int roundsInOne = 1) {
+        for (const std::int64_t divisor : divisors)
+            workloads.push_back({name, whole / divisor, limits, [=] { return rounds(whole / divisor); }, roundsInOne});
     };
-    for (const std::int64_t size : Sizes(quick, std::int64_t{1} << 28)) {
-        const double bytes = 1.01 * static_cast<double>(size);
-        workloads.push_back(
-            {"B1 one blob from a ready buffer", size, 1.15, bytes, [=] { return Blobs(1, size, true); }});
-        workloads.push_back(
-            {"B1 the same, copied from the host", size, 0, bytes, [=] { return Blobs(1, size, false); }});
+    const auto addBlobs = [&](std::string const& name, std::int64_t count, std::int64_t size, Limits limits) {
+        for (const bool copied : {false, true}) {
+            add(name + (copied ? ", copied" : ""), count, copied ? Limits{} : limits,
+                [=](std::int64_t number) { return Blobs(number, size, copied); });
+        }
+    };
+    constexpr std::int64_t oneBlob = std::int64_t{1} << 28;
+    for (const bool copied : {false, true}) {
+        for (const std::int64_t divisor : divisors) {
+            const std::int64_t size = oneBlob / divisor;
+            const Limits limits{copied ? 0 : 1.15, copied ? 0 : 1.01 * static_cast<double>(size)};
+            workloads.push_back(
+                {copied ? "B1 one blob, copied" : "B1 one blob", size, limits, [=] { return Blobs(1, size, copied); }});
+        }
     }
-    add("B2 blobs of 64 KiB", 1000, 1.25, 65536 + 600, [](auto count) { return Blobs(count, 65536, false); });
-    add("B3 blobs of 200 B", 100'000, 2.5, 200 + 260, [](auto count) { return Blobs(count, 200, false); });
-    add("B4 files by path, one directory", 16'000, 1.5, 6144, [](auto count) { return FilesByPath(count, {}); });
-    add("B5 files by path, three levels", 10'000, 2.5, 3072, [](auto count) { return FilesByPath(count, {20, 25}); });
-    add("B6 files in local trees", 100'000, 3.5, 450, LocalTrees);
-    add("B7 commits of one change", 20'000, 3.5, 2.2 * 1024, SmallCommits);
-    add("B14 one file of a directory", 100'000, 1.1, 8192, OneFileOfMany, 20);
+    addBlobs("B2 blobs of 64 KiB", 1000, 65536, {1.25, 65536 + 600});
+    addBlobs("B3 blobs of 200 B", 100'000, 200, {2.5, 200 + 260});
+    add("B4 files by path, one directory", 16'000, {1.5, 6144}, [](auto count) { return FilesByPath(count, {}); });
+    add("B5 files by path, three levels", 10'000, {2.5, 3072}, [](auto count) { return FilesByPath(count, {20, 25}); });
+    add("B6 files in local trees", 100'000, {3.5, 450}, LocalTrees);
+    add("B7 commits of one change", 20'000, {3.5, 2.2 * 1024}, SmallCommits);
+    add("B14 one file of a directory", 100'000, {1.1, 8192}, OneFileOfMany, 20);
 }
 
 } // namespace KivVcs::Bench

@@ -23,21 +23,18 @@ std::vector<Path> FilePaths(std::int64_t count, std::vector<int> const& director
     return paths;
 }
 
-std::string SmallText(std::int64_t number, int version) {
-    return "content " + std::to_string(number) + " version " + std::to_string(version);
-}
-
-Blob MakeBlob(std::string const& text) {
+Buffer SmallContent(std::int64_t number, int version) {
+    const std::string text = "content " + std::to_string(number) + " version " + std::to_string(version);
     Buffer buffer;
     buffer.Append(text.data(), text.size());
-    return Blob(std::move(buffer));
+    return buffer;
 }
 
-std::vector<HostFile> MakeFiles(std::vector<Path> names, int version) {
-    std::vector<HostFile> files;
-    for (Path& name : names)
-        files.push_back({std::move(name), SmallText(static_cast<std::int64_t>(files.size()), version)});
-    return files;
+std::vector<Buffer> SmallContents(std::int64_t count, int version) {
+    std::vector<Buffer> contents;
+    for (std::int64_t number = 0; number < count; ++number)
+        contents.push_back(SmallContent(number, version));
+    return contents;
 }
 
 std::vector<Path> DirectoryNames(std::int64_t count) {
@@ -47,21 +44,22 @@ std::vector<Path> DirectoryNames(std::int64_t count) {
     return names;
 }
 
-cow_ptr<Tree> MakeTwoLevels(Repository& repo, std::vector<HostFile> const& files,
+cow_ptr<Tree> MakeTwoLevels(Repository& repo, std::vector<Path> const& files, std::vector<Buffer>& contents,
                             std::vector<Path> const& directories) {
     Tree root;
     const std::size_t inEach = files.size() / directories.size();
     for (std::size_t number = 0; number < directories.size(); ++number) {
         Tree directory;
         for (std::size_t file = number * inEach; file < (number + 1) * inEach; ++file)
-            directory.AddBlob(&repo, files[file].name, MakeBlob(files[file].text));
+            directory.AddBlob(&repo, files[file], Blob(std::move(contents[file])));
         root.AddTree(&repo, directories[number], directory);
     }
     return repo.SyncWithStorage(immu::make<Tree>(std::move(root)));
 }
 
 cow_ptr<Tree> MakeTwoLevels(Repository& repo, std::int64_t files, std::int64_t inEach) {
-    return MakeTwoLevels(repo, MakeFiles(FilePaths(files, {})), DirectoryNames(files / inEach));
+    auto contents = SmallContents(files);
+    return MakeTwoLevels(repo, FilePaths(files, {}), contents, DirectoryNames(files / inEach));
 }
 
 cow_ptr<Tree> ChangeTwoLevels(Repository& repo, Tree const& tree, std::int64_t inEach, std::int64_t first,
@@ -73,7 +71,7 @@ cow_ptr<Tree> ChangeTwoLevels(Repository& repo, Tree const& tree, std::int64_t i
         const Path name = Numbered("directory-", number);
         Tree directory(*root.GetLocalTree(name));
         for (; file < end && file / inEach == number; file += step)
-            directory.AddBlob(&repo, Numbered("file-", file), MakeBlob(SmallText(file, version)));
+            directory.AddBlob(&repo, Numbered("file-", file), Blob(SmallContent(file, version)));
         root.AddTree(&repo, name, directory);
     }
     root.ResetState();

@@ -18,23 +18,17 @@ using Path = KivStringT<char16_t>;
 /// The paths of @p count files, spread evenly over @p directories.
 [[nodiscard]] std::vector<Path> FilePaths(std::int64_t count, std::vector<int> const& directories);
 
-/// A short text that tells @p number and @p version.
-[[nodiscard]] std::string SmallText(std::int64_t number, int version = 0);
-[[nodiscard]] Blob MakeBlob(std::string const& text);
-
-/// A file as the host has it, so that making it up is not measured.
-struct HostFile {
-    Path name;
-    std::string text;
-};
-[[nodiscard]] std::vector<HostFile> MakeFiles(std::vector<Path> names, int version = 0);
+/// A short content that tells @p number and @p version.
+[[nodiscard]] Buffer SmallContent(std::int64_t number, int version = 0);
+/// The contents of files 0 to @p count, as a host has them that has read them.
+[[nodiscard]] std::vector<Buffer> SmallContents(std::int64_t count, int version = 0);
 
 /// The first level of the trees below.
 [[nodiscard]] std::vector<Path> DirectoryNames(std::int64_t count);
 
-/// A tree of @p files in @p directories, evenly, built from the bottom up and stored.
-[[nodiscard]] cow_ptr<Tree> MakeTwoLevels(Repository& repo, std::vector<HostFile> const& files,
-                                          std::vector<Path> const& directories);
+/// A tree of the files in @p directories, evenly, built from the bottom up and stored. Takes the contents.
+[[nodiscard]] cow_ptr<Tree> MakeTwoLevels(Repository& repo, std::vector<Path> const& files,
+                                          std::vector<Buffer>& contents, std::vector<Path> const& directories);
 /// The same of numbered files, @p inEach directory.
 [[nodiscard]] cow_ptr<Tree> MakeTwoLevels(Repository& repo, std::int64_t files, std::int64_t inEach);
 

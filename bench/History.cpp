@@ -1,6 +1,7 @@
 #include "Content.h"
 #include "Measuring.h"
 
+#include <algorithm>
 #include <stdexcept>
 #include <unordered_set>
 
@@ -37,10 +38,13 @@ Round CommonBase(std::int64_t count) {
     }
     return [=] {
         Measurement result{.operations = static_cast<std::uint64_t>(2 * count)};
+        const MemoryTaken taken;
         ForgetPeak();
         const std::int64_t before = LiveBytes();
         cow_ptr<Commit> found;
-        result.seconds = SecondsOf([&] { found = repo->GetCommonBase(first, second); });
+        result.seconds = LibrarySecondsOf([&] { found = repo->GetCommonBase(first, second); });
+        taken.WriteTo(result);
+        // Nothing stays: what counts is what was needed meanwhile.
         result.keptBytes = PeakBytes() - before;
         if (!(found == base))
             throw std::runtime_error("another common base");
@@ -84,7 +88,7 @@ Round Simplification(std::int64_t count, int branches) {
         trunk.reset();
         lines.clear();
         bool good = ticks > 0;
-        result.seconds = SecondsOf([&] { good &= repo->SimplifyCommitGraph(true); });
+        result.seconds = LibrarySecondsOf([&] { good &= repo->SimplifyCommitGraph(true); });
         if (!good)
             throw std::runtime_error("not simplified");
         return result;
@@ -94,7 +98,7 @@ Round Simplification(std::int64_t count, int branches) {
 double ReleaseChain(std::int64_t count, bool stored) {
     auto repo = MakeRepository();
     cow_ptr<Commit> tip = Grow(stored ? repo.get() : nullptr, nullptr, count, u"author");
-    return SecondsOf([&] {
+    return LibrarySecondsOf([&] {
         repo.reset();
         tip.reset();
     });
@@ -109,7 +113,7 @@ double ReleaseDeepTree(std::int64_t depth) {
         tree = immu::make<Tree>(std::move(above));
     }
     repo.reset();
-    return SecondsOf([&] { tree.reset(); });
+    return LibrarySecondsOf([&] { tree.reset(); });
 }
 
 /// The floor is four times what a quarter of the size takes, so that the ratio tells how far from linear it is.
@@ -125,22 +129,27 @@ Round Growth(std::int64_t size, Release release) {
 
 } // namespace
 
-void AddHistoryWorkloads(std::vector<Workload>& workloads, bool quick) {
-    for (const std::int64_t count : Sizes(quick, 100'000)) {
-        workloads.push_back({"B10 common base of two chains", count, 1, 64, [=] { return CommonBase(count); }});
-        for (const int branches : {1, 20, 1000})
-            workloads.push_back({"B12 simplification, " + std::to_string(branches) + " branches", count, 0, 0,
-                                 [=] { return Simplification(count, branches); }});
+void AddHistoryWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
+    constexpr double linear = 1.5;
+    for (const std::int64_t divisor : divisors) {
+        const std::int64_t count = 100'000 / divisor;
+        workloads.push_back({"B10 common base of two chains", count, {1, 64}, [=] { return CommonBase(count); }});
+        for (const int branches : {1, 20, 1000}) {
+            const std::int64_t commits = std::max<std::int64_t>(count, 4 * branches);
+            workloads.push_back(
+                {"B12 simplification, branches: " + std::to_string(branches), commits, {0, 0, 4 * linear}, [=] {
+                     return Simplification(commits, branches);
+                 }});
+        }
     }
-    const std::int64_t million = Sizes(quick, 1'000'000).back();
-    const std::int64_t depth = Sizes(quick, 100'000).back();
-    const double linear = 1.5;
-    workloads.push_back({"B13 a chain released", million, linear, 0,
-                         [=] { return Growth(million, [](auto size) { return ReleaseChain(size, false); }); }});
-    workloads.push_back({"B13 a repository of it released", million, linear, 0,
-                         [=] { return Growth(million, [](auto size) { return ReleaseChain(size, true); }); }});
-    workloads.push_back({"B13 a deep tree released", depth, linear, 0,
-                         [=] { return Growth(depth, [](auto size) { return ReleaseDeepTree(size); }); }});
+    const auto addGrowth = [&](char const* name, std::int64_t whole, auto release) {
+        workloads.push_back({name, whole / divisors.back(), {linear}, [=, size = whole / divisors.back()] {
+                                 return Growth(size, release);
+                             }});
+    };
+    addGrowth("B13 a chain released", 1'000'000, [](auto size) { return ReleaseChain(size, false); });
+    addGrowth("B13 a repository of it released", 1'000'000, [](auto size) { return ReleaseChain(size, true); });
+    addGrowth("B13 a deep tree released", 100'000, ReleaseDeepTree);
 }
 
 } // namespace KivVcs::Bench

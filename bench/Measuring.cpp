@@ -6,14 +6,34 @@
 
 namespace KivVcs::Bench {
 
-std::vector<std::int64_t> Sizes(bool quick, std::int64_t whole) {
-    if (quick)
-        return {whole / 16};
-    return {whole / 4, whole};
+MemoryTaken::MemoryTaken() : live_(LiveBytes()), resident_(0) {
+    if (CountsMemory()) {
+        ForgetResidentPeak();
+        resident_ = PeakResidentBytes();
+    }
+}
+
+void MemoryTaken::WriteTo(Measurement& measurement) const {
+    measurement.keptBytes = LiveBytes() - live_;
+    if (CountsMemory())
+        measurement.residentBytes = PeakResidentBytes() - resident_;
 }
 
 std::unique_ptr<Repository> MakeRepository() {
     return std::make_unique<Repository>(std::make_unique<MemObjectsStorage>());
+}
+
+std::unordered_set<Id> StoredIds(Repository const& repo) {
+    std::unordered_set<Id> ids;
+    const auto add = [&ids](auto const& table) {
+        for (auto const& [id, object] : table)
+            ids.insert(id);
+    };
+    IObjectsStorage const& storage = *repo.GetStorage();
+    add(storage.GetBlobs());
+    add(storage.GetTrees());
+    add(storage.GetCommits());
+    return ids;
 }
 
 struct HashFloor::Context {
@@ -31,19 +51,17 @@ struct HashFloor::Context {
 
 HashFloor::HashFloor() : context_(std::make_shared<Context>()) {}
 
-void HashFloor::AddTree(Tree const& tree) {
-    const Tree copy(tree);
-    Add(copy.GetPackedData().GetSize());
-}
-
-void HashFloor::AddStored(Repository const& repo) {
+void HashFloor::AddStored(Repository const& repo, std::unordered_set<Id> const& known) {
+    const auto add = [&](auto const& table) {
+        for (auto const& [id, object] : table) {
+            if (!known.contains(id))
+                AddForm(*object);
+        }
+    };
     IObjectsStorage const& storage = *repo.GetStorage();
-    for (auto const& [id, blob] : storage.GetBlobs())
-        Add(Blob(*blob).GetPackedData().GetSize());
-    for (auto const& [id, tree] : storage.GetTrees())
-        AddTree(*tree);
-    for (auto const& [id, commit] : storage.GetCommits())
-        Add(Commit(*commit).GetPackedData().GetSize());
+    add(storage.GetBlobs());
+    add(storage.GetTrees());
+    add(storage.GetCommits());
 }
 
 double HashFloor::Run(std::vector<char> const* content) {

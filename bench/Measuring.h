@@ -11,36 +11,46 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <unordered_set>
+#include <valgrind/callgrind.h>
 #include <vector>
 
 namespace KivVcs::Bench {
 
-/// One round of a workload.
+/// One round of a workload. Memory is told only by rounds that are run while it is counted.
 struct Measurement {
     double seconds = 0;
     double floorSeconds = 0;
     std::int64_t keptBytes = 0;
+    std::int64_t residentBytes = 0;
     std::uint64_t operations = 1;
 };
 
 using Round = std::function<Measurement()>;
 
-/// A row of the table. What it needs is made by `prepare`, outside of all times; limits of 0 are none.
+/// What a row of the table must stay below; 0 is no limit.
+struct Limits {
+    double ratio = 0;
+    double bytes = 0;
+    /// How much longer the whole size may take than a quarter of it.
+    double growth = 0;
+};
+
+/// A row of the table. What it needs is made by `prepare`, outside of all times.
 struct Workload {
     std::string name;
     std::int64_t size = 0;
-    double ratioLimit = 0;
-    double bytesLimit = 0;
+    Limits limits;
     std::function<Round()> prepare;
     int roundsInOne = 1;
 };
 
-/// The sizes that a workload is run with: a quarter and the whole, or one small size.
-[[nodiscard]] std::vector<std::int64_t> Sizes(bool quick, std::int64_t whole);
+/// The sizes to run with: the whole size of each workload, divided by each of these.
+using Divisors = std::vector<std::int64_t>;
 
-void AddBuildingWorkloads(std::vector<Workload>& workloads, bool quick);
-void AddReadingWorkloads(std::vector<Workload>& workloads, bool quick);
-void AddHistoryWorkloads(std::vector<Workload>& workloads, bool quick);
+void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
+void AddReadingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
+void AddHistoryWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
 
 /// The processor time that @p work takes, in seconds. Unlike the time on the wall it does not grow with what else the
 /// machine does.
@@ -56,16 +66,40 @@ template <class Work>
     return now() - start;
 }
 
+/// The same of what the library does, the part of a round whose instructions are counted.
+template <class Work>
+[[nodiscard]] double LibrarySecondsOf(Work&& work) {
+    return SecondsOf([&] {
+        CALLGRIND_TOGGLE_COLLECT;
+        work();
+        CALLGRIND_TOGGLE_COLLECT;
+    });
+}
+
+/// The memory taken and not given back since its construction, and the most that the process has grown meanwhile.
+class MemoryTaken {
+public:
+    MemoryTaken();
+    void WriteTo(Measurement& measurement) const;
+
+private:
+    std::int64_t live_;
+    std::int64_t resident_;
+};
+
 /// The bytes that a workload must hash, hashed as fast as the best known implementation can: one digest for each piece.
 class HashFloor {
 public:
     HashFloor();
     /// Pieces of the given sizes, all read from the same bytes, which stay in the cache.
     void Add(std::uint64_t size) { sizes_.push_back(size); }
-    /// The packed forms of everything that @p repo stores.
-    void AddStored(Repository const& repo);
-    /// The packed form of a tree, without leaving it cached.
-    void AddTree(Tree const& tree);
+    /// The packed forms of everything that @p repo stores, except what is @p known.
+    void AddStored(Repository const& repo, std::unordered_set<Id> const& known = {});
+    /// The packed form of an object, made from a copy, so that it does not stay with the object.
+    template <class T>
+    void AddForm(T const& object) {
+        Add(T(object).GetPackedData().GetSize());
+    }
 
     [[nodiscard]] bool IsEmpty() const noexcept { return sizes_.empty(); }
     /// The seconds that it takes. With @p content, pieces are read from there, one after the other.
@@ -81,21 +115,26 @@ private:
 
 /// A repository in memory.
 [[nodiscard]] std::unique_ptr<Repository> MakeRepository();
+/// The identifiers of all that it stores.
+[[nodiscard]] std::unordered_set<Id> StoredIds(Repository const& repo);
 
-/// Rounds that let @p work fill a new repository, and hash what that stored as the floor. @p content holds the bytes of
-/// the blobs one after the other, where they are too many for the cache.
-template <class Work>
-[[nodiscard]] Round Storing(std::uint64_t operations, Work work, std::vector<char> const* content = nullptr) {
-    return [operations, work, content, floor = HashFloor()]() mutable {
+/// Rounds that let @p work fill a new repository with what @p bring has made ready, and hash what that stored as the
+/// floor. @p content holds the bytes of the blobs one after the other, where they are too many for the cache.
+template <class Bring, class Work>
+[[nodiscard]] Round Storing(std::uint64_t operations, Bring bring, Work work,
+                            std::shared_ptr<std::vector<char>> content = nullptr) {
+    return [=, floor = HashFloor()]() mutable {
         Measurement result{.operations = operations};
-        const std::int64_t before = LiveBytes();
+        const MemoryTaken taken;
+        auto brought = bring();
         auto repo = MakeRepository();
-        result.seconds = SecondsOf([&] { work(*repo); });
-        result.keptBytes = LiveBytes() - before;
+        result.seconds = LibrarySecondsOf([&] { work(*repo, brought); });
+        brought = {};
+        taken.WriteTo(result);
         if (floor.IsEmpty())
             floor.AddStored(*repo);
         repo.reset();
-        result.floorSeconds = floor.Run(content);
+        result.floorSeconds = floor.Run(content.get());
         return result;
     };
 }

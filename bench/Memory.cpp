@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <fstream>
+#include <limits>
 #include <malloc.h>
 #include <new>
 #include <string>
@@ -10,6 +11,7 @@
 namespace {
 
 // Plain integers: the benchmarks run on one thread, and an atomic would be paid for in every time measured.
+bool counting = false;
 std::int64_t live = 0;
 std::int64_t peak = 0;
 
@@ -19,13 +21,16 @@ void* operator new(std::size_t size) {
     void* const block = std::malloc(size);
     if (block == nullptr)
         throw std::bad_alloc();
-    live += static_cast<std::int64_t>(malloc_usable_size(block));
-    peak = std::max(peak, live);
+    if (counting) {
+        live += static_cast<std::int64_t>(malloc_usable_size(block));
+        peak = std::max(peak, live);
+    }
     return block;
 }
 
 void operator delete(void* block) noexcept {
-    live -= static_cast<std::int64_t>(malloc_usable_size(block));
+    if (counting)
+        live -= static_cast<std::int64_t>(malloc_usable_size(block));
     std::free(block);
 }
 
@@ -34,6 +39,14 @@ void operator delete(void* block, std::size_t) noexcept {
 }
 
 namespace KivVcs::Bench {
+
+void CountMemory(bool counted) noexcept {
+    counting = counted;
+}
+
+bool CountsMemory() noexcept {
+    return counting;
+}
 
 std::int64_t LiveBytes() noexcept {
     return live;
@@ -45,6 +58,11 @@ std::int64_t PeakBytes() noexcept {
 
 void ForgetPeak() noexcept {
     peak = live;
+}
+
+void KeepFreedMemory() {
+    mallopt(M_MMAP_MAX, 0);
+    mallopt(M_TRIM_THRESHOLD, std::numeric_limits<int>::max());
 }
 
 std::int64_t PeakResidentBytes() {

@@ -7,15 +7,24 @@
 
 namespace KivVcs::Bench {
 
-/// The usable bytes of all blocks held now.
+/// Counts from now on, or no longer. While it does not, taking and giving back memory costs what it always costs.
+void CountMemory(bool counted) noexcept;
+[[nodiscard]] bool CountsMemory() noexcept;
+
+/// The usable bytes of all blocks taken while they were counted, less those given back.
 [[nodiscard]] std::int64_t LiveBytes() noexcept;
 
 /// The most that `LiveBytes` has been since `ForgetPeak`.
 [[nodiscard]] std::int64_t PeakBytes() noexcept;
 void ForgetPeak() noexcept;
 
-/// The most memory that the process has occupied since `ForgetResidentPeak`, in bytes; 0 where the system does not tell.
+/// Keeps what is given back within the process, for the next one to take, as in a host that has run for a while.
+void KeepFreedMemory();
+
+/// The most memory that the process has occupied since `ForgetResidentPeak`, in bytes; 0 where the system does not
+/// tell.
 [[nodiscard]] std::int64_t PeakResidentBytes();
+/// Gives back to the system what is not used, and forgets.
 void ForgetResidentPeak();
 
 } // namespace KivVcs::Bench

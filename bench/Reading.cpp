@@ -5,7 +5,6 @@
 #include <random>
 #include <stdexcept>
 #include <unordered_map>
-#include <unordered_set>
 
 namespace KivVcs::Bench {
 
@@ -18,7 +17,16 @@ void Require(bool good, char const* what) {
         throw std::runtime_error(what);
 }
 
-/// The floor builds the paths of the result from their parts, in any order, and sorts them.
+Path Join(Path const& directory, Path const& name) {
+    return Path::Build(directory.GetLength() + 1 + name.GetLength(), [&](char16_t* units) {
+        units = std::copy_n(directory.GetString(), directory.GetLength(), units);
+        *units++ = u'/';
+        std::copy_n(name.GetString(), name.GetLength(), units);
+    });
+}
+
+/// The floor builds the paths of the result from their parts, in any order, and sorts them. Few changes are looked for
+/// many times, since reading the clock takes longer than finding them.
 Round Differences(std::int64_t files, std::int64_t changes) {
     const std::shared_ptr<Repository> repo = MakeRepository();
     const auto base = MakeTwoLevels(*repo, files, inEachDirectory);
@@ -30,25 +38,32 @@ Round Differences(std::int64_t files, std::int64_t changes) {
     }
     Require(parts.size() == static_cast<std::size_t>(changes), "wrong differences");
     std::shuffle(parts.begin(), parts.end(), std::mt19937_64(1));
-    return [=] {
-        Measurement result{.operations = static_cast<std::uint64_t>(changes)};
-        const std::int64_t before = LiveBytes();
+    const auto sorted = [parts] {
         PathList paths;
-        result.seconds = SecondsOf([&] { paths = base->GetDeepBlobDiffs(changed); });
-        result.keptBytes = LiveBytes() - before;
-        PathList sorted;
-        result.floorSeconds = SecondsOf([&] {
-            for (auto const& [directory, name] : parts) {
-                Path path(directory);
-                path += u'/';
-                path += name;
-                sorted.push_back(std::move(path));
-            }
-            std::sort(sorted.begin(), sorted.end());
+        paths.reserve(parts.size());
+        for (auto const& [directory, name] : parts)
+            paths.push_back(Join(directory, name));
+        std::sort(paths.begin(), paths.end());
+        return paths;
+    };
+    Require(sorted() == base->GetDeepBlobDiffs(changed), "wrong differences");
+    // The repository is kept until the last round, and so are the trees' identifiers.
+    return [=, keptUntilThen = repo] {
+        const std::int64_t times = CountsMemory() ? 1 : std::max<std::int64_t>(1, 1000 / changes);
+        Measurement result{.operations = static_cast<std::uint64_t>(changes)};
+        PathList paths;
+        const MemoryTaken taken;
+        result.seconds = LibrarySecondsOf([&] {
+            for (std::int64_t time = 0; time < times; ++time)
+                paths = base->GetDeepBlobDiffs(changed);
         });
-        Require(paths == sorted, "wrong differences");
-        // Keeps the repository, and so the trees' identifiers, until the last round.
-        Require(repo != nullptr, "no repository");
+        taken.WriteTo(result);
+        result.floorSeconds = SecondsOf([&] {
+            for (std::int64_t time = 0; time < times; ++time)
+                paths = sorted();
+        });
+        result.seconds /= static_cast<double>(times);
+        result.floorSeconds /= static_cast<double>(times);
         return result;
     };
 }
@@ -62,24 +77,18 @@ Round Merge(std::int64_t files, std::int64_t conflicts) {
     trees.right = ChangeTwoLevels(*repo, *trees.root, inEachDirectory, 50, 100, changes - conflicts, 2);
     if (conflicts > 0)
         trees.right = ChangeTwoLevels(*repo, *trees.right, inEachDirectory, 0, 100, conflicts, 2);
-    const auto known = std::make_shared<std::unordered_set<Id>>();
-    for (auto const& [id, tree] : repo->GetStorage()->GetTrees())
-        known->insert(id);
+    const auto known = StoredIds(*repo);
     const Resolvers resolvers{AlwaysChooseLeft(), always_return_t<TreeConflictChoice>{TreeConflictChoice::Merge}};
 
     return [=, floor = HashFloor()]() mutable {
         Measurement result{.operations = static_cast<std::uint64_t>(2 * changes)};
-        const std::int64_t before = LiveBytes();
+        const MemoryTaken taken;
         cow_ptr<Tree> merged;
-        result.seconds = SecondsOf([&] { merged = ThreeWayMerge(repo.get(), trees, resolvers); });
-        result.keptBytes = LiveBytes() - before;
+        result.seconds = LibrarySecondsOf([&] { merged = ThreeWayMerge(repo.get(), trees, resolvers); });
+        taken.WriteTo(result);
         Require(merged && !merged->HasSameId(*trees.left), "the merge gave up");
-        if (floor.IsEmpty()) {
-            for (auto const& [id, tree] : repo->GetStorage()->GetTrees()) {
-                if (!known->contains(id))
-                    floor.AddTree(*tree);
-            }
-        }
+        if (floor.IsEmpty())
+            floor.AddStored(*repo, known);
         merged.reset();
         repo->UpdateStorage();
         result.floorSeconds = floor.Run();
@@ -87,6 +96,7 @@ Round Merge(std::int64_t files, std::int64_t conflicts) {
     };
 }
 
+/// What the host's map needs to find the packed forms is measured apart, by asking it once more, and taken off.
 Round ReadBack(std::int64_t files) {
     const auto packed = std::make_shared<std::unordered_map<Id, Buffer>>();
     HashFloor floor;
@@ -96,25 +106,39 @@ Round ReadBack(std::int64_t files) {
         rootId = MakeTwoLevels(*repo, files, inEachDirectory)->GetId();
         floor.AddStored(*repo);
         const auto pack = [&packed](auto const& table) {
-            for (auto const& [id, object] : table)
-                packed->emplace(id, object->GetPackedData());
+            for (auto const& [id, object] : table) {
+                Buffer const& form = object->GetPackedData();
+                const auto fill = [&form](std::byte* bytes) { (void)form.Read(0, bytes, form.GetSize()); };
+                packed->emplace(id, Buffer::Build(form.GetSize(), fill));
+            }
         };
         pack(repo->GetStorage()->GetBlobs());
         pack(repo->GetStorage()->GetTrees());
     }
+    const auto asked = std::make_shared<std::vector<Id>>();
     return [=]() mutable {
         Measurement result{.operations = static_cast<std::uint64_t>(files)};
         const auto repo = MakeRepository();
-        const std::int64_t before = LiveBytes();
+        const bool remembers = asked->empty();
+        const MemoryTaken taken;
         cow_ptr<Tree> tree;
-        result.seconds = SecondsOf([&] {
-            tree = Tree::Deserialize(rootId, repo.get(), [&packed](Id const& id) {
+        result.seconds = LibrarySecondsOf([&] {
+            tree = Tree::Deserialize(rootId, repo.get(), [&](Id const& id) {
+                if (remembers)
+                    asked->push_back(id);
                 const auto found = packed->find(id);
                 return found == packed->end() ? StreamIO() : StreamIO(MemStream::CreateOnRef(found->second));
             });
         });
-        result.keptBytes = LiveBytes() - before;
+        taken.WriteTo(result);
         Require(tree && tree->GetId() == rootId, "read back something else");
+        std::uint64_t bytes = 0;
+        const double finding = SecondsOf([&] {
+            for (Id const& id : *asked)
+                bytes += packed->find(id)->second.GetSize();
+        });
+        Require(bytes > 0, "nothing read back");
+        result.seconds -= finding;
         result.floorSeconds = floor.Run();
         return result;
     };
@@ -122,18 +146,19 @@ Round ReadBack(std::int64_t files) {
 
 } // namespace
 
-void AddReadingWorkloads(std::vector<Workload>& workloads, bool quick) {
-    const auto sizes = Sizes(quick, 100'000);
-    for (std::int64_t files : sizes) {
-        files -= files % inEachDirectory;
-        for (const std::int64_t changes : {files / 10, std::int64_t{100}, std::int64_t{1}})
-            workloads.push_back({"B8 differences, " + std::to_string(changes) + " of the files", files, 3, 0,
-                                 [=] { return Differences(files, changes); }, changes > 100 ? 1 : 10});
-        for (const std::int64_t conflicts : {std::int64_t{0}, files / 1000})
-            workloads.push_back({"B9 merge, " + std::to_string(conflicts) + " conflicts", files, 8, 8192,
-                                 [=] { return Merge(files, conflicts); }});
-        workloads.push_back({"B11 files read back", files, 3.5, 0, [=] { return ReadBack(files); }});
-    }
+void AddReadingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
+    const auto add = [&](std::string const& name, Limits limits, auto rounds, int roundsInOne = 1) {
+        for (const std::int64_t divisor : divisors) {
+            const std::int64_t files = 100'000 / divisor / inEachDirectory * inEachDirectory;
+            workloads.push_back({name, files, limits, [=] { return rounds(files); }, roundsInOne});
+        }
+    };
+    add("B8 differences, one file in ten", {3}, [](auto files) { return Differences(files, files / 10); });
+    add("B8 differences, 100 files", {3}, [](auto files) { return Differences(files, 100); });
+    add("B8 differences, 1 file", {3}, [](auto files) { return Differences(files, 1); });
+    add("B9 merge without conflicts", {8, 8192}, [](auto files) { return Merge(files, 0); });
+    add("B9 merge, conflicts in one change of ten", {8, 8192}, [](auto files) { return Merge(files, files / 1000); });
+    add("B11 files read back", {3.5}, ReadBack);
 }
 
 } // namespace KivVcs::Bench

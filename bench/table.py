@@ -5,32 +5,44 @@ import sys
 
 
 def time(seconds):
-    return f"{seconds * 1e3:.3f} ms" if seconds < 1 else f"{seconds:.3f} s"
+    if seconds < 1e-3:
+        return f"{seconds * 1e6:.2f} us"
+    return f"{seconds * 1e3:.2f} ms" if seconds < 1 else f"{seconds:.2f} s"
 
 
 def amount(count):
     return f"{count:.0f} B" if count < 1e5 else f"{count / 2**20:.1f} MiB"
 
 
-with open(sys.argv[1], encoding="utf-8") as file:
-    result = json.load(file)
+def limited(value, limit, text):
+    """The two cells of a value and its limit."""
+    return text(value) if value else "-", text(limit) if limit else "-"
 
-rows = [("workload", "size", "floor", "ours", "ratio", "limit", "kept/op", "limit", "resident", "")]
+
+with open(sys.argv[1], encoding="utf-8") as file:
+    runs = [run for run in json.load(file)["benchmarks"] if run.get("aggregate_name") == "median"]
+
+rows = [("workload", "size", "floor", "ours", "ratio", "at most", "growth", "at most", "kept/op", "at most", "resident/op", "")]
 missed = 0
-for run in result["benchmarks"]:
-    if run.get("aggregate_name") != "median":
-        continue
+smaller = {}
+for run in runs:
     name, size = run["run_name"].split("/")[:2]
-    bad = any(run[limit] > 0 and run[value] > run[limit] for value, limit in (("ratio", "ratioLimit"), ("bytes", "bytesLimit")))
+    values = {"ratio": run["ratio"], "bytes": run["bytes"], "growth": 0}
+    if name in smaller and abs(int(size) / smaller[name][0] - 4) < 0.1:
+        values["growth"] = run["ours"] / smaller[name][1]
+    smaller[name] = int(size), run["ours"]
+    bad = any(run[f"{kind}Limit"] and value > run[f"{kind}Limit"] for kind, value in values.items())
     missed += bad
     rows.append((
-        name, size, time(run["floor"]), time(run["ours"]),
-        f"{run['ratio']:.2f}" if run["ratio"] else "-", f"{run['ratioLimit']:g}" if run["ratioLimit"] else "-",
-        amount(run["bytes"]), amount(run["bytesLimit"]) if run["bytesLimit"] else "-", amount(run["resident"]),
-        "MISSED" if bad else "ok",
+        name, size, time(run["floor"]) if run["floor"] else "-", time(run["ours"]),
+        *limited(values["ratio"], run["ratioLimit"], "{:.2f}".format),
+        *limited(values["growth"], run["growthLimit"], "{:.1f}".format),
+        *limited(values["bytes"], run["bytesLimit"], amount),
+        amount(run["resident"]) if run["resident"] else "-", "MISSED" if bad else "",
     ))
 
 widths = [max(map(len, column)) for column in zip(*rows)]
 for row in rows:
-    print("  ".join(cell.ljust(width) if index == 0 else cell.rjust(width) for index, (cell, width) in enumerate(zip(row, widths))))
-print(f"{len(rows) - 1} rows, {missed} missed their limit")
+    cells = (cell.rjust(width) if index else cell.ljust(width) for index, (cell, width) in enumerate(zip(row, widths)))
+    print("  ".join(cells).rstrip())
+print(f"{len(runs)} rows, {missed} missed a limit")

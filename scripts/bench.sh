@@ -1,23 +1,63 @@
 #!/bin/bash
-# usage: scripts/bench.sh [--quick] [FILTER]
+# usage: scripts/bench.sh [--quick | --plot] [FILTER]
+#        scripts/bench.sh --check [--update]
 # Installs what is missing, builds the benchmarks and runs those whose names match FILTER, each workload and its floor in
-# turn, and prints one table with the medians over seven rounds; build/bench/result.json holds the numbers. --quick runs
-# small sizes in three rounds, which takes seconds. Times are processor time, and a floor is the time that libcrypto's
-# SHA-256 needs for the bytes that the workload must hash, unless docs/performance.md names another one.
+# turn, and prints one table with the medians over seven rounds; build/bench/result.json holds the numbers. --quick runs a
+# quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws docs/performance.svg.
+# --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
+# tells by over 5 %; --update writes that file. docs/performance.md says what is measured.
 
 . "$(dirname "$0")/lib.sh"
 
-sizes=()
-if [ "${1:-}" = --quick ]; then
-    sizes=(--quick)
-    shift
+# The same functions of the C library on every processor, and a world without anything else that could change a count.
+count_instructions() {
+    local dumps=$1 tunables prefix=()
+    tunables=glibc.cpu.hwcaps=-AVX512F,-AVX2,-AVX,-AVX_Fast_Unaligned_Load,-ERMS,-FSRM,-SSSE3,-SSE4_2
+    ! setarch -R true 2>/dev/null || prefix=(setarch -R)
+    quietly env -i TZ=UTC LD_BIND_NOW=1 GLIBC_TUNABLES="$tunables:glibc.cpu.x86_non_temporal_threshold=0x8000000" \
+        "${prefix[@]}" valgrind --quiet --tool=callgrind --collect-atstart=no --callgrind-out-file="$dumps/dump" \
+        "$build_directory/bench/kivvcs_bench" count
+}
+
+check() {
+    local dumps tools status=0
+    dumps=$(mktemp -d)
+    # shellcheck disable=SC2064
+    trap "rm -rf '$dumps'" EXIT
+    count_instructions "$dumps" || die "counting failed"
+    tools="$("$build_directory/bench/kivvcs_bench" tools), $(valgrind --version)"
+    /usr/bin/python3 "$source_directory/bench/instructions.py" "$dumps" "$source_directory/bench/baseline.json" "$tools" "$@" ||
+        status=$?
+    exit "$status"
+}
+
+measure() {
+    local sizes=$1 filter=$2
+    quietly "$build_directory/bench/kivvcs_bench" "$sizes" --benchmark_filter="$filter" --benchmark_out="$result" \
+        --benchmark_out_format=json
+    grep -m1 'model name' /proc/cpuinfo 2>/dev/null || true
+    /usr/bin/python3 "$source_directory/bench/table.py" "$result"
+}
+
+mode=${1:-}
+case $mode in
+--quick | --plot | --check) shift ;;
+-*) usage 1 ;;
+*) mode= ;;
+esac
+if [ $# -gt 1 ] || [[ $mode == --check && ${1:---update} != --update ]]; then
+    usage 1
 fi
-[ $# -le 1 ] || usage 1
 
 install_packages build bench
 build_preset bench
 result=$build_directory/result.json
-quietly "$build_directory/bench/kivvcs_bench" "${sizes[@]}" --benchmark_filter="${1:-.}" \
-    --benchmark_out="$result" --benchmark_out_format=json
-grep -m1 'model name' /proc/cpuinfo 2>/dev/null || true
-python3 "$source_directory/bench/table.py" "$result"
+case $mode in
+--check) check "$@" ;;
+--quick) measure quick "${1:-.}" ;;
+--plot)
+    measure growth "${1:-.}"
+    /usr/bin/python3 "$source_directory/bench/plot.py" "$result" "$source_directory/docs/performance.svg"
+    ;;
+*) measure whole "${1:-.}" ;;
+esac
