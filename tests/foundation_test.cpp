@@ -222,7 +222,18 @@ TEST(CowPointer, ConvertsToTheBaseAndHandsItsObjectToTheLastOwner) {
     EXPECT_EQ(derived.release_if_last(), nullptr);
     EXPECT_EQ(derived, nullptr);
     EXPECT_EQ(base.release_if_last()->value, 4);
-    EXPECT_EQ(Tracked::alive, 0);
+
+    struct Named {
+        int name = 8;
+    };
+    struct Both : Tracked, Named {};
+    cow_ptr<Both> both(emplace);
+    const cow_ptr<Tracked> first = both;
+    EXPECT_TRUE(first.use_count() == 2 && first.get() == both.get());
+    EXPECT_THROW(cow_ptr<Named>{both}, std::invalid_argument);
+    both.reset();
+    EXPECT_EQ(first->value, 7);
+    EXPECT_EQ(Tracked::alive, 1);
 }
 
 std::string ContentOf(Buffer const& buffer) {

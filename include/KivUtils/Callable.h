@@ -7,6 +7,7 @@
 #include <iterator>
 #include <optional>
 #include <span>
+#include <utility>
 
 namespace KivUtils {
 
@@ -20,13 +21,17 @@ using array_view = std::span<T>;
 
 /// A callable that ignores its arguments and returns one stored value.
 template <class T>
-struct always_return_t {
-    T value;
+class always_return_t {
+public:
+    constexpr explicit always_return_t(T value) : value_(std::move(value)) {}
 
     template <class... Arguments>
-    [[nodiscard]] T operator()(Arguments const&...) const {
-        return value;
+    [[nodiscard]] constexpr T operator()(Arguments const&...) const {
+        return value_;
     }
+
+private:
+    T value_;
 };
 
 namespace PortableVersion {

@@ -8,8 +8,9 @@
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
-#include <new>
+#include <stdexcept>
 #include <type_traits>
 #include <utility>
 
@@ -47,28 +48,40 @@ private:
     mutable std::atomic<std::uint32_t> references_{0};
 };
 
-/// The control block of objects that do not count themselves: made in place, or adopted from a unique pointer.
+/// The control block of an object that does not count itself.
+class object_holder : public reference_counted {
+public:
+    object_holder() noexcept = default;
+    object_holder(object_holder const&) = delete;
+    object_holder& operator=(object_holder const&) = delete;
+    virtual ~object_holder() = default;
+
+    [[nodiscard]] virtual void* object() noexcept = 0;
+};
+
+/// Holds an object that was made in place.
 template <class T>
-class counted_holder final : public reference_counted {
+class in_place_holder final : public object_holder {
 public:
     template <class... Arguments>
-    explicit counted_holder(emplace_t, Arguments&&... arguments)
-        : object_(::new(static_cast<void*>(storage_)) T(std::forward<Arguments>(arguments)...)) {}
-    explicit counted_holder(std::unique_ptr<T> object) noexcept : object_(object.release()) {}
-    counted_holder(counted_holder const&) = delete;
-    counted_holder& operator=(counted_holder const&) = delete;
-    ~counted_holder() {
-        if (static_cast<void*>(object_) == static_cast<void*>(storage_))
-            object_->~T();
-        else
-            delete object_;
-    }
+    explicit in_place_holder(Arguments&&... arguments) : object_(std::forward<Arguments>(arguments)...) {}
 
-    [[nodiscard]] T* object() const noexcept { return object_; }
+    [[nodiscard]] void* object() noexcept override { return std::addressof(object_); }
 
 private:
-    T* object_;
-    alignas(T) std::byte storage_[sizeof(T)];
+    T object_;
+};
+
+/// Holds an object that was made elsewhere.
+template <class T>
+class adopting_holder final : public object_holder {
+public:
+    explicit adopting_holder(std::unique_ptr<T> object) noexcept : object_(std::move(object)) {}
+
+    [[nodiscard]] void* object() noexcept override { return object_.get(); }
+
+private:
+    std::unique_ptr<T> object_;
 };
 
 /// A pointer that shares its object with its copies and gives write access only to a sole owner, copying the object
@@ -93,7 +106,7 @@ public:
         if constexpr (is_self_counted())
             adopt(new T(std::forward<Arguments>(arguments)...));
         else
-            adopt(new counted_holder<T>(emplace, std::forward<Arguments>(arguments)...));
+            adopt(new in_place_holder<T>(std::forward<Arguments>(arguments)...));
     }
 
     /// Takes over an object made elsewhere; null gives null.
@@ -103,7 +116,7 @@ public:
         if constexpr (is_self_counted())
             adopt(object.release());
         else
-            adopt(new counted_holder<T>(std::move(object)));
+            adopt(new adopting_holder<T>(std::move(object)));
     }
 
     /// Another pointer to an object that a `cow_ptr` holds already; null gives null. Self-counted types only.
@@ -132,11 +145,19 @@ public:
     }
     cow_ptr(cow_ptr&& other) noexcept : counted_(std::exchange(other.counted_, nullptr)) {}
 
-    /// Shares the object as one of its base class.
+    /// Shares the object as one of its base class. A write through the result copies, if it has to, as the base class.
+    /// @throws std::invalid_argument if the classes do not count themselves and the base is not at the object's
+    /// beginning
     template <class Derived>
         requires(!std::is_same_v<Derived, T> && std::is_convertible_v<Derived*, T*>)
-    cow_ptr(cow_ptr<Derived> other) noexcept : counted_(std::exchange(other.counted_, nullptr)) {
-        static_assert(std::is_base_of_v<reference_counted, T>, "only self-counted types convert to their bases");
+    cow_ptr(cow_ptr<Derived> other) noexcept(is_self_counted()) {
+        static_assert(is_self_counted() == cow_ptr<Derived>::is_self_counted(), "both count themselves, or neither");
+        if constexpr (!is_self_counted()) {
+            T const* const base = other.get();
+            if (static_cast<void const*>(base) != static_cast<void const*>(other.get()))
+                throw std::invalid_argument("this base class is not at the beginning of the object");
+        }
+        counted_ = std::exchange(other.counted_, nullptr);
     }
 
     cow_ptr& operator=(cow_ptr const& other) noexcept {
@@ -165,7 +186,7 @@ public:
     /// The object for writing: null for null; the object itself for a sole owner; otherwise a copy made with the copy
     /// constructor of `T`, which this pointer then owns alone, the other owners keeping the unchanged object.
     /// @throws what copying throws; the pointer is unchanged then.
-    [[nodiscard]] T* write_if_there() {
+    T* write_if_there() {
         if (counted_ == nullptr)
             return nullptr;
         if (counted_->reference_count() != 1)
@@ -214,7 +235,7 @@ private:
         if constexpr (is_self_counted())
             return static_cast<T*>(counted);
         else
-            return counted == nullptr ? nullptr : static_cast<counted_holder<T>*>(counted)->object();
+            return counted == nullptr ? nullptr : static_cast<T*>(static_cast<object_holder*>(counted)->object());
     }
 
     void drop() noexcept {
@@ -223,7 +244,7 @@ private:
         if constexpr (is_self_counted())
             delete static_cast<T const*>(counted_);
         else
-            delete static_cast<counted_holder<T> const*>(counted_);
+            delete static_cast<object_holder const*>(counted_);
     }
 
     reference_counted const* counted_ = nullptr;

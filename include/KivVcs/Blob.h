@@ -20,12 +20,12 @@ public:
     /// "100644"
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
     /// The content.
-    [[nodiscard]] Buffer const& GetData() const override { return data_; }
+    Buffer const& GetData() const override { return data_; }
 
     /// Reads a blob from its packed form: everything behind the header's zero byte, whatever size the header tells.
     /// Large chunks of a stream on a buffer are shared, not copied.
     /// @return null if the stream is not valid, cannot be read, or its header does not begin with "blob".
-    [[nodiscard]] static cow_ptr<Blob> Deserialize(StreamIO& stream);
+    static cow_ptr<Blob> Deserialize(StreamIO& stream);
 
 protected:
     [[nodiscard]] Id ComputeId() const override;

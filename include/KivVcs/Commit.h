@@ -37,7 +37,7 @@ public:
     /// Empty.
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
     /// The commit text: tree, parent, author and committer lines, an empty line, the description and a line break.
-    [[nodiscard]] Buffer const& GetData() const override;
+    Buffer const& GetData() const override;
     void ResetState() override;
 
     [[nodiscard]] KivStringT<char16_t> const& GetAuthorName() const noexcept { return authorName_; }
@@ -98,8 +98,8 @@ public:
     /// What follows @p key in @p text up to the next line break, found anywhere at or after @p position, which moves to
     /// that line break; nothing, leaving @p position, if the key is not there. A value without line break is empty, and
     /// @p position moves to the end of the text.
-    [[nodiscard]] static optional<KivStringT<char>> ParseCommitInfo(KivStringT<char> const& text,
-                                                                    KivStringViewT<char> key, int& position);
+    static optional<KivStringT<char>> ParseCommitInfo(KivStringT<char> const& text, KivStringViewT<char> key,
+                                                      int& position);
 
     /// The commit of identifier @p id: the one that @p repository holds, otherwise read through @p loader with its
     /// tree. It has the repository's head as parent; the caller links the real one, whose identifier goes to @p
@@ -107,8 +107,8 @@ public:
     /// @return null if @p repository is null, @p id or @p loader is empty, the header does not begin with "commit ", or
     /// there is no tree line.
     /// @throws what @p loader and @p repository throw
-    [[nodiscard]] static cow_ptr<Commit> Deserialize(Id const& id, Id& parentId, IRepository* repository,
-                                                     PortableVersion::Delegate<StreamIO(Id const&)> loader);
+    static cow_ptr<Commit> Deserialize(Id const& id, Id& parentId, IRepository* repository,
+                                       PortableVersion::Delegate<StreamIO(Id const&)> loader);
 
 protected:
     [[nodiscard]] Id ComputeId() const override;

@@ -147,21 +147,21 @@ private:
 };
 
 /// The interface of all stored objects. The order of its operations is part of the binary interface.
-class KIVVCS_EXPORT IObject {
+class KIVVCS_EXPORT IObject : public KivUtils::reference_counted {
 public:
     /// Whether both objects have the same identifier, and so the same content.
     virtual bool operator==(IObject const& other) const = 0;
     virtual bool operator!=(IObject const& other) const = 0;
     /// The identifier of the packed form.
-    [[nodiscard]] virtual Id GetId() const = 0;
+    virtual Id GetId() const = 0;
     /// The type word: "blob", "tree" or "commit".
     [[nodiscard]] virtual KivStringT<char> GetHeader() const = 0;
     /// The mode word that a tree's packed form shows for such an entry; empty for commits.
     [[nodiscard]] virtual KivStringT<char> GetStoragePrefix() const = 0;
     /// The type word, a blank, the size of the data in decimal, a zero byte, the data.
-    [[nodiscard]] virtual Buffer const& GetPackedData() const = 0;
+    virtual Buffer const& GetPackedData() const = 0;
     /// The data of the packed form.
-    [[nodiscard]] virtual Buffer const& GetData() const = 0;
+    virtual Buffer const& GetData() const = 0;
     /// The packed form for display: a zero byte as `\0`, every other byte as one code unit, sign-extended.
     [[nodiscard]] virtual KivStringT<char16_t> ToString() const = 0;
     virtual ~IObject();
@@ -181,14 +181,14 @@ protected:
 ///
 /// Threads: all `const` operations may run concurrently on one object. A change needs exclusive use of the object.
 /// @throws std::bad_alloc from everything that computes; the object is as before then.
-class KIVVCS_EXPORT Object : public IObject, public KivUtils::reference_counted {
+class KIVVCS_EXPORT Object : public IObject {
 public:
     bool operator==(IObject const& other) const override;
     bool operator!=(IObject const& other) const override;
     bool operator==(Object const& other) const { return *this == static_cast<IObject const&>(other); }
     bool operator!=(Object const& other) const { return *this != static_cast<IObject const&>(other); }
-    [[nodiscard]] Id GetId() const override;
-    [[nodiscard]] Buffer const& GetPackedData() const override;
+    Id GetId() const override;
+    Buffer const& GetPackedData() const override;
     [[nodiscard]] KivStringT<char16_t> ToString() const override;
     void ResetState() override;
 
@@ -243,11 +243,11 @@ KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char16_t> 
 /// The rest of the stream as 8-bit text, at most 2,147,483,647 bytes of it; empty if the stream is not valid, has no
 /// rest, or cannot be read. Takes no more memory than a multiple of what the stream really holds, whatever size it
 /// claims.
-[[nodiscard]] KIVVCS_EXPORT KivStringT<char> StreamToStringA(StreamIO& stream);
+KIVVCS_EXPORT KivStringT<char> StreamToStringA(StreamIO& stream);
 
 /// Reads the header of a packed form, its zero byte included, which leaves the stream at the first data byte.
 /// @return whether the header begins with @p expected; false if the stream is not valid or ends before a zero byte.
-[[nodiscard]] KIVVCS_EXPORT bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> expected);
+KIVVCS_EXPORT bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> expected);
 
 /// The segments between the "/" of @p path, in order, without the empty ones; views into @p path.
 [[nodiscard]] KIVVCS_EXPORT std::vector<KivStringViewT<char16_t>> SplitVcsPath(KivStringViewT<char16_t> path);

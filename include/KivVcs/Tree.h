@@ -82,7 +82,7 @@ public:
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
     /// The entries in name order, each as mode, blank, type, blank, name in UTF-8, a zero byte and 64 digits of
     /// identifier.
-    [[nodiscard]] Buffer const& GetData() const override;
+    Buffer const& GetData() const override;
     void ResetState() override;
 
     [[nodiscard]] bool IsEmpty() const noexcept;
@@ -162,8 +162,8 @@ public:
     /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not
     /// begin with "tree", no entries, or an entry that is neither tree nor blob.
     /// @throws what @p loader and @p repo throw
-    [[nodiscard]] static cow_ptr<Tree> Deserialize(Id const& id, IRepository* repo,
-                                                   PortableVersion::Delegate<StreamIO(Id const&)> loader);
+    static cow_ptr<Tree> Deserialize(Id const& id, IRepository* repo,
+                                     PortableVersion::Delegate<StreamIO(Id const&)> loader);
 
 protected:
     [[nodiscard]] Id ComputeId() const override;
@@ -199,8 +199,8 @@ public:
     explicit CommitTree(cow_ptr<Tree> root) noexcept : root_(std::move(root)) {}
 
     /// A holder of what `Tree::Deserialize` gives; null if that is null.
-    [[nodiscard]] static cow_ptr<CommitTree> Deserialize(Id const& id, IRepository* repo,
-                                                         PortableVersion::Delegate<StreamIO(Id const&)> loader);
+    static cow_ptr<CommitTree> Deserialize(Id const& id, IRepository* repo,
+                                           PortableVersion::Delegate<StreamIO(Id const&)> loader);
 
     /// As the operations of `Tree`, on a root that is made if there is none, even if nothing is added then.
     cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
