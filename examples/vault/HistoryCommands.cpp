@@ -59,12 +59,15 @@ void ForgetBelow(KivVcs::Repository& repository, CommitHandle const& commit) {
     StoreReachableCommits(repository);
 }
 
+/// Graphviz takes what looks like an entity of HTML for one, in plain labels too.
 std::string Quoted(std::string const& text) {
     std::string quoted = "\"";
     for (const char c : text) {
         if (c == '"' || c == '\\')
             quoted += '\\';
         quoted += c;
+        if (c == '&')
+            quoted += "amp;";
     }
     return quoted + '"';
 }
