@@ -53,6 +53,7 @@ BadInputGetsOneLineAndChangesNothing() {
     refused 2 'no vault vault.db' log
     refused 2 'not a directory' save missing
     write d/f one
+    refused 2 'unable to open' -f '' save d
     refused 2 "must be given as 'Name <mail>'" save d --author 'A <b'
     [ ! -e vault.db ] || fail "a refused save left a vault"
     for i in $(seq 17); do write d/f "$i" && "$vault" save d -m "$i" >out; done

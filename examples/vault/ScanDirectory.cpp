@@ -32,7 +32,9 @@ public:
     Scanner(std::filesystem::path const& directory, ScanOptions const& options, KivVcs::IRepository& repository,
             Progress& progress)
         : path_(directory.native()), options_(options), repository_(repository), progress_(progress) {
-        hasVaultFile_ = stat(options.vaultFile.c_str(), &vaultFile_) == 0;
+        const auto vaultDirectory = options.vaultFile.parent_path();
+        hasVaultFile_ = stat(options.vaultFile.c_str(), &vaultFile_) == 0 &&
+                        stat(vaultDirectory.empty() ? "." : vaultDirectory.c_str(), &vaultDirectory_) == 0;
     }
 
     cow_ptr<Tree> Scan() {
@@ -136,8 +138,15 @@ private:
     [[nodiscard]] bool IsVault(std::string const& name, struct stat const& status) const {
         if (!hasVaultFile_)
             return false;
-        return (status.st_dev == vaultFile_.st_dev && status.st_ino == vaultFile_.st_ino) ||
-               name == options_.vaultFile.filename().native() + "-journal";
+        if (AreSame(status, vaultFile_))
+            return true;
+        struct stat directory {};
+        return name == options_.vaultFile.filename().native() + "-journal" && fstat(path_.Get(), &directory) == 0 &&
+               AreSame(directory, vaultDirectory_);
+    }
+
+    static bool AreSame(struct stat const& left, struct stat const& right) noexcept {
+        return left.st_dev == right.st_dev && left.st_ino == right.st_ino;
     }
 
     void Skip(std::string const& name, std::string const& reason) {
@@ -150,6 +159,7 @@ private:
     Progress& progress_;
     std::vector<Level> levels_;
     struct stat vaultFile_ {};
+    struct stat vaultDirectory_ {};
     bool hasVaultFile_ = false;
 };
 

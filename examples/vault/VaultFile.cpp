@@ -73,7 +73,9 @@ void VaultFile::Open(Access access) {
     sqlite3* database = nullptr;
     // Readers may have to roll back what a killed writer left, so they open for writing too.
     const int flags = SQLITE_OPEN_READWRITE | (access == Access::Create ? SQLITE_OPEN_CREATE : 0);
-    const int result = sqlite3_open_v2(path_.c_str(), &database, flags, nullptr);
+    // SQLite gives some names a meaning, among them those of databases that are kept in memory; a path has none.
+    const auto path = path_.is_absolute() ? path_.native() : "./" + path_.native();
+    const int result = sqlite3_open_v2(path.c_str(), &database, flags, nullptr);
     database_.reset(database);
     Check(result);
     sqlite3_busy_timeout(database, lockPatienceMilliseconds);
