@@ -143,7 +143,12 @@ void Compact(Path const& file) {
     const auto before = std::filesystem::file_size(file);
     vault.Repository().SimplifyCommitGraph(true);
     vault.WriteAndPrune();
-    vault.File().Shrink();
+    try {
+        vault.File().Shrink();
+    } catch (Problem const& problem) {
+        throw Problem(std::string("the history was compacted, but the file was not made smaller: ") + problem.what(),
+                      problem.ExitStatus());
+    }
     const auto after = std::filesystem::file_size(file);
     std::cout << before - std::min(before, after) << " bytes reclaimed, " << after << " left\n";
 }
