@@ -85,9 +85,10 @@ Level WriteLevel(DirectoryPath const& directory, cow_ptr<Tree> const& tree, Prog
 } // namespace
 
 void RestoreDirectory(cow_ptr<Tree> const& tree, std::filesystem::path const& top, bool force, Progress& progress) {
-    // What this cannot make is told when it is opened.
-    std::error_code ignored;
-    std::filesystem::create_directories(top, ignored);
+    std::error_code error;
+    std::filesystem::create_directories(top, error);
+    if (error)
+        throw Problem("cannot make directory " + Printable(top.native()) + ": " + error.message());
     DirectoryPath directory(top.native());
     if (!force && !directory.ReadNames().empty())
         throw Problem(Printable(top.native()) + " is not empty (--force writes into it all the same)");

@@ -12,6 +12,14 @@ namespace {
 
 constexpr char16_t const* firstBranch = u"master";
 
+/// A text that the file holds, which only damage can have made anything but UTF-8.
+Text StoredText(VaultFile const& file, std::string const& bytes) {
+    if (auto text = FromUtf8(bytes))
+        return *std::move(text);
+    throw Problem(Printable(file.Path().native()) + " is damaged: this is no text: " + Printable(bytes),
+                  findingsExitStatus);
+}
+
 [[noreturn]] void ReportDamage(VaultFile& file, std::string const& head) {
     Progress progress("looking for damage");
     auto findings = FindDamage(file, progress);
@@ -37,8 +45,8 @@ Vault::Vault(std::filesystem::path const& path, VaultFile::Access access)
     for (auto const& [name, head] : file_.ReadBranches())
         heads.emplace(name, Load(file_, head, progress));
     for (auto const& [name, head] : heads)
-        Storage().CreateBranch(RequireUtf8(name, "a branch name"), head);
-    if (const auto current = file_.ReadCurrentBranch(); !repository_.Checkout(RequireUtf8(current, "a branch name")))
+        Storage().CreateBranch(StoredText(file_, name), head);
+    if (const auto current = file_.ReadCurrentBranch(); !repository_.Checkout(StoredText(file_, current)))
         throw Problem(Printable(path.native()) + ": the current branch is missing: " + Printable(current),
                       findingsExitStatus);
 }
@@ -62,7 +70,7 @@ Vault::CommitHandle Vault::Load(VaultFile& from, std::string const& head, Progre
         if (isOwn)
             inFile_.insert(id);
     });
-    auto commit = loader.Load(Id(RequireUtf8(head, "an identifier")));
+    auto commit = loader.Load(Id(StoredText(from, head)));
     if (!commit)
         ReportDamage(from, head);
     return commit;
@@ -78,7 +86,7 @@ std::size_t Vault::Write() {
 void Vault::WriteAndPrune() {
     WriteObjects();
     for (auto const& name : file_.ListObjects()) {
-        const Id id(RequireUtf8(name, "an identifier"));
+        const Id id(StoredText(file_, name));
         if (!Storage().GetCommit(id) && !Storage().GetTree(id) && !Storage().GetBlob(id))
             file_.DeleteObject(name);
     }
