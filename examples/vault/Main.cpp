@@ -74,7 +74,8 @@ void DescribeCommands(CommandLine& line) {
     auto* const restore = app.add_subcommand("restore", "write the files of a version into a directory");
     restore->add_option("REV", line.first, revisionHelp)->required();
     restore->add_option("DIR", line.directory, "the directory, empty or to be made")->required();
-    restore->add_flag("--force", line.force, "write into a directory that is not empty: replace its files, not its directories");
+    restore->add_flag("--force", line.force,
+                      "write into a directory that is not empty: replace its files, not its directories");
     restore->callback([&] { Restore(line.file, line.first, line.directory, line.force); });
 
     app.add_subcommand("verify", "check every stored object")->callback([&] { Verify(line.file); });
