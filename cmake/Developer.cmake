@@ -7,6 +7,7 @@ option(KIVVCS_PACKAGE_TESTS "Among them, those that install the library and buil
 option(KIVVCS_EXAMPLES "Build the examples" ON)
 option(KIVVCS_BENCH "Build the benchmarks" OFF)
 option(KIVVCS_FUZZ "Build the fuzz targets" ON)
+option(KIVVCS_LIBFUZZER "Build them for libFuzzer, instead of as tests that replay their inputs" OFF)
 option(KIVVCS_WARNINGS_AS_ERRORS "Compile with many warnings, each of them an error" OFF)
 set(KIVVCS_GOOGLETEST_SOURCE "" CACHE PATH
     "Sources of GoogleTest to build with the flags of this build, for flags that its installed library does not agree with")

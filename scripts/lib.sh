@@ -47,7 +47,7 @@ packages_of() {
     bench) echo libbenchmark-dev libssl-dev valgrind python3 python3-matplotlib ;;
     valgrind) echo valgrind ;;
     coverage) echo gcovr ;;
-    fuzz) echo clang-14 ;;
+    fuzz) echo clang-14 libclang-rt-14-dev ;;
     googletest) echo googletest ;;
     portability) echo g++-i686-linux-gnu g++-aarch64-linux-gnu g++-s390x-linux-gnu g++-mingw-w64-x86-64-posix qemu-user googletest ;;
     *) die "there is no package set '$1'" ;;
