@@ -2,7 +2,8 @@
 # Shared by the scripts beside it, which source it:
 #   install_packages SET...   installs with apt-get what is missing of the named sets, or says plainly what is missing
 #   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
-#   run_tests                 runs the tests of the directory built last, and shows only the summary when all pass
+#   run_tests [OPTION...]     runs the tests of the directory built last, and shows only the summary when all pass; ctest takes
+#                             the options
 #   quietly COMMAND...        runs a command and shows its output only when it fails
 #   die MESSAGE               ends the script
 #   usage [STATUS]            shows the comment at the top of the script and ends it; -h and --help do so by themselves
@@ -49,7 +50,10 @@ packages_of() {
     coverage) echo gcovr ;;
     fuzz) echo clang-14 libclang-rt-14-dev ;;
     googletest) echo googletest ;;
-    portability) echo g++-i686-linux-gnu g++-aarch64-linux-gnu g++-s390x-linux-gnu g++-mingw-w64-x86-64-posix qemu-user googletest ;;
+    portability)
+        echo g++-i686-linux-gnu g++-aarch64-linux-gnu g++-s390x-linux-gnu g++-mingw-w64-x86-64-posix qemu-user wine wine64 \
+            googletest python3
+        ;;
     *) die "there is no package set '$1'" ;;
     esac
 }
@@ -82,7 +86,8 @@ build_preset() {
 }
 
 run_tests() {
-    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs") output status=0
+    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs" "$@")
+    local output status=0
     if [ -t 1 ]; then
         "${tests[@]}" --progress
         return

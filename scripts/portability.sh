@@ -1,0 +1,51 @@
+#!/bin/bash
+# usage: scripts/portability.sh [PLATFORM...]
+# Installs what is missing, then builds the library and its tests for each platform and runs them: x86-64 (once in each of
+# four time zones), x86, aarch64 and s390x (emulated), and windows (a DLL, run by wine). All platforms without arguments.
+# The identifiers that the tests expect are first compared with those which a script computes by other means. All but x86
+# leave out what takes minutes when it is emulated: long histories, wide directories, failing allocations, and all seeds of
+# the random tests but one.
+
+. "$(dirname "$0")/lib.sh"
+
+time_zones=(UTC Asia/Kathmandu Pacific/Kiritimati America/St_Johns)
+long_tests='OnStacksOf|AllocationFaults|LongHistories|AMillionOfThem|NestingTakesNoStack|BehavesLikeAText|Seeds/.*/[1-9]'
+
+compare_expected_identifiers() {
+    local name identifier
+    while IFS=: read -r name identifier; do
+        grep -q "\"${identifier# }\"" "$source_directory/tests/commit_test.cpp" ||
+            die "the tests expect another identifier than ${identifier# } for '$name' of the golden repository"
+    done < <(python3 "$source_directory/tests/golden_repository.py")
+}
+
+install_packages build vault portability
+compare_expected_identifiers
+[ $# -gt 0 ] || set -- x86-64 x86 aarch64 s390x windows
+for platform in "$@"; do
+    printf '%s:\n' "$platform"
+    case $platform in
+    x86-64)
+        build_preset release
+        for zone in "${time_zones[@]}"; do
+            printf '%s:\n' "$zone"
+            TZ=$zone run_tests --exclude-regex "$long_tests|Package|Vault"
+        done
+        ;;
+    x86)
+        build_preset x86
+        run_tests
+        ;;
+    aarch64 | s390x)
+        build_preset "$platform"
+        run_tests --exclude-regex "$long_tests"
+        ;;
+    windows)
+        export WINEPREFIX=$build_root/windows-wine WINEDEBUG=-all
+        build_preset windows
+        quietly wine cmd /c exit
+        run_tests --exclude-regex "$long_tests"
+        ;;
+    *) usage 1 ;;
+    esac
+done
