@@ -30,30 +30,31 @@ public:
         do {
             missedRelease_ = false;
             Sweep();
-            PurgeReleased();
         } while (missedRelease_);
     }
 
 private:
+    /// Follows at once what an object that dies releases, wherever the sweep may have passed it already, so that the
+    /// list of these stays short.
     void Sweep() {
-        helpers::remove_erase_if_helper(table_, [this](auto const& entry) {
-            if (!IsUnused(entry.second))
-                return false;
-            ListReleased(*entry.second);
-            return true;
-        });
+        for (next_ = table_.begin(); next_ != table_.end();) {
+            RemoveIfUnused(next_++);
+            while (!released_.empty()) {
+                const auto found = table_.find(released_.back());
+                released_.pop_back();
+                if (found != table_.end())
+                    RemoveIfUnused(found);
+            }
+        }
     }
 
-    /// Goes on with what the objects that died have released, wherever the sweep had passed it already.
-    void PurgeReleased() {
-        while (!released_.empty()) {
-            const auto found = table_.find(released_.back());
-            released_.pop_back();
-            if (found == table_.end() || !IsUnused(found->second))
-                continue;
-            ListReleased(*found->second);
-            table_.erase(found);
-        }
+    void RemoveIfUnused(typename Table::iterator entry) {
+        if (!IsUnused(entry->second))
+            return;
+        ListReleased(*entry->second);
+        if (entry == next_)
+            ++next_;
+        table_.erase(entry);
     }
 
     static bool IsUnused(cow_ptr<T> const& object) noexcept { return object.use_count() == 1; }
@@ -73,6 +74,7 @@ private:
     }
 
     Table& table_;
+    typename Table::iterator next_;
     std::vector<Id> released_;
     bool missedRelease_ = false;
 };
