@@ -192,8 +192,11 @@ template <class L, class R>
     return result += KivStringViewT<char16_t>(right);
 }
 
+// A DLL exports no inline members: there every program makes its own.
+#if !defined(_WIN32)
 extern template class KivStringT<char>;
 extern template class KivStringT<char16_t>;
+#endif
 
 } // namespace KivPlatform
 
