@@ -22,7 +22,7 @@ for target in "${targets[@]}"; do
     log=$build_directory/fuzz_$target.log
     mkdir -p "$inputs"
     : >"$log"
-    options=(-max_len=128 -entropic=0 -timeout=20 -malloc_limit_mb=64 -print_final_stats=1
+    options=(-max_len=128 -entropic=0 -timeout=60 -malloc_limit_mb=64 -print_final_stats=1
         -artifact_prefix="$build_directory/finding-$target-")
     [ ! -e "$source_directory/fuzz/$target.dict" ] || options+=(-dict="$source_directory/fuzz/$target.dict")
     spent=0
