@@ -130,18 +130,20 @@ Round Growth(std::int64_t size, Release release) {
 } // namespace
 
 void AddHistoryWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
-    constexpr double linear = 1.5;
-    for (const std::int64_t divisor : divisors) {
-        const std::int64_t count = 100'000 / divisor;
-        workloads.push_back({"B10 common base of two chains", count, {1, 64}, [=] { return CommonBase(count); }});
-        for (const int branches : {1, 20, 1000}) {
-            const std::int64_t commits = std::max<std::int64_t>(count, 4 * branches);
-            workloads.push_back(
-                {"B12 simplification, branches: " + std::to_string(branches), commits, {0, 0, 4 * linear}, [=] {
-                     return Simplification(commits, branches);
-                 }});
+    const auto add = [&](std::string const& name, std::int64_t least, Limits limits, auto rounds) {
+        for (const std::int64_t divisor : divisors) {
+            const std::int64_t count = std::max(100'000 / divisor, least);
+            workloads.push_back({name, count, limits, [=] { return rounds(count); }});
         }
-    }
+    };
+    // Four times the commits take four times the instructions, but no longer fit into the caches.
+    constexpr double linearBeyondCaches = 8;
+    add("B10 common base of two chains", 0, {1, 64}, CommonBase);
+    for (const int branches : {1, 20, 1000})
+        add("B12 simplification, branches: " + std::to_string(branches), 4 * branches, {0, 0, linearBeyondCaches},
+            [=](std::int64_t count) { return Simplification(count, branches); });
+
+    constexpr double linear = 1.5;
     const auto addGrowth = [&](char const* name, std::int64_t whole, auto release) {
         workloads.push_back({name, whole / divisors.back(), {linear}, [=, size = whole / divisors.back()] {
                                  return Growth(size, release);

@@ -12,8 +12,8 @@ import matplotlib.pyplot as plot  # noqa: E402
 # Colours that show on a light and on a dark page; the background is the page's.
 ink, ours, limit = "#808890", "#2f81f7", "#d9534f"
 plot.rcParams.update({
-    "svg.hashsalt": "performance", "font.size": 8, "axes.titlesize": 8, "axes.edgecolor": ink, "text.color": ink,
-    "axes.labelcolor": ink, "xtick.color": ink, "ytick.color": ink, "axes.titlecolor": ink,
+    "svg.hashsalt": "performance", "svg.fonttype": "none", "font.size": 8, "axes.titlesize": 8, "axes.edgecolor": ink,
+    "text.color": ink, "axes.titlecolor": ink, "axes.labelcolor": ink, "xtick.color": ink, "ytick.color": ink,
 })
 
 with open(sys.argv[1], encoding="utf-8") as file:

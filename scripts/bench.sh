@@ -56,6 +56,7 @@ case $mode in
 --check) check "$@" ;;
 --quick) measure quick "${1:-.}" ;;
 --plot)
+    install_packages plot
     measure growth "${1:-.}"
     /usr/bin/python3 "$source_directory/bench/plot.py" "$result" "$source_directory/docs/performance.svg"
     ;;

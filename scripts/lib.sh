@@ -45,7 +45,8 @@ packages_of() {
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
     lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck ;;
-    bench) echo libbenchmark-dev libssl-dev valgrind python3 python3-matplotlib ;;
+    bench) echo libbenchmark-dev libssl-dev valgrind python3 ;;
+    plot) echo python3-matplotlib ;;
     valgrind) echo valgrind ;;
     coverage) echo gcovr ;;
     fuzz) echo clang-14 libclang-rt-14-dev ;;
