@@ -12,6 +12,8 @@ using Names = std::vector<std::string>;
 inline std::string Identifier(std::string const& type, std::string const& data) {
     static std::map<std::string, std::string> known;
     const std::string packed = type + " " + std::to_string(data.size()) + '\0' + data;
+    if (known.size() > 20'000)
+        known.clear();
     std::string& id = known[packed];
     if (id.empty())
         id = Narrow(Helpers::ComputeEncodedSHA256Hash(packed.data(), packed.size()));

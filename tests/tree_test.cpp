@@ -1,94 +1,20 @@
-#include "PackedForms.h"
-#include "RecordingRepository.h"
+#include "PlainTree.h"
 
 #include <gtest/gtest.h>
 
 #include <random>
-#include <set>
 
 namespace KivVcs {
 namespace {
 
-/// What a tree should hold, kept in the plainest way.
-struct Model {
-    std::map<std::string, std::string> blobs;
-    std::map<std::string, Model> trees;
-
-    [[nodiscard]] bool IsEmpty() const { return blobs.empty() && trees.empty(); }
-};
-
-std::string Data(Model const& model) {
-    std::map<std::string, std::string> entries;
-    for (auto const& [name, content] : model.blobs)
-        entries.emplace(name, Entry("blob", name, Identifier("blob", content)));
-    for (auto const& [name, tree] : model.trees)
-        entries.emplace(name, Entry("tree", name, Identifier("tree", Data(tree))));
-    std::string data;
-    for (auto const& [name, entry] : entries)
-        data += entry;
-    return data;
-}
-
-std::string VisibleId(Model const& model, std::string const& name) {
-    if (auto const blob = model.blobs.find(name); blob != model.blobs.end())
-        return Identifier("blob", blob->second);
-    auto const tree = model.trees.find(name);
-    return tree == model.trees.end() ? "" : Identifier("tree", Data(tree->second));
-}
-
-std::set<std::string> LocalDiffs(Model const& left, Model const& right, bool ofTrees) {
-    std::set<std::string> names;
-    for (auto const& [mine, theirs] : {std::pair(&left, &right), std::pair(&right, &left)}) {
-        if (ofTrees) {
-            for (auto const& [name, tree] : mine->trees)
-                if (VisibleId(*theirs, name) != Identifier("tree", Data(tree)))
-                    names.insert(name);
-        } else {
-            for (auto const& [name, content] : mine->blobs)
-                if (VisibleId(*theirs, name) != Identifier("blob", content))
-                    names.insert(name);
-        }
-    }
-    return names;
-}
-
-// The paths of a single tree are its differences from an empty one.
-std::set<std::string> DeepDiffs(Model const& left, Model const& right) {
-    static const Model none;
-    const auto below = [](Model const& model, std::string const& name) -> Model const& {
-        auto const found = model.trees.find(name);
-        return found == model.trees.end() ? none : found->second;
-    };
-    std::set<std::string> paths = LocalDiffs(left, right, false);
-    for (std::string const& name : LocalDiffs(left, right, true))
-        for (std::string const& path : DeepDiffs(below(left, name), below(right, name)))
-            paths.insert(name + "/" + path);
-    return paths;
-}
-
-bool Remove(Model& model, std::span<std::string const> path) {
-    auto const sub = model.trees.find(path[0]);
-    if (path.size() > 1) {
-        if (sub == model.trees.end() || !Remove(sub->second, path.subspan(1)))
-            return false;
-        if (!sub->second.IsEmpty())
-            return true;
-    }
-    return model.blobs.erase(path[0]) + model.trees.erase(path[0]) > 0;
-}
-
-Names Sorted(std::set<std::string> const& names) {
-    return {names.begin(), names.end()};
-}
-
 /// A tree together with what it should hold.
 struct Version {
     cow_ptr<Tree> tree = immu::make<Tree>();
-    Model model{};
+    PlainTree model{};
 
     void Check() const {
         ASSERT_EQ(Bytes(tree->GetData()), Data(model));
-        ASSERT_EQ(Narrow(tree->GetId().GetText()), Identifier("tree", Data(model)));
+        ASSERT_EQ(Narrow(tree->GetId().GetText()), IdOf(model));
         ASSERT_EQ(tree->IsEmpty(), model.IsEmpty());
         ASSERT_EQ(tree->GetLocalObjectCount(), model.blobs.size() + model.trees.size());
         ASSERT_EQ(tree->GetLocalBlobCount(), model.blobs.size());
@@ -152,15 +78,12 @@ TEST_P(RandomTrees, NestedTreesFollowThePlainModel) {
             Version const& added = former[static_cast<std::size_t>(Below(static_cast<int>(former.size())))];
             if (added.tree->GetDeepBlobCount() > 30)
                 continue;
-            Model* holder = &now.model;
-            for (std::size_t level = 0; level + 1 < path.size(); ++level)
-                holder = &holder->trees[path[level]];
             if (action == 4) {
-                holder->trees[path.back()] = added.model;
+                Add(now.model, path, PlainTree(added.model));
                 ASSERT_TRUE(now.tree.write()->AddTree(&repo, wide(), *added.tree));
             } else {
                 const std::string content = std::to_string(Below(3));
-                holder->blobs[path.back()] = content;
+                Add(now.model, path, content);
                 ASSERT_TRUE(now.tree.write()->AddBlob(&repo, wide(), MakeBlob(content)));
             }
         }
