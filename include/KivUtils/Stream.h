@@ -11,6 +11,10 @@
 
 namespace KivUtils {
 
+namespace Serialization {
+class StreamIO;
+}
+
 /// A byte stream with one read position. Hosts implement it to serve packed forms from wherever they keep them.
 class KIVVCS_EXPORT IStream {
 public:
@@ -54,11 +58,18 @@ public:
     [[nodiscard]] std::uint64_t GetSize() const override { return buffer_.GetSize(); }
     [[nodiscard]] std::uint64_t GetPosition() const override { return position_; }
 
-    /// Moves everything from the position on to the end of @p destination's buffer, sharing large chunks with it, and
+    /// Appends everything from the position on to @p destination, sharing large chunks with it, moves to the end and
     /// returns the number of bytes. @throws std::bad_alloc
-    std::uint64_t ShareRest(MemStream& destination);
+    std::uint64_t ShareRest(Memory::Buffer& destination);
+
+    /// The bytes from the position to the end of the chunk that it is in.
+    [[nodiscard]] Memory::BufferChunks::Chunk GetNearBytes() const noexcept;
+    /// Moves past @p size of them.
+    void Skip(std::uint64_t size) noexcept { position_ += size; }
 
 private:
+    friend class Serialization::StreamIO;
+
     explicit MemStream(Memory::Buffer& buffer) noexcept : buffer_(buffer) {}
 
     Memory::Buffer& buffer_;
@@ -87,6 +98,13 @@ public:
     /// @param copied receives the number of bytes copied, unless null.
     /// @return false if there is no stream or destination, or if reading or writing failed on the way.
     bool CopyTo(IStream* destination, std::uint64_t* copied);
+
+    /// Appends everything from the position to the end to @p destination, sharing the large chunks of a stream on a
+    /// buffer. @return false if there is no stream, or if reading failed on the way.
+    bool ReadRest(Memory::Buffer& destination);
+
+    /// The stream if it is one on a buffer, otherwise null.
+    [[nodiscard]] MemStream* GetMemStream() const noexcept;
 
 private:
     Stream stream_;

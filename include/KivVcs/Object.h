@@ -111,6 +111,12 @@ public:
     /// The hash of the identifier. @pre IsSet()
     [[nodiscard]] std::size_t Hash() const noexcept { return record_.load(std::memory_order_acquire)->hash; }
 
+    /// The digest that the identifier tells, or null. @pre IsSet()
+    [[nodiscard]] Id::Digest const* Digest() const noexcept {
+        Id::Record const* const record = record_.load(std::memory_order_acquire);
+        return record->hasDigest ? &record->digest : nullptr;
+    }
+
     /// Whether both are there and equal; false tells nothing if one is missing.
     [[nodiscard]] bool Equals(CachedId const& other) const noexcept {
         Id::Record const* const mine = record_.load(std::memory_order_acquire);
@@ -131,8 +137,11 @@ public:
     }
 
     void Reset() noexcept {
-        Id::Record const* const record = record_.exchange(nullptr, std::memory_order_acquire);
-        if (record != nullptr && record->drop_reference())
+        Id::Record const* const record = record_.load(std::memory_order_acquire);
+        if (record == nullptr)
+            return;
+        record_.store(nullptr, std::memory_order_relaxed);
+        if (record->drop_reference())
             delete record;
     }
 
@@ -197,6 +206,13 @@ public:
 
     /// `GetId().Hash()`, without a copy of the identifier.
     [[nodiscard]] std::size_t GetIdHash() const { return id_.IsSet() ? id_.Hash() : GetId().Hash(); }
+
+    /// `GetId().GetDigest()`, without a copy of the identifier; valid until `ResetState`.
+    [[nodiscard]] Id::Digest const* GetIdDigest() const {
+        if (!id_.IsSet())
+            static_cast<void>(Object::GetId());
+        return id_.Digest();
+    }
 
 protected:
     Object() noexcept = default;

@@ -40,6 +40,9 @@ public:
     /// Sets the entry @p name of the kind of @p child, which may be null; the entry of the other kind stays.
     void Set(KivStringViewT<char16_t> name, cow_ptr<Blob> child);
     void Set(KivStringViewT<char16_t> name, cow_ptr<Tree> child);
+    /// The same with a text that a new entry shares.
+    void Set(KivStringT<char16_t> const& name, cow_ptr<Blob> child);
+    void Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child);
 
     /// Removes the entries @p name of both kinds; false if there is none.
     bool Erase(KivStringViewT<char16_t> name);

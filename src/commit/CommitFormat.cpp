@@ -40,8 +40,8 @@ struct Signature {
 /// An identifier as the lines of a commit show it.
 KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
     KivStringT<char> line = key.ToString();
-    if (!id.IsEmpty())
-        line += KivStringT<char>::Build(64, [&id](char* digits) { WriteDigits(id, digits); });
+    if (Id::Digest const* const digest = id.GetDigest())
+        line += KivStringT<char>::Build(64, [digest](char* digits) { WriteDigits(*digest, digits); });
     return line += "\n";
 }
 

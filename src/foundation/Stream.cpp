@@ -24,12 +24,22 @@ bool MemStream::Write(const void* source, std::uint64_t size) {
     return true;
 }
 
-std::uint64_t MemStream::ShareRest(MemStream& destination) {
+std::uint64_t MemStream::ShareRest(Memory::Buffer& destination) {
     const std::uint64_t size = buffer_.GetSize();
     const std::uint64_t rest = size - std::min(position_, size);
-    destination.buffer_.Append(buffer_, position_, rest);
+    destination.Append(buffer_, position_, rest);
     position_ += rest;
     return rest;
+}
+
+Memory::BufferChunks::Chunk MemStream::GetNearBytes() const noexcept {
+    std::uint64_t offset = position_;
+    for (auto const& chunk : buffer_.LockForRead()) {
+        if (offset < chunk.size())
+            return chunk.subspan(static_cast<std::size_t>(offset));
+        offset -= chunk.size();
+    }
+    return {};
 }
 
 namespace Serialization {
@@ -59,8 +69,9 @@ bool StreamIO::CopyTo(IStream* destination, std::uint64_t* copied) {
     IStream* const stream = stream_;
     if (stream == nullptr || destination == nullptr)
         return finish(false);
-    if (typeid(*stream) == typeid(MemStream) && typeid(*destination) == typeid(MemStream)) {
-        total = static_cast<MemStream&>(*stream).ShareRest(static_cast<MemStream&>(*destination));
+    MemStream* const source = GetMemStream();
+    if (source != nullptr && typeid(*destination) == typeid(MemStream)) {
+        total = source->ShareRest(static_cast<MemStream*>(destination)->buffer_);
         return finish(true);
     }
     // As large as what a buffer keeps in one block of exact size.
@@ -73,6 +84,20 @@ bool StreamIO::CopyTo(IStream* destination, std::uint64_t* copied) {
         position += count;
     }
     return finish(true);
+}
+
+bool StreamIO::ReadRest(Memory::Buffer& destination) {
+    if (MemStream* const source = GetMemStream()) {
+        source->ShareRest(destination);
+        return true;
+    }
+    const Stream appending = MemStream::CreateOnRef(destination);
+    return CopyTo(appending, nullptr);
+}
+
+MemStream* StreamIO::GetMemStream() const noexcept {
+    IStream* const stream = stream_;
+    return stream != nullptr && typeid(*stream) == typeid(MemStream) ? static_cast<MemStream*>(stream) : nullptr;
 }
 
 } // namespace Serialization

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstdlib>
 #include <ctime>
 #include <limits>
 
@@ -18,8 +19,10 @@ bool LocalCalendarTime(std::int64_t seconds, std::tm& calendar) noexcept {
 #if defined(_WIN32)
     return localtime_s(&calendar, &time) == 0;
 #else
-    // Unlike localtime, localtime_r need not notice that the process has changed its time zone.
-    tzset();
+    // Unlike localtime, localtime_r need not notice that the process has changed its time zone. Where it has none of its
+    // own, looking for a change of the system's would ask the file system for every commit.
+    if (std::getenv("TZ") != nullptr)
+        tzset();
     return localtime_r(&time, &calendar) != nullptr;
 #endif
 }

@@ -22,8 +22,7 @@ cow_ptr<Blob> Blob::Deserialize(StreamIO& stream) {
     if (!stream || !Helpers::ShiftObjectIdentifier(stream, "blob"))
         return nullptr;
     Buffer data;
-    const Stream destination = MemStream::CreateOnRef(data);
-    if (!stream.CopyTo(destination, nullptr))
+    if (!stream.ReadRest(data))
         return nullptr;
     return immu::make<Blob>(std::move(data));
 }

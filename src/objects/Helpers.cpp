@@ -1,7 +1,8 @@
-#include "KivVcs/Object.h"
+#include "objects/PathComponents.h"
 
 #include <algorithm>
 #include <array>
+#include <cstring>
 #include <limits>
 
 namespace KivVcs::Helpers {
@@ -80,6 +81,17 @@ KivStringT<char> StreamToStringA(StreamIO& stream) {
 }
 
 bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> expected) {
+    // Bytes that lie in memory are looked at there instead of being read one by one.
+    if (MemStream* const bytes = stream.GetMemStream()) {
+        const auto near = bytes->GetNearBytes();
+        const void* const end = near.empty() ? nullptr : std::memchr(near.data(), 0, near.size());
+        if (end != nullptr) {
+            const auto length = static_cast<std::size_t>(static_cast<const std::byte*>(end) - near.data());
+            const auto compared = static_cast<std::size_t>(expected.GetLength());
+            bytes->Skip(length + 1);
+            return compared <= length && std::memcmp(near.data(), expected.GetString(), compared) == 0;
+        }
+    }
     // Nothing but the expected beginning is compared, so that a header of any length takes no memory.
     bool matches = true;
     for (int position = 0;;) {
@@ -97,13 +109,7 @@ std::vector<KivStringViewT<char16_t>> SplitVcsPath(KivStringViewT<char16_t> path
     std::vector<KivStringViewT<char16_t>> segments;
     // Deeper paths are rare, and growing from nothing would allocate at every other segment.
     segments.reserve(8);
-    for (int start = 0; start < path.GetLength();) {
-        const int separator = path.Find(u"/", start);
-        const int end = separator < 0 ? path.GetLength() : separator;
-        if (end > start)
-            segments.push_back(path.Mid(start, end - start));
-        start = end + 1;
-    }
+    ForEachPathComponent(path, [&segments](KivStringViewT<char16_t> segment) { segments.push_back(segment); });
     return segments;
 }
 

@@ -2,6 +2,7 @@
 
 #include <array>
 #include <charconv>
+#include <cstring>
 
 namespace KivVcs {
 
@@ -23,26 +24,42 @@ private:
     char* end_;
 };
 
-using DigitPair = std::array<char, 2>;
-
-constexpr std::array<DigitPair, 256> digitPairs = [] {
-    std::array<DigitPair, 256> pairs{};
-    for (std::size_t byte = 0; byte < pairs.size(); ++byte)
-        pairs[byte] = {"0123456789abcdef"[byte >> 4], "0123456789abcdef"[byte & 15]};
-    return pairs;
-}();
-
 } // namespace
 
-char* WriteDigits(Id const& id, char* out) noexcept {
-    static constexpr Id::Digest none{};
-    Id::Digest const* const digest = id.GetDigest();
-    for (const std::uint8_t byte : digest == nullptr ? none : *digest) {
-        const DigitPair pair = digitPairs[byte];
-        *out++ = pair[0];
-        *out++ = pair[1];
+char* WriteDigits(Id::Digest const& digest, char* out) noexcept {
+    // Plain arithmetic in two loops of fixed length, which compilers turn into a few vector instructions.
+    std::array<std::uint8_t, 2 * std::tuple_size_v<Id::Digest>> digits;
+    for (std::size_t index = 0; index < digest.size(); ++index) {
+        digits[2 * index] = static_cast<std::uint8_t>(digest[index] >> 4);
+        digits[2 * index + 1] = static_cast<std::uint8_t>(digest[index] & 15);
     }
-    return out;
+    for (std::uint8_t& digit : digits)
+        digit = static_cast<std::uint8_t>(digit + (digit > 9 ? 'a' - 10 : '0'));
+    std::memcpy(out, digits.data(), digits.size());
+    return out + digits.size();
+}
+
+Id ReadId(KivStringViewT<char> text) {
+    Id::Digest digest;
+    if (static_cast<std::size_t>(text.GetLength()) != 2 * digest.size())
+        return Id(KivStringT<char16_t>(text.ToString()));
+    // As in `WriteDigits`: every digit is taken, and a wrong one noticed at the end.
+    std::array<std::uint8_t, 2 * std::tuple_size_v<Id::Digest>> digits;
+    std::memcpy(digits.data(), text.GetString(), digits.size());
+    std::uint8_t wrong = 0;
+    for (std::uint8_t& digit : digits) {
+        const auto number = static_cast<std::uint8_t>(digit - '0');
+        const auto letter = static_cast<std::uint8_t>(digit - 'a');
+        const auto isNumber = static_cast<std::uint8_t>(number <= 9 ? 0xFF : 0);
+        const auto isLetter = static_cast<std::uint8_t>(letter <= 5 ? 0xFF : 0);
+        wrong = static_cast<std::uint8_t>(wrong | ~(isNumber | isLetter));
+        digit = static_cast<std::uint8_t>((number & isNumber) | ((letter + 10) & isLetter));
+    }
+    if (wrong != 0)
+        return Id(KivStringT<char16_t>(text.ToString()));
+    for (std::size_t index = 0; index < digest.size(); ++index)
+        digest[index] = static_cast<std::uint8_t>(digits[2 * index] << 4 | digits[2 * index + 1]);
+    return Id::FromDigest(digest);
 }
 
 void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t size) {

@@ -7,9 +7,12 @@ namespace KivVcs {
 /// What precedes the data in a packed form: the type word, a blank, the data's size in decimal, a zero byte.
 void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t size);
 
-/// Writes the 64 digits of an identifier as packed forms show them, and returns the end of what was written. Unlike
-/// `Id::GetText` it leaves nothing behind. @pre the identifier tells a digest, as those of all objects do
-char* WriteDigits(Id const& id, char* out) noexcept;
+/// Writes the 64 digits of @p digest as packed forms show them, and returns the end of what was written. Unlike
+/// `Id::GetText` it leaves nothing behind.
+char* WriteDigits(Id::Digest const& digest, char* out) noexcept;
+
+/// The identifier that @p text tells, as packed forms show it. @throws std::bad_alloc
+[[nodiscard]] Id ReadId(KivStringViewT<char> text);
 
 /// Computes the identifier of a packed form that is fed piece by piece instead of being put together.
 class IdDigest {

@@ -68,7 +68,8 @@ bool SHADigest256::FinalDigest(void* out) noexcept {
     for (std::uint32_t const word : state_)
         for (int shift = 24; shift >= 0; shift -= 8)
             *digest++ = static_cast<std::uint8_t>(word >> shift);
-    *this = SHADigest256();
+    state_ = Sha256::initialState;
+    fed_ = 0;
     return true;
 }
 

@@ -4,6 +4,8 @@ namespace KivVcs {
 
 namespace {
 
+constexpr float mostObjectsForBucket = 0.25F;
+
 template <class Table, class Key>
 typename Table::mapped_type FindIn(Table const& table, Key const& key) {
     const auto found = table.find(key);
@@ -23,6 +25,11 @@ IObjectsStorage::~IObjectsStorage() = default;
 MemObjectsStorage::MemObjectsStorage() : MemObjectsStorage({u"master"}) {}
 
 MemObjectsStorage::MemObjectsStorage(std::initializer_list<KivStringViewT<char16_t>> branches) {
+    // Half-empty tables find out from the bucket alone that an object is new, as most that are asked for are, where they
+    // would otherwise visit a neighbour somewhere in memory.
+    commits_.max_load_factor(mostObjectsForBucket);
+    trees_.max_load_factor(mostObjectsForBucket);
+    blobs_.max_load_factor(mostObjectsForBucket);
     for (KivStringViewT<char16_t> name : branches)
         references_.try_emplace(name.ToString());
 }

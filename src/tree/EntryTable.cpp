@@ -60,7 +60,9 @@ void MakeWritable(TableNode*& slot, int room) {
         return;
     // A version that is shared is likely to be shared again at once, so it gets no spare room; one that is being built
     // does.
-    const int spare = sole ? std::clamp(slot->Count() / 2, room, TableNode::mostElements - slot->Count()) : room;
+    const int spare = sole ? std::clamp(slot->Count(), std::min(4, TableNode::mostElements - slot->Count()),
+                                        TableNode::mostElements - slot->Count())
+                           : room;
     TableNode* copy = nullptr;
     if (sole) {
         copy = TableNode::Make(slot->Height(), slot->Count() + spare);
@@ -125,6 +127,10 @@ void SplitChild(TableNode& parent, int index, KivStringViewT<char16_t> name) {
         first = child.IsLeaf() ? child.Entries()[static_cast<std::size_t>(at)].Name()
                                : child.Branches()[static_cast<std::size_t>(at)].first;
     TableNode* const right = child.CopyOf(at, child.Count(), room);
+    if (at == child.Count()) {
+        parent.Insert(index + 1, Branch{std::move(first), right});
+        return;
+    }
     if (slot->reference_count() == 1) {
         if (child.IsLeaf()) {
             slot->EraseEntries(at, child.Count());
@@ -138,7 +144,7 @@ void SplitChild(TableNode& parent, int index, KivStringViewT<char16_t> name) {
     } else {
         TableNode* left = nullptr;
         try {
-            left = child.CopyOf(0, at, at == child.Count() ? 0 : 1);
+            left = child.CopyOf(0, at, 1);
         } catch (...) {
             TableRelease::Drop(right);
             throw;
@@ -193,30 +199,90 @@ void RaiseRoot(TableNode*& root) {
     root = raised;
 }
 
-/// The entries of a leaf that have a given name: none, one, or a blob and a subtree.
+/// Some of the entries of a leaf that have one name.
 struct NameRange {
-    NameRange(TableNode const& leaf, KivStringViewT<char16_t> name) noexcept
-        : from(leaf.EntryFor(name, false)), to(from) {
-        const auto entries = leaf.Entries();
-        while (to < leaf.Count() && entries[static_cast<std::size_t>(to)].Name() == name)
-            ++to;
-    }
+    int from;
+    int to;
+
     [[nodiscard]] Tally TallyIn(TableNode const& leaf) const noexcept {
         return TallyOf(leaf.Entries().subspan(static_cast<std::size_t>(from), static_cast<std::size_t>(to - from)));
     }
-
-    int from;
-    int to;
 };
 
-template <class Child>
-void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, bool isTree, cow_ptr<Child> child) {
-    const bool exists = FindEntry(root, name, isTree) != nullptr;
+/// All entries of @p leaf that have @p name: none, one, or a blob and a subtree.
+NameRange RangeOfName(TableNode const& leaf, KivStringViewT<char16_t> name) noexcept {
+    const auto entries = leaf.Entries();
+    NameRange range{leaf.EntryFor(name, false), 0};
+    for (range.to = range.from; range.to < leaf.Count() && entries[static_cast<std::size_t>(range.to)].Name() == name;)
+        ++range.to;
+    return range;
+}
+
+/// Where in its leaf an entry is, or where it belongs.
+struct Place {
+    int index = 0;
+    int leafCount = 0;
+    bool exists = false;
+};
+
+Place FindPlace(TableNode const* root, KivStringViewT<char16_t> name, bool isTree) noexcept {
+    if (root == nullptr)
+        return {};
+    TableNode const& leaf = LeafFor(*root, name);
+    const int index = leaf.EntryToInsert(name, isTree);
+    return {index, leaf.Count(), leaf.IsEntryAt(index, name, isTree)};
+}
+
+/// The entries on one leaf that decide, with the one at @p index, what the entry (@p name, @p isTree) adds to a tally: at
+/// most one, of the other kind.
+NameRange OthersOfName(TableNode const& leaf, int index, KivStringViewT<char16_t> name, bool isTree) noexcept {
+    const int other = isTree ? index - 1 : index;
+    const bool there =
+        other >= 0 && other < leaf.Count() && leaf.Entries()[static_cast<std::size_t>(other)].Name() == name;
+    return there ? NameRange{other, other + 1} : NameRange{index, index};
+}
+
+/// Inserts an entry that is not there at @p index of @p path's leaf, which is writable and has room.
+void InsertEntry(Path const& path, int index, Entry&& entry) noexcept {
+    TableNode& leaf = *path.At(path.length - 1).node;
+    NameRange range = OthersOfName(leaf, index, entry.Name(), entry.IsTree());
+    const Tally before = range.TallyIn(leaf);
+    leaf.Insert(index, std::move(entry));
+    ++range.to;
+    path.AddToTotals(range.TallyIn(leaf), before);
+}
+
+/// Exchanges the child of the entry at @p index of @p path's leaf, which is writable.
+void ReplaceChild(Path const& path, int index, Entry&& replacement) noexcept {
+    TableNode& leaf = *path.At(path.length - 1).node;
+    Entry& entry = leaf.Entries()[static_cast<std::size_t>(index)];
+    if (entry.Child() != nullptr && replacement.Child() != nullptr) {
+        // The same name, kind and size as before: no total changes.
+        entry.TakeChildOf(replacement);
+        return;
+    }
+    const NameRange range = RangeOfName(leaf, entry.Name());
+    const Tally before = range.TallyIn(leaf);
+    entry.TakeChildOf(replacement);
+    path.AddToTotals(range.TallyIn(leaf), before);
+}
+
+KivStringT<char16_t> NewName(KivStringViewT<char16_t> name) {
+    return name.ToString();
+}
+
+KivStringT<char16_t> NewName(KivStringT<char16_t> const& name) noexcept {
+    return name;
+}
+
+template <class Name, class Child>
+void SetEntry(TableNode*& root, Name const& name, bool isTree, cow_ptr<Child> child) {
+    const Place place = FindPlace(root, name, isTree);
     // An entry that is replaced keeps its name, which its other versions share.
-    Entry entry(exists ? KivStringT<char16_t>() : name.ToString(), std::move(child));
+    Entry entry(place.exists ? KivStringT<char16_t>() : NewName(name), std::move(child));
     if (root == nullptr)
         root = TableNode::Make(0, 1);
-    if (!exists && root->IsFull())
+    if (!place.exists && root->IsFull())
         RaiseRoot(root);
 
     // Everything that can fail happens on the way down and leaves the content as it is: nodes are copied, and split
@@ -228,7 +294,7 @@ void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, bool isTree, cow_
             return (*slot)->Branches()[static_cast<std::size_t>(branch)].child;
         };
         int branch = (*slot)->BranchFor(name);
-        const bool split = !exists && childOf(branch)->IsFull();
+        const bool split = !place.exists && childOf(branch)->IsFull();
         MakeWritable(*slot, split ? 1 : 0);
         if (split) {
             SplitChild(**slot, branch, name);
@@ -237,23 +303,17 @@ void SetEntry(TableNode*& root, KivStringViewT<char16_t> name, bool isTree, cow_
         path.Add(*slot, branch);
         slot = &childOf(branch);
     }
-    MakeWritable(*slot, exists ? 0 : 1);
+    MakeWritable(*slot, place.exists ? 0 : 1);
     path.Add(*slot, 0);
 
     TableNode& leaf = **slot;
     leaf.DropPackedRun();
-    const int index = leaf.EntryFor(name, isTree);
-    if (exists && entry.Child() != nullptr && leaf.Entries()[static_cast<std::size_t>(index)].Child() != nullptr) {
-        // The same name, kind and size as before: no total changes.
-        leaf.Entries()[static_cast<std::size_t>(index)].TakeChildOf(entry);
-        return;
-    }
-    const Tally before = NameRange(leaf, name).TallyIn(leaf);
-    if (exists)
-        leaf.Entries()[static_cast<std::size_t>(index)].TakeChildOf(entry);
+    if (place.exists)
+        ReplaceChild(path, place.index, std::move(entry));
     else
-        leaf.Insert(index, std::move(entry));
-    path.AddToTotals(NameRange(leaf, name).TallyIn(leaf), before);
+        // A leaf that was split on the way has become shorter.
+        InsertEntry(path, leaf.Count() == place.leafCount ? place.index : leaf.EntryToInsert(name, isTree),
+                    std::move(entry));
 }
 
 } // namespace
@@ -275,6 +335,14 @@ void EntryTable::Set(KivStringViewT<char16_t> name, cow_ptr<Tree> child) {
     SetEntry(root_, name, true, std::move(child));
 }
 
+void EntryTable::Set(KivStringT<char16_t> const& name, cow_ptr<Blob> child) {
+    SetEntry(root_, name, false, std::move(child));
+}
+
+void EntryTable::Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child) {
+    SetEntry(root_, name, true, std::move(child));
+}
+
 bool EntryTable::Erase(KivStringViewT<char16_t> name) {
     if (FindEntry(root_, name, false) == nullptr && FindEntry(root_, name, true) == nullptr)
         return false;
@@ -290,7 +358,7 @@ bool EntryTable::Erase(KivStringViewT<char16_t> name) {
     path.Add(*slot, 0);
 
     TableNode& leaf = **slot;
-    const NameRange range(leaf, name);
+    const NameRange range = RangeOfName(leaf, name);
     path.AddToTotals({}, range.TallyIn(leaf));
     leaf.EraseEntries(range.from, range.to);
     leaf.DropPackedRun();

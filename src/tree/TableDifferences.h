@@ -49,6 +49,24 @@ public:
         return false;
     }
 
+    /// Moves both cursors past the entries of their leaves that are the same on both sides; false if the next ones
+    /// differ.
+    static bool SkipSharedEntries(TableCursor& left, TableCursor& right) noexcept {
+        // As above.
+        if (left.nodes_[0]->Total().doubled != 0 || right.nodes_[0]->Total().doubled != 0)
+            return false;
+        const auto mine = left.nodes_[0]->Entries().subspan(Index(left.positions_[0]));
+        const auto theirs = right.nodes_[0]->Entries().subspan(Index(right.positions_[0]));
+        const auto differing = std::mismatch(mine.begin(), mine.end(), theirs.begin(), theirs.end(),
+                                             [](Entry const& a, Entry const& b) { return a.Shares(b); });
+        if (differing.first == mine.begin())
+            return false;
+        const auto passed = static_cast<int>(differing.first - mine.begin());
+        left.Pass(passed);
+        right.Pass(passed);
+        return true;
+    }
+
     /// Takes both entries of the name at the cursor, which lie in one leaf, and moves past them.
     NamedObjects TakeName() noexcept {
         NamedObjects objects;
@@ -81,6 +99,12 @@ private:
             nodes_[Index(height - 1)] = nodes_[Index(height)]->Branches()[Index(positions_[Index(height)])].child;
             positions_[Index(height - 1)] = 0;
         }
+    }
+
+    /// Moves past @p count entries of the leaf.
+    void Pass(int count) noexcept {
+        positions_[0] += count - 1;
+        Next();
     }
 
     /// Moves to the next element of the node at @p height, or of the first one above it that has another.
@@ -125,8 +149,10 @@ void ForEachDifference(TableNode const* left, TableNode const* right, Visit cons
     TableCursor mine(left);
     TableCursor theirs(right);
     while (!mine.AtEnd() || !theirs.AtEnd()) {
-        if (!mine.AtEnd() && !theirs.AtEnd() && TableCursor::SkipShared(mine, theirs))
-            continue;
+        if (!mine.AtEnd() && !theirs.AtEnd()) {
+            if (TableCursor::SkipShared(mine, theirs) || TableCursor::SkipSharedEntries(mine, theirs))
+                continue;
+        }
         int order = mine.AtEnd() ? 1 : -1;
         if (!mine.AtEnd() && !theirs.AtEnd()) {
             KivStringT<char16_t> const& first = mine.Get().Name();

@@ -79,6 +79,17 @@ int TableNode::EntryFor(KivStringViewT<char16_t> name, bool isTree) const noexce
     return static_cast<int>(found - entries.begin());
 }
 
+int TableNode::EntryToInsert(KivStringViewT<char16_t> name, bool isTree) const noexcept {
+    return count_ == 0 || Entries().back().ComesBefore(name, isTree) ? count_ : EntryFor(name, isTree);
+}
+
+bool TableNode::IsEntryAt(int index, KivStringViewT<char16_t> name, bool isTree) const noexcept {
+    if (index == count_)
+        return false;
+    Entry const& entry = Entries()[static_cast<std::size_t>(index)];
+    return entry.IsTree() == isTree && entry.Name() == name;
+}
+
 template <class Element>
 void TableNode::InsertElement(int index, Element element) noexcept {
     auto* const elements = Elements<Element>();
@@ -145,15 +156,19 @@ Buffer const& TableNode::PackedRun() const {
     });
 }
 
+TableNode const& LeafFor(TableNode const& root, KivStringViewT<char16_t> name) noexcept {
+    TableNode const* node = &root;
+    while (!node->IsLeaf())
+        node = node->Branches()[static_cast<std::size_t>(node->BranchFor(name))].child;
+    return *node;
+}
+
 Entry const* FindEntry(TableNode const* root, KivStringViewT<char16_t> name, bool isTree) noexcept {
     if (root == nullptr)
         return nullptr;
-    while (!root->IsLeaf())
-        root = root->Branches()[static_cast<std::size_t>(root->BranchFor(name))].child;
-    const auto index = static_cast<std::size_t>(root->EntryFor(name, isTree));
-    const auto entries = root->Entries();
-    const bool found = index < entries.size() && entries[index].IsTree() == isTree && entries[index].Name() == name;
-    return found ? &entries[index] : nullptr;
+    TableNode const& leaf = LeafFor(*root, name);
+    const int index = leaf.EntryFor(name, isTree);
+    return leaf.IsEntryAt(index, name, isTree) ? &leaf.Entries()[static_cast<std::size_t>(index)] : nullptr;
 }
 
 } // namespace KivVcs::detail

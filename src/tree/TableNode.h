@@ -40,6 +40,11 @@ public:
         return IsTree() ? static_cast<Tree const*>(Child()) : nullptr;
     }
 
+    /// Whether both are the same name and child, and not only equal ones.
+    [[nodiscard]] bool Shares(Entry const& other) const noexcept {
+        return child_ == other.child_ && name_.GetString() == other.name_.GetString();
+    }
+
     /// Exchanges the child, and only that, for one of the same kind.
     void TakeChildOf(Entry& other) noexcept { std::swap(child_, other.child_); }
 
@@ -134,6 +139,10 @@ public:
     [[nodiscard]] int BranchFor(KivStringViewT<char16_t> name) const noexcept;
     /// The index of the first entry that does not come before (@p name, @p isTree).
     [[nodiscard]] int EntryFor(KivStringViewT<char16_t> name, bool isTree) const noexcept;
+    /// The same, found at once if it is the end, as when names are added in their order.
+    [[nodiscard]] int EntryToInsert(KivStringViewT<char16_t> name, bool isTree) const noexcept;
+    /// Whether the entry (@p name, @p isTree) is at @p index.
+    [[nodiscard]] bool IsEntryAt(int index, KivStringViewT<char16_t> name, bool isTree) const noexcept;
 
     /// Inserts and erases elements; the total is the caller's. @pre there is room
     void Insert(int index, Entry&& entry) noexcept { InsertElement(index, std::move(entry)); }
@@ -183,6 +192,9 @@ private:
     TableNode* nextDying_ = nullptr;
 };
 
+/// The leaf below @p root that has the entries of that name, if any has.
+[[nodiscard]] TableNode const& LeafFor(TableNode const& root, KivStringViewT<char16_t> name) noexcept;
+
 /// The entry (@p name, @p isTree) of the table with the given root, or null.
 [[nodiscard]] Entry const* FindEntry(TableNode const* root, KivStringViewT<char16_t> name, bool isTree) noexcept;
 
@@ -212,6 +224,10 @@ void ForEachEntry(TableNode const* node, Visit const& visit) {
 /// The entries of a tree, for the files that the tree is implemented in.
 struct TableAccess {
     [[nodiscard]] static TableNode const* Root(Tree const& tree) noexcept { return tree.entries_.Root(); }
+
+    /// As `AddBlob` and `AddTree` of @p tree, for an object that the caller may be the only one to hold.
+    template <class T>
+    static void AddRead(Tree& tree, IRepository& repo, KivStringT<char16_t> const& name, cow_ptr<T> object);
 };
 
 } // namespace KivVcs::detail

@@ -1,6 +1,7 @@
 #include "KivVcs/Tree.h"
 
 #include "KivVcs/Repository.h"
+#include "objects/PathComponents.h"
 #include "tree/TableNode.h"
 
 namespace KivVcs {
@@ -67,6 +68,23 @@ cow_ptr<T> Tree::SetLocalObject(IRepository& repo, KivStringViewT<char16_t> name
     return stored;
 }
 
+template <class T>
+void detail::TableAccess::AddRead(Tree& tree, IRepository& repo, KivStringT<char16_t> const& name, cow_ptr<T> object) {
+    if (name.IsEmpty() || name.Find(u"/") >= 0) {
+        tree.AddObjectToTree<T>(&repo, PathComponents(name), *object);
+        return;
+    }
+    // Only the caller knows of an object that nobody else holds, so that it needs no copy.
+    cow_ptr<T> stored = FindStored(repo, object->GetId(), object.get());
+    if (!stored)
+        stored = object.use_count() == 1 ? std::move(object) : immu::make<T>(*object);
+    tree.entries_.Set(name, repo.SyncWithStorage(std::move(stored)));
+    tree.ResetState();
+}
+
+template void detail::TableAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Blob>);
+template void detail::TableAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Tree>);
+
 void Tree::SetLocalTree(IRepository& repo, KivStringViewT<char16_t> name, cow_ptr<Tree> tree) {
     if (name.IsEmpty())
         return;
@@ -105,11 +123,11 @@ template cow_ptr<Blob> Tree::AddObjectToTree(IRepository*, Components, Blob cons
 template cow_ptr<Tree> Tree::AddObjectToTree(IRepository*, Components, Tree const&);
 
 cow_ptr<Blob> Tree::AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob) {
-    return AddObjectToTree<Blob>(repo, Helpers::SplitVcsPath(path), blob);
+    return AddObjectToTree<Blob>(repo, PathComponents(path), blob);
 }
 
 cow_ptr<Tree> Tree::AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree) {
-    return AddObjectToTree<Tree>(repo, Helpers::SplitVcsPath(path), tree);
+    return AddObjectToTree<Tree>(repo, PathComponents(path), tree);
 }
 
 cow_ptr<Object> Tree::AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id) {
@@ -123,7 +141,7 @@ cow_ptr<Object> Tree::AddObject(IRepository* repo, KivStringViewT<char16_t> path
 }
 
 bool Tree::RemoveObject(IRepository* repo, KivStringViewT<char16_t> path) {
-    return RemoveObjectFromTree(repo, Helpers::SplitVcsPath(path));
+    return RemoveObjectFromTree(repo, PathComponents(path));
 }
 
 bool Tree::RemoveObjectFromTree(IRepository* repo, Components components) {
@@ -182,7 +200,7 @@ cow_ptr<Tree> Tree::GetLocalTree(KivStringViewT<char16_t> name) const noexcept {
 }
 
 cow_ptr<Object> Tree::GetDeepObject(KivStringViewT<char16_t> path) const {
-    return GetDeepObject(Helpers::SplitVcsPath(path));
+    return GetDeepObject(PathComponents(path));
 }
 
 cow_ptr<Object> Tree::GetDeepObject(Components components) const noexcept {
@@ -193,7 +211,7 @@ cow_ptr<Object> Tree::GetDeepObject(Components components) const noexcept {
 }
 
 cow_ptr<Blob> Tree::GetDeepBlob(KivStringViewT<char16_t> path) const {
-    return GetDeepBlob(Helpers::SplitVcsPath(path));
+    return GetDeepBlob(PathComponents(path));
 }
 
 cow_ptr<Blob> Tree::GetDeepBlob(Components components) const noexcept {
@@ -204,7 +222,7 @@ cow_ptr<Blob> Tree::GetDeepBlob(Components components) const noexcept {
 }
 
 cow_ptr<Tree> Tree::GetDeepTree(KivStringViewT<char16_t> path) const {
-    return GetDeepTree(Helpers::SplitVcsPath(path));
+    return GetDeepTree(PathComponents(path));
 }
 
 cow_ptr<Tree> Tree::GetDeepTree(Components components) const noexcept {

@@ -26,14 +26,15 @@ public:
     explicit PackedEntryFeed(IdDigest& digest) noexcept : digest_(digest) {}
 
     void Add(Entry const& entry) {
-        const std::uint64_t size = PackedSize(entry);
-        if (size > bytes_.size()) {
+        const std::uint64_t most = detail::MostPackedSize(entry);
+        if (most > bytes_.size()) {
             Flush();
-            digest_.Feed(Buffer::Build(
-                size, [&entry](std::byte* bytes) { detail::PackEntry(entry, reinterpret_cast<char*>(bytes)); }));
+            digest_.Feed(Buffer::Build(PackedSize(entry), [&entry](std::byte* bytes) {
+                detail::PackEntry(entry, reinterpret_cast<char*>(bytes));
+            }));
             return;
         }
-        if (size > bytes_.size() - used_)
+        if (most > bytes_.size() - used_)
             Flush();
         used_ = static_cast<std::size_t>(detail::PackEntry(entry, bytes_.data() + used_) - bytes_.data());
     }
@@ -111,10 +112,6 @@ ParsedEntry ParseEntry(KivStringViewT<char> data, int& position) noexcept {
     return {data.Mid(type, typeEnd - type), data.Mid(name, nameEnd - name), idText};
 }
 
-Id IdFromText(KivStringViewT<char> text) {
-    return Id(KivStringT<char16_t>(text.ToString()));
-}
-
 /// Reads a tree and everything below it, one tree at a time, with the trees that are being read on a list of its own: nesting
 /// takes no stack.
 class TreeReader {
@@ -178,11 +175,11 @@ private:
         if (entry.type == "tree") {
             current.name = String::ToStringW(entry.name);
             cow_ptr<Tree> child;
-            if (Open(IdFromText(entry.id), child) == Opened::Finished)
+            if (Open(ReadId(entry.id), child) == Opened::Finished)
                 AddChild(child);
         } else if (entry.type == "blob") {
-            if (const cow_ptr<Blob> blob = FindOrReadBlob(IdFromText(entry.id)))
-                current.tree.AddBlob(&repo_, String::ToStringW(entry.name), *blob);
+            if (cow_ptr<Blob> blob = FindOrReadBlob(ReadId(entry.id)))
+                detail::TableAccess::AddRead(current.tree, repo_, String::ToStringW(entry.name), std::move(blob));
         } else {
             cow_ptr<Tree> none;
             Close(nullptr, none);
@@ -198,7 +195,7 @@ private:
 
     void AddChild(cow_ptr<Tree> const& child) {
         if (child)
-            open_.back().tree.AddTree(&repo_, open_.back().name, *child);
+            detail::TableAccess::AddRead(open_.back().tree, repo_, open_.back().name, child);
     }
 
     /// Ends the innermost tree with @p read as its result, which goes to its parent, or to @p result for the outermost one.
