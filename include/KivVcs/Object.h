@@ -7,6 +7,7 @@
 #include "KivVcs/Foundation.h"
 
 #include <array>
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <vector>
@@ -38,121 +39,152 @@ private:
 /// The identifier of an object: the hexadecimal text of the SHA-256 digest of its packed form, 64 lowercase digits. The
 /// empty text is the null identifier: no object.
 ///
-/// As large as a pointer; copying shares it and allocates nothing. Identifiers are equal when their texts are. Any
-/// number of threads may read one identifier.
+/// A value that holds the digest itself: copying it allocates nothing, comparing and hashing it visits no other memory.
+/// Identifiers are equal when their texts are. Any number of threads may read one identifier.
 class KIVVCS_EXPORT Id {
 public:
     using Digest = std::array<std::uint8_t, 32>;
 
     /// The null identifier.
     Id() noexcept = default;
-    /// The identifier of a packed form: hashes it. @throws std::bad_alloc
+    /// The identifier of a packed form: hashes it.
     Id(Buffer const& packed);
     /// The identifier with the given text, whatever it is. @throws std::bad_alloc
     explicit Id(KivStringT<char16_t> const& text);
-    /// The identifier whose text tells @p digest. @throws std::bad_alloc
-    [[nodiscard]] static Id FromDigest(Digest const& digest);
+    /// The identifier whose text tells @p digest.
+    [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return Id(digest, HashOf(digest)); }
 
-    /// The text, made on first use; valid as long as this identifier or a copy of it lives. @throws std::bad_alloc
-    [[nodiscard]] KivStringT<char16_t> const& GetText() const;
-
-    [[nodiscard]] bool IsEmpty() const noexcept { return !record_; }
-
-    /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
-    [[nodiscard]] std::size_t Hash() const noexcept { return record_ ? record_->hash : HashOfNull(); }
-
-    /// The digest that the text tells; null if it is not 64 lowercase hexadecimal digits.
-    [[nodiscard]] Digest const* GetDigest() const noexcept {
-        return record_ && record_->hasDigest ? &record_->digest : nullptr;
+    Id(Id const& other) noexcept
+        : digest_(other.digest_), hash_(other.hash_), text_(Share(other)), tellsDigest_(other.tellsDigest_) {}
+    Id(Id&& other) noexcept
+        : digest_(other.digest_), hash_(std::exchange(other.hash_, hashOfNull)), text_(TakeText(other)),
+          tellsDigest_(std::exchange(other.tellsDigest_, false)) {}
+    Id& operator=(Id other) noexcept {
+        digest_ = other.digest_;
+        std::swap(hash_, other.hash_);
+        std::swap(tellsDigest_, other.tellsDigest_);
+        Text const* const mine = text_.load(std::memory_order_relaxed);
+        text_.store(other.text_.load(std::memory_order_relaxed), std::memory_order_relaxed);
+        other.text_.store(mine, std::memory_order_relaxed);
+        return *this;
+    }
+    ~Id() {
+        if (Text const* const text = text_.load(std::memory_order_acquire))
+            Drop(text);
     }
 
+    /// The text, made on first use; valid as long as this identifier, or a copy made of it afterwards, lives.
+    /// @throws std::bad_alloc
+    [[nodiscard]] KivStringT<char16_t> const& GetText() const;
+
+    [[nodiscard]] bool IsEmpty() const noexcept {
+        return !tellsDigest_ && text_.load(std::memory_order_relaxed) == nullptr;
+    }
+
+    /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
+    [[nodiscard]] std::size_t Hash() const noexcept { return hash_; }
+
+    /// The digest that the text tells; null if it is not 64 lowercase hexadecimal digits.
+    [[nodiscard]] Digest const* GetDigest() const noexcept { return tellsDigest_ ? &digest_ : nullptr; }
+
     friend bool operator==(Id const& left, Id const& right) noexcept {
-        return left.record_ == right.record_ ||
-               (left.record_ && right.record_ && SameText(*left.record_, *right.record_));
+        if (left.hash_ != right.hash_ || left.tellsDigest_ != right.tellsDigest_)
+            return false;
+        // A text that tells a digest is always kept as one, so that the two kinds never have the same text.
+        return left.tellsDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
     }
 
 private:
     friend class CachedId;
 
-    /// What identifiers share. The text is kept as its digest and spelled out only when somebody asks for it, since a
-    /// repository holds one record for every object.
-    struct Record final : KivUtils::reference_counted {
-        bool hasDigest = false;
-        std::size_t hash = 0;
-        Digest digest{};
-        Published<KivStringT<char16_t>> text;
-    };
+    Id(Digest const& digest, std::size_t hash) noexcept : digest_(digest), hash_(hash), tellsDigest_(true) {}
 
-    explicit Id(cow_ptr<Record> record) noexcept : record_(std::move(record)) {}
-    static bool SameText(Record const& left, Record const& right) noexcept;
-    static std::size_t HashOfNull() noexcept { return static_cast<std::size_t>(0x42c52834b230ef45U); }
+    /// Spelled out only when somebody asks for it, since a repository holds an identifier for every object.
+    struct Text;
 
-    cow_ptr<Record> record_;
+    static constexpr auto hashOfNull = static_cast<std::size_t>(0x42c52834b230ef45U);
+
+    static std::size_t HashOf(Digest const& digest) noexcept;
+    static Text const* Share(Id const& other) noexcept {
+        Text const* const text = other.text_.load(std::memory_order_acquire);
+        if (text != nullptr)
+            AddReference(text);
+        return text;
+    }
+    static Text const* TakeText(Id& other) noexcept {
+        Text const* const text = other.text_.load(std::memory_order_relaxed);
+        other.text_.store(nullptr, std::memory_order_relaxed);
+        return text;
+    }
+    static void AddReference(Text const* text) noexcept;
+    static void Drop(Text const* text) noexcept;
+    static bool HaveSameText(Id const& left, Id const& right) noexcept;
+
+    Digest digest_{};
+    std::size_t hash_ = hashOfNull;
+    mutable std::atomic<Text const*> text_{nullptr};
+    bool tellsDigest_ = false;
 };
 
 /// An identifier that is computed on first use, by whichever thread comes first.
 class CachedId {
 public:
     CachedId() noexcept = default;
-    CachedId(CachedId const& other) noexcept : record_(Share(other.record_.load(std::memory_order_acquire))) {}
-    CachedId(CachedId&& other) noexcept : record_(other.record_.exchange(nullptr, std::memory_order_acquire)) {}
-    CachedId& operator=(CachedId other) noexcept {
-        Id::Record const* const mine = record_.load(std::memory_order_relaxed);
-        record_.store(other.record_.exchange(mine, std::memory_order_relaxed), std::memory_order_relaxed);
+    CachedId(CachedId const& other) noexcept { Take(other); }
+    CachedId(CachedId&& other) noexcept : CachedId(other) { other.Reset(); }
+    CachedId& operator=(CachedId const& other) noexcept {
+        if (this != &other) {
+            Reset();
+            Take(other);
+        }
         return *this;
     }
-    ~CachedId() { Reset(); }
-
-    /// The identifier, or the null identifier if there is none yet.
-    [[nodiscard]] Id Get() const noexcept {
-        return Id(cow_ptr<Id::Record>::share(record_.load(std::memory_order_acquire)));
+    CachedId& operator=(CachedId&& other) noexcept {
+        if (this != &other) {
+            *this = other;
+            other.Reset();
+        }
+        return *this;
     }
+    ~CachedId() = default;
 
-    /// The hash of the identifier. @pre IsSet()
-    [[nodiscard]] std::size_t Hash() const noexcept { return record_.load(std::memory_order_acquire)->hash; }
+    [[nodiscard]] bool IsSet() const noexcept { return state_.load(std::memory_order_acquire) == State::Set; }
 
-    /// The digest that the identifier tells, or null. @pre IsSet()
-    [[nodiscard]] Id::Digest const* Digest() const noexcept {
-        Id::Record const* const record = record_.load(std::memory_order_acquire);
-        return record->hasDigest ? &record->digest : nullptr;
-    }
+    /// The identifier, and the digest that it tells. @pre IsSet()
+    [[nodiscard]] Id Get() const noexcept { return Id(digest_, hash_); }
+    [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
     /// Whether both are there and equal; false tells nothing if one is missing.
     [[nodiscard]] bool Equals(CachedId const& other) const noexcept {
-        Id::Record const* const mine = record_.load(std::memory_order_acquire);
-        Id::Record const* const theirs = other.record_.load(std::memory_order_acquire);
-        return mine != nullptr && (mine == theirs || (theirs != nullptr && Id::SameText(*mine, *theirs)));
+        return IsSet() && other.IsSet() && digest_ == other.digest_;
     }
 
-    [[nodiscard]] bool IsSet() const noexcept { return record_.load(std::memory_order_acquire) != nullptr; }
-
-    /// Keeps @p id unless another thread was faster, and returns what is kept.
-    Id Publish(Id id) const noexcept {
-        Id::Record const* expected = nullptr;
-        if (record_.compare_exchange_strong(expected, id.record_.get(), std::memory_order_acq_rel)) {
-            Share(id.record_.get());
-            return id;
-        }
-        return Get();
-    }
-
-    void Reset() noexcept {
-        Id::Record const* const record = record_.load(std::memory_order_acquire);
-        if (record == nullptr)
+    /// Keeps @p id, which must tell a digest, unless another thread is doing so.
+    void Keep(Id const& id) const noexcept {
+        State expected = State::Empty;
+        if (!state_.compare_exchange_strong(expected, State::Writing, std::memory_order_relaxed))
             return;
-        record_.store(nullptr, std::memory_order_relaxed);
-        if (record->drop_reference())
-            delete record;
+        digest_ = *id.GetDigest();
+        hash_ = id.Hash();
+        state_.store(State::Set, std::memory_order_release);
     }
+
+    void Reset() noexcept { state_.store(State::Empty, std::memory_order_relaxed); }
 
 private:
-    static Id::Record const* Share(Id::Record const* record) noexcept {
-        if (record != nullptr)
-            record->add_reference();
-        return record;
+    enum class State : std::uint8_t { Empty, Writing, Set };
+
+    void Take(CachedId const& other) noexcept {
+        if (!other.IsSet())
+            return;
+        digest_ = other.digest_;
+        hash_ = other.hash_;
+        state_.store(State::Set, std::memory_order_relaxed);
     }
 
-    mutable std::atomic<Id::Record const*> record_{nullptr};
+    mutable std::atomic<State> state_{State::Empty};
+    mutable Id::Digest digest_{};
+    mutable std::size_t hash_ = 0;
 };
 
 /// The interface of all stored objects. The order of its operations is part of the binary interface.
@@ -204,15 +236,11 @@ public:
     /// Whether both objects have the same identifier; without touching it when they are one object.
     [[nodiscard]] bool HasSameId(Object const& other) const;
 
-    /// `GetId().Hash()`, without a copy of the identifier.
-    [[nodiscard]] std::size_t GetIdHash() const { return id_.IsSet() ? id_.Hash() : GetId().Hash(); }
+    /// A part of the identifier that tells nearly all objects apart.
+    [[nodiscard]] std::uint64_t GetIdPrefix() const;
 
-    /// `GetId().GetDigest()`, without a copy of the identifier; valid until `ResetState`.
-    [[nodiscard]] Id::Digest const* GetIdDigest() const {
-        if (!id_.IsSet())
-            static_cast<void>(Object::GetId());
-        return id_.Digest();
-    }
+    /// The digest that the identifier tells, valid until `ResetState`; null if the identifier has not been computed.
+    [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept { return id_.IsSet() ? &id_.Digest() : nullptr; }
 
 protected:
     Object() noexcept = default;
@@ -274,7 +302,5 @@ KIVVCS_EXPORT bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> 
 
 template <>
 struct std::hash<KivVcs::Id> {
-    // Not declared noexcept, though it never throws: tables then keep the hash beside the key, and finding or moving an
-    // element does not visit the identifiers of its neighbours.
-    std::size_t operator()(KivVcs::Id const& id) const { return id.Hash(); }
+    std::size_t operator()(KivVcs::Id const& id) const noexcept { return id.Hash(); }
 };

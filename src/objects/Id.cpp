@@ -53,6 +53,12 @@ bool ParseDigest(KivStringViewT<char16_t> text, Id::Digest& digest) noexcept {
 
 } // namespace
 
+struct Id::Text final : KivUtils::reference_counted {
+    explicit Text(KivStringT<char16_t> value) noexcept : text(std::move(value)) {}
+
+    KivStringT<char16_t> text;
+};
+
 Id::Id(Buffer const& packed) {
     SHADigest256 digest;
     for (auto const& chunk : packed.LockForRead())
@@ -69,37 +75,43 @@ Id::Id(KivStringT<char16_t> const& text) {
         *this = FromDigest(digest);
         return;
     }
-    auto record = immu::make<Record>();
-    auto* const writable = record.write();
-    writable->hash = SampledHash(KivStringViewT<char16_t>(text));
-    writable->text.GetOrMake([&text] { return text; });
-    record_ = std::move(record);
+    auto kept = std::make_unique<Text>(text);
+    kept->add_reference();
+    hash_ = SampledHash(KivStringViewT<char16_t>(text));
+    text_.store(kept.release(), std::memory_order_relaxed);
 }
 
-Id Id::FromDigest(Digest const& digest) {
-    auto record = immu::make<Record>();
-    auto* const writable = record.write();
-    writable->hasDigest = true;
-    writable->digest = digest;
-    writable->hash = SampledHash(DigestDigits{digest});
-    return Id(std::move(record));
+std::size_t Id::HashOf(Digest const& digest) noexcept {
+    return SampledHash(DigestDigits{digest});
 }
 
 KivStringT<char16_t> const& Id::GetText() const {
     static constinit const KivStringT<char16_t> empty;
-    if (!record_)
+    if (IsEmpty())
         return empty;
-    return record_->text.GetOrMake(
-        [this] { return DataEncoding::HexEncode(record_->digest.data(), record_->digest.size()); });
+    Text const* known = text_.load(std::memory_order_acquire);
+    if (known == nullptr) {
+        auto made = std::make_unique<Text>(DataEncoding::HexEncode(digest_.data(), digest_.size()));
+        made->add_reference();
+        if (text_.compare_exchange_strong(known, made.get(), std::memory_order_acq_rel, std::memory_order_acquire))
+            known = made.release();
+    }
+    return known->text;
 }
 
-bool Id::SameText(Record const& left, Record const& right) noexcept {
-    // A text that tells a digest is always kept as one, so that the two kinds never have the same text.
-    if (left.hasDigest != right.hasDigest || left.hash != right.hash)
-        return false;
-    if (left.hasDigest)
-        return left.digest == right.digest;
-    return *left.text.Get() == *right.text.Get();
+void Id::AddReference(Text const* text) noexcept {
+    text->add_reference();
+}
+
+void Id::Drop(Text const* text) noexcept {
+    if (text->drop_reference())
+        delete text;
+}
+
+bool Id::HaveSameText(Id const& left, Id const& right) noexcept {
+    Text const* const mine = left.text_.load(std::memory_order_relaxed);
+    Text const* const theirs = right.text_.load(std::memory_order_relaxed);
+    return mine == theirs || (mine != nullptr && theirs != nullptr && mine->text == theirs->text);
 }
 
 } // namespace KivVcs

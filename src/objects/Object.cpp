@@ -2,6 +2,8 @@
 
 #include "objects/PackedForm.h"
 
+#include <cstring>
+
 namespace KivVcs {
 
 IObject::~IObject() = default;
@@ -15,7 +17,11 @@ bool Object::operator!=(IObject const& other) const {
 }
 
 Id Object::GetId() const {
-    return id_.IsSet() ? id_.Get() : id_.Publish(ComputeId());
+    if (id_.IsSet())
+        return id_.Get();
+    Id id = ComputeId();
+    id_.Keep(id);
+    return id;
 }
 
 Buffer const& Object::GetPackedData() const {
@@ -52,6 +58,15 @@ KivStringT<char16_t> Object::ToString() const {
 void Object::ResetState() {
     id_.Reset();
     packedData_.Reset();
+}
+
+std::uint64_t Object::GetIdPrefix() const {
+    std::uint64_t prefix = 0;
+    if (Id::Digest const* const known = GetKnownDigest())
+        std::memcpy(&prefix, known->data(), sizeof prefix);
+    else
+        std::memcpy(&prefix, Object::GetId().GetDigest()->data(), sizeof prefix);
+    return prefix;
 }
 
 bool Object::HasSameId(Object const& other) const {

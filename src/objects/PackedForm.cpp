@@ -79,7 +79,7 @@ void IdDigest::Feed(Buffer const& data) noexcept {
         Feed(chunk.data(), chunk.size());
 }
 
-Id IdDigest::Finish() {
+Id IdDigest::Finish() noexcept {
     Id::Digest digest;
     digest_.FinalDigest(digest.data());
     return Id::FromDigest(digest);

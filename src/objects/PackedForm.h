@@ -23,8 +23,7 @@ public:
     void Feed(const void* data, std::size_t size) noexcept { digest_.InitData(data, size); }
     void Feed(Buffer const& data) noexcept;
 
-    /// @throws std::bad_alloc
-    [[nodiscard]] Id Finish();
+    [[nodiscard]] Id Finish() noexcept;
 
 private:
     SHADigest256 digest_;

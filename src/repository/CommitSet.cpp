@@ -8,7 +8,7 @@ void CommitSet::Grow() {
     for (std::size_t old = 0; old <= mask_; ++old) {
         if (slots_[old].commit == nullptr)
             continue;
-        std::size_t index = Spread(slots_[old].hash) & (slotCount - 1);
+        std::size_t index = static_cast<std::size_t>(slots_[old].prefix) & (slotCount - 1);
         while (larger[index].commit != nullptr)
             index = (index + 1) & (slotCount - 1);
         larger[index] = slots_[old];

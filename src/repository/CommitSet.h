@@ -21,11 +21,11 @@ public:
     /// now.
     /// @pre @p commit outlives the set
     Commit const* Insert(Commit const& commit) {
-        const std::size_t hash = commit.GetIdHash();
-        Slot* const slot = Find(hash, commit);
+        const std::uint64_t prefix = commit.GetIdPrefix();
+        Slot* const slot = Find(prefix, commit);
         if (slot->commit != nullptr)
             return slot->commit;
-        *slot = {hash, &commit};
+        *slot = {prefix, &commit};
         if (++count_ > mask_ - mask_ / 4)
             Grow();
         return nullptr;
@@ -33,25 +33,19 @@ public:
 
 private:
     struct Slot {
-        std::size_t hash;
+        std::uint64_t prefix;
         Commit const* commit;
     };
 
     static constexpr std::size_t slotsAtFirst = 32;
 
     /// The slot of the commit with that identifier, or the empty one where it belongs.
-    Slot* Find(std::size_t hash, Commit const& commit) {
-        for (std::size_t index = Spread(hash) & mask_;; index = (index + 1) & mask_) {
+    Slot* Find(std::uint64_t prefix, Commit const& commit) {
+        for (std::size_t index = static_cast<std::size_t>(prefix) & mask_;; index = (index + 1) & mask_) {
             Slot& slot = slots_[index];
-            if (slot.commit == nullptr || (slot.hash == hash && slot.commit->HasSameId(commit)))
+            if (slot.commit == nullptr || (slot.prefix == prefix && slot.commit->HasSameId(commit)))
                 return &slot;
         }
-    }
-
-    /// The sampled hash leaves its low bits nearly constant.
-    static std::size_t Spread(std::size_t hash) noexcept {
-        const std::uint64_t mixed = static_cast<std::uint64_t>(hash) * 0x9e3779b97f4a7c15U;
-        return static_cast<std::size_t>(mixed >> 32);
     }
 
     void Grow();

@@ -61,12 +61,13 @@ std::uint64_t MostPackedSize(Entry const& entry) noexcept {
 char* PackEntry(Entry const& entry, char* out) {
     if (entry.Child() == nullptr)
         return out;
-    Id::Digest const& digest = *entry.Child()->GetIdDigest();
+    Id::Digest const* const known = entry.Child()->GetKnownDigest();
+    const Id computed = known == nullptr ? entry.Child()->Object::GetId() : Id();
     const std::string_view prefix = entry.IsTree() ? treePrefix : blobPrefix;
     out = std::copy(prefix.begin(), prefix.end(), out);
     out = PackName(entry.Name(), out);
     *out++ = '\0';
-    return WriteDigits(digest, out);
+    return WriteDigits(known == nullptr ? *computed.GetDigest() : *known, out);
 }
 
 } // namespace KivVcs::detail
