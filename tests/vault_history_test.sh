@@ -81,6 +81,12 @@ HistoriesAreRewrittenAndShrink() {
     equal "$("$vault" log | wc -l) $("$vault" log side | wc -l)" "2 2"
     matches "$("$vault" graph)" 'digraph' '"branch side" -> ' 'last'
     "$vault" verify >out
+    # A version that is the same without what was forgotten stays.
+    rm vault.db && "$vault" save d -m first >out && "$vault" branch kept
+    for version in second third; do write d/f "$version" && "$vault" save d -m "$version" >out; done
+    "$vault" forget "$("$vault" log | sed -n '2s/ .*//p')"
+    equal "$("$vault" log | sed 's/.*  //' | xargs)" "third second first"
+    "$vault" verify >out
 }
 
 TwoVaultsComeTogether() {

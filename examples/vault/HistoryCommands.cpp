@@ -34,7 +34,8 @@ std::map<std::string, CommitHandle> BranchesAbove(KivVcs::Repository const& repo
     return above;
 }
 
-/// Deleting takes commits out of the storage that a branch beside the forgotten history still needs.
+/// Deleting takes commits out of the storage that branches still need, and stores some anew that equal them. Those would
+/// be purged, since no branch holds them: the storage is to have the very objects that the branches hold.
 void StoreReachableCommits(KivVcs::Repository& repository) {
     std::unordered_set<Id> visited;
     std::vector<CommitHandle> reachable;
@@ -42,8 +43,10 @@ void StoreReachableCommits(KivVcs::Repository& repository) {
         for (auto commit = head; commit && visited.insert(commit->GetId()).second; commit = commit->GetParent())
             reachable.push_back(commit);
     }
-    for (auto const& commit : reachable)
+    for (auto const& commit : reachable) {
+        repository.GetStorage()->DeleteCommit(commit);
         repository.AddCommitToStorage(commit);
+    }
 }
 
 /// The library deletes a history with its top; a branch at the top makes it survive, and what lies above is put on top
