@@ -52,7 +52,7 @@ public:
     /// The identifier with the given text, whatever it is. @throws std::bad_alloc
     explicit Id(KivStringT<char16_t> const& text);
     /// The identifier whose text tells @p digest.
-    [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return Id(digest, HashOf(digest)); }
+    [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return {digest, HashOf(digest)}; }
 
     Id(Id const& other) noexcept
         : digest_(other.digest_), hash_(other.hash_), text_(Share(other)), tellsDigest_(other.tellsDigest_) {}
@@ -131,7 +131,10 @@ class CachedId {
 public:
     CachedId() noexcept = default;
     CachedId(CachedId const& other) noexcept { Take(other); }
-    CachedId(CachedId&& other) noexcept : CachedId(other) { other.Reset(); }
+    CachedId(CachedId&& other) noexcept {
+        Take(other);
+        other.Reset();
+    }
     CachedId& operator=(CachedId const& other) noexcept {
         if (this != &other) {
             Reset();
@@ -151,7 +154,7 @@ public:
     [[nodiscard]] bool IsSet() const noexcept { return state_.load(std::memory_order_acquire) == State::Set; }
 
     /// The identifier, and the digest that it tells. @pre IsSet()
-    [[nodiscard]] Id Get() const noexcept { return Id(digest_, hash_); }
+    [[nodiscard]] Id Get() const noexcept { return {digest_, hash_}; }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
     /// Whether both are there and equal; false tells nothing if one is missing.
