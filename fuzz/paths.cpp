@@ -50,12 +50,10 @@ struct World {
 /// Enough entries for a table of several nodes.
 World MakeMany(Repository& repository) {
     World world;
-    for (unsigned index = 0; index < 36; ++index) {
-        const char16_t name[] = {static_cast<char16_t>('a' + index % 20), static_cast<char16_t>('a' + index / 20), 0};
+    for (char16_t name[] = u"A"; *name < u'A' + 36; ++*name) {
         world.tree.write()->AddBlob(&repository, name, MakeBlob('m'));
         world.blobs[name] = 'm';
     }
-    repository.SyncWithStorage(world.tree);
     return world;
 }
 
@@ -75,13 +73,11 @@ void Compare(World const& older, World const& newer) {
 }
 
 void Run(Input input) {
-    static const auto common = MakeRepository();
-    static const World many = MakeMany(*common);
-    Repository repository(common->GetStorage()->Clone());
+    const auto repository = MakeRepository();
     World world;
     World older;
     while (!input.IsUsedUp()) {
-        const char operation = "+-<>=*+!"[input.Byte() % 8];
+        const char operation = "+-<>==+!"[input.Byte() % 8];
         const Text written = ReadPath(input);
         const auto components = Helpers::SplitVcsPath(written);
         Tree* const tree = world.tree.write();
@@ -95,11 +91,11 @@ void Run(Input input) {
         }
         if (operation == '+' && !isBelowBlob && !tree->GetDeepTree(components)) {
             const char content = "012"[written.GetLength() % 3];
-            const auto blob = tree->AddBlob(&repository, written, MakeBlob(content));
+            const auto blob = tree->AddBlob(repository.get(), written, MakeBlob(content));
             Require(blob && tree->GetDeepBlob(path) == blob, "what was added is found");
             world.blobs[path] = content;
         } else if (operation == '-') {
-            Require(tree->RemoveObject(&repository, written) == (found != nullptr), "what is there is removed");
+            Require(tree->RemoveObject(repository.get(), written) == (found != nullptr), "what is there is removed");
             Require(!tree->GetDeepObject(path), "what was removed is not found");
             if (found)
                 world.Remove(path);
@@ -107,11 +103,9 @@ void Run(Input input) {
             older = world;
         } else if (operation == '>') {
             std::swap(world, older);
-        } else if (operation == '=' || operation == '*') {
-            const World added = operation == '=' ? older : many;
-            if (isBelowBlob || world.blobs.contains(path) || world.blobs.size() + added.blobs.size() > 48)
-                continue;
-            Require(tree->AddTree(&repository, written, *added.tree) != nullptr, "a tree is added");
+        } else if (operation == '=' && !isBelowBlob && !world.blobs.contains(path) && world.blobs.size() < 20) {
+            const World added = older.blobs.empty() ? MakeMany(*repository) : older;
+            Require(tree->AddTree(repository.get(), written, *added.tree) != nullptr, "a tree is added");
             world.Remove(path);
             for (auto const& [below, content] : added.blobs)
                 world.blobs[Joined(path, below)] = content;
@@ -121,12 +115,12 @@ void Run(Input input) {
     }
     for (World const* each : {&world, &older}) {
         each->Check();
-        repository.SyncWithStorage(each->tree);
+        repository->SyncWithStorage(each->tree);
     }
     Compare(older, world);
     // Versions in between would take most of the time.
-    repository.UpdateStorage();
-    RequireConsistency(*repository.GetStorage());
+    repository->UpdateStorage();
+    RequireConsistency(*repository->GetStorage());
 }
 
 } // namespace
