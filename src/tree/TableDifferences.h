@@ -142,8 +142,14 @@ void ForEachDifference(TableNode const* left, TableNode const* right, Visit cons
     if (left == right && (left == nullptr || left->Total().doubled == 0))
         return;
     if (left != nullptr && right != nullptr && DivideAlike(*left, *right)) {
-        for (std::size_t index = 0; index < left->Branches().size(); ++index)
-            ForEachDifference(left->Branches()[index].child, right->Branches()[index].child, visit);
+        // Most children of two versions are the same; without doubled names below they need not even be looked at.
+        const bool skipsShared = left->Total().doubled == 0;
+        for (std::size_t index = 0; index < left->Branches().size(); ++index) {
+            TableNode const* const mine = left->Branches()[index].child;
+            TableNode const* const theirs = right->Branches()[index].child;
+            if (mine != theirs || !skipsShared)
+                ForEachDifference(mine, theirs, visit);
+        }
         return;
     }
     TableCursor mine(left);

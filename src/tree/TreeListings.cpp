@@ -11,17 +11,18 @@ using detail::TableNode;
 
 namespace {
 
-/// Collects full paths below directories that are entered and left in depth-first order.
+/// Collects full paths below directories that are entered depth first.
 class PathCollector {
 public:
-    [[nodiscard]] std::size_t Depth() const noexcept { return prefix_.size(); }
-
-    void Enter(KivStringT<char16_t> const& name) {
+    /// Goes to the directory @p name of the one whose paths begin with the first @p length code units of this one's.
+    void Enter(std::size_t length, KivStringT<char16_t> const& name) {
+        prefix_.resize(length);
         prefix_.insert(prefix_.end(), name.GetString(), name.GetString() + name.GetLength());
         prefix_.push_back(u'/');
     }
 
-    void LeaveTo(std::size_t depth) noexcept { prefix_.resize(depth); }
+    /// The length of what the paths of this directory begin with.
+    [[nodiscard]] std::size_t PrefixLength() const noexcept { return prefix_.size(); }
 
     void Add(KivStringT<char16_t> const& name) {
         if (prefix_.empty()) {
@@ -51,11 +52,13 @@ private:
     PathList paths_;
 };
 
-/// Two directories of the same path that are compared; null where one side has none. Both null is not there at all.
+/// Two directories of the same path that are compared, either of which may be null, and how the path begins that their
+/// name ends.
 struct DirectoryPair {
-    KivStringT<char16_t> name;
+    KivStringT<char16_t> const* name;
     Tree const* mine;
     Tree const* theirs;
+    std::size_t prefixLength;
 };
 
 /// Whether a comparison by name counts @p object as unchanged, given what the other side shows under that name.
@@ -77,41 +80,31 @@ TableNode const* RootOf(Tree const* tree) noexcept {
     return tree == nullptr ? nullptr : TableAccess::Root(*tree);
 }
 
-/// Adds the paths that differ right in a pair of directories, and returns the pairs of subdirectories that differ.
-std::vector<DirectoryPair> CompareDirectories(Tree const* mine, Tree const* theirs, PathCollector& paths) {
-    std::vector<DirectoryPair> below;
+/// Adds the paths that differ right in a pair of directories, and puts the pairs of subdirectories that differ on @p open,
+/// the first one last.
+void CompareDirectories(Tree const* mine, Tree const* theirs, PathCollector& paths, std::vector<DirectoryPair>& open) {
+    const auto before = static_cast<std::ptrdiff_t>(open.size());
     detail::ForEachDifference(
         RootOf(mine), RootOf(theirs),
         [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
             if (BlobDiffers(here, there))
                 paths.Add(name);
             if (!name.IsEmpty() && TreeDiffers(here, there))
-                below.push_back({name, here.tree, there.tree});
+                open.push_back({&name, here.tree, there.tree, paths.PrefixLength()});
         });
-    return below;
+    std::reverse(open.begin() + before, open.end());
 }
 
 /// The paths of all blobs that differ between two trees, either of which may be null, without recursing into directories.
 PathList DeepBlobDiffs(Tree const* mine, Tree const* theirs) {
-    struct Level {
-        std::vector<DirectoryPair> pairs;
-        std::size_t next;
-        std::size_t depth;
-    };
     PathCollector paths;
-    std::vector<Level> levels;
-    levels.push_back({CompareDirectories(mine, theirs, paths), 0, 0});
-    while (!levels.empty()) {
-        Level& level = levels.back();
-        paths.LeaveTo(level.depth);
-        if (level.next == level.pairs.size()) {
-            levels.pop_back();
-            continue;
-        }
-        DirectoryPair const& pair = level.pairs[level.next++];
-        paths.Enter(pair.name);
-        const std::size_t depth = paths.Depth();
-        levels.push_back({CompareDirectories(pair.mine, pair.theirs, paths), 0, depth});
+    std::vector<DirectoryPair> open;
+    CompareDirectories(mine, theirs, paths, open);
+    while (!open.empty()) {
+        const DirectoryPair pair = open.back();
+        open.pop_back();
+        paths.Enter(pair.prefixLength, *pair.name);
+        CompareDirectories(pair.mine, pair.theirs, paths, open);
     }
     return paths.Take();
 }
