@@ -260,7 +260,7 @@ const Operation operations[] = {
      }},
     {"a deep path", [](World& w) {
          KivStringT<char16_t> path;
-         for (int level = 0; level < 100; ++level)
+         for (int level = 0; level < 160; ++level)
              path += u"n/";
          w.tree = immu::make<Tree>(w.sole);
          w.done = !!w.tree.write()->AddTree(&w.repository, path, w.edited);
@@ -273,7 +273,7 @@ const Operation operations[] = {
      }},
     {"a line of commits", [](World& w) {
          cow_ptr<Commit> tip = w.commits["c"];
-         for (char16_t name[] = u"A"; name[0] < u'P'; ++name[0]) {
+         for (char16_t name[] = u"A"; name[0] < u'f'; ++name[0]) {
              Commit next(tip, false);
              next.SetDescription(name);
              next.AddBlob(&w.repository, name, w.blob);

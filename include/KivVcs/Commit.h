@@ -119,8 +119,9 @@ private:
     void IdentifyAncestors() const;
     void ReleaseHistory() noexcept;
 
-    cow_ptr<CommitTree> tree_;
+    // First, beside the cached identifier: walks over the history visit nothing else.
     cow_ptr<Commit> parent_;
+    cow_ptr<CommitTree> tree_;
     KivStringT<char16_t> description_;
     KivStringT<char16_t> authorName_;
     KivStringT<char16_t> authorEmail_;

@@ -10,6 +10,7 @@
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <vector>
 
 namespace KivVcs {
@@ -240,7 +241,10 @@ public:
     [[nodiscard]] bool HasSameId(Object const& other) const;
 
     /// A part of the identifier that tells nearly all objects apart.
-    [[nodiscard]] std::uint64_t GetIdPrefix() const;
+    [[nodiscard]] std::uint64_t GetIdPrefix() const {
+        Id::Digest const* const known = GetKnownDigest();
+        return known == nullptr ? PrefixOf(*Object::GetId().GetDigest()) : PrefixOf(*known);
+    }
 
     /// The digest that the identifier tells, valid until `ResetState`; null if the identifier has not been computed.
     [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept { return id_.IsSet() ? &id_.Digest() : nullptr; }
@@ -260,6 +264,12 @@ protected:
     [[nodiscard]] bool IsIdentified() const noexcept { return id_.IsSet(); }
 
 private:
+    static std::uint64_t PrefixOf(Id::Digest const& digest) noexcept {
+        std::uint64_t prefix = 0;
+        std::memcpy(&prefix, digest.data(), sizeof prefix);
+        return prefix;
+    }
+
     CachedId id_;
     Published<Buffer> packedData_;
 };

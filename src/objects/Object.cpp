@@ -2,8 +2,6 @@
 
 #include "objects/PackedForm.h"
 
-#include <cstring>
-
 namespace KivVcs {
 
 IObject::~IObject() = default;
@@ -58,15 +56,6 @@ KivStringT<char16_t> Object::ToString() const {
 void Object::ResetState() {
     id_.Reset();
     packedData_.Reset();
-}
-
-std::uint64_t Object::GetIdPrefix() const {
-    std::uint64_t prefix = 0;
-    if (Id::Digest const* const known = GetKnownDigest())
-        std::memcpy(&prefix, known->data(), sizeof prefix);
-    else
-        std::memcpy(&prefix, Object::GetId().GetDigest()->data(), sizeof prefix);
-    return prefix;
 }
 
 bool Object::HasSameId(Object const& other) const {

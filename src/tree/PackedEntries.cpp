@@ -61,13 +61,12 @@ std::uint64_t MostPackedSize(Entry const& entry) noexcept {
 char* PackEntry(Entry const& entry, char* out) {
     if (entry.Child() == nullptr)
         return out;
-    Id::Digest const* const known = entry.Child()->GetKnownDigest();
-    const Id computed = known == nullptr ? entry.Child()->Object::GetId() : Id();
     const std::string_view prefix = entry.IsTree() ? treePrefix : blobPrefix;
     out = std::copy(prefix.begin(), prefix.end(), out);
     out = PackName(entry.Name(), out);
     *out++ = '\0';
-    return WriteDigits(known == nullptr ? *computed.GetDigest() : *known, out);
+    Id::Digest const* const known = entry.Child()->GetKnownDigest();
+    return WriteDigits(known == nullptr ? *entry.Child()->Object::GetId().GetDigest() : *known, out);
 }
 
 } // namespace KivVcs::detail
