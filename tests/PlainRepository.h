@@ -147,13 +147,17 @@ public:
         return !kept.empty();
     }
 
-    void Simplify() {
+    /// @return false if the outcome depends on the order in which commits are visited, which is anybody's choice: a commit
+    /// that is kept but not stored stops the rebuild above it, unless a rebuilt one takes its place first.
+    bool Simplify() {
         const auto former = branches;
         std::set<std::string> kept;
         for (auto const& [name, head] : former)
             for (auto const& [other, otherHead] : former)
                 if (const auto base = CommonBase(head, otherHead))
                     kept.insert(base->id);
+        auto missing = kept;
+        std::erase_if(missing, [this](auto const& id) { return commits.contains(id); });
         std::map<std::string, std::string> parents;
         for (auto const& [name, head] : former) {
             if (!head || !commits.contains(head->id))
@@ -181,6 +185,7 @@ public:
         for (auto const& id : kept)
             if (!parents.contains(id))
                 rebuild(id, nullptr);
+        return std::ranges::none_of(missing, [this](auto const& id) { return commits.contains(id); });
     }
 
     /// @param open the commits that the host holds
