@@ -21,6 +21,7 @@ bool LocalCalendarTime(std::int64_t seconds, std::tm& calendar) noexcept {
 #else
     // Unlike localtime, localtime_r need not notice that the process has changed its time zone. Where it has none of its
     // own, looking for a change of the system's would ask the file system for every commit.
+    // NOLINTNEXTLINE(concurrency-mt-unsafe): reads the environment as the functions of the C library below do
     if (std::getenv("TZ") != nullptr)
         tzset();
     return localtime_r(&time, &calendar) != nullptr;

@@ -49,24 +49,6 @@ public:
         return false;
     }
 
-    /// Moves both cursors past the entries of their leaves that are the same on both sides; false if the next ones
-    /// differ.
-    static bool SkipSharedEntries(TableCursor& left, TableCursor& right) noexcept {
-        // As above.
-        if (left.nodes_[0]->Total().doubled != 0 || right.nodes_[0]->Total().doubled != 0)
-            return false;
-        const auto mine = left.nodes_[0]->Entries().subspan(Index(left.positions_[0]));
-        const auto theirs = right.nodes_[0]->Entries().subspan(Index(right.positions_[0]));
-        const auto differing = std::mismatch(mine.begin(), mine.end(), theirs.begin(), theirs.end(),
-                                             [](Entry const& a, Entry const& b) { return a.Shares(b); });
-        if (differing.first == mine.begin())
-            return false;
-        const auto passed = static_cast<int>(differing.first - mine.begin());
-        left.Pass(passed);
-        right.Pass(passed);
-        return true;
-    }
-
     /// Takes both entries of the name at the cursor, which lie in one leaf, and moves past them.
     NamedObjects TakeName() noexcept {
         NamedObjects objects;
@@ -101,12 +83,6 @@ private:
         }
     }
 
-    /// Moves past @p count entries of the leaf.
-    void Pass(int count) noexcept {
-        positions_[0] += count - 1;
-        Next();
-    }
-
     /// Moves to the next element of the node at @p height, or of the first one above it that has another.
     void Advance(int height) noexcept {
         while (height <= top_ && ++positions_[Index(height)] == nodes_[Index(height)]->Count())
@@ -134,6 +110,39 @@ private:
     });
 }
 
+/// The order of two entries by name; 0 without a look at the texts where both share one.
+[[nodiscard]] inline int CompareNames(Entry const& left, Entry const& right) noexcept {
+    KivStringT<char16_t> const& mine = left.Name();
+    KivStringT<char16_t> const& theirs = right.Name();
+    return mine.GetString() == theirs.GetString() ? 0 : mine.Compare(theirs);
+}
+
+/// As below, for two leaves without doubled names: each name is one entry there.
+template <class Visit>
+void ForEachDifferenceOfLeaves(TableNode const& left, TableNode const& right, Visit const& visit) {
+    const auto objectsOf = [](Entry const& entry) { return NamedObjects{entry.BlobChild(), entry.TreeChild()}; };
+    auto mine = left.Entries().begin();
+    auto theirs = right.Entries().begin();
+    const auto mineEnd = left.Entries().end();
+    const auto theirsEnd = right.Entries().end();
+    while (mine != mineEnd && theirs != theirsEnd) {
+        if (mine->Shares(*theirs)) {
+            ++mine;
+            ++theirs;
+            continue;
+        }
+        const int order = CompareNames(*mine, *theirs);
+        visit((order <= 0 ? mine : theirs)->Name(), order <= 0 ? objectsOf(*mine) : NamedObjects{},
+              order >= 0 ? objectsOf(*theirs) : NamedObjects{});
+        mine += order <= 0 ? 1 : 0;
+        theirs += order >= 0 ? 1 : 0;
+    }
+    for (; mine != mineEnd; ++mine)
+        visit(mine->Name(), objectsOf(*mine), NamedObjects{});
+    for (; theirs != theirsEnd; ++theirs)
+        visit(theirs->Name(), NamedObjects{}, objectsOf(*theirs));
+}
+
 /// Hands every name of two tables (either may be null) to @p visit, in order, with what both sides hold under it, but for runs
 /// of entries that both tables share and that no lookup can tell apart. Recurses only with the height.
 template <class Visit>
@@ -152,19 +161,19 @@ void ForEachDifference(TableNode const* left, TableNode const* right, Visit cons
         }
         return;
     }
+    if (left != nullptr && right != nullptr && left->IsLeaf() && right->IsLeaf() && left->Total().doubled == 0 &&
+        right->Total().doubled == 0) {
+        ForEachDifferenceOfLeaves(*left, *right, visit);
+        return;
+    }
     TableCursor mine(left);
     TableCursor theirs(right);
     while (!mine.AtEnd() || !theirs.AtEnd()) {
-        if (!mine.AtEnd() && !theirs.AtEnd()) {
-            if (TableCursor::SkipShared(mine, theirs) || TableCursor::SkipSharedEntries(mine, theirs))
-                continue;
-        }
+        if (!mine.AtEnd() && !theirs.AtEnd() && TableCursor::SkipShared(mine, theirs))
+            continue;
         int order = mine.AtEnd() ? 1 : -1;
-        if (!mine.AtEnd() && !theirs.AtEnd()) {
-            KivStringT<char16_t> const& first = mine.Get().Name();
-            KivStringT<char16_t> const& second = theirs.Get().Name();
-            order = first.GetString() == second.GetString() ? 0 : first.Compare(second);
-        }
+        if (!mine.AtEnd() && !theirs.AtEnd())
+            order = CompareNames(mine.Get(), theirs.Get());
         KivStringT<char16_t> const& name = order <= 0 ? mine.Get().Name() : theirs.Get().Name();
         const NamedObjects here = order <= 0 ? mine.TakeName() : NamedObjects{};
         const NamedObjects there = order >= 0 ? theirs.TakeName() : NamedObjects{};
