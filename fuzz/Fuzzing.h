@@ -72,7 +72,8 @@ inline void RequireConsistency(IObjectsStorage const& storage) {
     const auto repository = MakeRepository();
     for (auto const& [id, tree] : storage.GetTrees()) {
         const auto read = Tree::Deserialize(id, repository.get(), loader);
-        Require(read && read->GetId() == id, "a tree reads back as it was");
+        Require(read && read->GetId() == id && read->GetLocalBlobPaths() == tree->GetLocalBlobPaths(),
+                "a tree reads back as it was");
     }
     for (auto const& [id, commit] : storage.GetCommits()) {
         Id parent;

@@ -100,6 +100,8 @@ void Run(Input input) {
             if (found)
                 world.Remove(path);
         } else if (operation == '<') {
+            // So that an identifier is there for edits to drop.
+            static_cast<void>(tree->GetId());
             older = world;
         } else if (operation == '>') {
             std::swap(world, older);
