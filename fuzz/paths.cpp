@@ -117,7 +117,8 @@ void Run(Input input) {
     }
     for (World const* each : {&world, &older}) {
         each->Check();
-        repository->SyncWithStorage(each->tree);
+        const auto stored = repository->SyncWithStorage(each->tree);
+        Require(stored->GetDeepBlobPaths() == each->tree->GetDeepBlobPaths(), "equal identifiers mean equal content");
     }
     Compare(older, world);
     // Versions in between would take most of the time.
