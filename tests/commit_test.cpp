@@ -177,6 +177,7 @@ TEST_F(Commits, KeepTheirTextBehindAReplacedRootUntilTheirStateIsReset) {
             static_cast<void>(commit.GetData());
         commit.ReplaceRoot(&repo, MakeTree(repo, "b=2"));
         EXPECT_EQ(Files(commit.GetCommitTree()->GetRoot()), "b=2");
+        EXPECT_TRUE(commit.GetCommitTree()->GetRoot() == repo.GetTreeFromStorage(commit.GetCommitTree()->GetRootId()));
         EXPECT_EQ(Bytes(commit.GetPackedData()), Bytes(untouched.GetPackedData()));
         EXPECT_EQ(IdText(commit), IdText(untouched));
         commit.ResetState();
