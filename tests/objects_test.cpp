@@ -255,6 +255,8 @@ TEST(Helpers, ShiftAHeaderAndCompareItsBeginning) {
         EXPECT_EQ(Helpers::ShiftObjectIdentifier(reader, expected), matches) << bytes;
         EXPECT_EQ(reader.GetPosition(), position) << bytes;
     }
+    auto whole = ReaderOf("blob 3\0abc"s);
+    EXPECT_TRUE(Helpers::ShiftObjectIdentifier(whole, {"blob 3\0", 7}));
 }
 
 TEST(Helpers, SplitPathsIntoViewsOfTheirSegments) {

@@ -42,6 +42,7 @@ TEST_F(Repositories, AStorageKeepsTheFirstObjectUnderAnIdentifier) {
     EXPECT_EQ(storage.GetCommitCount(), 1U);
     EXPECT_EQ(storage.GetTreeCount(), 1U);
     EXPECT_EQ(storage.GetBlobCount(), 2U);
+    EXPECT_EQ(storage.GetBlobs().max_load_factor(), 1.0F);
     EXPECT_FALSE(storage.GetTree(one->GetId()) || storage.GetBlob(Id()) || storage.GetCommit(two->GetId()));
 
     storage.DeleteCommit(nullptr);

@@ -20,7 +20,8 @@ bool LocalCalendarTime(std::int64_t seconds, std::tm& calendar) noexcept {
     return localtime_s(&calendar, &time) == 0;
 #else
     // Unlike localtime, localtime_r need not notice that the process has changed its time zone. Where it has none of its
-    // own, looking for a change of the system's would ask the file system for every commit.
+    // own, looking for a change of the system's would ask the file system for every commit, so a zone that was taken away
+    // again is noticed only when somebody calls tzset.
     // NOLINTNEXTLINE(concurrency-mt-unsafe): reads the environment as the functions of the C library below do
     if (std::getenv("TZ") != nullptr)
         tzset();

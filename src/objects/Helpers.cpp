@@ -86,10 +86,11 @@ bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> expected) {
         const auto near = bytes->GetNearBytes();
         const void* const end = near.empty() ? nullptr : std::memchr(near.data(), 0, near.size());
         if (end != nullptr) {
-            const auto length = static_cast<std::size_t>(static_cast<const std::byte*>(end) - near.data());
-            const auto compared = static_cast<std::size_t>(expected.GetLength());
-            bytes->Skip(length + 1);
-            return compared <= length && std::memcmp(near.data(), expected.GetString(), compared) == 0;
+            const auto length = static_cast<std::size_t>(static_cast<const std::byte*>(end) - near.data()) + 1;
+            const auto compared = std::min(length, static_cast<std::size_t>(expected.GetLength()));
+            bytes->Skip(length);
+            return KivStringViewT<char>(reinterpret_cast<const char*>(near.data()), static_cast<int>(compared)) ==
+                   expected;
         }
     }
     // Nothing but the expected beginning is compared, so that a header of any length takes no memory.

@@ -4,8 +4,6 @@ namespace KivVcs {
 
 namespace {
 
-constexpr float mostObjectsForBucket = 0.25F;
-
 template <class Table, class Key>
 typename Table::mapped_type FindIn(Table const& table, Key const& key) {
     const auto found = table.find(key);
@@ -15,6 +13,10 @@ typename Table::mapped_type FindIn(Table const& table, Key const& key) {
 template <class T>
 void AddTo(std::unordered_map<Id, cow_ptr<T>>& table, cow_ptr<T> object) {
     Id id = object->GetId();
+    // Where most buckets are free, the bucket alone tells that an object is new, as most that are asked for are; otherwise
+    // that takes a visit to a neighbour somewhere in memory.
+    if (table.size() >= table.bucket_count() / 4)
+        table.rehash(2 * table.bucket_count());
     table.try_emplace(std::move(id), std::move(object));
 }
 
@@ -25,11 +27,6 @@ IObjectsStorage::~IObjectsStorage() = default;
 MemObjectsStorage::MemObjectsStorage() : MemObjectsStorage({u"master"}) {}
 
 MemObjectsStorage::MemObjectsStorage(std::initializer_list<KivStringViewT<char16_t>> branches) {
-    // Half-empty tables find out from the bucket alone that an object is new, as most that are asked for are, where they
-    // would otherwise visit a neighbour somewhere in memory.
-    commits_.max_load_factor(mostObjectsForBucket);
-    trees_.max_load_factor(mostObjectsForBucket);
-    blobs_.max_load_factor(mostObjectsForBucket);
     for (KivStringViewT<char16_t> name : branches)
         references_.try_emplace(name.ToString());
 }
