@@ -201,17 +201,5 @@ TEST_F(Commits, AreLinkedOldestFirst) {
     EXPECT_EQ(repo.GetCommitCount(), 3U);
 }
 
-TEST_F(Commits, AMillionOfThemAreReleasedWithoutStack) {
-    cow_ptr<Commit> tip;
-    for (int index = 0; index < 1'000'000; ++index) {
-        Commit next;
-        next.SetParent(std::move(tip));
-        tip = immu::make<Commit>(std::move(next));
-    }
-    Commit last(std::move(tip), false);
-    last.SetParent(nullptr);
-    EXPECT_FALSE(last.GetParent());
-}
-
 } // namespace
 } // namespace KivVcs

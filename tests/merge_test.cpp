@@ -140,22 +140,6 @@ TEST_F(Merging, AsksAboutFilesBeforeDirectoriesInNameOrderWithFullPaths) {
     EXPECT_TRUE(ThreeWayMerge(&repo, {host.trees.left, nullptr, host.trees.left}, {}) == host.trees.left);
 }
 
-TEST_F(Merging, FollowsTwentyThousandNestedDirectories) {
-    std::string path;
-    for (int depth = 0; depth < 20'000; ++depth)
-        path += "d/";
-    path += "f";
-    const auto trees = Trees(path + "=0", path + "=1", path + "=2");
-    std::size_t deepest = 0;
-    const auto right = [&deepest](Path components, MergeTrees) {
-        deepest = components.size();
-        return ConflictChoice::Right;
-    };
-    const auto merged = ThreeWayMerge(&repo, trees, {right, mergeAlways});
-    EXPECT_EQ(deepest, 20'001U);
-    EXPECT_TRUE(*merged == *trees.right);
-}
-
 TEST_F(Merging, BringsACommitInTheCheapestWay) {
     history.Grow("base ours:base theirs:base more:ours alone");
     const auto callsOf = [this](const char* commit, Resolvers resolvers) {

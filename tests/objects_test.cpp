@@ -1,6 +1,5 @@
 #include "../src/objects/Sha256Compression.h"
-#include "HostStream.h"
-#include "RecordingRepository.h"
+#include "PackedForms.h"
 
 #include <gtest/gtest.h>
 
@@ -25,13 +24,6 @@ Buffer BufferOf(std::string const& content) {
     Buffer buffer;
     buffer.Append(content.data(), content.size());
     return buffer;
-}
-
-std::string ContentOf(Buffer const& buffer) {
-    std::string content;
-    for (auto const& chunk : buffer.LockForRead())
-        content.append(reinterpret_cast<const char*>(chunk.data()), chunk.size());
-    return content;
 }
 
 std::string const helloId = "8aec4e4876f854f688d0ebfc8f37598f38e5fd6903cccc850ca36591175aeb60";
@@ -140,11 +132,11 @@ TEST(Blob, PacksItsContentBehindTypeAndSize) {
         const Blob blob = MakeBlob(content);
         EXPECT_EQ(Narrow(blob.GetId().GetText()), id);
         const std::string packed = "blob " + std::to_string(content.size()) + '\0' + content;
-        EXPECT_EQ(ContentOf(blob.GetPackedData()), packed);
+        EXPECT_EQ(Bytes(blob.GetPackedData()), packed);
         EXPECT_EQ(&blob.GetPackedData(), &blob.GetPackedData());
         auto reader = ReaderOf(packed);
         const auto read = Blob::Deserialize(reader);
-        EXPECT_TRUE(*read == blob && !(*read != blob) && ContentOf(read->GetData()) == content);
+        EXPECT_TRUE(*read == blob && !(*read != blob) && Bytes(read->GetData()) == content);
     }
     EXPECT_EQ(MakeBlob(std::get<0>(blobs[2])).ToString(), u"blob 5\\0\\0\xFFFF\xFF80\n\\0");
     EXPECT_TRUE(Blob().GetHeader() == "blob" && Blob().GetStoragePrefix() == "100644");
@@ -168,7 +160,7 @@ TEST(Blob, IsReadBackFromWhateverFollowsItsHeader) {
         StreamIO memory(MemStream::CreateOnRef(buffer));
         for (auto const& blob : {Blob::Deserialize(host), Blob::Deserialize(memory)}) {
             EXPECT_EQ(blob != nullptr, readable) << bytes;
-            EXPECT_EQ(blob ? ContentOf(blob->GetData()) : "", readable ? bytes.substr(bytes.find('\0') + 1) : "");
+            EXPECT_EQ(blob ? Bytes(blob->GetData()) : "", readable ? bytes.substr(bytes.find('\0') + 1) : "");
         }
     }
     StreamIO invalid;
@@ -205,12 +197,12 @@ TEST(Object, CachesIdentifierAndPackedFormUntilItsStateIsReset) {
     thing.data.Append("d", 1);
     const Thing copy = thing;
     EXPECT_EQ(Narrow(thing.GetId().GetText()) + Narrow(copy.GetId().GetText()), id + id);
-    EXPECT_EQ(ContentOf(copy.GetPackedData()), std::string("thing 3\0abc", 11));
+    EXPECT_EQ(Bytes(copy.GetPackedData()), std::string("thing 3\0abc", 11));
     EXPECT_EQ(thing.asked + copy.asked, 2 * asked);
     thing.ResetState();
     EXPECT_EQ(Narrow(thing.GetId().GetText()), "dd594ce1e440536e093d2643eb07c045cb29cac1a6e4f5852fd7be8ad140dcb3");
     EXPECT_TRUE(thing != copy && thing == thing && !thing.HasSameId(copy) &&
-                ContentOf(thing.GetPackedData()).back() == 'd');
+                Bytes(thing.GetPackedData()).back() == 'd');
 }
 
 TEST(Helpers, HashAppendAndReadTexts) {
@@ -224,7 +216,7 @@ TEST(Helpers, HashAppendAndReadTexts) {
     Helpers::AppendToBuffer(buffer, KivStringViewT<char16_t>(u"\0z", 2));
     Helpers::AppendToBuffer(buffer, BufferOf("!"));
     const std::string content("a\0b\xC3\xA9!", 6);
-    EXPECT_EQ(ContentOf(buffer), content);
+    EXPECT_EQ(Bytes(buffer), content);
     EXPECT_EQ(Helpers::StringAFromBuffer(buffer), KivStringViewT<char>(content.data(), 6));
 
     const std::string large(300'000, 'l');

@@ -213,32 +213,20 @@ TEST_F(ReadingTrees, EndsWhereTreesNameThemselvesOrEachOther) {
     EXPECT_EQ(packed.loads, 62);
 }
 
-TEST_F(ReadingTrees, NestingTakesNoStack) {
-    std::string path;
-    for (int level = 0; level < 20'000; ++level)
-        path += "d/";
-    auto tree = MakeTree(repo, path + "x=1");
-    auto const former = tree;
-    tree.write()->AddBlob(&repo, Wide(path + "y"), MakeBlob("2"));
-    EXPECT_EQ(ToNames(tree->GetDeepBlobDiffs(former)), Names{path + "y"});
-    EXPECT_EQ(ToNames(former->GetDeepBlobPaths()), Names{path + "x"});
-    repo.SyncWithStorage(former);
-    for (auto const& [id, stored] : std::as_const(repo).GetStorage()->GetTrees())
-        packed.forms[Narrow(id.GetText())] = Bytes(stored->GetPackedData());
-    Repository other(std::make_unique<MemObjectsStorage>());
-    auto const read = packed.Read(Narrow(former->GetId().GetText()), &other);
-    EXPECT_TRUE(read && read->GetId() == former->GetId());
-    EXPECT_TRUE(tree.write()->RemoveObject(&repo, Wide(path + "x")) && tree->GetDeepBlobCount() == 1);
-    EXPECT_TRUE(tree.write()->RemoveObject(&repo, Wide(path + "y")) && tree->IsEmpty());
-
-    Repository none(nullptr);
-    for (int level = 0; level < 100'000; ++level) {
-        Tree above;
-        above.AddTree(&none, u"d", *tree);
-        tree = immu::make<Tree>(std::move(above));
-    }
-    EXPECT_EQ(tree->GetDeepBlobCount(), 0U);
-    tree.reset();
+TEST_F(ReadingTrees, NestingTakesNoStackAndIsReadDownToItsBound) {
+    const auto numbered = [](int level) {
+        const std::string digits = std::to_string(level);
+        return std::string(64 - digits.size(), '0') + digits;
+    };
+    const auto endless = [&](Id const& id) {
+        const std::string text = Narrow(id.GetText());
+        if (text == one)
+            return ReaderOf(packed.forms[one]);
+        return ReaderOf(std::string("tree 1\0", 7) + Entry("blob", "x", one) +
+                        Entry("tree", "d", numbered(std::stoi(text) + 1)));
+    };
+    const auto read = Tree::Deserialize(Id(Wide(numbered(0))), &repo, endless);
+    EXPECT_EQ(read->GetDeepBlobCount(), deepestLoadedNesting);
 }
 
 } // namespace

@@ -52,50 +52,6 @@ protected:
     std::vector<Version> former{now};
 };
 
-TEST_P(RandomTrees, NestedTreesFollowThePlainModel) {
-    // A storage may exchange a tree for an equal one without the subtrees that a blob hides, so names are doubled only
-    // where there is none.
-    const bool doubled = GetParam() % 2 == 0;
-    Repository repo(doubled ? nullptr : std::make_unique<MemObjectsStorage>());
-    for (int step = 0; step < 600; ++step) {
-        std::vector<std::string> path;
-        for (int depth = Below(4); depth >= 0; --depth)
-            path.push_back(std::string(1, static_cast<char>('a' + Below(3))));
-        const int action = Below(5);
-        const auto wide = [&path] {
-            std::string joined;
-            for (auto const& name : path)
-                joined += "/" + name;
-            return Wide(joined);
-        };
-        if (action == 0 || action == 1) {
-            if (!doubled)
-                path.back() = action == 0 ? path.back() : "file";
-            ASSERT_EQ(now.tree.write()->RemoveObject(&repo, wide()), Remove(now.model, path));
-        } else {
-            if (!doubled && action != 4)
-                path.back() = "file";
-            Version const& added = former[static_cast<std::size_t>(Below(static_cast<int>(former.size())))];
-            if (added.tree->GetDeepBlobCount() > 30)
-                continue;
-            if (action == 4) {
-                Add(now.model, path, PlainTree(added.model));
-                ASSERT_TRUE(now.tree.write()->AddTree(&repo, wide(), *added.tree));
-            } else {
-                const std::string content = std::to_string(Below(3));
-                Add(now.model, path, content);
-                ASSERT_TRUE(now.tree.write()->AddBlob(&repo, wide(), MakeBlob(content)));
-            }
-        }
-        ASSERT_NO_FATAL_FAILURE(now.Check()) << step;
-        ASSERT_NO_FATAL_FAILURE(now.CheckAgainst(former[random() % former.size()])) << step;
-        if (Below(10) == 0)
-            former.push_back(now);
-    }
-    for (Version const& version : former)
-        ASSERT_NO_FATAL_FAILURE(version.Check());
-}
-
 TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
     Repository repo(std::make_unique<MemObjectsStorage>());
     const auto edit = [&](int number, bool add) {

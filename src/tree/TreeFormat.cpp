@@ -3,7 +3,7 @@
 #include "tree/PackedEntries.h"
 
 #include <array>
-#include <unordered_map>
+#include <map>
 
 namespace KivVcs {
 
@@ -112,6 +112,17 @@ ParsedEntry ParseEntry(KivStringViewT<char> data, int& position) noexcept {
     return {data.Mid(type, typeEnd - type), data.Mid(name, nameEnd - name), idText};
 }
 
+/// Some order of identifiers. Those that packed forms name are the host's, and their hashes may all be equal.
+struct InOrder {
+    bool operator()(Id const& left, Id const& right) const {
+        Id::Digest const* const mine = left.GetDigest();
+        Id::Digest const* const theirs = right.GetDigest();
+        if (mine == nullptr || theirs == nullptr)
+            return mine == theirs ? left.GetText() < right.GetText() : theirs == nullptr;
+        return *mine < *theirs;
+    }
+};
+
 /// Reads a tree and everything below it, one tree at a time, with the trees that are being read on a list of its own: nesting
 /// takes no stack.
 class TreeReader {
@@ -211,7 +222,7 @@ private:
     IRepository& repo_;
     Loader const& loader_;
     std::vector<OpenTree> open_;
-    std::unordered_map<Id, cow_ptr<Tree>> opened_;
+    std::map<Id, cow_ptr<Tree>, InOrder> opened_;
 };
 
 } // namespace
