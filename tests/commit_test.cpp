@@ -145,6 +145,15 @@ TEST_F(Commits, AnAmendTakesThePlaceOfItsParent) {
               "Ppparent");
     EXPECT_TRUE(amend.GetCommitTime() == Time() && amend.GetCommitTimezoneBias() == TimeDelta());
     EXPECT_TRUE(Commit(immu::make<Commit>(), true).GetCommitTree() && !Commit().GetCommitTree());
+    Commit properties = Signed(root, u"", u"", 5, 5, u"");
+    properties.ResetPropertiesForAmend(*parent);
+    // A description ends at its first zero.
+    EXPECT_EQ(IdText(properties), IdText(Signed(root, u"P", u"p", 5, 5, u"parent")));
+    properties = Signed(nullptr, u"P", u"p", 5, 5, u"parent");
+    properties.SetDescription({u"parent\0x", 8});
+    EXPECT_EQ(IdText(properties), IdText(Signed(nullptr, u"P", u"p", 5, 5, u"parent")));
+    const Commit& assigned = properties = amend;
+    EXPECT_TRUE(assigned == amend && assigned.IsAmend() && assigned.GetStoragePrefix().IsEmpty());
     EXPECT_FALSE(Commit(immu::make<Commit>(), false).GetCommitTree() == nullptr);
     EXPECT_FALSE(Commit(static_cast<IRepository*>(nullptr), false).GetParent());
 }
@@ -158,6 +167,8 @@ TEST_F(Commits, EditsStoreTheirTreesAndLeaveOthersAlone) {
     EXPECT_FALSE(child.AddBlob(nullptr, u"d", MakeBlob("3")) || child.AddBlob(&repo, u"/", MakeBlob("3")));
     EXPECT_FALSE(child.AddObject(&repo, u"d", Id(u"x")) || child.RemoveObject(&repo, u"d"));
     EXPECT_FALSE(Commit().RemoveObject(&repo, u"d") || Commit().GetBlob(u"d") || child.GetTree(u"c"));
+    EXPECT_EQ(ToNames(CommitTree().GetBlobDiffs(parent.GetCommitTree())), (Names{"a/b", "c"}));
+    EXPECT_TRUE(CommitTree().GetBlobDiffs(nullptr).empty() && CommitTree().GetAllBlobPaths().empty());
     EXPECT_TRUE(child.GetCommitTree() == parent.GetCommitTree());
     EXPECT_EQ(IdText(child), before);
     EXPECT_TRUE(child.RemoveObject(&repo, u"c") && child.AddTree(&repo, u"e", *child.GetTree(u"a")->GetRoot()));
@@ -199,6 +210,17 @@ TEST_F(Commits, AreLinkedOldestFirst) {
     EXPECT_TRUE(line[3]->GetParent() == line[4] && line[1] == former[1] && line[0]->GetParent() == line[1]);
     EXPECT_FALSE(former[3]->GetParent());
     EXPECT_EQ(repo.GetCommitCount(), 3U);
+}
+
+TEST_F(Commits, AreTakenOverFromAnotherModule) {
+    auto commit = std::make_unique<Commit>(Signed(nullptr, u"A", u"a", 1, 0, u"one"));
+    const Commit* const address = commit.get();
+    const cow_ptr<Commit> taken = dll_wrapped_shared(std::move(commit));
+    EXPECT_TRUE(taken.get() == address && taken.use_count() == 1);
+    const auto line = dll_wrapped_shared(std::make_unique<std::vector<cow_ptr<Commit>>>(2, taken));
+    EXPECT_TRUE(line->back() == taken && taken.use_count() == 3);
+    EXPECT_FALSE(dll_wrapped_shared(std::unique_ptr<Tree>()) || dll_wrapped_shared(std::unique_ptr<CommitTree>()));
+    EXPECT_FALSE(dll_wrapped_shared(std::unique_ptr<Blob>()) || dll_wrapped_shared(std::unique_ptr<Object>()));
 }
 
 } // namespace

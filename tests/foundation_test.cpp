@@ -50,7 +50,7 @@ TEST(Text, CopiesShareTheirCharactersUntilOneChanges) {
     for (int count = 0; count < 100'000; ++count)
         wide += u'x';
     EXPECT_EQ(wide.GetLength(), 100'005);
-    EXPECT_EQ(wide[100'005], u'\0');
+    EXPECT_EQ(wide.GetAt(100'005), u'\0');
     EXPECT_EQ(Text(nullptr, 5) + Text("abc", -1) + static_cast<const char*>(nullptr), "");
 }
 

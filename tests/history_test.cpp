@@ -140,6 +140,24 @@ TEST_F(Histories, DeletingMovesBranchesNewestFirstAndSurvivesAFailure) {
     EXPECT_EQ(repo.TakeCalls(), "Sync(b) Sync(c) MoveBranchTo(master,c) MoveBranchTo(topic,b) UpdateStorage");
     EXPECT_EQ(history.Branches(), "master=c/b topic=b");
     EXPECT_TRUE(repo.GetHead()->GetCommitTree()->GetRoot() == tree);
+
+    // A branch that will not move keeps the others of its commit, and none else.
+    class Refusing : public Repository {
+    public:
+        using Repository::Repository;
+        bool MoveBranchTo(KivStringViewT<char16_t> branch, cow_ptr<Commit> commit) override {
+            const bool refuses = NameOf(commit) == "b" && !std::exchange(hasRefused, true);
+            return !refuses && Repository::MoveBranchTo(branch, commit);
+        }
+        bool hasRefused = false;
+    };
+    Refusing refusing(std::make_unique<MemObjectsStorage>());
+    History line(refusing);
+    line.Grow("a b:a c:b");
+    for (auto const& [branch, head] : {std::pair(u"one", "b"), {u"two", "b"}, {u"three", "c"}})
+        refusing.CreateBranch(branch, line[head]);
+    EXPECT_TRUE(refusing.DeleteCommits(line["c"]));
+    EXPECT_EQ(line.Branches(), "master= one=b/a three=c/b two=b/a");
 }
 
 TEST_F(Histories, BranchesAreWhereTheyWereWhenAnExceptionEndsTheirMoves) {

@@ -122,6 +122,10 @@ TEST_F(TreePaths, ARepositorysAnswerBecomesTheEntryWhateverItIs) {
     EXPECT_FALSE(tree.write()->AddBlob(&repo, u"a", MakeBlob("3")));
     EXPECT_FALSE(tree.write()->AddBlob(&repo, u"c", MakeBlob("3")));
     EXPECT_TRUE(tree->LocalObjectExists(u"c") && !tree->GetLocalObject(u"c"));
+    auto filled = tree;
+    repo.blobAnswer.reset();
+    EXPECT_TRUE(filled.write()->AddBlob(&repo, u"c", MakeBlob("3")));
+    EXPECT_EQ(Files(filled), "a/k=1 b=other c=3");
     EXPECT_EQ(tree->GetLocalObjectCount(), 4U);
     EXPECT_EQ(tree->GetDeepBlobCount(), 4U);
     EXPECT_EQ(Joined(ToNames(tree->GetLocalObjectPaths())), "a b");
@@ -132,6 +136,22 @@ TEST_F(TreePaths, ARepositorysAnswerBecomesTheEntryWhateverItIs) {
     EXPECT_FALSE(tree.write()->AddTree(&repo, u"b", Tree()));
     EXPECT_TRUE(tree.write()->RemoveObject(&repo, u"c"));
     EXPECT_EQ(Joined(ToNames(tree->GetDeepBlobPaths())), "a/k b");
+}
+
+TEST_F(TreePaths, NamesOfAnyLengthArePackedUpToTheirFirstZero) {
+    const std::string one = Identifier("blob", "1");
+    const std::string longName(5000, 'n');
+    Tree tree;
+    Tree moved;
+    for (auto const& name : {KivStringT<char16_t>(u"a\0b", 3), Wide(longName), KivStringT<char16_t>(u"z")}) {
+        tree.AddBlob(&repo, name, MakeBlob("1"));
+        moved = std::move(tree);
+        tree = moved;
+    }
+    const std::string data = Entry("blob", "a", one) + Entry("blob", longName, one) + Entry("blob", "z", one);
+    EXPECT_EQ(Narrow(tree.GetId().GetText()), Identifier("tree", data));
+    EXPECT_EQ(Bytes(tree.GetData()), data);
+    EXPECT_EQ(tree.GetStoragePrefix(), "40000");
 }
 
 class ReadingTrees : public testing::Test {
@@ -175,7 +195,9 @@ TEST_F(ReadingTrees, LeavesOutWhatCannotBeLoaded) {
                  {"1 blob y" + std::string(1, '\0') + one + good, "x=1 y=1"}};
     for (auto const& [data, files] : cases)
         EXPECT_EQ(Files(packed.Read(packed.Add("tree", data), &repo)), files) << data;
-    packed.forms["other"] = packed.forms[one];
+    const std::string noDigest(64, 'Z');
+    packed.forms["other"] = packed.forms[noDigest] = packed.forms[one];
+    EXPECT_EQ(Files(packed.Read(packed.Add("tree", Entry("blob", "x", noDigest)), &repo)), "x=1");
     packed.forms["long"] = std::string("treehouse\0", 10) + good;
     EXPECT_EQ(Files(packed.Read("other", &repo)), "-");
     EXPECT_EQ(Files(packed.Read("long", &repo)), "x=1");

@@ -11,8 +11,7 @@ namespace {
 
 KivStringT<char16_t> EncodedDigest(SHADigest256& digest) {
     std::array<std::byte, 32> bytes;
-    if (!digest.FinalDigest(bytes.data()))
-        return {};
+    digest.FinalDigest(bytes.data());
     return DataEncoding::HexEncode(bytes.data(), bytes.size());
 }
 
@@ -29,10 +28,8 @@ KivStringT<char16_t> ComputeEncodedSHA256Hash(const void* data, std::size_t size
 
 KivStringT<char16_t> ComputeEncodedSHA256Hash(Buffer const& buffer) {
     SHADigest256 digest;
-    for (auto const& chunk : buffer.LockForRead()) {
-        if (!digest.InitData(chunk.data(), chunk.size()))
-            return {};
-    }
+    for (auto const& chunk : buffer.LockForRead())
+        digest.InitData(chunk.data(), chunk.size());
     return EncodedDigest(digest);
 }
 

@@ -56,10 +56,9 @@ bool Repository::DeleteCommits(cow_ptr<Commit> commit) {
     {
         // Gone before the purge: whatever is held here would survive it.
         auto kept = DeleteChain(*storage_, std::move(commit));
-        if (kept.commits.empty())
+        const bool areAnyKept = Commit::MakeCommitLinksInOrder(kept.commits, this);
+        if (!areAnyKept)
             return true;
-        if (!Commit::MakeCommitLinksInOrder(kept.commits, this))
-            return false;
         MoveBranches(*this, *storage_, kept);
     }
     UpdateStorage();
