@@ -169,6 +169,7 @@ TEST_F(Commits, EditsStoreTheirTreesAndLeaveOthersAlone) {
     EXPECT_FALSE(Commit().RemoveObject(&repo, u"d") || Commit().GetBlob(u"d") || child.GetTree(u"c"));
     EXPECT_EQ(ToNames(CommitTree().GetBlobDiffs(parent.GetCommitTree())), (Names{"a/b", "c"}));
     EXPECT_TRUE(CommitTree().GetBlobDiffs(nullptr).empty() && CommitTree().GetAllBlobPaths().empty());
+    EXPECT_TRUE(CommitTree().IsEmpty() && !parent.GetCommitTree()->IsEmpty());
     EXPECT_TRUE(child.GetCommitTree() == parent.GetCommitTree());
     EXPECT_EQ(IdText(child), before);
     EXPECT_TRUE(child.RemoveObject(&repo, u"c") && child.AddTree(&repo, u"e", *child.GetTree(u"a")->GetRoot()));

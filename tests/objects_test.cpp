@@ -208,6 +208,7 @@ TEST(Object, CachesIdentifierAndPackedFormUntilItsStateIsReset) {
 TEST(Helpers, HashAppendAndReadTexts) {
     EXPECT_EQ(Narrow(Helpers::ComputeEncodedSHA256Hash("", 0)), emptyDigest);
     EXPECT_EQ(Narrow(Helpers::ComputeEncodedSHA256Hash(Buffer())), emptyDigest);
+    EXPECT_EQ(Narrow(Helpers::ComputeEncodedSHA256Hash(BufferOf(std::string("blob 5\0hello", 12)))), helloId);
     EXPECT_TRUE(Helpers::ComputeEncodedSHA256Hash(nullptr, 0).IsEmpty() &&
                 Helpers::ComputeEncodedSHA256Hash(nullptr, 3).IsEmpty());
     Buffer buffer;

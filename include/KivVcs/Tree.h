@@ -44,8 +44,8 @@ public:
     void Set(KivStringT<char16_t> const& name, cow_ptr<Blob> child);
     void Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child);
 
-    /// Removes the entries @p name of both kinds; false if there is none.
-    bool Erase(KivStringViewT<char16_t> name);
+    /// Removes the entries @p name of both kinds. @pre There is one.
+    void Erase(KivStringViewT<char16_t> name);
 
 private:
     friend class TableRelease;

@@ -343,9 +343,7 @@ void EntryTable::Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child) {
     SetEntry(root_, name, true, std::move(child));
 }
 
-bool EntryTable::Erase(KivStringViewT<char16_t> name) {
-    if (FindEntry(root_, name, false) == nullptr && FindEntry(root_, name, true) == nullptr)
-        return false;
+void EntryTable::Erase(KivStringViewT<char16_t> name) {
     Path path;
     TableNode** slot = &root_;
     while (!(*slot)->IsLeaf()) {
@@ -370,7 +368,6 @@ bool EntryTable::Erase(KivStringViewT<char16_t> name) {
     if (root_->Count() == 0)
         TableRelease::Drop(std::exchange(root_, nullptr));
     LowerRoot(root_);
-    return true;
 }
 
 } // namespace KivVcs::detail
