@@ -4,6 +4,7 @@
 #   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
 #   run_tests [OPTION...]     runs the tests of the directory built last, and shows only the summary when all pass; ctest takes
 #                             the options
+#   $long_tests               an expression for tests to leave out where they are slowed down many times
 #   quietly COMMAND...        runs a command and shows its output only when it fails
 #   die MESSAGE               ends the script
 #   usage [STATUS]            shows the comment at the top of the script and ends it; -h and --help do so by themselves
@@ -14,6 +15,8 @@ set -euo pipefail
 source_directory=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
 build_root=${KIVVCS_BUILD_ROOT:-$source_directory/build}
 jobs=$(nproc)
+# shellcheck disable=SC2034
+long_tests='OnStacksOf|AllocationFaults|LongHistories|NestingTakesNoStack|BehavesLikeAText|Seeds/.*/([2-9]|1[0-9]|20)$'
 
 die() {
     printf '%s: %s\n' "${0##*/}" "$*" >&2
