@@ -78,6 +78,10 @@ TEST(Digest, DoesNotDependOnHowTheMessageIsSplit) {
 
 TEST(Digest, IsTheSameWithAndWithoutTheProcessorsInstructions) {
     const Sha256::Compression hardware = Sha256::FindHardwareCompression();
+#if (defined(__x86_64__) || defined(__i386__)) && !defined(__clang__)
+    const bool hasInstructions = __builtin_cpu_supports("sha") && __builtin_cpu_supports("sse4.1");
+    EXPECT_EQ(hardware != nullptr, hasInstructions && __builtin_cpu_supports("ssse3"));
+#endif
     if (hardware == nullptr)
         GTEST_SKIP() << "this processor has no SHA-256 instructions that the library knows";
     std::mt19937 random(256);
