@@ -112,8 +112,10 @@ TEST(Text, FormatsLikePrintf) {
 
 TEST(Encoding, EveryTextSurvivesUtf8) {
     Wide text;
-    for (int unit = 0; unit < 0x10000; ++unit)
+    for (int unit = 0; unit < 0x10000; ++unit) {
+        ASSERT_EQ(String::ToStringW(DataEncoding::Utf8Encode(Units({unit}))), Units({unit}));
         text += static_cast<char16_t>(unit);
+    }
     text += u"\U00010000 \U0001F600 \U0010FFFF ";
     text += Units({0xDC00, 0xD800, 'x', 0xD800, 0xD800, 0xDC00, 0xDBFF});
     const Text encoded = DataEncoding::Utf8Encode(text);
