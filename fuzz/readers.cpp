@@ -25,7 +25,7 @@ public:
     bool Read(void* destination, std::uint64_t size) override {
         if (form_.manner == ThrowsHalfway && position_ + size > form_.bytes.size() / 2)
             throw std::runtime_error("broken stream");
-        const std::uint64_t taken = std::min<std::uint64_t>(size, form_.bytes.size() - position_);
+        const auto taken = static_cast<std::size_t>(std::min<std::uint64_t>(size, form_.bytes.size() - position_));
         form_.bytes.copy(static_cast<char*>(destination), taken, position_);
         position_ += taken;
         return taken == size;
