@@ -213,6 +213,17 @@ TEST_F(Commits, AreLinkedOldestFirst) {
     EXPECT_EQ(repo.GetCommitCount(), 3U);
 }
 
+TEST_F(Commits, ALongUnstoredHistoryIsIdentifiedWithoutStack) {
+    cow_ptr<Commit> unstored;
+    cow_ptr<Commit> stored;
+    for (int index = 0; index < 100'000; ++index) {
+        unstored = immu::make<Commit>(Commit(std::move(unstored), false));
+        stored = repo.SyncWithStorage(immu::make<Commit>(Commit(std::move(stored), false)));
+        repo.TakeCalls();
+    }
+    EXPECT_EQ(IdText(*unstored), IdText(*stored));
+}
+
 TEST_F(Commits, AreTakenOverFromAnotherModule) {
     auto commit = std::make_unique<Commit>(Signed(nullptr, u"A", u"a", 1, 0, u"one"));
     const Commit* const address = commit.get();
