@@ -152,6 +152,8 @@ TEST_F(Commits, AnAmendTakesThePlaceOfItsParent) {
     properties = Signed(nullptr, u"P", u"p", 5, 5, u"parent");
     properties.SetDescription({u"parent\0x", 8});
     EXPECT_EQ(IdText(properties), IdText(Signed(nullptr, u"P", u"p", 5, 5, u"parent")));
+    properties.SetDescription({u"\0x", 2});
+    EXPECT_EQ(IdText(properties), IdText(Signed(nullptr, u"P", u"p", 5, 5, u"")));
     const Commit& assigned = properties = amend;
     EXPECT_TRUE(assigned == amend && assigned.IsAmend() && assigned.GetStoragePrefix().IsEmpty());
     EXPECT_FALSE(Commit(immu::make<Commit>(), false).GetCommitTree() == nullptr);
