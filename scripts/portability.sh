@@ -43,6 +43,7 @@ for platform in "$@"; do
         export WINEPREFIX=$build_root/windows-wine WINEDEBUG=-all
         build_preset windows
         # Started by a test, wine's services would keep the pipe open at whose end ctest knows that the test has ended.
+        mkdir -p "$WINEPREFIX"
         trap 'wineserver --kill' EXIT
         wineserver --persistent
         quietly wine cmd /c exit
