@@ -143,12 +143,12 @@ TEST_F(TreePaths, NamesOfAnyLengthArePackedUpToTheirFirstZero) {
     const std::string longName(5000, 'n');
     Tree tree;
     Tree moved;
-    for (auto const& name : {KivStringT<char16_t>(u"a\0b", 3), Wide(longName), KivStringT<char16_t>(u"z")}) {
+    for (auto const& name : {KivStringT<char16_t>(u"a\0b", 3), Wide(longName), KivStringT<char16_t>(u"z\x80")}) {
         tree.AddBlob(&repo, name, MakeBlob("1"));
         moved = std::move(tree);
         tree = moved;
     }
-    const std::string data = Entry("blob", "a", one) + Entry("blob", longName, one) + Entry("blob", "z", one);
+    const std::string data = Entry("blob", "a", one) + Entry("blob", longName, one) + Entry("blob", "z\xC2\x80", one);
     EXPECT_EQ(Narrow(tree.GetId().GetText()), Identifier("tree", data));
     EXPECT_EQ(Bytes(tree.GetData()), data);
     EXPECT_EQ(tree.GetStoragePrefix(), "40000");
