@@ -198,6 +198,13 @@ TEST_F(ReadingTrees, LeavesOutWhatCannotBeLoaded) {
     const std::string noDigest(64, 'Z');
     packed.forms["other"] = packed.forms[noDigest] = packed.forms[one];
     EXPECT_EQ(Files(packed.Read(packed.Add("tree", Entry("blob", "x", noDigest)), &repo)), "x=1");
+    std::string repeated;
+    for (auto const* name : {"a", "b", "c"})
+        repeated += Entry("blob", name, noDigest) + Entry("blob", name, missing) + Entry("tree", name, missing) +
+                    Entry("tree", name, one);
+    packed.loads = 0;
+    EXPECT_EQ(Files(packed.Read(packed.Add("tree", repeated), &repo)), "a=1 b=1 c=1");
+    EXPECT_EQ(packed.loads, 5) << "whatever is named is asked for once";
     packed.forms["long"] = std::string("treehouse\0", 10) + good;
     EXPECT_EQ(Files(packed.Read("other", &repo)), "-");
     EXPECT_EQ(Files(packed.Read("long", &repo)), "x=1");

@@ -253,7 +253,12 @@ protected:
     Object() noexcept = default;
     Object(Object const&) = default;
     Object(Object&&) noexcept = default;
-    Object& operator=(Object const&) = default;
+    Object& operator=(Object const& other) {
+        // First what may fail, so that the identifier stays that of the content.
+        packedData_ = other.packedData_;
+        id_ = other.id_;
+        return *this;
+    }
     Object& operator=(Object&&) noexcept = default;
 
     /// The identifier of what `GetPackedData` gives. Overridden where it can be had without putting the packed form

@@ -43,7 +43,7 @@ public:
     /// Deletes @p commit and everything below it on its chain, but for the commits that are branch heads: those are
     /// stored anew, linked to each other in their old order, their branches moved, and unused objects purged. A root
     /// commit, and null, are left alone. Descendants of @p commit keep their old parents in memory.
-    /// @return false without storage, or if the kept commits could not be linked.
+    /// @return false without storage.
     /// @throws what allocation and the host's operations throw; unless that is the purge, no branch has moved then.
     virtual bool DeleteCommits(cow_ptr<Commit> commit) = 0;
     /// Rewrites the history of all branches so that it keeps only their heads and the common bases of every two heads,

@@ -93,7 +93,7 @@ public:
     [[nodiscard]] std::uint64_t GetLocalObjectCount() const noexcept;
     /// The number of blob entries. O(1).
     [[nodiscard]] std::uint64_t GetLocalBlobCount() const noexcept;
-    /// The number of blob entries at any depth; proportional to the number of subtrees.
+    /// The number of blob entries at any depth; proportional to the number of subtrees, each counted wherever it is named.
     [[nodiscard]] std::uint64_t GetDeepBlobCount() const;
 
     /// Adds a blob under @p path, making the trees on the way that are missing and replacing a blob of that name. A
@@ -161,7 +161,8 @@ public:
 
     /// The tree of identifier @p id: the one that @p repo holds already, otherwise read through @p loader with
     /// everything below it. Blobs and subtrees that cannot be loaded are left out. A tree that names itself, directly
-    /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable.
+    /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable. An entry whose name holds "/" is
+    /// added by that path, as `AddBlob` and `AddTree` do, each time storing the directories on its way.
     /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not
     /// begin with "tree", no entries, or an entry that is neither tree nor blob.
     /// @throws what @p loader and @p repo throw

@@ -23,7 +23,9 @@ Commit::Commit(cow_ptr<Commit> parent, bool amend) : amend_(amend) {
 Commit::Commit(IRepository* repository, bool amend)
     : Commit(repository == nullptr ? nullptr : repository->GetHead(), amend) {}
 
-Commit& Commit::operator=(Commit const& other) = default;
+Commit& Commit::operator=(Commit const& other) {
+    return *this = Commit(other);
+}
 Commit& Commit::operator=(Commit&& other) noexcept = default;
 
 Commit::~Commit() {

@@ -56,9 +56,9 @@ bool Repository::DeleteCommits(cow_ptr<Commit> commit) {
     {
         // Gone before the purge: whatever is held here would survive it.
         auto kept = DeleteChain(*storage_, std::move(commit));
-        const bool areAnyKept = Commit::MakeCommitLinksInOrder(kept.commits, this);
-        if (!areAnyKept)
+        if (kept.commits.empty())
             return true;
+        Commit::MakeCommitLinksInOrder(kept.commits, this);
         MoveBranches(*this, *storage_, kept);
     }
     UpdateStorage();

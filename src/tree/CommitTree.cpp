@@ -2,6 +2,21 @@
 
 namespace KivVcs {
 
+namespace {
+
+/// Adds to @p root, which is made if there is none, but not if the addition ends in an exception.
+template <class Add>
+auto AddTo(cow_ptr<Tree>& root, Add add) {
+    if (root)
+        return add(*root.write());
+    cow_ptr<Tree> made;
+    auto added = add(*made.write());
+    root = std::move(made);
+    return added;
+}
+
+} // namespace
+
 cow_ptr<CommitTree> CommitTree::Deserialize(Id const& id, IRepository* repo,
                                             PortableVersion::Delegate<StreamIO(Id const&)> loader) {
     cow_ptr<Tree> root = Tree::Deserialize(id, repo, std::move(loader));
@@ -9,15 +24,15 @@ cow_ptr<CommitTree> CommitTree::Deserialize(Id const& id, IRepository* repo,
 }
 
 cow_ptr<Blob> CommitTree::AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob) {
-    return root_.write()->AddBlob(repo, path, blob);
+    return AddTo(root_, [&](Tree& root) { return root.AddBlob(repo, path, blob); });
 }
 
 cow_ptr<Tree> CommitTree::AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree) {
-    return root_.write()->AddTree(repo, path, tree);
+    return AddTo(root_, [&](Tree& root) { return root.AddTree(repo, path, tree); });
 }
 
 cow_ptr<Object> CommitTree::AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id) {
-    return root_.write()->AddObject(repo, path, id);
+    return AddTo(root_, [&](Tree& root) { return root.AddObject(repo, path, id); });
 }
 
 bool CommitTree::RemoveObject(IRepository* repo, KivStringViewT<char16_t> path) {

@@ -26,7 +26,9 @@ cow_ptr<Tree> FindStored(IRepository& repo, Id const& id, Tree const*) {
 Tree::Tree() noexcept = default;
 Tree::Tree(Tree const& other) = default;
 Tree::Tree(Tree&& other) noexcept = default;
-Tree& Tree::operator=(Tree const& other) = default;
+Tree& Tree::operator=(Tree const& other) {
+    return *this = Tree(other);
+}
 Tree& Tree::operator=(Tree&& other) noexcept = default;
 Tree::~Tree() = default;
 

@@ -170,13 +170,13 @@ private:
         }
         if (open_.size() == deepestLoadedNesting)
             return Opened::Finished;
+        opened_.emplace(id, nullptr);
         StreamIO stream = loader_(id);
         if (!Helpers::ShiftObjectIdentifier(stream, "tree"))
             return Opened::Finished;
         KivStringT<char> data = Helpers::StreamToStringA(stream);
         if (data.IsEmpty())
             return Opened::Finished;
-        opened_.emplace(id, nullptr);
         open_.push_back({id, std::move(data), 0, {}, {}});
         return Opened::Pushed;
     }
@@ -200,8 +200,13 @@ private:
     cow_ptr<Blob> FindOrReadBlob(Id const& id) {
         if (cow_ptr<Blob> stored = repo_.GetBlobFromStorage(id))
             return stored;
+        if (const auto known = misnamed_.find(id); known != misnamed_.end())
+            return known->second;
         StreamIO stream = loader_(id);
-        return Blob::Deserialize(stream);
+        cow_ptr<Blob> blob = Blob::Deserialize(stream);
+        if (!blob || blob->GetId() != id)
+            misnamed_.emplace(id, blob);
+        return blob;
     }
 
     void AddChild(cow_ptr<Tree> const& child) {
@@ -223,6 +228,8 @@ private:
     Loader const& loader_;
     std::vector<OpenTree> open_;
     std::map<Id, cow_ptr<Tree>, InOrder> opened_;
+    /// What was read for identifiers of blobs under which no repository will hold it.
+    std::map<Id, cow_ptr<Blob>, InOrder> misnamed_;
 };
 
 } // namespace
