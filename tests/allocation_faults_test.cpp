@@ -1,3 +1,4 @@
+#include "HostStream.h"
 #include "RecordingRepository.h"
 
 #include <gtest/gtest.h>
@@ -111,7 +112,8 @@ struct World {
         return state + "\n" + Narrow(draft.GetDescription()) + Narrow(draft.GetAuthorName()) + " on " +
                NameOf(draft.GetParent()) + "{" + Files(draft.GetCommitTree()) + "}\n" +
                KivVcs::Files(immu::make<Tree>(edited)) + "\n" + KivVcs::Files(immu::make<Tree>(sole)) + "\n" +
-               Narrow(text) + "\n" + Helpers::StringAFromBuffer(data).GetString();
+               Narrow(text) + "\n" + Helpers::StringAFromBuffer(data).GetString() + "\n" +
+               Helpers::StringAFromBuffer(blob.GetData()).GetString();
     }
 
     /// The state and what the last operation gave.
@@ -179,6 +181,7 @@ public:
         Check(&world.draft);
         Check(&world.edited);
         Check(&world.sole);
+        Check(&world.blob);
     }
 
 private:
@@ -233,8 +236,9 @@ cow_ptr<Tree> RootOf(World& world, const char* commit) {
 
 Resolvers AskTimesThenRight() {
     const auto getTime = [](cow_ptr<Blob> const& blob) { return optional<Time>(Time(blob->GetData().GetSize())); };
+    const TreeConflictResolver undecided = [](auto const&, auto const&) { return TreeConflictChoice::Undecided; };
     return {ChainResolvers(TimeBasedConflictResolver({u"absent", u"f1"}, getTime), AlwaysChooseRight()),
-            [](auto const&, auto const&) { return TreeConflictChoice::Merge; }};
+            ChainResolvers(undecided, [](auto const&, auto const&) { return TreeConflictChoice::Merge; })};
 }
 
 // clang-format off
@@ -248,8 +252,9 @@ const Operation operations[] = {
     {"Tree::RemoveObject many", [](World& w) { w.done = w.edited.RemoveObject(&w.repository, u"many/101"); }},
     {"a wide tree", [](World& w) {
          Tree wide;
-         for (char16_t name[] = u"aa"; name[0] < u'j'; name[1] == u'z' ? (++name[0], name[1] = u'a') : ++name[1])
+         for (char16_t name[] = u"aa"; name[0] < u'l'; name[1] == u'z' ? (++name[0], name[1] = u'a') : ++name[1])
              wide.AddBlob(&w.repository, name, w.blob);
+         w.done = !wide.GetId().IsEmpty();
          w.tree = immu::make<Tree>(wide);
      }},
     {"emptying a tree", [](World& w) {
@@ -279,7 +284,7 @@ const Operation operations[] = {
              next.AddBlob(&w.repository, name, w.blob);
              tip = w.repository.SyncWithStorage(immu::make<Commit>(next));
          }
-         w.commit = tip;
+         w.commit = w.repository.GetCommonBase(tip, w.commits["v"]);
      }},
     {"Tree listings", [](World& w) {
          w.paths = w.edited.GetDeepBlobPaths();
@@ -299,6 +304,19 @@ const Operation operations[] = {
          w.done = !w.edited.GetId().GetText().IsEmpty() && w.draft.GetId() == Id(w.draft.GetPackedData());
          w.narrow = Helpers::StringAFromBuffer(w.edited.GetData());
      }},
+    {"assigning a blob", [](World& w) {
+         const Blob other = MakeBlob("other");
+         w.done = other.GetPackedData().GetSize() > w.blob.GetPackedData().GetSize();
+         w.blob = other;
+     }},
+    {"assigning a tree", [](World& w) {
+         w.done = w.sole.GetData().GetSize() < RootOf(w, "v")->GetPackedData().GetSize();
+         w.sole = *RootOf(w, "v");
+     }},
+    {"assigning a commit", [](World& w) {
+         w.done = w.draft.GetData().GetSize() < w.commits["v"]->GetPackedData().GetSize();
+         w.draft = *w.commits["v"];
+     }},
     {"ToString", [](World& w) { w.done = w.edited.ToString().GetLength() > w.blob.ToString().GetLength(); }},
     {"Commit::AddBlob", [](World& w) { w.draft.AddBlob(&w.repository, u"d/e/fresh", MakeBlob("fresh")); }},
     {"Commit::AddTree", [](World& w) { w.tree = w.draft.AddTree(&w.repository, u"trees/one", w.edited); }},
@@ -314,6 +332,14 @@ const Operation operations[] = {
          holder.write()->AddBlob(&w.repository, u"only/here", w.blob);
          w.paths = holder->GetBlobDiffs(w.draft.GetCommitTree());
          w.holder = w.draft.GetTree(u"d");
+         w.done = holder->GetIdByPath(u"d/e") && holder->GetBlob(u"f1") == w.draft.GetBlob(u"f1");
+     }},
+    {"CommitTree without root", [](World& w) {
+         CommitTree holder;
+         holder.AddTree(&w.repository, u"d", w.edited);
+         w.holder = dll_wrapped_shared(std::make_unique<CommitTree>(holder));
+         w.paths = w.holder->GetAllBlobPaths();
+         w.done = w.holder->GetBlobCount() == w.paths.size();
      }},
     {"author lines", [](World& w) {
          int position = 0;
@@ -352,6 +378,21 @@ const Operation operations[] = {
          large.Append("0123456789", 10, 1'000);
          StreamIO stream(MemStream::CreateOnRef(large));
          w.done = Blob::Deserialize(stream)->GetData().GetSize() == 10'000;
+         StreamIO host = ReaderOf(std::string("blob 1\0", 7) + std::string(200'000, 'h'));
+         w.done = w.done && Blob::Deserialize(host)->GetData().GetSize() == 200'000;
+     }},
+    {"a repository", [](World& w) {
+         Repository other(std::make_unique<MemObjectsStorage>(std::initializer_list<KivStringViewT<char16_t>>{u"a", u"b"}));
+         w.done = other.MoveBranchTo(u"a", w.commits["v"]) && other.GetStorage()->GetCommitBranches(w.commits["v"]).size() == 1;
+     }},
+    {"Helpers", [](World& w) {
+         Buffer data(w.data);
+         Helpers::AppendToBuffer(data, KivStringViewT<char16_t>(u"wide"));
+         Helpers::AppendToBuffer(data, w.blob.GetData());
+         StreamIO host = ReaderOf(std::string(70'000, 'h'));
+         w.narrow = Helpers::StreamToStringA(host).Left(5);
+         w.done = Helpers::SplitVcsPath(u"a/b/c").size() == 3 && Id(KivStringT<char16_t>(u"no digest")) != Id(data);
+         w.text = Helpers::ComputeEncodedSHA256Hash(data) + Helpers::ComputeEncodedSHA256Hash("abc", 3);
      }},
     {"CreateBranch", [](World& w) { w.done = w.repository.CreateBranch(u"new", nullptr); }},
     {"RemoveBranch", [](World& w) { w.done = w.repository.RemoveBranch(u"twin"); }},

@@ -171,7 +171,13 @@ TEST_F(Commits, EditsStoreTheirTreesAndLeaveOthersAlone) {
     EXPECT_FALSE(Commit().RemoveObject(&repo, u"d") || Commit().GetBlob(u"d") || child.GetTree(u"c"));
     EXPECT_EQ(ToNames(CommitTree().GetBlobDiffs(parent.GetCommitTree())), (Names{"a/b", "c"}));
     EXPECT_TRUE(CommitTree().GetBlobDiffs(nullptr).empty() && CommitTree().GetAllBlobPaths().empty());
-    EXPECT_TRUE(CommitTree().IsEmpty() && !parent.GetCommitTree()->IsEmpty());
+    CommitTree holder;
+    EXPECT_TRUE(holder.IsEmpty() && !parent.GetCommitTree()->IsEmpty());
+    const auto unstored = MakeTree(repo, "a/b=1 c=2");
+    holder.ReplaceRoot(&repo, unstored);
+    EXPECT_TRUE(holder.GetRoot() == parent.GetCommitTree()->GetRoot());
+    holder.ReplaceRoot(nullptr, unstored);
+    EXPECT_TRUE(holder.GetRoot() == unstored);
     EXPECT_TRUE(child.GetCommitTree() == parent.GetCommitTree());
     EXPECT_EQ(IdText(child), before);
     EXPECT_TRUE(child.RemoveObject(&repo, u"c") && child.AddTree(&repo, u"e", *child.GetTree(u"a")->GetRoot()));
@@ -217,13 +223,16 @@ TEST_F(Commits, AreLinkedOldestFirst) {
 
 TEST_F(Commits, ALongUnstoredHistoryIsIdentifiedWithoutStack) {
     cow_ptr<Commit> unstored;
+    cow_ptr<Commit> another;
     cow_ptr<Commit> stored;
     for (int index = 0; index < 100'000; ++index) {
         unstored = immu::make<Commit>(Commit(std::move(unstored), false));
+        another = immu::make<Commit>(Commit(std::move(another), false));
         stored = repo.SyncWithStorage(immu::make<Commit>(Commit(std::move(stored), false)));
         repo.TakeCalls();
     }
     EXPECT_EQ(IdText(*unstored), IdText(*stored));
+    EXPECT_EQ(Bytes(another->GetData()), Bytes(stored->GetData()));
 }
 
 TEST_F(Commits, AreTakenOverFromAnotherModule) {

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <random>
+
 namespace KivVcs {
 namespace {
 
@@ -219,6 +221,56 @@ TEST_F(Histories, SimplifyingAsksAboutPairsAndMakesRemovedBranchesAgain) {
     Storage().DeleteCommit(history["m"]);
     EXPECT_TRUE(repo.SimplifyCommitGraph(true));
     EXPECT_EQ(history.Branches(), "master=a/m/r other=c/r topic=b/m/r");
+}
+
+/// Finds common bases by following both chains in the plainest way, and compares.
+class FollowingRepository : public Repository {
+public:
+    using Repository::Repository;
+    cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const override {
+        const auto base = Follow(first, second);
+        EXPECT_TRUE(Repository::GetCommonBase(first, second) == base);
+        return base;
+    }
+
+private:
+    static cow_ptr<Commit> Follow(cow_ptr<Commit> first, cow_ptr<Commit> const& second) {
+        for (; first; first = first->GetParent()) {
+            for (auto other = second; other; other = other->GetParent()) {
+                if (*first == *other)
+                    return other;
+            }
+        }
+        return nullptr;
+    }
+};
+
+TEST(RandomHistories, SimplifyingKeepsWhatFollowingEveryPairKeeps) {
+    for (unsigned seed = 0; seed < 60; ++seed) {
+        std::mt19937 random(seed);
+        const auto below = [&random](unsigned limit) { return static_cast<unsigned>(random() % limit); };
+        std::string graph = "0";
+        std::string branches = "master=0";
+        for (unsigned commit = 1; commit < 60; ++commit) {
+            const auto name = std::to_string(commit);
+            graph += " " + name;
+            if (const unsigned back = below(8); back < 7)
+                graph += ":" + std::to_string(commit - 1 - std::min(back * back / 4, commit - 1));
+            if (below(3) == 0)
+                branches += " b" + name + "=" + std::to_string(below(commit + 1));
+        }
+        Repository plain(std::make_unique<MemObjectsStorage>());
+        FollowingRepository following(std::make_unique<MemObjectsStorage>());
+        const auto simplified = [&](Repository& each) {
+            History line(each);
+            line.Grow(graph);
+            line.Point(branches);
+            line.Forget();
+            EXPECT_TRUE(each.SimplifyCommitGraph(true));
+            return line.Branches() + " | " + line.Counts();
+        };
+        ASSERT_EQ(simplified(plain), simplified(following)) << "seed " << seed;
+    }
 }
 
 TEST_F(Histories, ARebaseChangesParentsOnly) {

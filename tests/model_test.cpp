@@ -28,6 +28,21 @@ std::string IdText(optional<PlainTree> const& tree) {
     return tree ? IdOf(*tree) : "none";
 }
 
+/// What is at a path, a blob before a tree of the same name.
+std::string IdAt(PlainTree const& tree, std::span<std::string const> path) {
+    if (path.size() < 2)
+        return path.empty() ? "" : VisibleId(tree, path[0]);
+    auto const below = tree.trees.find(path[0]);
+    return below == tree.trees.end() ? "" : IdAt(below->second, path.subspan(1));
+}
+
+std::size_t CountBlobs(PlainTree const& tree) {
+    std::size_t count = tree.blobs.size();
+    for (auto const& [name, below] : tree.trees)
+        count += CountBlobs(below);
+    return count;
+}
+
 cow_ptr<Tree> RootOf(cow_ptr<Commit> const& commit) {
     return commit && commit->GetCommitTree() ? commit->GetCommitTree()->GetRoot() : nullptr;
 }
@@ -225,6 +240,10 @@ struct World {
         Expect("the draft", Bytes(draft.GetData()), plainDraft.Text());
         Expect("the tree", Files(immu::make<Tree>(tree)), Files(plainTree));
         Expect("its data", Bytes(tree.GetData()), Data(plainTree));
+        Expect("its blobs", tree.GetDeepBlobCount(), CountBlobs(plainTree));
+        const auto path = PickPath();
+        const auto found = tree.GetDeepObject(path.first);
+        Expect("what is found", found ? IdText(found) : "", IdAt(plainTree, path.second));
         const Side other = PickSide();
         const auto differing = DeepDiffs(plainTree, other.plain.value_or(PlainTree()));
         Expect("the differences", Joined(ToNames(tree.GetDeepBlobDiffs(other.tree))), Joined(Sorted(differing)));
@@ -372,6 +391,20 @@ const Action actions[] = {
          Expect("the new tip", IdText(moved), IdText(expected));
          w.repository.MoveBranchTo(u"b", moved);
          w.plain.Move("b", expected);
+     }},
+    {"MergelessRebase of a branch", 3, [](World& w) {
+         const auto [branch, onto] = std::pair{w.PickBranch(), w.PickBranch()};
+         const auto [head, target] = std::pair{w.plain.Head(branch), w.plain.Head(onto)};
+         const auto expected = w.plain.Rebase(head, w.plain.CommonBase(head, target), target);
+         Expect("the new tip", IdText(w.repository.MergelessRebase(Wide(branch), Wide(onto))), IdText(expected));
+     }},
+    {"Clone", 1, [](World& w) {
+         Repository clone(w.repository.GetStorage()->Clone());
+         Commit commit(&clone, false);
+         clone.DoCommit(commit);
+         clone.RemoveBranch(w.PickBranch() == "b" ? u"b" : u"c");
+         clone.UpdateStorage();
+         Expect("the clone's trees", clone.GetTreeCount(), w.repository.GetTreeCount());
      }},
     {"EnsureCommonRootFor", 2, [](World& w) {
          const auto [one, other, root] = std::tuple{w.PickBranch(), w.PickBranch(), w.PickBranch()};
