@@ -1,8 +1,8 @@
 #!/bin/bash
 # usage: scripts/check.sh PRESET...
 # Installs what is missing, then builds each preset of CMakePresets.json and runs its tests: release, debug, clang, static,
-# asan, tsan, glibcxx-debug, valgrind, and clang-tidy, which only builds. Valgrind, which is slow, gets neither long
-# histories, deep paths, wide directories nor failing allocations, of the random tests one seed, and not the vault.
+# asan, tsan, glibcxx-debug, valgrind, and clang-tidy, which only builds. Valgrind, which is slow, gets neither the vault nor
+# the tests that $long_tests in lib.sh names.
 
 . "$(dirname "$0")/lib.sh"
 [ $# -gt 0 ] || usage 1

@@ -43,7 +43,7 @@ quietly() {
 
 packages_of() {
     case $1 in
-    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils ;;
+    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata ;;
     vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
@@ -52,6 +52,7 @@ packages_of() {
     plot) echo python3-matplotlib ;;
     valgrind) echo valgrind ;;
     coverage) echo gcovr ;;
+    mutation) echo python3 ;;
     fuzz) echo clang-14 libclang-rt-14-dev ;;
     googletest) echo googletest ;;
     portability)

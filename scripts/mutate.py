@@ -14,7 +14,7 @@ import time
 SOURCE, BUILD = map(pathlib.Path, sys.argv[1:3])
 PLACES, SEED = map(int, sys.argv[3:5])
 # What they would catch beyond the others does not pay their minutes: long histories, and all random seeds but one.
-LONG_TESTS = "-*LongHistories*:*AMillion*:" + ":".join(f"*/{seed}" for seed in range(1, 32))
+LONG_TESTS = "-*LongHistories*:" + ":".join(f"*/{seed}" for seed in range(1, 32))
 FLIPS = {"==": ["!="], "!=": ["=="], "<": [">=", "<="], ">": ["<=", ">="], "<=": [">", "<"], ">=": ["<", ">"]}
 NO_STATEMENT = re.compile(r"(return|using|static|const|constexpr|auto|if|for|while|throw|break|continue|else|case|struct|"
                           r"class|template|friend|namespace|static_assert|default|public|private|inline)\b")
@@ -175,7 +175,7 @@ def main():
                   flush=True)
     print(f"{caught} of {caught + len(survivors)} faults were caught (seed {SEED}); {not_compiling} more did not "
           f"compile and {without_effect} compiled to the same code")
-    return 1 if caught < 0.95 * (caught + len(survivors)) else 0
+    return 0 if caught >= 0.95 * PLACES else 1
 
 
 sys.exit(main())

@@ -8,7 +8,7 @@
 . "$(dirname "$0")/lib.sh"
 [ $# -le 2 ] || usage 1
 
-install_packages build
+install_packages build mutation
 build_directory=$build_root/mutation
 rm -rf "$build_directory/source"
 mkdir -p "$build_directory/source"

@@ -11,11 +11,12 @@
 time_zones=(UTC Asia/Kathmandu Pacific/Kiritimati America/St_Johns)
 
 compare_expected_identifiers() {
-    local name identifier
+    local expected name identifier
+    expected=$(python3 "$source_directory/tests/golden_repository.py")
     while IFS=: read -r name identifier; do
         grep -q "\"${identifier# }\"" "$source_directory/tests/commit_test.cpp" ||
             die "the tests expect another identifier than ${identifier# } for '$name' of the golden repository"
-    done < <(python3 "$source_directory/tests/golden_repository.py")
+    done <<<"$expected"
 }
 
 install_packages build vault portability

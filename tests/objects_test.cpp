@@ -256,7 +256,7 @@ TEST(Helpers, ShiftAHeaderAndCompareItsBeginning) {
     EXPECT_TRUE(Helpers::ShiftObjectIdentifier(whole, {"blob 3\0", 7}));
 
     Buffer pieces(100'000);
-    pieces.Append(BufferOf("blob 3\0abc"s + std::string(100'000, ' ')));
+    pieces.Append(BufferOf("blob 3\0abc"s + std::string(99'990, ' ') + "tree 1\0"s));
     StreamIO later(MemStream::CreateOnRef(pieces));
     std::string skipped(100'000, 'x');
     EXPECT_TRUE(later.Read(skipped.data(), skipped.size()) && Helpers::ShiftObjectIdentifier(later, "blob "));

@@ -33,7 +33,7 @@ public:
     [[nodiscard]] virtual std::uint64_t GetPosition() const = 0;
 };
 
-/// Owns a stream, or nothing. Move-only.
+/// Owns a stream, or nothing. Move-only. A stream, which moves on when it is read, belongs to one thread at a time.
 class Stream {
 public:
     Stream() noexcept = default;

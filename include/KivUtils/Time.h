@@ -56,7 +56,7 @@ private:
 namespace DateTime {
 
 /// The offset from UTC that the local time zone has at @p time (positive east of Greenwich), to the second; zero where
-/// the platform cannot tell.
+/// the platform cannot tell. Reads the environment, which no other thread may change meanwhile.
 [[nodiscard]] KIVVCS_EXPORT TimeDelta GetCurrentTimezoneBias(Time time) noexcept;
 
 } // namespace DateTime

@@ -2,6 +2,9 @@
 
 /// @file
 /// Three-way merges of trees and the resolvers that settle their conflicts.
+///
+/// Threads: a merge needs exclusive use of its repository, reads its trees as their `const` operations do, and asks the
+/// resolvers on the thread that called it.
 
 #include "KivVcs/Tree.h"
 

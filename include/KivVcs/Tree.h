@@ -196,6 +196,8 @@ Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>, 
 ///
 /// The first add makes the root; once there it stays, even when removals empty it. A root that is shared with another
 /// holder is copied before it is changed.
+///
+/// Threads: all `const` operations may run concurrently on one holder. A change needs exclusive use of the holder.
 class KIVVCS_EXPORT CommitTree {
 public:
     /// No root.

@@ -58,7 +58,7 @@ KivStringT<char> StreamToStringA(StreamIO& stream) {
     if (!stream || stream.GetPosition() >= stream.GetSize())
         return {};
     std::uint64_t rest = std::min(stream.GetSize() - stream.GetPosition(), longestText);
-    // The claimed size is believed piece by piece only: each piece is at most as long as what has been read already.
+    // The claimed size is believed piece by piece only: each is at most 64 KiB longer than what has been read already.
     KivStringT<char> text;
     for (std::uint64_t piece = 65536; rest > 0; piece *= 2) {
         piece = std::min(piece, rest);
