@@ -22,7 +22,10 @@ public:
             value_.store(new T(*value), std::memory_order_relaxed);
     }
     Published(Published&& other) noexcept : value_(other.value_.exchange(nullptr, std::memory_order_relaxed)) {}
-    Published& operator=(Published const& other) { return *this = Published(other); }
+    Published& operator=(Published const& other) {
+        *this = Published(other);
+        return *this;
+    }
     Published& operator=(Published&& other) noexcept {
         T* const mine = value_.load(std::memory_order_relaxed);
         value_.store(other.value_.exchange(mine, std::memory_order_relaxed), std::memory_order_relaxed);

@@ -90,7 +90,6 @@ void Commit::IdentifyAncestors() const {
 }
 
 Buffer const& Commit::GetData() const {
-    IdentifyAncestors();
     return data_.GetOrMake([this] {
         Buffer data;
         Helpers::AppendToBuffer(data, TextOf(*this));
