@@ -3,7 +3,7 @@
 /// @file
 /// One version of the whole file set.
 
-#include "KivVcs/Tree.h"
+#include "KivVcs/CommitTree.h"
 
 namespace KivVcs {
 
@@ -128,7 +128,7 @@ private:
     Time commitTime_;
     TimeDelta timezoneBias_;
     bool amend_ = false;
-    Published<Buffer> data_;
+    detail::Published<Buffer> data_;
 };
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Commit> dll_wrapped_shared(std::unique_ptr<Commit> commit);

@@ -7,7 +7,6 @@
 #include "KivUtils/Buffer.h"
 #include "KivUtils/Callable.h"
 #include "KivUtils/Encoding.h"
-#include "KivUtils/Published.h"
 #include "KivUtils/Stream.h"
 #include "KivUtils/Time.h"
 #include "KivUtils/cow_ptr.h"
@@ -26,7 +25,6 @@ using KivUtils::emplace_t;
 using KivUtils::IStream;
 using KivUtils::MemStream;
 using KivUtils::optional;
-using KivUtils::Published;
 using KivUtils::Stream;
 using KivUtils::Time;
 using KivUtils::TimeDelta;

@@ -1,9 +1,12 @@
 #pragma once
 
 /// @file
-/// Directories, and the holder of a commit's root directory.
+/// Directories.
 
 #include "KivVcs/Blob.h"
+#include "KivVcs/detail/EntryTable.h"
+
+#include <vector>
 
 namespace KivVcs {
 
@@ -15,45 +18,6 @@ using PathList = std::vector<KivStringT<char16_t>>;
 
 /// The deepest nesting of directories that `Tree::Deserialize` reads; what lies deeper counts as not loadable.
 inline constexpr std::size_t deepestLoadedNesting = 131'072;
-
-namespace detail {
-
-class TableNode;
-class TableRelease;
-struct TableAccess;
-
-/// The entries of a tree: an ordered table whose copies share their nodes. Copying is O(1), an edit O(log n).
-class EntryTable {
-public:
-    EntryTable() noexcept = default;
-    EntryTable(EntryTable const& other) noexcept;
-    EntryTable(EntryTable&& other) noexcept : root_(std::exchange(other.root_, nullptr)) {}
-    EntryTable& operator=(EntryTable other) noexcept {
-        std::swap(root_, other.root_);
-        return *this;
-    }
-    ~EntryTable();
-
-    /// Null while there are no entries.
-    [[nodiscard]] TableNode const* Root() const noexcept { return root_; }
-
-    /// Sets the entry @p name of the kind of @p child, which may be null; the entry of the other kind stays.
-    void Set(KivStringViewT<char16_t> name, cow_ptr<Blob> child);
-    void Set(KivStringViewT<char16_t> name, cow_ptr<Tree> child);
-    /// The same with a text that a new entry shares.
-    void Set(KivStringT<char16_t> const& name, cow_ptr<Blob> child);
-    void Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child);
-
-    /// Removes the entries @p name of both kinds. @pre There is one.
-    void Erase(KivStringViewT<char16_t> name);
-
-private:
-    friend class TableRelease;
-
-    TableNode* root_ = nullptr;
-};
-
-} // namespace detail
 
 /// A directory: names mapped to blobs and to subtrees.
 ///
@@ -181,7 +145,7 @@ private:
     void SetLocalTree(IRepository& repo, KivStringViewT<char16_t> name, cow_ptr<Tree> tree);
 
     detail::EntryTable entries_;
-    Published<Buffer> data_;
+    detail::Published<Buffer> data_;
 };
 
 extern template KIVVCS_EXPORT cow_ptr<Blob>
@@ -190,52 +154,5 @@ extern template KIVVCS_EXPORT cow_ptr<Tree>
 Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>, Tree const&);
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Tree> dll_wrapped_shared(std::unique_ptr<Tree> tree);
-
-/// The holder of a commit's root tree, which may be absent. Everything forwards to the root; without one, lookups find
-/// nothing.
-///
-/// The first add makes the root; once there it stays, even when removals empty it. A root that is shared with another
-/// holder is copied before it is changed.
-///
-/// Threads: all `const` operations may run concurrently on one holder. A change needs exclusive use of the holder.
-class KIVVCS_EXPORT CommitTree {
-public:
-    /// No root.
-    CommitTree() noexcept = default;
-    explicit CommitTree(cow_ptr<Tree> root) noexcept : root_(std::move(root)) {}
-
-    /// A holder of what `Tree::Deserialize` gives; null if that is null.
-    static cow_ptr<CommitTree> Deserialize(Id const& id, IRepository* repo,
-                                           PortableVersion::Delegate<StreamIO(Id const&)> loader);
-
-    /// As the operations of `Tree`, on a root that is made if there is none, even if nothing is added then.
-    cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
-    cow_ptr<Tree> AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree);
-    cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
-    bool RemoveObject(IRepository* repo, KivStringViewT<char16_t> path);
-
-    [[nodiscard]] cow_ptr<Blob> GetBlob(KivStringViewT<char16_t> path) const;
-    [[nodiscard]] cow_ptr<Tree> GetTree(KivStringViewT<char16_t> path) const;
-    [[nodiscard]] cow_ptr<Tree> GetRoot() const noexcept { return root_; }
-    /// The root's identifier; the null identifier without a root.
-    [[nodiscard]] Id GetRootId() const;
-
-    /// Takes the tree that @p repo holds under the identifier of @p root, or @p root itself if there is none or @p repo
-    /// is null; null clears the root. Stores nothing.
-    void ReplaceRoot(IRepository* repo, cow_ptr<Tree> root);
-
-    /// Whether there is no root, or one without entries.
-    [[nodiscard]] bool IsEmpty() const noexcept;
-    [[nodiscard]] optional<Id> GetIdByPath(KivStringViewT<char16_t> path) const;
-    /// The paths of all blobs that differ between the two roots; a missing root counts as empty.
-    [[nodiscard]] PathList GetBlobDiffs(cow_ptr<CommitTree> const& other) const;
-    [[nodiscard]] PathList GetAllBlobPaths() const;
-    [[nodiscard]] std::uint64_t GetBlobCount() const;
-
-private:
-    cow_ptr<Tree> root_;
-};
-
-[[nodiscard]] KIVVCS_EXPORT cow_ptr<CommitTree> dll_wrapped_shared(std::unique_ptr<CommitTree> tree);
 
 } // namespace KivVcs

@@ -1,6 +1,6 @@
 #include "KivVcs/Commit.h"
 
-#include "KivVcs/Repository.h"
+#include "KivVcs/IRepository.h"
 
 namespace KivVcs {
 

@@ -1,4 +1,6 @@
-#include "KivVcs/Repository.h"
+#include "KivVcs/Commit.h"
+#include "KivVcs/Helpers.h"
+#include "KivVcs/IRepository.h"
 #include "objects/PackedForm.h"
 
 #include <cstdlib>

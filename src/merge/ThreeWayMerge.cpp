@@ -1,4 +1,5 @@
-#include "KivVcs/Repository.h"
+#include "KivVcs/IRepository.h"
+#include "KivVcs/Merge.h"
 
 #include <algorithm>
 #include <iterator>

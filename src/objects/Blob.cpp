@@ -1,5 +1,6 @@
 #include "KivVcs/Blob.h"
 
+#include "KivVcs/Helpers.h"
 #include "objects/PackedForm.h"
 
 namespace KivVcs {

@@ -1,3 +1,6 @@
+#include "KivVcs/Helpers.h"
+
+#include "KivVcs/SHADigest256.h"
 #include "objects/PathComponents.h"
 
 #include <algorithm>

@@ -1,4 +1,6 @@
-#include "KivVcs/Object.h"
+#include "KivVcs/Id.h"
+
+#include "KivVcs/SHADigest256.h"
 
 #include <algorithm>
 #include <cstring>

@@ -1,6 +1,7 @@
 #pragma once
 
-#include "KivVcs/Object.h"
+#include "KivVcs/Id.h"
+#include "KivVcs/SHADigest256.h"
 
 namespace KivVcs {
 

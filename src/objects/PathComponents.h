@@ -1,6 +1,6 @@
 #pragma once
 
-#include "KivVcs/Object.h"
+#include "KivVcs/Helpers.h"
 
 #include <algorithm>
 #include <array>

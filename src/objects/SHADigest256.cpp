@@ -1,4 +1,4 @@
-#include "KivVcs/Object.h"
+#include "KivVcs/SHADigest256.h"
 #include "objects/Sha256Compression.h"
 
 #include <algorithm>

@@ -1,4 +1,6 @@
-#include "KivVcs/Repository.h"
+#include "KivVcs/CommitTree.h"
+
+#include "KivVcs/IRepository.h"
 
 namespace KivVcs {
 

@@ -1,6 +1,6 @@
 #include "KivVcs/Tree.h"
 
-#include "KivVcs/Repository.h"
+#include "KivVcs/IRepository.h"
 #include "objects/PathComponents.h"
 #include "tree/TableNode.h"
 

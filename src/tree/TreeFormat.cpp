@@ -1,4 +1,5 @@
-#include "KivVcs/Repository.h"
+#include "KivVcs/Helpers.h"
+#include "KivVcs/IRepository.h"
 #include "objects/PackedForm.h"
 #include "tree/PackedEntries.h"
 

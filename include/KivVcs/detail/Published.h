@@ -1,13 +1,10 @@
 #pragma once
 
-/// @file
-/// A value that is computed on first use and then read by any number of threads.
-
 #include <atomic>
 #include <memory>
 #include <utility>
 
-namespace KivUtils {
+namespace KivVcs::detail {
 
 /// Holds nothing, or a complete value: it is built aside and published in one step, so that an exception while building
 /// leaves nothing behind, and racing first readers agree on one value.
@@ -58,4 +55,4 @@ private:
     mutable std::atomic<T*> value_{nullptr};
 };
 
-} // namespace KivUtils
+} // namespace KivVcs::detail

@@ -1,0 +1,116 @@
+#pragma once
+
+/// @file
+/// What every object is known by.
+
+#include "KivVcs/Foundation.h"
+
+#include <array>
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <utility>
+
+namespace KivVcs {
+
+namespace detail {
+class CachedId;
+} // namespace detail
+
+/// The identifier of an object: the hexadecimal text of the SHA-256 digest of its packed form, 64 lowercase digits. The
+/// empty text is the null identifier: no object.
+///
+/// A value that holds the digest itself: copying it allocates nothing, comparing and hashing it visits no other memory.
+/// Identifiers are equal when their texts are. Any number of threads may read one identifier.
+class KIVVCS_EXPORT Id {
+public:
+    using Digest = std::array<std::uint8_t, 32>;
+
+    /// The null identifier.
+    Id() noexcept = default;
+    /// The identifier of a packed form: hashes it.
+    Id(Buffer const& packed);
+    /// The identifier with the given text, whatever it is. @throws std::bad_alloc
+    explicit Id(KivStringT<char16_t> const& text);
+    /// The identifier whose text tells @p digest.
+    [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return {digest, HashOf(digest)}; }
+
+    Id(Id const& other) noexcept
+        : digest_(other.digest_), hash_(other.hash_), text_(Share(other)), tellsDigest_(other.tellsDigest_) {}
+    Id(Id&& other) noexcept
+        : digest_(other.digest_), hash_(std::exchange(other.hash_, hashOfNull)), text_(TakeText(other)),
+          tellsDigest_(std::exchange(other.tellsDigest_, false)) {}
+    Id& operator=(Id other) noexcept {
+        digest_ = other.digest_;
+        std::swap(hash_, other.hash_);
+        std::swap(tellsDigest_, other.tellsDigest_);
+        Text const* const mine = text_.load(std::memory_order_relaxed);
+        text_.store(other.text_.load(std::memory_order_relaxed), std::memory_order_relaxed);
+        other.text_.store(mine, std::memory_order_relaxed);
+        return *this;
+    }
+    ~Id() {
+        if (Text const* const text = text_.load(std::memory_order_acquire))
+            Drop(text);
+    }
+
+    /// The text, made on first use; valid as long as this identifier, or a copy made of it afterwards, lives.
+    /// @throws std::bad_alloc
+    [[nodiscard]] KivStringT<char16_t> const& GetText() const;
+
+    [[nodiscard]] bool IsEmpty() const noexcept {
+        return !tellsDigest_ && text_.load(std::memory_order_relaxed) == nullptr;
+    }
+
+    /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
+    [[nodiscard]] std::size_t Hash() const noexcept { return hash_; }
+
+    /// The digest that the text tells; null if it is not 64 lowercase hexadecimal digits.
+    [[nodiscard]] Digest const* GetDigest() const noexcept { return tellsDigest_ ? &digest_ : nullptr; }
+
+    friend bool operator==(Id const& left, Id const& right) noexcept {
+        if (left.hash_ != right.hash_ || left.tellsDigest_ != right.tellsDigest_)
+            return false;
+        // A text that tells a digest is always kept as one, so that the two kinds never have the same text.
+        return left.tellsDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
+    }
+
+private:
+    friend class detail::CachedId;
+
+    Id(Digest const& digest, std::size_t hash) noexcept : digest_(digest), hash_(hash), tellsDigest_(true) {}
+
+    /// Spelled out only when somebody asks for it, since a repository holds an identifier for every object.
+    struct Text;
+
+    static constexpr auto hashOfNull = static_cast<std::size_t>(0x42c52834b230ef45U);
+
+    static std::size_t HashOf(Digest const& digest) noexcept;
+    static Text const* Share(Id const& other) noexcept {
+        Text const* const text = other.text_.load(std::memory_order_acquire);
+        if (text != nullptr)
+            AddReference(text);
+        return text;
+    }
+    static Text const* TakeText(Id& other) noexcept {
+        Text const* const text = other.text_.load(std::memory_order_relaxed);
+        other.text_.store(nullptr, std::memory_order_relaxed);
+        return text;
+    }
+    static void AddReference(Text const* text) noexcept;
+    static void Drop(Text const* text) noexcept;
+    static bool HaveSameText(Id const& left, Id const& right) noexcept;
+
+    Digest digest_{};
+    std::size_t hash_ = hashOfNull;
+    mutable std::atomic<Text const*> text_{nullptr};
+    bool tellsDigest_ = false;
+};
+
+} // namespace KivVcs
+
+template <>
+struct std::hash<KivVcs::Id> {
+    std::size_t operator()(KivVcs::Id const& id) const noexcept { return id.Hash(); }
+};
