@@ -55,10 +55,13 @@ packages_of() {
     mutation) echo python3 ;;
     fuzz) echo clang-14 libclang-rt-14-dev ;;
     googletest) echo googletest ;;
-    portability)
-        echo g++-i686-linux-gnu g++-aarch64-linux-gnu g++-s390x-linux-gnu g++-mingw-w64-x86-64-posix qemu-user wine wine64 \
-            googletest python3
-        ;;
+    portability) echo googletest python3 ;;
+    x86-64) ;;
+    libcxx) echo clang-14 libc++-14-dev libc++abi-14-dev ;;
+    x86) echo g++-i686-linux-gnu ;;
+    aarch64) echo g++-aarch64-linux-gnu qemu-user ;;
+    s390x) echo g++-s390x-linux-gnu qemu-user ;;
+    windows) echo g++-mingw-w64-x86-64-posix wine wine64 ;;
     *) die "there is no package set '$1'" ;;
     esac
 }

@@ -1,10 +1,11 @@
 #!/bin/bash
 # usage: scripts/portability.sh [PLATFORM...]
 # Installs what is missing, then builds the library and its tests for each platform and runs them: x86-64 (once in each of
-# four time zones), x86, aarch64 and s390x (emulated), and windows (a DLL, run by wine). All platforms without arguments.
-# The identifiers that the tests expect are first compared with those which a script computes by other means. All but x86
-# leave out what takes minutes when it is emulated: long histories, deep paths, wide directories, failing allocations, and
-# all seeds of the random tests but one.
+# four time zones), libcxx (clang with libc++ instead of libstdc++), x86, aarch64 and s390x (emulated), and windows (a DLL,
+# run by wine). All platforms without arguments.
+# The identifiers that the tests expect are first compared with those which a script computes by other means. All but
+# libcxx and x86 leave out what takes minutes when it is emulated: long histories, deep paths, wide directories, failing
+# allocations, and all seeds of the random tests but one.
 
 . "$(dirname "$0")/lib.sh"
 
@@ -21,9 +22,10 @@ compare_expected_identifiers() {
 
 install_packages build vault portability
 compare_expected_identifiers
-[ $# -gt 0 ] || set -- x86-64 x86 aarch64 s390x windows
+[ $# -gt 0 ] || set -- x86-64 libcxx x86 aarch64 s390x windows
 for platform in "$@"; do
     printf '%s:\n' "$platform"
+    install_packages "$platform"
     case $platform in
     x86-64)
         build_preset release
@@ -32,8 +34,8 @@ for platform in "$@"; do
             TZ=$zone run_tests --exclude-regex "$long_tests|Package|Vault"
         done
         ;;
-    x86)
-        build_preset x86
+    libcxx | x86)
+        build_preset "$platform"
         run_tests
         ;;
     aarch64 | s390x)

@@ -136,7 +136,8 @@ public:
             for (auto const& [name, head] : branches)
                 if (head == each)
                     moves[name] = kept.size();
-            if (std::ranges::any_of(moves, [&kept](auto const& move) { return move.second == kept.size(); }))
+            if (std::any_of(moves.begin(), moves.end(),
+                            [&kept](auto const& move) { return move.second == kept.size(); }))
                 kept.push_back(std::make_shared<PlainCommit>(detached));
             commits.erase(each->id);
         }
@@ -185,7 +186,7 @@ public:
         for (auto const& id : kept)
             if (!parents.contains(id))
                 rebuild(id, nullptr);
-        return std::ranges::none_of(missing, [this](auto const& id) { return commits.contains(id); });
+        return std::none_of(missing.begin(), missing.end(), [this](auto const& id) { return commits.contains(id); });
     }
 
     /// @param open the commits that the host holds
@@ -263,7 +264,8 @@ private:
             const auto changedHere = LocalDiffs(base, mine, ofTrees);
             const auto changedThere = LocalDiffs(base, theirs, ofTrees);
             Names conflicts;
-            std::ranges::set_intersection(changedHere, changedThere, std::back_inserter(conflicts));
+            std::set_intersection(changedHere.begin(), changedHere.end(), changedThere.begin(), changedThere.end(),
+                                  std::back_inserter(conflicts));
             std::erase_if(conflicts,
                           [&](auto const& name) { return VisibleId(mine, name) == VisibleId(theirs, name); });
             for (auto const& name : ofTrees ? Names() : conflicts) {
@@ -273,7 +275,7 @@ private:
             }
             for (auto const& [changed, from] : {std::pair(&changedThere, &theirs), std::pair(&changedHere, &mine)})
                 for (auto const& name : *changed)
-                    if (!std::ranges::binary_search(conflicts, name))
+                    if (!std::binary_search(conflicts.begin(), conflicts.end(), name))
                         Use(result, *from, name);
             for (auto const& name : ofTrees ? conflicts : Names()) {
                 const auto below = [&name](PlainTree const& tree) {

@@ -116,7 +116,7 @@ inline void ListFiles(PlainTree const& tree, std::string const& prefix, Names& f
 inline std::string Files(PlainTree const& tree) {
     Names files;
     ListFiles(tree, "", files);
-    std::ranges::sort(files);
+    std::sort(files.begin(), files.end());
     return Joined(files);
 }
 

@@ -63,7 +63,7 @@ inline std::string Files(cow_ptr<Tree> const& tree) {
         return "-";
     std::vector<std::string> files;
     ListFiles(*tree, "", files);
-    std::ranges::sort(files);
+    std::sort(files.begin(), files.end());
     return Joined(files);
 }
 

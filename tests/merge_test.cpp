@@ -116,7 +116,7 @@ TEST_F(Merging, AsksAboutFilesBeforeDirectoriesInNameOrderWithFullPaths) {
     const std::string files = "a/b/c/d/e/f=# a/z=# k/x=# m=# n=# same/s=7";
     const auto numbered = [&files](char digit) {
         auto text = files;
-        std::ranges::replace(text, '#', digit);
+        std::replace(text.begin(), text.end(), '#', digit);
         return text;
     };
     Host host{.trees = Trees(numbered('0'), numbered('1'), numbered('2'))};

@@ -6,7 +6,7 @@ namespace KivVcs {
 namespace {
 
 std::string SortedNames(std::vector<KivStringT<char16_t>> names) {
-    std::ranges::sort(names);
+    std::sort(names.begin(), names.end());
     std::vector<std::string> words;
     for (auto const& name : names)
         words.push_back(Narrow(name));

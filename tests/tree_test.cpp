@@ -82,9 +82,9 @@ TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
             numbers.push_back(from + index);
         const int order = Below(3);
         if (order == 1)
-            std::ranges::reverse(numbers);
+            std::reverse(numbers.begin(), numbers.end());
         else if (order == 2)
-            std::ranges::shuffle(numbers, random);
+            std::shuffle(numbers.begin(), numbers.end(), random);
         // Some keep a few entries, so that sparse leaves are left behind; some add to what an erasure left.
         const bool add = round == 0 || Below(5) < 2;
         const int kept = Below(2) * (Below(9) + 2);

@@ -25,15 +25,18 @@ bool SidesAgree(MergeTrees const& trees, KivStringT<char16_t> const& name) {
 
 DiffCategories GetDiffCategories(MergeTrees const& trees, PathList const& leftDiffs, PathList const& rightDiffs) {
     DiffCategories categories;
-    std::ranges::set_intersection(leftDiffs, rightDiffs, std::back_inserter(categories.conflicting));
+    std::set_intersection(leftDiffs.begin(), leftDiffs.end(), rightDiffs.begin(), rightDiffs.end(),
+                          std::back_inserter(categories.conflicting));
     std::erase_if(categories.conflicting, [&](KivStringT<char16_t> const& name) {
         if (!SidesAgree(trees, name))
             return false;
         categories.identical.push_back(name);
         return true;
     });
-    std::ranges::set_difference(rightDiffs, leftDiffs, std::back_inserter(categories.rightOnly));
-    std::ranges::set_difference(leftDiffs, rightDiffs, std::back_inserter(categories.leftOnly));
+    std::set_difference(rightDiffs.begin(), rightDiffs.end(), leftDiffs.begin(), leftDiffs.end(),
+                        std::back_inserter(categories.rightOnly));
+    std::set_difference(leftDiffs.begin(), leftDiffs.end(), rightDiffs.begin(), rightDiffs.end(),
+                        std::back_inserter(categories.leftOnly));
     return categories;
 }
 

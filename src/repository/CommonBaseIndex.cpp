@@ -53,7 +53,7 @@ void CommonBaseIndex::LinkPath(Commit const& head) {
         node.commit = commit;
         path.push_back(&node);
     }
-    std::ranges::reverse(path);
+    std::reverse(path.begin(), path.end());
     for (Node* const node : path) {
         Node const* const below = node->below;
         node->depth = below == nullptr ? 1 : below->depth + 1;

@@ -15,7 +15,7 @@ std::vector<cow_ptr<Commit>> LineAbove(cow_ptr<Commit> const& base, cow_ptr<Comm
         return line;
     while (line.back()->GetParent() && !(line.back()->GetParent() == base))
         line.push_back(line.back()->GetParent());
-    std::ranges::reverse(line);
+    std::reverse(line.begin(), line.end());
     return line;
 }
 
