@@ -47,6 +47,7 @@ packages_of() {
     vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
+    abi) echo abigail-tools xz-utils ;;
     lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 ;;
     plot) echo python3-matplotlib ;;
