@@ -6,7 +6,7 @@
 [ $# -eq 0 ] || usage 1
 
 "$source_directory/scripts/format.sh" --check
-install_packages build vault lint
+install_packages build archive vault lint
 cd "$source_directory"
 shellcheck -x -P scripts .ci/run scripts/*.sh
 build_preset clang-tidy

@@ -5,6 +5,6 @@
 . "$(dirname "$0")/lib.sh"
 [ $# -eq 0 ] || usage 1
 
-install_packages build vault
+install_packages build archive vault
 build_preset release
 run_tests

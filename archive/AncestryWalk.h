@@ -1,0 +1,43 @@
+#pragma once
+
+/// @file
+/// The walk along known facts that `IArchive::ReadAncestry` describes.
+
+#include "Changes.h"
+
+#include <unordered_set>
+
+namespace KivArchive {
+
+/// @param lookUp gives the facts of an identifier, as a pointer or an optional value; none if they are not known
+template <class LookUp>
+[[nodiscard]] std::vector<Ancestry> WalkAncestry(std::span<const Id> commits, Follow follow, std::size_t more,
+                                                 LookUp lookUp) {
+    std::vector<Ancestry> found;
+    std::unordered_set<Id> met;
+    auto const meet = [&](Id const& id) {
+        if (id.IsEmpty() || !met.insert(id).second)
+            return false;
+        auto const facts = lookUp(id);
+        if (facts)
+            found.push_back(*facts);
+        return static_cast<bool>(facts);
+    };
+    for (Id const& commit : commits)
+        if (met.count(commit) == 0)
+            meet(commit);
+    // What has been found is its own queue.
+    for (std::size_t next = 0; next < found.size() && more > 0; ++next) {
+        std::vector<Id> links{found[next].parent};
+        if (follow != Follow::Parents)
+            for (ContainedCommit const& contained : found[next].contains)
+                if (follow == Follow::Everything || contained.how == Containment::Merged)
+                    links.push_back(contained.id);
+        for (auto link = links.begin(); link != links.end() && more > 0; ++link)
+            if (meet(*link))
+                --more;
+    }
+    return found;
+}
+
+} // namespace KivArchive

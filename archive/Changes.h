@@ -1,0 +1,36 @@
+#pragma once
+
+/// @file
+/// What all archives do with identifiers and changes before they store anything.
+
+#include "KivArchive/IArchive.h"
+
+#include <string>
+
+namespace KivArchive {
+
+/// The most bytes that a record may have.
+inline constexpr std::uint64_t largestRecord = 16 * largestWholeContent;
+
+/// The digest of an identifier that must tell one. @throws std::invalid_argument
+[[nodiscard]] Id::Digest const& DigestOf(Id const& id);
+
+/// Throws unless @p change can be stored anywhere: all its identifiers tell digests where they have to, and nothing is
+/// too large. @throws std::invalid_argument, ArchiveError
+void CheckChange(Change const& change, std::string const& file);
+
+[[noreturn]] void ThrowCollected(Id const& id, std::string const& file);
+
+/// Throws if @p progress, which may be null, asks to stop.
+void ReportProgress(IProgress* progress, Progress const& state, std::string const& file);
+
+/// The content as one piece of memory, sharing @p data where it is one already.
+[[nodiscard]] Buffer Joined(Buffer const& data);
+
+/// The bytes of a buffer that is one piece.
+[[nodiscard]] std::span<const std::byte> BytesOf(Buffer const& joined) noexcept;
+
+/// Adds to @p known those of @p further that it does not have.
+void AddContained(std::vector<ContainedCommit>& known, std::vector<ContainedCommit> const& further);
+
+} // namespace KivArchive

@@ -1,0 +1,9 @@
+#pragma once
+
+/// @file
+/// The whole archive.
+
+#include "KivArchive/ArchiveError.h"
+#include "KivArchive/IArchive.h"
+#include "KivArchive/MemArchive.h"
+#include "KivArchive/Progress.h"
