@@ -2,9 +2,10 @@
 # Shared by the scripts beside it, which source it:
 #   install_packages SET...   installs with apt-get what is missing of the named sets, or says plainly what is missing
 #   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
-#   run_tests [OPTION...]     runs the tests of the directory built last, and shows only the summary when all pass; ctest takes
-#                             the options
-#   $long_tests               an expression for tests to leave out where they are slowed down many times
+#   run_tests TIER [OPTION...]
+#                             runs the tests of the directory built last that have a label, quick, full or soak, and of the
+#                             lesser ones (tests/CMakeLists.txt explains them), and shows only the summary when all pass; ctest
+#                             takes the options
 #   quietly COMMAND...        runs a command and shows its output only when it fails
 #   die MESSAGE               ends the script
 #   usage [STATUS]            shows the comment at the top of the script and ends it; -h and --help do so by themselves
@@ -15,8 +16,6 @@ set -euo pipefail
 source_directory=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
 build_root=${KIVVCS_BUILD_ROOT:-$source_directory/build}
 jobs=$(nproc)
-# shellcheck disable=SC2034
-long_tests='OnStacksOf|AllocationFaults|LongHistories|NestingTakesNoStack|BehavesLikeAText|Seeds/.*/([2-9]|1[0-9]|20)$'
 
 die() {
     printf '%s: %s\n' "${0##*/}" "$*" >&2
@@ -96,7 +95,13 @@ build_preset() {
 }
 
 run_tests() {
-    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs" "$@")
+    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs" "${@:2}")
+    case $1 in
+    quick) tests+=(--label-exclude 'full|soak') ;;
+    full) tests+=(--label-exclude soak) ;;
+    soak) ;;
+    *) die "there are no tests of the tier '$1'" ;;
+    esac
     local output status=0
     if [ -t 1 ]; then
         "${tests[@]}" --progress

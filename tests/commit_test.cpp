@@ -1,5 +1,6 @@
-#include "PackedForms.h"
-#include "RecordingRepository.h"
+#include "support/Builders.h"
+#include "support/PackedForms.h"
+#include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
 
@@ -219,20 +220,6 @@ TEST_F(Commits, AreLinkedOldestFirst) {
     EXPECT_TRUE(line[3]->GetParent() == line[4] && line[1] == former[1] && line[0]->GetParent() == line[1]);
     EXPECT_FALSE(former[3]->GetParent());
     EXPECT_EQ(repo.GetCommitCount(), 3U);
-}
-
-TEST_F(Commits, ALongUnstoredHistoryIsIdentifiedWithoutStack) {
-    cow_ptr<Commit> unstored;
-    cow_ptr<Commit> another;
-    cow_ptr<Commit> stored;
-    for (int index = 0; index < 100'000; ++index) {
-        unstored = immu::make<Commit>(Commit(std::move(unstored), false));
-        another = immu::make<Commit>(Commit(std::move(another), false));
-        stored = repo.SyncWithStorage(immu::make<Commit>(Commit(std::move(stored), false)));
-        repo.TakeCalls();
-    }
-    EXPECT_EQ(IdText(*unstored), IdText(*stored));
-    EXPECT_EQ(Bytes(another->GetData()), Bytes(stored->GetData()));
 }
 
 TEST_F(Commits, AreTakenOverFromAnotherModule) {

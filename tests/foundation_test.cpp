@@ -1,5 +1,5 @@
-#include "HostStream.h"
 #include "KivVcs/Foundation.h"
+#include "support/HostStream.h"
 
 #include <gtest/gtest.h>
 

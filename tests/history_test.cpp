@@ -1,4 +1,5 @@
-#include "RecordingRepository.h"
+#include "support/Builders.h"
+#include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
 
@@ -323,31 +324,6 @@ TEST_F(Histories, UnrelatedBranchesGetACommonRoot) {
     Storage().CreateBranch(u"bare", nullptr);
     EXPECT_FALSE(repo.EnsureCommonRootFor(u"one", u"absent", u"bare"));
     EXPECT_FALSE(repo.EnsureCommonRootFor(u"one", u"", u"root"));
-}
-
-TEST(LongHistories, AHundredThousandCommitsUnderAThousandBranchesAreRewritten) {
-    constexpr int commitCount = 100'000;
-    Repository repo(std::make_unique<MemObjectsStorage>());
-    cow_ptr<Commit> first;
-    cow_ptr<Commit> tip;
-    cow_ptr<Commit> middle;
-    for (int index = 0; index < commitCount; ++index) {
-        Commit commit(std::move(tip), false);
-        commit.SetCommitTime(Time(static_cast<std::uint64_t>(index) * 10'000'000));
-        tip = repo.SyncWithStorage(immu::make<Commit>(commit));
-        first = index == 0 ? tip : first;
-        middle = index == commitCount / 2 ? tip : middle;
-        if (index % 100 == 99)
-            repo.CreateBranch(Wide("b" + std::to_string(index)), tip);
-    }
-    EXPECT_TRUE(repo.GetCommonBase(tip, middle) == middle);
-    EXPECT_TRUE(repo.GetCommonBase(repo.MergelessRebase(middle, first, tip), tip) == tip);
-    EXPECT_EQ(repo.GetCommitCount(), 150'000U);
-    tip.reset();
-    EXPECT_TRUE(repo.DeleteCommits(std::move(middle)));
-    EXPECT_TRUE(repo.SimplifyCommitGraph(false));
-    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
-    EXPECT_EQ(repo.GetCommitCount(), 1000U);
 }
 
 } // namespace

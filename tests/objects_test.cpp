@@ -1,5 +1,7 @@
 #include "../src/objects/Sha256Compression.h"
-#include "PackedForms.h"
+#include "support/Builders.h"
+#include "support/HostStream.h"
+#include "support/PackedForms.h"
 
 #include <gtest/gtest.h>
 

@@ -1,4 +1,5 @@
-#include "RecordingRepository.h"
+#include "support/Builders.h"
+#include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
 

@@ -1,4 +1,6 @@
-#include "PackedForms.h"
+#include "support/Builders.h"
+#include "support/HostStream.h"
+#include "support/PackedForms.h"
 
 #include <gtest/gtest.h>
 
@@ -97,6 +99,63 @@ void LiveInAWideDirectory() {
     MergeAndReadBack(repository, repository.SyncWithStorage(immu::make<Commit>(std::move(commit))), "wide/");
     EXPECT_TRUE(wide.RemoveObject(&repository, u"7"));
     EXPECT_EQ(wide.GetDeepBlobCount(), entryCount - 1);
+}
+
+TEST(LongHistories, AHundredThousandCommitsUnderAThousandBranchesAreRewritten) {
+    constexpr int lineLength = 100'000;
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    cow_ptr<Commit> first;
+    cow_ptr<Commit> tip;
+    cow_ptr<Commit> middle;
+    for (int index = 0; index < lineLength; ++index) {
+        Commit commit(std::move(tip), false);
+        commit.SetCommitTime(Time(static_cast<std::uint64_t>(index) * 10'000'000));
+        tip = repo.SyncWithStorage(immu::make<Commit>(commit));
+        first = index == 0 ? tip : first;
+        middle = index == lineLength / 2 ? tip : middle;
+        if (index % 100 == 99)
+            repo.CreateBranch(Wide("b" + std::to_string(index)), tip);
+    }
+    EXPECT_TRUE(repo.GetCommonBase(tip, middle) == middle);
+    EXPECT_TRUE(repo.GetCommonBase(repo.MergelessRebase(middle, first, tip), tip) == tip);
+    EXPECT_EQ(repo.GetCommitCount(), 150'000U);
+    tip.reset();
+    EXPECT_TRUE(repo.DeleteCommits(std::move(middle)));
+    EXPECT_TRUE(repo.SimplifyCommitGraph(false));
+    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
+    EXPECT_EQ(repo.GetCommitCount(), 1000U);
+}
+
+TEST(LongHistories, AreIdentifiedWithoutStackWhereNothingIsStored) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    cow_ptr<Commit> unstored;
+    cow_ptr<Commit> another;
+    cow_ptr<Commit> stored;
+    for (int index = 0; index < 100'000; ++index) {
+        unstored = immu::make<Commit>(Commit(std::move(unstored), false));
+        another = immu::make<Commit>(Commit(std::move(another), false));
+        stored = repo.SyncWithStorage(immu::make<Commit>(Commit(std::move(stored), false)));
+    }
+    EXPECT_EQ(unstored->GetId(), stored->GetId());
+    EXPECT_EQ(Bytes(another->GetData()), Bytes(stored->GetData()));
+}
+
+TEST(DeepNesting, TakesNoStackAndIsReadDownToItsBound) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    const std::string one = Identifier("blob", "1");
+    const auto numbered = [](int level) {
+        const std::string digits = std::to_string(level);
+        return std::string(64 - digits.size(), '0') + digits;
+    };
+    const auto endless = [&](Id const& id) {
+        const std::string text = Narrow(id.GetText());
+        if (text == one)
+            return ReaderOf(std::string("blob 1\0001", 8));
+        return ReaderOf(std::string("tree 1\0", 7) + Entry("blob", "x", one) +
+                        Entry("tree", "d", numbered(std::stoi(text) + 1)));
+    };
+    const auto read = Tree::Deserialize(Id(Wide(numbered(0))), &repo, endless);
+    EXPECT_EQ(read->GetDeepBlobCount(), deepestLoadedNesting);
 }
 
 /// Runs the test's body on a thread with a stack of the given size; 0 for the default one.

@@ -1,4 +1,5 @@
-#include "PackedForms.h"
+#include "support/Builders.h"
+#include "support/PackedForms.h"
 
 #include <gtest/gtest.h>
 

@@ -1,5 +1,6 @@
-#include "PackedForms.h"
-#include "RecordingRepository.h"
+#include "support/Builders.h"
+#include "support/PackedForms.h"
+#include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
 
@@ -240,22 +241,6 @@ TEST_F(ReadingTrees, EndsWhereTreesNameThemselvesOrEachOther) {
     packed.loads = 0;
     EXPECT_EQ(Narrow(packed.Read(id, &none)->GetId().GetText()), id);
     EXPECT_EQ(packed.loads, 62);
-}
-
-TEST_F(ReadingTrees, NestingTakesNoStackAndIsReadDownToItsBound) {
-    const auto numbered = [](int level) {
-        const std::string digits = std::to_string(level);
-        return std::string(64 - digits.size(), '0') + digits;
-    };
-    const auto endless = [&](Id const& id) {
-        const std::string text = Narrow(id.GetText());
-        if (text == one)
-            return ReaderOf(packed.forms[one]);
-        return ReaderOf(std::string("tree 1\0", 7) + Entry("blob", "x", one) +
-                        Entry("tree", "d", numbered(std::stoi(text) + 1)));
-    };
-    const auto read = Tree::Deserialize(Id(Wide(numbered(0))), &repo, endless);
-    EXPECT_EQ(read->GetDeepBlobCount(), deepestLoadedNesting);
 }
 
 } // namespace

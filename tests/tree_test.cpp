@@ -1,4 +1,5 @@
-#include "PlainTree.h"
+#include "support/Builders.h"
+#include "support/PlainTree.h"
 
 #include <gtest/gtest.h>
 

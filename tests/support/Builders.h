@@ -1,21 +1,14 @@
 #pragma once
 
-#include "KivVcs/KivVcs.h"
+#include "support/Text.h"
 
 #include <algorithm>
 #include <map>
 #include <sstream>
-#include <string>
+
+/// Objects made from short descriptions, and described again.
 
 namespace KivVcs {
-
-inline std::string Narrow(KivStringViewT<char16_t> text) {
-    return std::string(text.begin(), text.end());
-}
-
-inline KivStringT<char16_t> Wide(std::string const& text) {
-    return KivStringT<char>(text.data(), static_cast<int>(text.size()));
-}
 
 inline Blob MakeBlob(std::string const& content) {
     Buffer data(0);
@@ -50,13 +43,6 @@ inline void ListFiles(Tree const& tree, std::string const& prefix, std::vector<s
     }
 }
 
-inline std::string Joined(std::vector<std::string> const& words) {
-    std::string text;
-    for (auto const& word : words)
-        text += (text.empty() ? "" : " ") + word;
-    return text;
-}
-
 /// The inverse of `MakeTree`, sorted; an empty directory shows as "name/".
 inline std::string Files(cow_ptr<Tree> const& tree) {
     if (!tree)
@@ -71,86 +57,6 @@ inline std::string Files(cow_ptr<Tree> const& tree) {
 inline std::string NameOf(cow_ptr<Commit> const& commit) {
     return commit ? Narrow(commit->GetDescription()) : "-";
 }
-
-/// A host that hands out the packed forms of what a repository stores.
-class PackedFormsOf {
-public:
-    explicit PackedFormsOf(Repository const& repo) : repo_(repo) {}
-
-    PortableVersion::Delegate<StreamIO(Id const&)> Loader() {
-        return [this](Id const& id) {
-            for (cow_ptr<Object> const& stored :
-                 {cow_ptr<Object>(repo_.GetTreeFromStorage(id)), cow_ptr<Object>(repo_.GetBlobFromStorage(id)),
-                  cow_ptr<Object>(repo_.GetCommitFromStorage(id))}) {
-                if (stored)
-                    return StreamIO(MemStream::CreateOnRef(lent_[id] = stored->GetPackedData()));
-            }
-            return StreamIO();
-        };
-    }
-
-private:
-    Repository const& repo_;
-    std::unordered_map<Id, Buffer> lent_;
-};
-
-/// Tells in order which overridable operations are called, and fails on request.
-class RecordingRepository : public Repository {
-public:
-    using Repository::Repository;
-
-    /// The calls since the last time.
-    std::string TakeCalls() { return Joined(std::exchange(calls_, {})); }
-    /// The operation of that name throws from now on; none for the empty text.
-    void Break(std::string operation) { broken_ = std::move(operation); }
-
-    using Repository::SyncWithStorage;
-    cow_ptr<Commit> DoCommit(Commit& commit) override { return Recorded("DoCommit").Repository::DoCommit(commit); }
-    cow_ptr<Commit> GetHead() const override { return Recorded("GetHead()").Repository::GetHead(); }
-    cow_ptr<Commit> GetHead(KivStringViewT<char16_t> branch) const override {
-        return Recorded("GetHead(" + Narrow(branch) + ")").Repository::GetHead(branch);
-    }
-    KivStringT<char16_t> GetCurentBranch() const override {
-        return Recorded("GetCurentBranch").Repository::GetCurentBranch();
-    }
-    cow_ptr<Commit> SyncWithStorage(cow_ptr<Commit> commit) override {
-        return Recorded("Sync(" + NameOf(commit) + ")").Repository::SyncWithStorage(commit);
-    }
-    void UpdateStorage() override { Recorded("UpdateStorage").Repository::UpdateStorage(); }
-    cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const override {
-        return Recorded("GetCommonBase(" + NameOf(first) + "," + NameOf(second) + ")")
-            .Repository::GetCommonBase(first, second);
-    }
-    bool CreateBranch(KivStringViewT<char16_t> branch, cow_ptr<Commit> head) override {
-        return Recorded("CreateBranch(" + Narrow(branch) + "," + NameOf(head) + ")")
-            .Repository::CreateBranch(branch, head);
-    }
-    bool MoveBranchTo(KivStringViewT<char16_t> branch, cow_ptr<Commit> commit) override {
-        return Recorded("MoveBranchTo(" + Narrow(branch) + "," + NameOf(commit) + ")")
-            .Repository::MoveBranchTo(branch, commit);
-    }
-    bool FastForwardMerge(cow_ptr<Commit> commit) override {
-        return Recorded("FastForwardMerge").Repository::FastForwardMerge(commit);
-    }
-    bool Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) override {
-        return Recorded("Merge3Way").Repository::Merge3Way(commit, resolvers);
-    }
-
-private:
-    RecordingRepository const& Recorded(std::string call) const {
-        if (!broken_.empty() && call.starts_with(broken_))
-            throw std::runtime_error(call);
-        calls_.push_back(std::move(call));
-        return *this;
-    }
-    RecordingRepository& Recorded(std::string call) {
-        (void)std::as_const(*this).Recorded(std::move(call));
-        return *this;
-    }
-
-    mutable std::vector<std::string> calls_;
-    std::string broken_;
-};
 
 /// Grows commits with the given names as descriptions, each with a file of its name on top of its parent's files.
 class History {

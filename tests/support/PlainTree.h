@@ -1,7 +1,8 @@
 #pragma once
 
-#include "PackedForms.h"
+#include "support/PackedForms.h"
 
+#include <algorithm>
 #include <functional>
 #include <set>
 #include <span>

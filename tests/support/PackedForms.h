@@ -1,13 +1,13 @@
 #pragma once
 
-#include "HostStream.h"
-#include "RecordingRepository.h"
+#include "support/HostStream.h"
+#include "support/Text.h"
+
+#include <map>
 
 /// Packed forms put together byte by byte, to compare with those of the library, and a host that hands them out.
 
 namespace KivVcs {
-
-using Names = std::vector<std::string>;
 
 inline std::string Identifier(std::string const& type, std::string const& data) {
     static std::map<std::string, std::string> known;
@@ -22,18 +22,6 @@ inline std::string Identifier(std::string const& type, std::string const& data) 
 
 inline std::string Entry(std::string const& type, std::string const& name, std::string const& id) {
     return (type == "tree" ? "40000 " : "100644 ") + type + " " + name + '\0' + id;
-}
-
-inline Names ToNames(PathList const& paths) {
-    Names names;
-    for (auto const& path : paths)
-        names.push_back(Narrow(path));
-    return names;
-}
-
-inline std::string Bytes(Buffer const& buffer) {
-    const KivStringT<char> text = Helpers::StringAFromBuffer(buffer);
-    return {text.GetString(), static_cast<std::size_t>(text.GetLength())};
 }
 
 /// Packed forms by identifier, and how often they were asked for.
@@ -56,6 +44,28 @@ struct Packed {
     cow_ptr<Tree> Read(std::string const& id, IRepository* repo) {
         return Tree::Deserialize(Id(Wide(id)), repo, Loader());
     }
+};
+
+/// A host that hands out the packed forms of what a repository stores.
+class PackedFormsOf {
+public:
+    explicit PackedFormsOf(Repository const& repo) : repo_(repo) {}
+
+    PortableVersion::Delegate<StreamIO(Id const&)> Loader() {
+        return [this](Id const& id) {
+            for (cow_ptr<Object> const& stored :
+                 {cow_ptr<Object>(repo_.GetTreeFromStorage(id)), cow_ptr<Object>(repo_.GetBlobFromStorage(id)),
+                  cow_ptr<Object>(repo_.GetCommitFromStorage(id))}) {
+                if (stored)
+                    return StreamIO(MemStream::CreateOnRef(lent_[id] = stored->GetPackedData()));
+            }
+            return StreamIO();
+        };
+    }
+
+private:
+    Repository const& repo_;
+    std::unordered_map<Id, Buffer> lent_;
 };
 
 } // namespace KivVcs

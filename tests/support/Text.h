@@ -1,0 +1,41 @@
+#pragma once
+
+#include "KivVcs/KivVcs.h"
+
+#include <string>
+#include <vector>
+
+/// Texts and bytes of the library as the standard library's.
+
+namespace KivVcs {
+
+using Names = std::vector<std::string>;
+
+inline std::string Narrow(KivStringViewT<char16_t> text) {
+    return std::string(text.begin(), text.end());
+}
+
+inline KivStringT<char16_t> Wide(std::string const& text) {
+    return KivStringT<char>(text.data(), static_cast<int>(text.size()));
+}
+
+inline Names ToNames(PathList const& paths) {
+    Names names;
+    for (auto const& path : paths)
+        names.push_back(Narrow(path));
+    return names;
+}
+
+inline std::string Bytes(Buffer const& buffer) {
+    const KivStringT<char> text = Helpers::StringAFromBuffer(buffer);
+    return {text.GetString(), static_cast<std::size_t>(text.GetLength())};
+}
+
+inline std::string Joined(std::vector<std::string> const& words) {
+    std::string text;
+    for (auto const& word : words)
+        text += (text.empty() ? "" : " ") + word;
+    return text;
+}
+
+} // namespace KivVcs
