@@ -1,6 +1,6 @@
-# Builds and runs a consumer of the library: with the sources as a subdirectory, and by find_package and pkg-config from the
-# installed library. The subdirectory's library is static, and is installed for the other two as well. Every installed tree is
-# moved first, so that an absolute path in it does not go unnoticed.
+# Builds and runs a consumer of the library: with the sources as a subdirectory, which come out of the source archive, and by
+# find_package and pkg-config from the installed library and from the Debian packages. The subdirectory's library is static, and
+# is installed for the others as well. Every installed tree is moved first, so that an absolute path in it does not go unnoticed.
 
 set(consumer ${CMAKE_CURRENT_LIST_DIR}/consumer)
 file(REMOVE_RECURSE ${SCRATCH})
@@ -19,13 +19,7 @@ function(build_and_run directory)
     run(${directory}/consumer)
 endfunction()
 
-function(check_installed build name)
-    run(${CMAKE_COMMAND} --install ${build} --prefix ${SCRATCH}/unmoved)
-    set(prefix ${SCRATCH}/${name})
-    file(RENAME ${SCRATCH}/unmoved ${prefix})
-
-    build_and_run(${SCRATCH}/${name}-package -D CMAKE_PREFIX_PATH=${prefix})
-
+function(build_by_pkgconfig prefix name)
     file(GLOB_RECURSE modules ${prefix}/*/KivVcs.pc)
     cmake_path(GET modules PARENT_PATH module_directory)
     set(ENV{PKG_CONFIG_PATH} ${module_directory})
@@ -36,6 +30,70 @@ function(check_installed build name)
     run(${CMAKE_COMMAND} -E env LD_LIBRARY_PATH=${library_directory} ${SCRATCH}/${name}-pkg-config)
 endfunction()
 
-build_and_run(${SCRATCH}/subdirectory -D KIVVCS_SOURCE=${SOURCE} -D BUILD_SHARED_LIBS=OFF)
+function(check_installed build name)
+    run(${CMAKE_COMMAND} --install ${build} --prefix ${SCRATCH}/unmoved)
+    set(prefix ${SCRATCH}/${name})
+    file(RENAME ${SCRATCH}/unmoved ${prefix})
+    build_and_run(${SCRATCH}/${name}-package -D CMAKE_PREFIX_PATH=${prefix} ${ARGN})
+    build_by_pkgconfig(${prefix} ${name})
+endfunction()
+
+function(unpack_sources)
+    run(${CPACK} --config ${BUILD}/CPackSourceConfig.cmake -B ${SCRATCH}/source-archive)
+    file(GLOB archive ${SCRATCH}/source-archive/kivvcs-*.tar.gz)
+    file(ARCHIVE_EXTRACT INPUT ${archive} DESTINATION ${SCRATCH}/sources)
+endfunction()
+
+# The packages as they are unpacked on a machine, in a root of their own.
+function(check_debian_packages)
+    run(${CPACK} --config ${BUILD}/CPackConfig.cmake -G DEB -B ${SCRATCH}/debian)
+    file(GLOB packages ${SCRATCH}/debian/*.deb)
+    set(dependencies "")
+    foreach(package IN LISTS packages)
+        run(dpkg-deb --extract ${package} ${SCRATCH}/root)
+        execute_process(COMMAND dpkg-deb --field ${package} Package Depends OUTPUT_VARIABLE fields COMMAND_ERROR_IS_FATAL ANY)
+        string(APPEND dependencies "${fields}")
+    endforeach()
+    foreach(expected IN ITEMS "Package: libkivvcs[0-9.]+\nDepends: .*libstdc"
+                              "Package: libkivvcs-dev\nDepends: libkivvcs[0-9.]+ \\(= [0-9.]+\\)")
+        if(NOT dependencies MATCHES "${expected}")
+            message(FATAL_ERROR "No package is like '${expected}':\n${dependencies}")
+        endif()
+    endforeach()
+    build_and_run(${SCRATCH}/debian-package -D CMAKE_PREFIX_PATH=${SCRATCH}/root/usr)
+    if(EXISTS ${SCRATCH}/root/usr/bin/vault)
+        file(GLOB_RECURSE library ${SCRATCH}/root/usr/lib/*libKivVcs.so)
+        cmake_path(GET library PARENT_PATH library_directory)
+        run(${CMAKE_COMMAND} -E env LD_LIBRARY_PATH=${library_directory} ${SCRATCH}/root/usr/bin/vault --help)
+    endif()
+endfunction()
+
+# What a user reads who asks for a component that is not there.
+function(check_missing_component component expected)
+    file(GLOB_RECURSE targets ${SCRATCH}/static/*/KivVcs${component}Targets.cmake)
+    if(targets)
+        return()
+    endif()
+    execute_process(COMMAND ${CMAKE_COMMAND} -S ${consumer} -B ${SCRATCH}/missing -D CMAKE_CXX_COMPILER=${CXX}
+                            -D CMAKE_PREFIX_PATH=${SCRATCH}/static -D COMPONENTS=${component}
+                    RESULT_VARIABLE status OUTPUT_QUIET ERROR_VARIABLE output)
+    string(REGEX REPLACE "[ \n]+" " " output "${output}")
+    if(status EQUAL 0 OR NOT output MATCHES "${expected}")
+        message(FATAL_ERROR "Asked for the component ${component}, CMake says:\n${output}")
+    endif()
+endfunction()
+
+unpack_sources()
+file(GLOB sources ${SCRATCH}/sources/kivvcs-*)
+build_and_run(${SCRATCH}/subdirectory -D KIVVCS_SOURCE=${sources} -D BUILD_SHARED_LIBS=OFF)
 check_installed(${SCRATCH}/subdirectory static)
-check_installed(${BUILD} installed)
+check_missing_component(Nonsense "KivVcs has no component 'Nonsense'; there are: Archive")
+check_missing_component(Archive "It was installed without its component Archive")
+check_installed(${BUILD} installed -D CMAKE_CXX_STANDARD=23)
+if(CMAKE_HOST_SYSTEM_NAME STREQUAL Linux AND SHARED)
+    find_program(dpkg_deb dpkg-deb)
+    find_program(shlibdeps dpkg-shlibdeps)
+    if(dpkg_deb AND shlibdeps)
+        check_debian_packages()
+    endif()
+endif()

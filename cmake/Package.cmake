@@ -1,0 +1,49 @@
+# What CPack makes of a build: the source archive, and a Debian package for each part of the installation that was built.
+#     cpack -G DEB                               in the build directory
+#     cpack --config CPackSourceConfig.cmake
+
+set(CPACK_PACKAGE_NAME kivvcs)
+set(CPACK_PACKAGE_VENDOR KivVcs)
+set(CPACK_PACKAGE_CONTACT "The maintainers of KivVcs")
+set(CPACK_STRIP_FILES ON)
+
+set(CPACK_SOURCE_GENERATOR TGZ)
+set(CPACK_SOURCE_PACKAGE_FILE_NAME kivvcs-${PROJECT_VERSION})
+set(CPACK_SOURCE_IGNORE_FILES "${PROJECT_SOURCE_DIR}/build;${PROJECT_SOURCE_DIR}/\\\\.git$;${PROJECT_SOURCE_DIR}/\\\\.git/"
+    "/node_modules/;/__pycache__/;/\\\\.cache/;\\\\.db$;\\\\.vault$")
+
+set(CPACK_GENERATOR DEB)
+set(CPACK_DEB_COMPONENT_INSTALL ON)
+set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
+set(CPACK_DEBIAN_ENABLE_COMPONENT_DEPENDS ON)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${CMAKE_BINARY_DIR})
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
+set(CPACK_DEBIAN_PACKAGE_SECTION libs)
+
+set(kivvcs_soname_version ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR})
+set(CPACK_DEBIAN_RUNTIME_PACKAGE_NAME libkivvcs${kivvcs_soname_version})
+set(CPACK_DEBIAN_RUNTIME_DESCRIPTION "${PROJECT_DESCRIPTION}")
+
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_NAME libkivvcs-dev)
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_SECTION libdevel)
+set(CPACK_COMPONENT_DEVELOPMENT_DEPENDS runtime)
+set(CPACK_DEBIAN_DEVELOPMENT_DESCRIPTION "Headers of KivVcs, version control for host applications")
+
+set(CPACK_DEBIAN_VAULT_PACKAGE_NAME kivvcs-vault)
+set(CPACK_DEBIAN_VAULT_PACKAGE_SECTION vcs)
+set(CPACK_COMPONENT_VAULT_DEPENDS runtime)
+set(CPACK_DEBIAN_VAULT_DESCRIPTION "Versions of directories in one file, the example host of KivVcs")
+
+set(CPACK_DEBIAN_ARCHIVE-RUNTIME_PACKAGE_NAME libkivvcs-archive${kivvcs_soname_version})
+set(CPACK_DEBIAN_ARCHIVE-RUNTIME_DESCRIPTION "Archives that make versions of KivVcs last")
+
+set(CPACK_DEBIAN_ARCHIVE-DEVELOPMENT_PACKAGE_NAME libkivvcs-archive-dev)
+set(CPACK_DEBIAN_ARCHIVE-DEVELOPMENT_PACKAGE_SECTION libdevel)
+set(CPACK_COMPONENT_ARCHIVE-DEVELOPMENT_DEPENDS archive-runtime development)
+set(CPACK_DEBIAN_ARCHIVE-DEVELOPMENT_DESCRIPTION "Headers of KivArchive, which makes versions of KivVcs last")
+
+# Only what this build installs; nothing that other projects in the build may install.
+get_cmake_property(CPACK_COMPONENTS_ALL COMPONENTS)
+list(FILTER CPACK_COMPONENTS_ALL INCLUDE REGEX "^(archive-)?(runtime|development)$|^vault$")
+include(CPack)
