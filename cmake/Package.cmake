@@ -33,9 +33,16 @@ set(CPACK_DEBIAN_DEVELOPMENT_DESCRIPTION "Headers of KivVcs, version control for
 set(CPACK_DEBIAN_VAULT_PACKAGE_NAME kivvcs-vault)
 set(CPACK_DEBIAN_VAULT_PACKAGE_SECTION vcs)
 set(CPACK_COMPONENT_VAULT_DEPENDS runtime)
+if(TARGET vault)
+    get_target_property(kivvcs_vault_libraries vault LINK_LIBRARIES)
+    if(kivvcs_vault_libraries MATCHES Archive)
+        list(APPEND CPACK_COMPONENT_VAULT_DEPENDS archive-runtime)
+    endif()
+endif()
 set(CPACK_DEBIAN_VAULT_DESCRIPTION "Versions of directories in one file, the example host of KivVcs")
 
 set(CPACK_DEBIAN_ARCHIVE-RUNTIME_PACKAGE_NAME libkivvcs-archive${kivvcs_soname_version})
+set(CPACK_COMPONENT_ARCHIVE-RUNTIME_DEPENDS runtime)
 set(CPACK_DEBIAN_ARCHIVE-RUNTIME_DESCRIPTION "Archives that make versions of KivVcs last")
 
 set(CPACK_DEBIAN_ARCHIVE-DEVELOPMENT_PACKAGE_NAME libkivvcs-archive-dev)

@@ -1,0 +1,3 @@
+include(CMakeFindDependencyMacro)
+find_dependency(SQLite3)
+find_dependency(Threads)
