@@ -48,7 +48,7 @@ packages_of() {
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
     abi) echo abigail-tools xz-utils ;;
-    lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck ;;
+    lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck python3 ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 ;;
     plot) echo python3-matplotlib ;;
     valgrind) echo valgrind ;;
