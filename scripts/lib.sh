@@ -42,7 +42,7 @@ quietly() {
 
 packages_of() {
     case $1 in
-    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata ;;
+    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata gdb dpkg-dev ;;
     archive) echo libsqlite3-dev libzstd-dev ;;
     vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
