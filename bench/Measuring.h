@@ -51,6 +51,7 @@ using Divisors = std::vector<std::int64_t>;
 void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
 void AddReadingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
 void AddHistoryWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
+void AddScalingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors);
 
 /// The processor time that @p work takes, in seconds. Unlike the time on the wall it does not grow with what else the
 /// machine does.

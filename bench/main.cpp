@@ -79,6 +79,7 @@ std::vector<Workload> MakeWorkloads(Divisors const& divisors) {
     AddBuildingWorkloads(workloads, divisors);
     AddReadingWorkloads(workloads, divisors);
     AddHistoryWorkloads(workloads, divisors);
+    AddScalingWorkloads(workloads, divisors);
     return workloads;
 }
 

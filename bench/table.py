@@ -28,9 +28,10 @@ smaller = {}
 for run in runs:
     name, size = run["run_name"].split("/")[:2]
     values = {"ratio": run["ratio"], "bytes": run["bytes"], "growth": 0}
-    if name in smaller and abs(int(size) / smaller[name][0] - 4) < 0.1:
-        values["growth"] = run["ours"] / smaller[name][1]
-    smaller[name] = int(size), run["ours"]
+    for smaller_size, seconds in smaller.setdefault(name, []):
+        if abs(int(size) / smaller_size - 4) < 0.1:
+            values["growth"] = run["ours"] / seconds
+    smaller[name].append((int(size), run["ours"]))
     bad = any(run[f"{kind}Limit"] and value > run[f"{kind}Limit"] for kind, value in values.items())
     missed += bad
     rows.append((

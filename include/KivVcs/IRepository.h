@@ -49,11 +49,13 @@ public:
     /// stored anew, linked to each other in their old order, their branches moved, and unused objects purged. A root
     /// commit, and null, are left alone. Descendants of @p commit keep their old parents in memory.
     /// @return false without storage.
-    /// @throws what allocation and the host's operations throw; unless that is the purge, no branch has moved then.
+    /// @throws what allocation and the host's operations throw; what has been deleted, stored or moved by then stays so.
     virtual bool DeleteCommits(cow_ptr<Commit> commit) = 0;
     /// Rewrites the history of all branches so that it keeps only their heads and the common bases of every two heads,
     /// each linked to the nearest kept ancestor; purges unused objects at the end if @p purge. Content stays.
     /// @return false without storage.
+    /// @complexity proportional to the histories and their heads; in a repository of a host's class every two heads are
+    /// asked about by `GetCommonBase`
     /// @throws as `DeleteCommits`
     virtual bool SimplifyCommitGraph(bool purge) = 0;
     /// Purges the objects that nothing references.
@@ -79,7 +81,7 @@ public:
     /// commits is put at the root itself.
     /// @return false if the root branch cannot be made or a branch cannot be moved; what was stored before stays
     /// stored, and a branch that was moved before stays there.
-    /// @throws as `DeleteCommits`, and no branch has been made; one without commits may stay at the root
+    /// @throws as `DeleteCommits`
     virtual bool EnsureCommonRootFor(KivStringViewT<char16_t> first, KivStringViewT<char16_t> second,
                                      KivStringViewT<char16_t> rootBranch) = 0;
     /// Moves the current branch forward to @p commit; false if the current head is not on its history (as the same

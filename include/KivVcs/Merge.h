@@ -81,7 +81,8 @@ struct Resolvers {
 /// Merges the changes that @p trees make on both sides of their root, entry by entry.
 ///
 /// Resolvers are asked only where both sides changed one entry, or directory, to different states: in ascending name
-/// order, the blobs of a directory before its subdirectories. Contents are never merged. Unchanged subtrees are shared
+/// order, the blobs of a directory before its subdirectories. All directories of a merge ask the very same resolvers,
+/// which are not copied for each. Contents are never merged, nor asked for. Unchanged subtrees are shared
 /// with the inputs, which stay as they are. New trees are stored in @p repo as they are made.
 /// @return the merged tree; null if @p repo is null, a resolver that was needed is empty or undecided, or no side has a
 /// tree.

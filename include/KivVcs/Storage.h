@@ -6,6 +6,7 @@
 #include "KivVcs/Commit.h"
 
 #include <initializer_list>
+#include <set>
 #include <unordered_map>
 
 namespace KivVcs {
@@ -56,7 +57,8 @@ public:
     virtual bool UpdateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) = 0;
     /// The branch's head; null if it has none or does not exist.
     [[nodiscard]] virtual cow_ptr<Commit> GetHead(KivStringViewT<char16_t> name) const = 0;
-    /// The names, in no particular order, of the branches whose head is this very object.
+    /// The names, in no particular order, of the branches whose head is this very object; of those without a head for
+    /// null.
     [[nodiscard]] virtual std::vector<KivStringT<char16_t>> GetCommitBranches(cow_ptr<Commit> commit) const = 0;
 
 protected:
@@ -73,7 +75,7 @@ public:
     MemObjectsStorage();
     /// No objects and the given branches without heads; an empty name is taken too.
     MemObjectsStorage(std::initializer_list<KivStringViewT<char16_t>> branches);
-    MemObjectsStorage(MemObjectsStorage const& other) = default;
+    MemObjectsStorage(MemObjectsStorage const& other);
     MemObjectsStorage& operator=(MemObjectsStorage const&) = delete;
     ~MemObjectsStorage() override;
 
@@ -92,22 +94,30 @@ public:
     [[nodiscard]] BlobTable const& GetBlobs() const override;
     [[nodiscard]] ReferenceTable const& GetRefs() const override;
     void DeleteCommit(cow_ptr<Commit> commit) override;
-    /// One pass over the tables, commits, trees, blobs, plus the objects removed. Use counts are the whole rule: an
-    /// object stays as long as a branch, another object, another storage or the host holds it. Does not fail for want of
-    /// memory, but is slower then.
+    /// One pass over the tables, commits, trees, blobs, plus what the objects removed have held. Use counts are the whole
+    /// rule: an object stays as long as a branch, another object, another storage or the host holds it. Does not fail
+    /// for want of memory, but is slower then.
     void PurgeUnusedObjects() override;
     [[nodiscard]] bool BranchExist(KivStringViewT<char16_t> name) const override;
     bool CreateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) override;
     bool RemoveBranch(KivStringViewT<char16_t> name) override;
     bool UpdateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) override;
     [[nodiscard]] cow_ptr<Commit> GetHead(KivStringViewT<char16_t> name) const override;
+    /// In time proportional to the names, and logarithmic in the number of branches.
     [[nodiscard]] std::vector<KivStringT<char16_t>> GetCommitBranches(cow_ptr<Commit> commit) const override;
 
 private:
+    /// Every branch's head, which may be null, with the branch's name as the table of references holds it.
+    using NamesByHead = std::set<std::pair<Commit const*, KivStringT<char16_t> const*>>;
+
+    bool AddBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> head);
+    void FileName(NamesByHead::node_type entry, ReferenceTable::value_type const& branch) noexcept;
+
     CommitTable commits_;
     TreeTable trees_;
     BlobTable blobs_;
     ReferenceTable references_;
+    NamesByHead namesByHead_;
 };
 
 } // namespace KivVcs

@@ -1,8 +1,6 @@
 #include "KivVcs/IRepository.h"
 #include "KivVcs/Merge.h"
 
-#include <algorithm>
-#include <iterator>
 #include <utility>
 
 namespace KivVcs {
@@ -23,20 +21,25 @@ bool SidesAgree(MergeTrees const& trees, KivStringT<char16_t> const& name) {
     return left && right ? left->HasSameId(*right) : left == right;
 }
 
-DiffCategories GetDiffCategories(MergeTrees const& trees, PathList const& leftDiffs, PathList const& rightDiffs) {
+/// @param leftDiffs, rightDiffs names, sorted, each once
+DiffCategories GetDiffCategories(MergeTrees const& trees, PathList leftDiffs, PathList rightDiffs) {
     DiffCategories categories;
-    std::set_intersection(leftDiffs.begin(), leftDiffs.end(), rightDiffs.begin(), rightDiffs.end(),
-                          std::back_inserter(categories.conflicting));
-    std::erase_if(categories.conflicting, [&](KivStringT<char16_t> const& name) {
-        if (!SidesAgree(trees, name))
-            return false;
-        categories.identical.push_back(name);
-        return true;
-    });
-    std::set_difference(rightDiffs.begin(), rightDiffs.end(), leftDiffs.begin(), leftDiffs.end(),
-                        std::back_inserter(categories.rightOnly));
-    std::set_difference(leftDiffs.begin(), leftDiffs.end(), rightDiffs.begin(), rightDiffs.end(),
-                        std::back_inserter(categories.leftOnly));
+    auto left = leftDiffs.begin();
+    auto right = rightDiffs.begin();
+    while (left != leftDiffs.end() || right != rightDiffs.end()) {
+        const int order = left == leftDiffs.end()     ? 1
+                          : right == rightDiffs.end() ? -1
+                                                      : left->Compare(*right, CompareCase{});
+        if (order < 0) {
+            categories.leftOnly.push_back(std::move(*left++));
+        } else if (order > 0) {
+            categories.rightOnly.push_back(std::move(*right++));
+        } else {
+            (SidesAgree(trees, *left) ? categories.identical : categories.conflicting).push_back(std::move(*left));
+            ++left;
+            ++right;
+        }
+    }
     return categories;
 }
 

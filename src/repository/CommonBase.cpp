@@ -32,7 +32,7 @@ bool Repository::FastForwardMerge(cow_ptr<Commit> commit) {
     const auto head = GetHead();
     const auto base = GetCommonBase(head, commit);
     // Identity of objects: a branch without a head, where both are null, goes forward to anything.
-    return base == head && MoveBranchTo(currentBranch_, std::move(commit));
+    return base == head && MoveBranchTo(Repository::GetCurentBranch(), std::move(commit));
 }
 
 } // namespace KivVcs

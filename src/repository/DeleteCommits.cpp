@@ -1,14 +1,12 @@
 #include "KivVcs/Repository.h"
 
-#include "repository/BranchMoves.h"
-
 namespace KivVcs {
 
 namespace {
 
 /// The branch heads of a deleted chain, newest first.
 struct KeptHeads {
-    std::vector<cow_ptr<Commit>> formerly;
+    std::vector<cow_ptr<Commit>> former;
     /// Private copies without parents.
     std::vector<cow_ptr<Commit>> commits;
     /// The names of the branches that point at each of them.
@@ -21,7 +19,7 @@ KeptHeads DeleteChain(IObjectsStorage& storage, cow_ptr<Commit> newest) {
     KeptHeads kept;
     for (auto commit = std::move(newest); commit; commit = commit->GetParent()) {
         if (auto branches = storage.GetCommitBranches(commit); !branches.empty()) {
-            kept.formerly.push_back(commit);
+            kept.former.push_back(commit);
             kept.commits.push_back(commit);
             kept.commits.back().write()->SetParent(nullptr);
             kept.branches.push_back(std::move(branches));
@@ -31,21 +29,6 @@ KeptHeads DeleteChain(IObjectsStorage& storage, cow_ptr<Commit> newest) {
     return kept;
 }
 
-void MoveBranches(IRepository& repository, IObjectsStorage& storage, KeptHeads const& kept) {
-    std::size_t branchCount = 0;
-    for (auto const& branches : kept.branches)
-        branchCount += branches.size();
-    BranchMoves moves(&storage, branchCount);
-    for (std::size_t index = 0; index < kept.commits.size(); ++index) {
-        for (auto const& branch : kept.branches[index]) {
-            moves.NoteMove(branch, kept.formerly[index]);
-            if (!repository.MoveBranchTo(branch, kept.commits[index]))
-                break;
-        }
-    }
-    moves.Keep();
-}
-
 } // namespace
 
 bool Repository::DeleteCommits(cow_ptr<Commit> commit) {
@@ -53,14 +36,21 @@ bool Repository::DeleteCommits(cow_ptr<Commit> commit) {
         return false;
     if (!commit || !commit->GetParent())
         return true;
-    {
-        // Gone before the purge: whatever is held here would survive it.
-        auto kept = DeleteChain(*storage_, std::move(commit));
-        if (kept.commits.empty())
-            return true;
-        Commit::MakeCommitLinksInOrder(kept.commits, this);
-        MoveBranches(*this, *storage_, kept);
+    KeptHeads kept = DeleteChain(*storage_, std::move(commit));
+    if (kept.commits.empty())
+        return true;
+    if (!Commit::MakeCommitLinksInOrder(kept.commits, this))
+        return false;
+    for (std::size_t index = 0; index < kept.commits.size(); ++index) {
+        AnnounceRewrite(kept.former[index], kept.commits[index]);
+        for (auto const& branch : kept.branches[index]) {
+            if (!MoveBranchTo(branch, kept.commits[index]))
+                break;
+        }
     }
+    // What is held here survives the purge, which is right for the commits that were stored anew, even where a branch did
+    // not move, and would be wrong for the old ones.
+    kept.former.clear();
     UpdateStorage();
     return true;
 }

@@ -1,7 +1,5 @@
 #include "KivVcs/Repository.h"
 
-#include "repository/BranchMoves.h"
-
 #include <algorithm>
 
 namespace KivVcs {
@@ -29,8 +27,10 @@ cow_ptr<Commit> Repository::MergelessRebase(cow_ptr<Commit> commit, cow_ptr<Comm
     for (auto& moved : line) {
         if (moved->GetParent() == parent)
             return commit;
+        const cow_ptr<Commit> old = moved;
         moved.write()->SetParent(std::move(parent));
         parent = SyncWithStorage(std::move(moved));
+        AnnounceRewrite(old, parent);
     }
     return parent;
 }
@@ -44,20 +44,13 @@ cow_ptr<Commit> Repository::MergelessRebase(KivStringViewT<char16_t> branch, Kiv
 
 namespace {
 
-bool AttachToRoot(Repository& repository, KivStringViewT<char16_t> branch, cow_ptr<Commit> const& root,
-                  BranchMoves& moves) {
-    const auto head = repository.GetHead(branch);
-    if (!head) {
-        if (!repository.CreateBranch(branch, root))
-            return repository.MoveBranchTo(branch, root);
-        moves.NoteNew(branch);
-        return true;
-    }
+bool AttachToRoot(Repository& repository, KivStringViewT<char16_t> branch, cow_ptr<Commit> const& root) {
+    auto head = repository.GetHead(branch);
+    if (!head)
+        return repository.CreateBranch(branch, root) || repository.MoveBranchTo(branch, root);
     if (repository.GetCommonBase(head, root))
         return true;
-    auto rebased = repository.MergelessRebase(head, nullptr, root);
-    moves.NoteMove(branch, head);
-    return repository.MoveBranchTo(branch, std::move(rebased));
+    return repository.MoveBranchTo(branch, repository.MergelessRebase(std::move(head), nullptr, root));
 }
 
 } // namespace
@@ -68,18 +61,14 @@ bool Repository::EnsureCommonRootFor(KivStringViewT<char16_t> first, KivStringVi
     const auto secondHead = GetHead(second);
     if (firstHead && secondHead && GetCommonBase(firstHead, secondHead))
         return true;
-    BranchMoves moves(storage_.get(), 3);
     auto root = GetHead(rootBranch);
     if (!root) {
         root.write()->SetDescription(u"Root commit");
         if (!CreateBranch(rootBranch, SyncWithStorage(std::move(root))))
             return false;
-        moves.NoteNew(rootBranch);
         root = GetHead(rootBranch);
     }
-    const bool attached = AttachToRoot(*this, first, root, moves) && AttachToRoot(*this, second, root, moves);
-    moves.Keep();
-    return attached;
+    return AttachToRoot(*this, first, root) && AttachToRoot(*this, second, root);
 }
 
 } // namespace KivVcs

@@ -19,12 +19,13 @@ cow_ptr<Commit> Repository::DoCommit(Commit& commit) {
     if (!stored)
         stored = SyncWithStorage(immu::make<Commit>(commit));
     // A current branch that has been removed is not moved; the commit is stored all the same.
-    storage_->UpdateBranch(currentBranch_, stored);
+    storage_->UpdateBranch(Repository::GetCurentBranch(), stored);
     return stored;
 }
 
 cow_ptr<Commit> Repository::GetHead() const {
-    return GetHead(currentBranch_);
+    // A copy of the name: what is called may make another branch current.
+    return GetHead(Repository::GetCurentBranch());
 }
 
 cow_ptr<Commit> Repository::GetHead(KivStringViewT<char16_t> branch) const {
@@ -115,7 +116,7 @@ IObjectsStorage const* Repository::GetStorage() const {
 }
 
 bool Repository::Checkout(KivStringViewT<char16_t> branch) {
-    if (!BranchExist(branch))
+    if (storage_ == nullptr || !BranchExist(branch))
         return false;
     currentBranch_ = branch;
     return true;
@@ -139,6 +140,13 @@ bool Repository::MoveBranchTo(KivStringViewT<char16_t> branch, cow_ptr<Commit> c
 
 bool Repository::RemoveBranch(KivStringViewT<char16_t> branch) {
     return storage_ != nullptr && BranchExist(branch) && storage_->RemoveBranch(branch);
+}
+
+void Repository::CommitRewritten(cow_ptr<Commit>, cow_ptr<Commit>) {}
+
+void Repository::AnnounceRewrite(cow_ptr<Commit> const& old, cow_ptr<Commit> const& rebuilt) {
+    if (rebuilt && *old != *rebuilt)
+        CommitRewritten(old, rebuilt);
 }
 
 } // namespace KivVcs

@@ -1,8 +1,9 @@
 #include "KivVcs/Repository.h"
 
-#include "repository/BranchMoves.h"
+#include "repository/CommitSet.h"
 #include "repository/CommonBaseIndex.h"
 
+#include <typeinfo>
 #include <unordered_map>
 
 namespace KivVcs {
@@ -27,12 +28,12 @@ struct KeptCommit {
 
 using KeptCommits = std::unordered_map<Id, KeptCommit>;
 
+} // namespace
+
 /// Rewrites the history of a repository's branches. Nothing of it may be alive when the storage is purged.
-class GraphSimplification {
+class Repository::GraphSimplification {
 public:
-    /// @param repository called for whatever its hosts may override
-    GraphSimplification(IRepository& repository, IObjectsStorage& storage)
-        : repository_(repository), storage_(storage) {
+    GraphSimplification(Repository& repository, IObjectsStorage& storage) : repository_(repository), storage_(storage) {
         for (auto const& [name, head] : storage.GetRefs())
             branches_.push_back({name, head});
         for (auto const& branch : branches_) {
@@ -46,6 +47,27 @@ public:
         for (auto const& branch : branches_)
             heads.push_back(branch.head);
         return heads;
+    }
+
+    /// Keeps every commit at which the way down from a head meets that of another one: the common bases of every two
+    /// heads, since an identifier of ours determines those of all ancestors, so that ways that meet stay together.
+    /// @return false, keeping none, if there are commits of a host's class, whose identifiers are what the host says.
+    bool KeepMeetings() {
+        CommitSet visited;
+        std::vector<Id> meetings;
+        for (auto const& branch : branches_) {
+            for (Commit const* commit = branch.head.get(); commit != nullptr; commit = commit->GetParent().get()) {
+                if (typeid(*commit) != typeid(Commit))
+                    return false;
+                if (visited.Insert(*commit) != nullptr) {
+                    meetings.push_back(commit->GetId());
+                    break;
+                }
+            }
+        }
+        for (auto& id : meetings)
+            kept_.try_emplace(std::move(id));
+        return true;
     }
 
     /// Keeps the common base of every two heads, as `GetCommonBase` gives it.
@@ -70,12 +92,10 @@ public:
 
     /// Stores the kept commits anew, each with the nearest kept ancestor as parent, and moves the branches.
     void Rebuild() const {
-        BranchMoves moves(&storage_, branches_.size());
         for (auto const& [id, kept] : kept_) {
             if (!kept.hasParent)
-                RebuildFrom(id, moves);
+                RebuildFrom(id);
         }
-        moves.Keep();
     }
 
 private:
@@ -94,7 +114,7 @@ private:
     }
 
     /// Depth-first, on a stack of its own since a chain may keep any number of commits.
-    void RebuildFrom(Id const& root, BranchMoves& moves) const {
+    void RebuildFrom(Id const& root) const {
         struct Level {
             KeptCommit const* kept;
             cow_ptr<Commit> rebuilt;
@@ -104,7 +124,7 @@ private:
         const auto open = [&](Id const& id, cow_ptr<Commit> const& parent) {
             if (auto commit = storage_.GetCommit(id)) {
                 auto const& kept = kept_.at(id);
-                levels.push_back({&kept, RebuildCommit(std::move(commit), parent, kept, moves)});
+                levels.push_back({&kept, RebuildCommit(std::move(commit), parent, kept)});
             }
         };
         open(root, nullptr);
@@ -117,26 +137,27 @@ private:
         }
     }
 
-    cow_ptr<Commit> RebuildCommit(cow_ptr<Commit> commit, cow_ptr<Commit> const& parent, KeptCommit const& kept,
-                                  BranchMoves& moves) const {
+    cow_ptr<Commit> RebuildCommit(cow_ptr<Commit> commit, cow_ptr<Commit> const& parent, KeptCommit const& kept) const {
+        const cow_ptr<Commit> old = commit;
         commit.write()->SetParent(parent);
         auto rebuilt = repository_.SyncWithStorage(std::move(commit));
+        repository_.AnnounceRewrite(old, rebuilt);
         for (Branch const* const branch : kept.branches) {
-            if (repository_.BranchExist(branch->name)) {
-                moves.NoteMove(branch->name, branch->head);
+            if (repository_.BranchExist(branch->name))
                 repository_.MoveBranchTo(branch->name, rebuilt);
-            } else if (repository_.CreateBranch(branch->name, rebuilt)) {
-                moves.NoteNew(branch->name);
-            }
+            else
+                repository_.CreateBranch(branch->name, rebuilt);
         }
         return rebuilt;
     }
 
-    IRepository& repository_;
+    Repository& repository_;
     IObjectsStorage& storage_;
     std::vector<Branch> branches_;
     KeptCommits kept_;
 };
+
+namespace {
 
 /// Lets a repository answer from an index while this lives.
 class CommonBaseLease {
@@ -159,9 +180,10 @@ bool Repository::SimplifyCommitGraph(bool purge) {
         return false;
     {
         GraphSimplification simplification(*this, *storage_);
-        {
-            // Every pair is asked about, but following each pair's histories would take time in proportion to their
-            // length.
+        if (typeid(*this) != typeid(Repository) || !simplification.KeepMeetings()) {
+            // A host may override `GetCommonBase` and is asked about every pair. Its override may ask this class, which
+            // finds the index nowhere but in the repository itself; following each pair's histories would take time in
+            // proportion to their length.
             const CommonBaseIndex index(simplification.Heads());
             const CommonBaseLease lease(commonBases_, index);
             simplification.KeepCommonBases();

@@ -14,8 +14,9 @@ template <class T>
 void AddTo(std::unordered_map<Id, cow_ptr<T>>& table, cow_ptr<T> object) {
     Id id = object->GetId();
     // Where most buckets are free, the bucket alone tells that an object is new, as most that are asked for are; otherwise
-    // that takes a visit to a neighbour somewhere in memory.
-    if (table.size() >= table.bucket_count() / 4)
+    // that takes a visit to a neighbour somewhere in memory. What is there already must not make the table grow, which
+    // would change its order.
+    if (table.size() >= table.bucket_count() / 4 && !table.contains(id))
         table.rehash(2 * table.bucket_count());
     table.try_emplace(std::move(id), std::move(object));
 }
@@ -28,7 +29,14 @@ MemObjectsStorage::MemObjectsStorage() : MemObjectsStorage({u"master"}) {}
 
 MemObjectsStorage::MemObjectsStorage(std::initializer_list<KivStringViewT<char16_t>> branches) {
     for (KivStringViewT<char16_t> name : branches)
-        references_.try_emplace(name.ToString());
+        AddBranch(name, nullptr);
+}
+
+MemObjectsStorage::MemObjectsStorage(MemObjectsStorage const& other)
+    : IObjectsStorage(other), commits_(other.commits_), trees_(other.trees_), blobs_(other.blobs_),
+      references_(other.references_) {
+    for (auto const& [name, head] : references_)
+        namesByHead_.emplace(head.get(), &name);
 }
 
 MemObjectsStorage::~MemObjectsStorage() = default;
@@ -90,8 +98,11 @@ IObjectsStorage::ReferenceTable const& MemObjectsStorage::GetRefs() const {
 }
 
 void MemObjectsStorage::DeleteCommit(cow_ptr<Commit> commit) {
-    if (commit)
-        commits_.erase(commit->GetId());
+    if (!commit)
+        return;
+    const Id id = commit->GetId();
+    if (GetCommit(id))
+        commits_.erase(id);
 }
 
 bool MemObjectsStorage::BranchExist(KivStringViewT<char16_t> name) const {
@@ -99,13 +110,25 @@ bool MemObjectsStorage::BranchExist(KivStringViewT<char16_t> name) const {
 }
 
 bool MemObjectsStorage::CreateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) {
-    return !name.IsEmpty() && references_.try_emplace(name.ToString(), std::move(commit)).second;
+    return !name.IsEmpty() && AddBranch(name, std::move(commit));
+}
+
+bool MemObjectsStorage::AddBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> head) {
+    if (references_.contains(name))
+        return false;
+    // Made before the branch is, so that nothing can fail in between.
+    NamesByHead entry;
+    entry.emplace(head.get(), nullptr);
+    auto const& added = *references_.try_emplace(name.ToString(), std::move(head)).first;
+    FileName(entry.extract(entry.begin()), added);
+    return true;
 }
 
 bool MemObjectsStorage::RemoveBranch(KivStringViewT<char16_t> name) {
     const auto branch = references_.find(name);
     if (branch == references_.end())
         return false;
+    namesByHead_.erase({branch->second.get(), &branch->first});
     references_.erase(branch);
     return true;
 }
@@ -116,8 +139,15 @@ bool MemObjectsStorage::UpdateBranch(KivStringViewT<char16_t> name, cow_ptr<Comm
     const auto branch = references_.find(name);
     if (branch == references_.end())
         return false;
-    branch->second = std::move(commit);
+    auto entry = namesByHead_.extract({branch->second.get(), &branch->first});
+    branch->second.swap(commit);
+    FileName(std::move(entry), *branch);
     return true;
+}
+
+void MemObjectsStorage::FileName(NamesByHead::node_type entry, ReferenceTable::value_type const& branch) noexcept {
+    entry.value() = {branch.second.get(), &branch.first};
+    namesByHead_.insert(std::move(entry));
 }
 
 cow_ptr<Commit> MemObjectsStorage::GetHead(KivStringViewT<char16_t> name) const {
@@ -126,10 +156,9 @@ cow_ptr<Commit> MemObjectsStorage::GetHead(KivStringViewT<char16_t> name) const 
 
 std::vector<KivStringT<char16_t>> MemObjectsStorage::GetCommitBranches(cow_ptr<Commit> commit) const {
     std::vector<KivStringT<char16_t>> names;
-    for (auto const& [name, head] : references_) {
-        if (head == commit)
-            names.push_back(name);
-    }
+    for (auto entry = namesByHead_.lower_bound({commit.get(), nullptr});
+         entry != namesByHead_.end() && entry->first == commit.get(); ++entry)
+        names.push_back(*entry->second);
     return names;
 }
 

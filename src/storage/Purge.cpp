@@ -1,22 +1,26 @@
 #include "KivVcs/Storage.h"
 
+#include <new>
+
 namespace KivVcs {
 
 namespace {
 
-/// Appends the identifiers of the objects of its own kind that an object holds.
-void AddVcsDependencies(Commit const& commit, std::vector<Id>& dependencies) {
+/// Appends the objects of its own kind that an object holds.
+void AddHeld(Commit const& commit, std::vector<cow_ptr<Commit>>& held) {
     if (commit.GetParent())
-        dependencies.push_back(commit.GetParent()->GetId());
+        held.push_back(commit.GetParent());
 }
 
 /// By name and not by path, which shows a blob where a subtree has the same name.
-void AddVcsDependencies(Tree const& tree, std::vector<Id>& dependencies) {
+void AddHeld(Tree const& tree, std::vector<cow_ptr<Tree>>& held) {
+    if (tree.GetLocalBlobCount() == tree.GetLocalObjectCount())
+        return;
     for (auto const& name : tree.GetLocalSubtreePaths())
-        dependencies.push_back(tree.GetLocalTree(name)->GetId());
+        held.push_back(tree.GetLocalTree(name));
 }
 
-void AddVcsDependencies(Blob const&, std::vector<Id>&) {}
+void AddHeld(Blob const&, std::vector<cow_ptr<Blob>>&) noexcept {}
 
 /// The purge of one table. An object is unused when the table holds the only reference to it.
 template <class T>
@@ -28,55 +32,68 @@ public:
 
     void Run() {
         do {
-            missedRelease_ = false;
+            hasMissed_ = false;
             Sweep();
-        } while (missedRelease_);
+        } while (hasMissed_);
     }
 
 private:
-    /// Follows at once what an object that dies releases, wherever the sweep may have passed it already, so that the
-    /// list of these stays short.
+    /// Follows at once what an object that dies has held, wherever the sweep may have passed it already, so that the list
+    /// of these stays short.
     void Sweep() {
         for (next_ = table_.begin(); next_ != table_.end();) {
-            RemoveIfUnused(next_++);
-            while (!released_.empty()) {
-                const auto found = table_.find(released_.back());
-                released_.pop_back();
-                if (found != table_.end())
-                    RemoveIfUnused(found);
-            }
+            const auto entry = next_++;
+            if (entry->second.use_count() == 1)
+                LetDie(TakeOut(entry));
+            while (!held_.empty())
+                ReleaseLastHeld();
         }
     }
 
-    void RemoveIfUnused(typename Table::iterator entry) {
-        if (!IsUnused(entry->second))
-            return;
-        ListReleased(*entry->second);
-        if (entry == next_)
-            ++next_;
-        table_.erase(entry);
+    /// Releases an object whose holder has died. It may be stored, or hold what is stored, or both, or neither: what is
+    /// equal to a stored object need not be that object.
+    void ReleaseLastHeld() {
+        cow_ptr<T> object = std::move(held_.back());
+        held_.pop_back();
+        if (object.use_count() == 2)
+            TakeOutIfStored(object);
+        if (object.use_count() == 1)
+            LetDie(std::move(object));
     }
 
-    static bool IsUnused(cow_ptr<T> const& object) noexcept { return object.use_count() == 1; }
-
-    /// Called while @p dying still holds its dependencies, so that one that is stored is still in the table. One that
-    /// is not may die with it and release stored objects further down, which only another sweep finds.
-    void ListReleased(T const& dying) {
-        const std::size_t listedBefore = released_.size();
+    /// Called with the last reference. What the object holds is shared before it dies: while somebody else holds it, it
+    /// stays whole and dies when its turn comes.
+    void LetDie(cow_ptr<T> object) {
         try {
-            AddVcsDependencies(dying, released_);
+            AddHeld(*object, held_);
         } catch (std::bad_alloc const&) {
             // The list saves sweeps, nothing else: what did not get into it is found by the next one.
-            missedRelease_ = true;
+            hasMissed_ = true;
         }
-        for (std::size_t index = listedBefore; index < released_.size(); ++index)
-            missedRelease_ = missedRelease_ || !table_.contains(released_[index]);
+    }
+
+    void TakeOutIfStored(cow_ptr<T> const& object) {
+        try {
+            const auto entry = table_.find(object->GetId());
+            if (entry != table_.end() && entry->second == object)
+                TakeOut(entry);
+        } catch (std::bad_alloc const&) {
+            hasMissed_ = true;
+        }
+    }
+
+    cow_ptr<T> TakeOut(typename Table::iterator entry) {
+        if (entry == next_)
+            ++next_;
+        cow_ptr<T> object = std::move(entry->second);
+        table_.erase(entry);
+        return object;
     }
 
     Table& table_;
     typename Table::iterator next_;
-    std::vector<Id> released_;
-    bool missedRelease_ = false;
+    std::vector<cow_ptr<T>> held_;
+    bool hasMissed_ = false;
 };
 
 } // namespace

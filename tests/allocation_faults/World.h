@@ -68,6 +68,16 @@ struct World {
                Helpers::StringAFromBuffer(blob.GetData()).GetString();
     }
 
+    /// What the branches hold that have been there from the beginning, whatever their histories.
+    std::string Contents() const {
+        std::string contents;
+        for (const char16_t* branch : {u"master", u"topic", u"side", u"twin", u"island"}) {
+            const auto head = repository.GetHead(branch);
+            contents += NameOf(head) + "{" + Files(head->GetCommitTree()) + "}";
+        }
+        return contents;
+    }
+
     /// The state and what the last operation gave.
     std::string Outcome() {
         std::string outcome = State() + "\n" + std::to_string(done) + " " + narrow.GetString() + " " +
@@ -106,6 +116,8 @@ struct World {
 struct Operation {
     const char* name;
     void (*run)(World&);
+    /// Branches that it has moved when it fails stay moved.
+    bool movesBranches = false;
 
     friend std::ostream& operator<<(std::ostream& out, Operation const& operation) { return out << operation.name; }
 };

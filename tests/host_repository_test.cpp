@@ -1,0 +1,255 @@
+#include "support/RecordingRepository.h"
+
+#include <gtest/gtest.h>
+
+#include <random>
+#include <set>
+
+/// Repositories and storages whose hosts override operations, refuse, or change things meanwhile.
+
+namespace KivVcs {
+namespace {
+
+/// Makes another branch current whenever it is asked to look at or move one, and notes the names that it was given.
+class SwitchingStorage : public MemObjectsStorage {
+public:
+    SwitchingStorage() : MemObjectsStorage{u"first!", u"second"} {}
+
+    cow_ptr<Commit> GetHead(KivStringViewT<char16_t> name) const override {
+        Switch(name);
+        return MemObjectsStorage::GetHead(name);
+    }
+    bool UpdateBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> commit) override {
+        Switch(name);
+        return MemObjectsStorage::UpdateBranch(name, std::move(commit));
+    }
+
+    Repository* repository = nullptr;
+    mutable std::vector<std::string> names;
+
+private:
+    void Switch(KivStringViewT<char16_t> name) const {
+        const KivStringT<char16_t> former = repository->GetCurentBranch();
+        repository->Checkout(former == u"first!" ? u"second" : u"first!");
+        // Takes the memory of a name that nobody holds any more.
+        const KivStringT<char16_t> other = KivStringT<char16_t>(u"other") + u"!";
+        names.push_back(Narrow(name));
+    }
+};
+
+TEST(HostRepositories, AreGivenTheNameOfTheBranchThatIsCurrentAtTheMomentOfTheCall) {
+    auto owned = std::make_unique<SwitchingStorage>();
+    SwitchingStorage& storage = *owned;
+    Repository repo(std::move(owned));
+    storage.repository = &repo;
+    repo.Checkout(u"first!");
+    Commit commit(nullptr, false);
+    const auto stored = repo.DoCommit(commit);
+    EXPECT_FALSE(repo.GetHead());
+    EXPECT_TRUE(repo.GetHead() == stored);
+    EXPECT_TRUE(repo.FastForwardMerge(stored));
+    EXPECT_EQ(Joined(storage.names), "first! second first! second first!");
+}
+
+TEST(HostRepositories, DecideWhatTheirOverridesAreAskedAbout) {
+    class Claiming : public Repository {
+    public:
+        using Repository::Repository;
+        bool BranchExist(KivStringViewT<char16_t>) override { return true; }
+    };
+    Claiming none(nullptr);
+    EXPECT_FALSE(none.Checkout(u"anything"));
+    EXPECT_EQ(Narrow(none.GetCurentBranch()), "master");
+
+    class Hiding : public MemObjectsStorage {
+    public:
+        cow_ptr<Commit> GetCommit(Id const&) const override { return nullptr; }
+    };
+    Hiding storage;
+    const auto commit = immu::make<Commit>();
+    storage.AddCommit(commit);
+    storage.DeleteCommit(commit);
+    EXPECT_EQ(storage.GetCommitCount(), 1U);
+}
+
+TEST(HostRepositories, FindTheirTablesAsTheyWereAfterAddingWhatIsThere) {
+    MemObjectsStorage storage;
+    const auto order = [&storage] {
+        std::vector<Blob const*> blobs;
+        for (auto const& [id, blob] : storage.GetBlobs())
+            blobs.push_back(blob.get());
+        return blobs;
+    };
+    for (int number = 0; number < 200; ++number) {
+        const Blob blob = MakeBlob(std::to_string(number));
+        storage.AddBlob(immu::make<Blob>(blob));
+        const auto before = order();
+        const std::size_t buckets = storage.GetBlobs().bucket_count();
+        storage.AddBlob(immu::make<Blob>(blob));
+        ASSERT_TRUE(order() == before && storage.GetBlobs().bucket_count() == buckets) << number;
+    }
+}
+
+std::multiset<std::string> NamesOf(IObjectsStorage const& storage, cow_ptr<Commit> const& head, bool scanning) {
+    std::multiset<std::string> names;
+    if (scanning) {
+        for (auto const& [name, each] : storage.GetRefs()) {
+            if (each == head)
+                names.insert(Narrow(name));
+        }
+    } else {
+        for (auto const& name : storage.GetCommitBranches(head))
+            names.insert(Narrow(name));
+    }
+    return names;
+}
+
+TEST(HostRepositories, FindTheBranchesOfACommitHoweverTheyWereMoved) {
+    std::mt19937 random(7);
+    const cow_ptr<Commit> heads[] = {nullptr, immu::make<Commit>(), immu::make<Commit>(), immu::make<Commit>()};
+    std::unique_ptr<IObjectsStorage> storage = std::make_unique<MemObjectsStorage>();
+    for (int step = 0; step < 2000; ++step) {
+        const auto name = Wide("b" + std::to_string(random() % 20));
+        auto const& head = heads[random() % 4];
+        switch (random() % 4) {
+        case 0:
+            storage->CreateBranch(name, head);
+            break;
+        case 1:
+            storage->RemoveBranch(name);
+            break;
+        default:
+            storage->UpdateBranch(name, head);
+            break;
+        }
+        if (step % 100 == 0)
+            storage = storage->Clone();
+        for (auto const& each : heads)
+            ASSERT_EQ(NamesOf(*storage, each, false), NamesOf(*storage, each, true)) << step;
+    }
+}
+
+/// Notes what becomes of commits, with the line of each old one, and who stands where then; fails on request.
+class NotingRepository : public RecordingRepository {
+public:
+    using RecordingRepository::RecordingRepository;
+
+    std::string broken;
+    std::vector<std::string> rewrites;
+
+protected:
+    void CommitRewritten(cow_ptr<Commit> old, cow_ptr<Commit> rebuilt) override {
+        if (NameOf(old) == broken)
+            throw std::runtime_error(broken);
+        EXPECT_TRUE(GetCommitFromStorage(rebuilt->GetId()) == rebuilt && *old != *rebuilt);
+        EXPECT_TRUE(GetStorage()->GetCommitBranches(rebuilt).empty());
+        rewrites.push_back(Line(old) + ">" + Line(rebuilt));
+    }
+
+private:
+    static std::string Line(cow_ptr<Commit> const& commit) {
+        return NameOf(commit) + (commit->GetParent() ? "/" + Line(commit->GetParent()) : "");
+    }
+};
+
+class Rewriting : public testing::Test {
+protected:
+    std::string TakeRewrites() {
+        std::sort(repo.rewrites.begin(), repo.rewrites.end());
+        return Joined(std::exchange(repo.rewrites, {}));
+    }
+
+    NotingRepository repo{std::make_unique<MemObjectsStorage>()};
+    History history{repo};
+};
+
+TEST_F(Rewriting, IsToldToTheHostBeforeBranchesMoveAndAnythingIsPurged) {
+    history.Grow("r a:r b:a c:b x:a");
+    history.Point("master=c topic=a side=x");
+    history.Forget();
+    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
+    EXPECT_EQ(TakeRewrites(), "a/r>a c/b/a/r>c/a x/a/r>x/a");
+    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
+    EXPECT_EQ(TakeRewrites(), "");
+
+    history.Grow("d e:d f:e");
+    history.Point("one=f two=d three=f");
+    history.Forget();
+    // The oldest stays what it is.
+    EXPECT_TRUE(repo.DeleteCommits(repo.GetHead(u"one")));
+    EXPECT_EQ(TakeRewrites(), "f/e/d>f/d");
+    EXPECT_EQ(history.Branches(), "master=c/a one=f/d side=x/a three=f/d topic=a two=d");
+
+    repo.MergelessRebase(KivStringViewT<char16_t>(u"side"), u"master");
+    EXPECT_EQ(TakeRewrites(), "x/a>x/c/a");
+    EXPECT_TRUE(repo.EnsureCommonRootFor(u"master", u"one", u"side"));
+    EXPECT_EQ(TakeRewrites(), "d>d/x/a f/d>f/d/x/a");
+    repo.broken = "f";
+    const auto head = repo.GetHead(u"one");
+    EXPECT_THROW(repo.DeleteCommits(head), std::runtime_error);
+    EXPECT_TRUE(repo.GetHead(u"one") == head);
+}
+
+TEST_F(Rewriting, LetsThePurgeHaveTheOldCommitsAndNotTheNewOnes) {
+    class Refusing : public Repository {
+    public:
+        using Repository::Repository;
+        bool MoveBranchTo(KivStringViewT<char16_t> branch, cow_ptr<Commit> commit) override {
+            return NameOf(commit) != "b" && Repository::MoveBranchTo(branch, commit);
+        }
+        void UpdateStorage() override {
+            countBefore = GetCommitCount();
+            RemoveBranch(u"master");
+            Repository::UpdateStorage();
+        }
+        std::uint64_t countBefore = 0;
+    };
+    Refusing refusing(std::make_unique<MemObjectsStorage>());
+    History line(refusing);
+    line.Grow("a b:a c:b d:c");
+    refusing.CreateBranch(u"topic", line["b"]);
+    refusing.MoveBranchTo(u"master", line["d"]);
+    // Nobody else holds the commit that is given, and nobody at all the rewritten ones once their branch is gone.
+    refusing.GetStorage()->DeleteCommit(line["a"]);
+    auto given = line["d"];
+    line.Forget();
+    EXPECT_TRUE(refusing.DeleteCommits(std::move(given)));
+    EXPECT_EQ(line.Branches(), "topic=b/a");
+    EXPECT_EQ(refusing.countBefore, 2U);
+    EXPECT_EQ(line.Counts(), "2 3 4");
+    refusing.UpdateStorage();
+    EXPECT_EQ(line.Counts(), "0 2 2");
+}
+
+/// A copy of a line of commits, or of nested directories, of which every second one is that of the storage.
+TEST(Purges, RemoveAllThatDiesAtOnceAlsoBelowWhatIsEqualToStoredObjects) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    for (const bool storesTwins : {false, true}) {
+        cow_ptr<Commit> commit;
+        cow_ptr<Tree> tree;
+        for (int number = 0; number < 64; ++number) {
+            Commit next(std::move(commit), false);
+            next.SetDescription(Wide(std::to_string(number)));
+            commit = immu::make<Commit>(next);
+            Tree above;
+            // With a repository of its own, which would hand out the stored directory below otherwise.
+            Repository other(nullptr);
+            if (tree)
+                above.AddTree(&other, u"below", *tree);
+            above.AddBlob(&repo, Wide(std::to_string(number)), MakeBlob(std::to_string(number)));
+            tree = immu::make<Tree>(above);
+            if (number % 2 == 0 && !storesTwins)
+                continue;
+            repo.AddCommitToStorage(number % 2 == 0 ? immu::make<Commit>(*commit) : commit);
+            repo.AddTreeToStorage(number % 2 == 0 ? immu::make<Tree>(*tree) : tree);
+        }
+        commit.reset();
+        tree.reset();
+        EXPECT_EQ(repo.GetCommitCount(), storesTwins ? 64U : 32U);
+        repo.UpdateStorage();
+        EXPECT_EQ(repo.GetCommitCount() + repo.GetTreeCount() + repo.GetBlobCount(), 0U) << storesTwins;
+    }
+}
+
+} // namespace
+} // namespace KivVcs
