@@ -42,12 +42,13 @@ quietly() {
 
 packages_of() {
     case $1 in
-    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata gdb dpkg-dev ;;
+    build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata gdb dpkg-dev python3 ;;
     archive) echo libsqlite3-dev libzstd-dev ;;
     vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
     abi) echo abigail-tools xz-utils ;;
+    docs) echo doxygen doxygen-awesome-css ;;
     lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck python3 ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 ;;
     plot) echo python3-matplotlib ;;

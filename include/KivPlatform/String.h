@@ -79,9 +79,9 @@ public:
     }
     ~KivStringT() { Release(); }
 
-    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does: `%%s`
-    /// takes NUL-terminated text (null counts as empty), `%%.*s` a length and text, `%%d`, `%%u` and `%%lu` any
-    /// integer; a width (`%%5d`, `%%02d`) pads with blanks or zeros, `%%%%` is a percent sign. A directive without an
+    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does. Behind a
+    /// percent sign, "s" takes NUL-terminated text (null counts as empty), ".*s" a length and text, "d", "u" and "lu" any
+    /// integer; a width ("5d", "02d") pads with blanks or zeros; two percent signs write one. A directive without an
     /// argument writes nothing.
     template <class... Arguments>
     void FormatInternal(View format, Arguments const&... arguments) {

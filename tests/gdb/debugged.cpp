@@ -34,5 +34,6 @@ int main() {
     const cow_ptr<Tree> nothing;
     const cow_ptr<Object> object = blob;
     Look();
-    return word.IsEmpty() || view.IsEmpty() || !empty.IsEmpty() || !noId.IsEmpty() || id.IsEmpty() || nothing || !object || !tree;
+    return word.IsEmpty() || view.IsEmpty() || !empty.IsEmpty() || !noId.IsEmpty() || id.IsEmpty() || nothing ||
+           !object || !tree;
 }

@@ -61,9 +61,13 @@ public:
     void DeleteCommit(cow_ptr<Commit> commit) override { kept_.DeleteCommit(std::move(commit)); }
     void PurgeUnusedObjects() override { kept_.PurgeUnusedObjects(); }
     [[nodiscard]] bool BranchExist(Path name) const override { return kept_.BranchExist(name); }
-    bool CreateBranch(Path name, cow_ptr<Commit> commit) override { return kept_.CreateBranch(name, std::move(commit)); }
+    bool CreateBranch(Path name, cow_ptr<Commit> commit) override {
+        return kept_.CreateBranch(name, std::move(commit));
+    }
     bool RemoveBranch(Path name) override { return kept_.RemoveBranch(name); }
-    bool UpdateBranch(Path name, cow_ptr<Commit> commit) override { return kept_.UpdateBranch(name, std::move(commit)); }
+    bool UpdateBranch(Path name, cow_ptr<Commit> commit) override {
+        return kept_.UpdateBranch(name, std::move(commit));
+    }
     [[nodiscard]] cow_ptr<Commit> GetHead(Path name) const override { return kept_.GetHead(name); }
     [[nodiscard]] std::vector<KivStringT<char16_t>> GetCommitBranches(cow_ptr<Commit> commit) const override {
         return kept_.GetCommitBranches(std::move(commit));
@@ -87,10 +91,14 @@ public:
     [[nodiscard]] cow_ptr<Commit> GetHead() const override { return kept_.GetHead(); }
     [[nodiscard]] cow_ptr<Commit> GetHead(Path branch) const override { return kept_.GetHead(branch); }
     [[nodiscard]] KivStringT<char16_t> GetCurentBranch() const override { return kept_.GetCurentBranch(); }
-    [[nodiscard]] cow_ptr<Commit> GetCommitFromStorage(Id const& id) const override { return kept_.GetCommitFromStorage(id); }
+    [[nodiscard]] cow_ptr<Commit> GetCommitFromStorage(Id const& id) const override {
+        return kept_.GetCommitFromStorage(id);
+    }
     [[nodiscard]] cow_ptr<Tree> GetTreeFromStorage(Id const& id) const override { return kept_.GetTreeFromStorage(id); }
     [[nodiscard]] cow_ptr<Blob> GetBlobFromStorage(Id const& id) const override { return kept_.GetBlobFromStorage(id); }
-    cow_ptr<Commit> SyncWithStorage(cow_ptr<Commit> commit) override { return kept_.SyncWithStorage(std::move(commit)); }
+    cow_ptr<Commit> SyncWithStorage(cow_ptr<Commit> commit) override {
+        return kept_.SyncWithStorage(std::move(commit));
+    }
     cow_ptr<Tree> SyncWithStorage(cow_ptr<Tree> tree) override { return kept_.SyncWithStorage(std::move(tree)); }
     cow_ptr<Blob> SyncWithStorage(cow_ptr<Blob> blob) override { return kept_.SyncWithStorage(std::move(blob)); }
     [[nodiscard]] std::uint64_t GetCommitCount() const override { return kept_.GetCommitCount(); }
@@ -105,9 +113,13 @@ public:
         return kept_.GetCommonBase(std::move(first), std::move(second));
     }
     bool Checkout(Path branch) override { return kept_.Checkout(branch); }
-    bool CreateBranch(Path branch, cow_ptr<Commit> head) override { return kept_.CreateBranch(branch, std::move(head)); }
+    bool CreateBranch(Path branch, cow_ptr<Commit> head) override {
+        return kept_.CreateBranch(branch, std::move(head));
+    }
     [[nodiscard]] bool BranchExist(Path branch) override { return kept_.BranchExist(branch); }
-    bool MoveBranchTo(Path branch, cow_ptr<Commit> commit) override { return kept_.MoveBranchTo(branch, std::move(commit)); }
+    bool MoveBranchTo(Path branch, cow_ptr<Commit> commit) override {
+        return kept_.MoveBranchTo(branch, std::move(commit));
+    }
     bool RemoveBranch(Path branch) override { return kept_.RemoveBranch(branch); }
     bool EnsureCommonRootFor(Path first, Path second, Path rootBranch) override {
         return kept_.EnsureCommonRootFor(first, second, rootBranch);
