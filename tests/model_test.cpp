@@ -21,8 +21,7 @@ std::string Failure(std::vector<Step> const& steps) {
     try {
         for (Step const& step : steps) {
             world.log += std::string("\n") + step.action->name;
-            world.random.seed(step.number);
-            step.action->run(world);
+            world.Run(step.action->run, step.number);
             world.Check();
             if (step.number % 32 == 0 || &step == &steps.back())
                 world.CheckAll();

@@ -85,6 +85,7 @@ const Action actions[] = {
      }},
     {"EnsureCommonRootFor", 2, [](World& w) {
          const auto [one, other, root] = std::tuple{w.PickBranch(), w.PickBranch(), w.PickBranch()};
+         w.InterruptInClone([&](Repository& clone) { clone.EnsureCommonRootFor(Wide(one), Wide(other), Wide(root)); });
          const bool done = w.plain.EnsureCommonRoot(one, other, root);
          Expect("done", w.repository.EnsureCommonRootFor(Wide(one), Wide(other), Wide(root)), done);
      }},

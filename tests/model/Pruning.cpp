@@ -9,6 +9,7 @@ namespace {
 const Action actions[] = {
     {"DeleteCommits", 1, [](World& w) {
          Version version = w.PickVersion();
+         w.InterruptInClone([&](Repository& clone) { clone.DeleteCommits(version.commit); });
          Expect("deleted", w.repository.DeleteCommits(std::move(version.commit)), true);
          const bool isPurged = w.plain.DeleteCommits(version.plain);
          version = {};
@@ -21,6 +22,7 @@ const Action actions[] = {
              return;
          w.plain = std::move(simplified);
          const bool isPurged = w.Below(2) == 0;
+         w.InterruptInClone([&](Repository& clone) { clone.SimplifyCommitGraph(isPurged); });
          Expect("simplified", w.repository.SimplifyCommitGraph(isPurged), true);
          if (isPurged)
              w.Purge();

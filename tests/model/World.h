@@ -1,6 +1,7 @@
 #pragma once
 
 #include "support/Builders.h"
+#include "support/InterruptingHost.h"
 #include "support/PlainMerge.h"
 
 #include <array>
@@ -187,6 +188,7 @@ struct World {
         bool expected = false;
         const bool done = alwaysByTrees ? repository.Merge3Way(version.commit, answers.AsResolvers())
                                         : repository.Merge(version.commit, answers.AsResolvers());
+        countdown.Stop();
         if (version.plain && !alwaysByTrees)
             expected = head ? plain.FastForward(version.plain) : plain.Move(plain.current, version.plain);
         if (version.plain && head && !expected) {
@@ -209,6 +211,53 @@ struct World {
         for (Version const& version : held)
             commits.push_back(version.plain);
         plain.Purge(std::move(commits), {&plainTree});
+    }
+
+    /// Runs an action as @p number decides: now and then a call to the host fails in its midst, and must leave everything as
+    /// it was, but for what may have been stored already.
+    void Run(auto action, unsigned number) {
+        random.seed(number);
+        if (number % 4 != 0)
+            return action(*this);
+        auto former = std::tuple(plain, plainDraft, plainTree);
+        countdown.Start(1 + number / 4 % 24);
+        try {
+            action(*this);
+            countdown.Stop();
+        } catch (Interruption const&) {
+            countdown.Stop();
+            log += "\ninterrupted, and once more";
+            std::tie(plain, plainDraft, plainTree) = std::move(former);
+            TakeTime(plainDraft, draft);
+            repository.UpdateStorage();
+            Purge();
+            CheckAll();
+            random.seed(number);
+            action(*this);
+        }
+    }
+
+    /// Runs an operation that may stop halfway in a clone, and expects that each head has the content that it had.
+    void InterruptInClone(auto operation) {
+        countdown.Stop();
+        InterruptingRepository clone(repository.GetStorage()->Clone(), countdown);
+        countdown.Start(1 + static_cast<unsigned>(Below(60)));
+        try {
+            operation(clone);
+        } catch (Interruption const&) {
+        }
+        countdown.Stop();
+        for (auto const& [name, head] : plain.branches) {
+            if (!head)
+                continue;
+            const auto found = clone.GetHead(Wide(name));
+            Expect("the content of " + name, Files(RootOf(found)), head->root ? Files(*head->root) : "-");
+            Commit fresh(*found);
+            fresh.ResetState();
+            Expect("its identifier", IdText(found), Narrow(fresh.GetId().GetText()));
+        }
+        operation(clone);
+        clone.UpdateStorage();
     }
 
     void Check() {
@@ -250,7 +299,8 @@ struct World {
         Expect("the differences", Joined(ToNames(tree.GetDeepBlobDiffs(other.tree))), Joined(Sorted(differing)));
     }
 
-    Repository repository{std::make_unique<MemObjectsStorage>()};
+    Countdown countdown;
+    InterruptingRepository repository{std::make_unique<InterruptingStorage>(countdown), countdown};
     PlainRepository plain;
     Commit draft{cow_ptr<Commit>(), false};
     PlainCommit plainDraft;

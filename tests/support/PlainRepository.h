@@ -192,12 +192,8 @@ public:
     /// @param open the commits that the host holds
     /// @param held the trees that it holds, themselves not stored
     void Purge(std::vector<Pointer> open, std::vector<PlainTree const*> held) {
-        const auto isUnused = [](auto const& entry) { return entry.second.use_count() == 1; };
-        while (std::erase_if(commits, isUnused) > 0) {
-        }
-        for (auto const* table : {&commits, &branches})
-            for (auto const& [key, commit] : *table)
-                open.push_back(commit);
+        for (auto const& [name, head] : branches)
+            open.push_back(head);
         std::set<std::string> usedTrees;
         std::set<std::string> usedContents;
         std::set<PlainCommit const*> seen;
@@ -218,6 +214,7 @@ public:
                 usedTrees.insert(IdOf(below));
             }
         }
+        std::erase_if(commits, [&](auto const& entry) { return !seen.contains(entry.second.get()); });
         std::erase_if(trees, [&](auto const& entry) { return !usedTrees.contains(entry.first); });
         std::erase_if(contents, [&](auto const& content) { return !usedContents.contains(content); });
     }
