@@ -5,6 +5,8 @@
 
 #include "KivArchive/IArchive.h"
 
+#include <KivVcs/SHADigest256.h>
+
 #include <string>
 
 namespace KivArchive {
@@ -18,6 +20,9 @@ inline constexpr std::uint64_t largestRecord = 16 * largestWholeContent;
 /// Throws unless @p change can be stored anywhere: all its identifiers tell digests where they have to, and nothing is
 /// too large. @throws std::invalid_argument, ArchiveError
 void CheckChange(Change const& change, std::string const& file);
+
+/// A digest that has taken the header of a packed form, and goes on with its data.
+[[nodiscard]] KivVcs::SHADigest256 BeginPackedForm(ObjectType type, std::uint64_t size);
 
 [[noreturn]] void ThrowCollected(Id const& id, std::string const& file);
 

@@ -7,3 +7,4 @@
 #include "KivArchive/IArchive.h"
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/Progress.h"
+#include "KivArchive/SqliteArchive.h"

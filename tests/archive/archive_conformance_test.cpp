@@ -1,5 +1,7 @@
 #include "KivArchive/ArchiveConformance.h"
 #include "KivArchive/MemArchive.h"
+#include "KivArchive/SqliteArchive.h"
+#include "TemporaryDirectory.h"
 
 #include <gtest/gtest.h>
 
@@ -9,6 +11,13 @@ using namespace KivArchive;
 
 TEST(ArchiveConformance, OfMemArchive) {
     CheckArchiveConformance([] { return std::make_unique<MemArchive>(); },
+                            [](std::string const& failure) { ADD_FAILURE() << failure; });
+}
+
+TEST(ArchiveConformance, OfSqliteArchive) {
+    TemporaryDirectory const directory;
+    int number = 0;
+    CheckArchiveConformance([&] { return std::make_unique<SqliteArchive>(directory.Path(std::to_string(number++))); },
                             [](std::string const& failure) { ADD_FAILURE() << failure; });
 }
 

@@ -1,0 +1,169 @@
+#include "Compression.h"
+
+#include <algorithm>
+#include <bit>
+#include <cstring>
+#include <new>
+#include <zstd.h>
+#include <zstd_errors.h>
+
+namespace KivArchive {
+
+namespace {
+
+constexpr int level = 3;
+/// From here on zstd's matcher for long distances finds what its tables for short ones have forgotten.
+constexpr std::size_t longDistance = 200000;
+
+void CheckMemory(std::size_t code) {
+    if (ZSTD_isError(code) != 0 && ZSTD_getErrorCode(code) == ZSTD_error_memory_allocation)
+        throw std::bad_alloc();
+}
+
+/// How many bytes both begin with, up to @p most.
+std::size_t CommonBeginning(const std::byte* left, const std::byte* right, std::size_t most) noexcept {
+    std::size_t same = 0;
+    while (same + sizeof(std::uint64_t) <= most && std::memcmp(left + same, right + same, sizeof(std::uint64_t)) == 0)
+        same += sizeof(std::uint64_t);
+    while (same < most && left[same] == right[same])
+        ++same;
+    return same;
+}
+
+std::size_t CommonEnd(ByteView left, ByteView right, std::size_t most) noexcept {
+    std::size_t same = 0;
+    constexpr std::size_t step = sizeof(std::uint64_t);
+    while (same + step <= most &&
+           std::memcmp(left.data() + left.size() - same - step, right.data() + right.size() - same - step, step) == 0)
+        same += step;
+    while (same < most && left[left.size() - same - 1] == right[right.size() - same - 1])
+        ++same;
+    return same;
+}
+
+} // namespace
+
+struct Compressor::Contexts {
+    struct FreeCompression {
+        void operator()(ZSTD_CCtx* context) const noexcept { ZSTD_freeCCtx(context); }
+    };
+    struct FreeDecompression {
+        void operator()(ZSTD_DCtx* context) const noexcept { ZSTD_freeDCtx(context); }
+    };
+    std::unique_ptr<ZSTD_CCtx, FreeCompression> compression;
+    std::unique_ptr<ZSTD_DCtx, FreeDecompression> decompression;
+
+    ZSTD_CCtx* Compression() {
+        if (compression == nullptr)
+            compression.reset(ZSTD_createCCtx());
+        if (compression == nullptr)
+            throw std::bad_alloc();
+        return compression.get();
+    }
+    ZSTD_DCtx* Decompression() {
+        if (decompression == nullptr)
+            decompression.reset(ZSTD_createDCtx());
+        if (decompression == nullptr)
+            throw std::bad_alloc();
+        return decompression.get();
+    }
+};
+
+Compressor::Compressor() : contexts_(std::make_unique<Contexts>()) {}
+Compressor::~Compressor() = default;
+
+bool Compressor::Compress(ByteView bytes, ByteView prefix, std::size_t limit, Bytes& to) {
+    ZSTD_CCtx* const context = contexts_->Compression();
+    ZSTD_CCtx_reset(context, ZSTD_reset_session_and_parameters);
+    ZSTD_CCtx_setParameter(context, ZSTD_c_compressionLevel, level);
+    ZSTD_CCtx_setParameter(context, ZSTD_c_dictIDFlag, 0);
+    if (!prefix.empty()) {
+        auto const reach = static_cast<int>(std::bit_width(prefix.size() + bytes.size()));
+        ZSTD_CCtx_setParameter(context, ZSTD_c_windowLog, std::clamp(reach, 10, 27));
+        if (prefix.size() + bytes.size() > longDistance) {
+            ZSTD_CCtx_setParameter(context, ZSTD_c_enableLongDistanceMatching, 1);
+            ZSTD_CCtx_setParameter(context, ZSTD_c_ldmMinMatch, 32);
+            ZSTD_CCtx_setParameter(context, ZSTD_c_ldmHashLog, 20);
+            ZSTD_CCtx_setParameter(context, ZSTD_c_ldmHashRateLog, 4);
+        }
+        ZSTD_CCtx_refPrefix(context, prefix.data(), prefix.size());
+    }
+    std::size_t const before = to.size();
+    std::size_t const room = std::min(limit, ZSTD_compressBound(bytes.size()));
+    to.resize(before + room);
+    std::size_t const size = ZSTD_compress2(context, to.data() + before, room, bytes.data(), bytes.size());
+    bool const fits = ZSTD_isError(size) == 0 && size < limit;
+    to.resize(before + (fits ? size : 0));
+    CheckMemory(size);
+    return fits;
+}
+
+void Compressor::Decompress(ByteView bytes, ByteView prefix, std::byte* to, std::size_t size) {
+    ZSTD_DCtx* const context = contexts_->Decompression();
+    ZSTD_DCtx_reset(context, ZSTD_reset_session_and_parameters);
+    if (!prefix.empty())
+        ZSTD_DCtx_refPrefix(context, prefix.data(), prefix.size());
+    std::size_t const decompressed = ZSTD_decompressDCtx(context, to, size, bytes.data(), bytes.size());
+    CheckMemory(decompressed);
+    if (ZSTD_isError(decompressed) != 0 || decompressed != size)
+        throw Malformed();
+}
+
+bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept {
+    // A block of 128 KiB takes four bytes at least.
+    constexpr std::uint64_t mostGrowth = 32768;
+    return size / mostGrowth <= bytes.size() && ZSTD_getFrameContentSize(bytes.data(), bytes.size()) == size;
+}
+
+bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit, Bytes& to) {
+    std::size_t const most = std::min(base.size(), form.size());
+    std::size_t const begin = CommonBeginning(base.data(), form.data(), most);
+    std::size_t const end = CommonEnd(base, form, most - begin);
+    ByteView const between = form.subspan(begin, form.size() - begin - end);
+    ByteView const replaced = base.subspan(begin, base.size() - begin - end);
+    std::size_t const before = to.size();
+    AppendNumber(to, begin);
+    AppendNumber(to, end);
+    Append(to, std::byte{1});
+    std::size_t const head = to.size() - before;
+    // What is small, or does not become smaller, is kept as it is.
+    constexpr std::size_t worthTrying = 48;
+    if (between.size() > worthTrying &&
+        compressor.Compress(between, replaced, std::min(limit > head ? limit - head : 0, between.size()), to))
+        return true;
+    to.back() = std::byte{0};
+    if (head + between.size() < limit) {
+        Append(to, between);
+        return true;
+    }
+    to.resize(before);
+    return false;
+}
+
+Bytes ApplyDifference(Compressor& compressor, ByteView base, ByteView difference, std::size_t size) {
+    ByteReader reader(difference);
+    std::uint64_t const begin = reader.TakeNumber();
+    std::uint64_t const end = reader.TakeNumber();
+    bool const isCompressed = reader.TakeByte() != 0;
+    std::size_t const most = std::min(base.size(), size);
+    if (begin > most || end > most - begin)
+        throw Malformed();
+    auto const beginSize = static_cast<std::size_t>(begin);
+    auto const endSize = static_cast<std::size_t>(end);
+    std::size_t const betweenSize = size - beginSize - endSize;
+    if (isCompressed ? !CanDecompressTo(reader.Rest(), betweenSize) : reader.Rest().size() != betweenSize)
+        throw Malformed();
+    Bytes form;
+    form.reserve(size);
+    Append(form, base.first(beginSize));
+    form.resize(beginSize + betweenSize);
+    if (isCompressed)
+        compressor.Decompress(reader.Rest(), base.subspan(beginSize, base.size() - beginSize - endSize),
+                              form.data() + beginSize, betweenSize);
+    else
+        std::copy(reader.Rest().begin(), reader.Rest().end(), form.data() + beginSize);
+    Append(form, base.last(endSize));
+    return form;
+}
+
+} // namespace KivArchive

@@ -1,0 +1,111 @@
+#pragma once
+
+/// @file
+/// Segments: what stored forms are kept in, many small ones or one large one. docs/archive.md tells the bytes.
+
+#include "Compression.h"
+#include "KivArchive/IArchive.h"
+
+#include <memory>
+#include <optional>
+
+namespace KivArchive {
+
+/// What is stored. A large content is stored as the list of its pieces' digests.
+enum class StoredType : std::uint8_t { Blob, Tree, Commit, Piece, LargeBlob };
+
+enum class Encoding : std::uint8_t {
+    Removed,    ///< A place whose form is gone, so that its neighbours keep theirs.
+    Plain,      ///< The form as it is.
+    Shared,     ///< In the frame that the segment's members share.
+    Difference, ///< What makes it of another member's form.
+};
+
+/// Where a stored form is.
+struct Place {
+    std::uint64_t segment = 0;
+    std::uint64_t member = 0;
+
+    friend auto operator<=>(Place const& left, Place const& right) noexcept = default;
+};
+
+/// Members name a base in a segment that is stored together with theirs by the distance to it, since numbers are only
+/// given then.
+struct Base {
+    bool isDistance = false;
+    std::uint64_t segment = 0;
+    std::uint64_t member = 0;
+};
+
+struct Member {
+    StoredType type = StoredType::Blob;
+    Encoding encoding = Encoding::Removed;
+    /// Whether the form is that of `CompactTree` or `CompactCommit`.
+    bool isCompact = false;
+    /// The size of the data, and of the stored form.
+    std::uint64_t size = 0;
+    std::uint64_t formSize = 0;
+    /// How many versions its path has had since one that is no difference; 0 for that one.
+    std::uint64_t generation = 0;
+    Base base;
+    /// The bytes of its own; empty if it is shared.
+    ByteView own;
+    /// Where it begins in what the shared frame holds.
+    std::uint64_t sharedOffset = 0;
+};
+
+/// The form of one segment, parsed. Any number of threads may read it.
+class Segment {
+public:
+    /// @throws Malformed unless @p form is one that `SegmentBuilder` made
+    Segment(std::uint64_t number, Bytes form);
+    Segment(Segment const&) = delete;
+    Segment& operator=(Segment const&) = delete;
+    ~Segment() = default;
+
+    [[nodiscard]] std::uint64_t Number() const noexcept { return number_; }
+    /// A number that is another one for every form.
+    [[nodiscard]] std::uint64_t Check() const noexcept { return check_; }
+    [[nodiscard]] std::uint64_t FormSize() const noexcept { return form_.size(); }
+    [[nodiscard]] std::span<const Member> Members() const noexcept { return members_; }
+    /// @throws Malformed if there is no such member, or if it is removed
+    [[nodiscard]] Member const& At(std::uint64_t member) const;
+    /// Where the base of a member that is a difference is.
+    [[nodiscard]] Place BaseOf(Member const& member) const;
+    /// What all shared members' forms are, one after the other. @throws Malformed
+    [[nodiscard]] Bytes DecompressShared(Compressor& compressor) const;
+
+private:
+    std::uint64_t number_;
+    Bytes form_;
+    std::uint64_t check_ = 0;
+    std::vector<Member> members_;
+    std::uint64_t sharedSize_ = 0;
+    bool isSharedCompressed_ = false;
+    ByteView shared_;
+};
+
+/// Makes the form of a segment. The forms added must stay alive until it is made.
+class SegmentBuilder {
+public:
+    /// @param own the bytes of a plain member or a difference, the form of a shared one; nothing for a removed one
+    /// @return the number of the member
+    std::uint64_t Add(Member const& member, ByteView own);
+    [[nodiscard]] bool IsEmpty() const noexcept { return members_.empty(); }
+    [[nodiscard]] std::span<const Member> Members() const noexcept { return members_; }
+    /// The bytes of all forms added.
+    [[nodiscard]] std::uint64_t GetSize() const noexcept { return size_; }
+    [[nodiscard]] Bytes Make(Compressor& compressor) const;
+
+private:
+    std::vector<Member> members_;
+    std::uint64_t size_ = 0;
+};
+
+/// The digest of stored bytes that are no object, such as a piece of a content.
+[[nodiscard]] Id DigestOfBytes(ByteView bytes);
+
+/// The data that a stored form stands for.
+[[nodiscard]] Bytes ExpandForm(Member const& member, ByteView form);
+
+} // namespace KivArchive

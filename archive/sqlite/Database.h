@@ -1,0 +1,111 @@
+#pragma once
+
+/// @file
+/// One connection to a database file, and statements on it.
+
+#include "Bytes.h"
+#include "KivArchive/IArchive.h"
+
+#include <memory>
+#include <sqlite3.h>
+#include <string>
+#include <unordered_map>
+
+namespace KivArchive {
+
+/// A connection; used by one thread at a time. Set up so that nothing that a file holds can run: no triggers, views or
+/// functions of its schema.
+class Database {
+public:
+    enum class Access : std::uint8_t { Use, Make };
+
+    Database(std::string const& path, Access access, std::chrono::milliseconds wait);
+    Database(Database const&) = delete;
+    Database& operator=(Database const&) = delete;
+    ~Database();
+
+    [[nodiscard]] std::string const& Path() const noexcept { return path_; }
+    [[nodiscard]] sqlite3* Handle() const noexcept { return handle_.get(); }
+
+    /// Runs statements without parameters.
+    void Run(const char* sql);
+    /// The first column of the only row of a statement.
+    [[nodiscard]] std::int64_t Ask(const char* sql);
+
+    /// Throws what the failure @p code means. @param code as SQLite gave it
+    [[noreturn]] void Fail(int code) const;
+
+    /// The statement of a literal, prepared once.
+    [[nodiscard]] sqlite3_stmt* Prepared(const char* sql);
+
+private:
+    struct Close {
+        void operator()(sqlite3* handle) const noexcept { sqlite3_close_v2(handle); }
+    };
+    struct Finalize {
+        void operator()(sqlite3_stmt* statement) const noexcept { sqlite3_finalize(statement); }
+    };
+
+    std::string path_;
+    std::unique_ptr<sqlite3, Close> handle_;
+    std::unordered_map<const char*, std::unique_ptr<sqlite3_stmt, Finalize>> statements_;
+};
+
+/// One use of a prepared statement.
+class Query {
+public:
+    /// @param sql a literal
+    Query(Database& database, const char* sql) : database_(database), statement_(database.Prepared(sql)) {}
+    Query(Query const&) = delete;
+    Query& operator=(Query const&) = delete;
+    ~Query() {
+        sqlite3_reset(statement_);
+        sqlite3_clear_bindings(statement_);
+    }
+
+    /// The next parameter. Bytes must stay as they are until the query ends.
+    Query& With(std::int64_t number);
+    Query& With(std::uint64_t number) { return With(static_cast<std::int64_t>(number)); }
+    Query& With(ByteView bytes);
+    Query& With(Id::Digest const& digest) { return With(std::as_bytes(std::span(digest))); }
+    /// Null becomes no bytes.
+    Query& With(Id const& id);
+
+    /// Goes to the next row. @return false behind the last one
+    bool Next();
+    /// Runs to the end.
+    void Run();
+    /// Makes it ready to be run once more with other parameters.
+    Query& Again();
+
+    [[nodiscard]] std::int64_t Number(int column) const { return sqlite3_column_int64(statement_, column); }
+    /// Valid until the next row.
+    [[nodiscard]] ByteView Blob(int column) const;
+    [[nodiscard]] Id Identifier(int column) const;
+
+private:
+    Database& database_;
+    sqlite3_stmt* statement_;
+    int bound_ = 0;
+};
+
+/// A transaction, rolled back unless it is committed.
+class Transaction {
+public:
+    enum class Kind : std::uint8_t { Read, Write };
+
+    Transaction(Database& database, Kind kind) : database_(database) {
+        database.Run(kind == Kind::Read ? "BEGIN" : "BEGIN IMMEDIATE");
+    }
+    Transaction(Transaction const&) = delete;
+    Transaction& operator=(Transaction const&) = delete;
+    ~Transaction();
+
+    void Commit();
+
+private:
+    Database& database_;
+    bool isOpen_ = true;
+};
+
+} // namespace KivArchive

@@ -1,0 +1,139 @@
+#include "Changes.h"
+#include "sqlite/SqliteStore.h"
+
+#include <algorithm>
+
+namespace KivArchive {
+
+namespace {
+
+constexpr std::uint64_t mostHeldSegments = std::uint64_t{8} * 1024 * 1024;
+/// The flag under which the cache keeps what the members of a segment share, beside the check of its form: that changes
+/// when members are removed.
+constexpr std::uint64_t sharedFlag = std::uint64_t{1} << 63U;
+/// A version is that many steps from one that is no difference at most, one for each bit of its number.
+constexpr std::size_t mostSteps = 64;
+
+} // namespace
+
+std::shared_ptr<const Bytes> FormCache::Find(Place const& place) {
+    std::scoped_lock const lock(mutex_);
+    auto const found = entries_.find(place);
+    if (found == entries_.end())
+        return nullptr;
+    newestFirst_.splice(newestFirst_.begin(), newestFirst_, found->second);
+    return found->second->form;
+}
+
+void FormCache::Keep(Place const& place, std::shared_ptr<const Bytes> const& form) {
+    std::scoped_lock const lock(mutex_);
+    if (form->size() > budget_ || entries_.count(place) != 0)
+        return;
+    newestFirst_.push_front({place, form});
+    try {
+        entries_.emplace(place, newestFirst_.begin());
+    } catch (...) {
+        newestFirst_.pop_front();
+        throw;
+    }
+    size_ += form->size();
+    while (size_ > budget_) {
+        size_ -= newestFirst_.back().form->size();
+        entries_.erase(newestFirst_.back().place);
+        newestFirst_.pop_back();
+    }
+}
+
+std::shared_ptr<const Segment> FormReader::SegmentAt(std::uint64_t number) {
+    auto const found = segments_.find(number);
+    if (found != segments_.end())
+        return found->second;
+    Query query(connection_.database, "SELECT form FROM segments WHERE number=?");
+    if (!query.With(number).Next())
+        throw Malformed();
+    ByteView const form = query.Blob(0);
+    auto segment = std::make_shared<const Segment>(number, Bytes(form.begin(), form.end()));
+    if (held_ + form.size() > mostHeldSegments) {
+        segments_.clear();
+        held_ = 0;
+    }
+    segments_.emplace(number, segment);
+    held_ += form.size();
+    return segment;
+}
+
+Form FormReader::SharedForm(Segment const& segment, Member const& member) {
+    Place const place{segment.Number(), sharedFlag | segment.Check()};
+    std::shared_ptr<const Bytes> shared = cache_.Find(place);
+    if (shared == nullptr) {
+        shared = std::make_shared<const Bytes>(segment.DecompressShared(connection_.compressor));
+        cache_.Keep(place, shared);
+    }
+    if (member.sharedOffset > shared->size() || member.formSize > shared->size() - member.sharedOffset)
+        throw Malformed();
+    return {shared,
+            ByteView(*shared).subspan(static_cast<std::size_t>(member.sharedOffset),
+                                      static_cast<std::size_t>(member.formSize)),
+            shared->size()};
+}
+
+Form FormReader::FormAt(Place place) {
+    struct Step {
+        std::shared_ptr<const Segment> segment;
+        Member const& member;
+        Place place;
+    };
+    // Down to a form that is no difference or that is known, and back up.
+    std::vector<Step> steps;
+    Form form;
+    while (form.owner == nullptr) {
+        auto segment = SegmentAt(place.segment);
+        Member const& member = segment->At(place.member);
+        if (member.encoding == Encoding::Plain) {
+            form = {segment, member.own, segment->FormSize()};
+        } else if (member.encoding == Encoding::Shared) {
+            form = SharedForm(*segment, member);
+        } else if (auto const known = cache_.Find(place)) {
+            form = {known, *known, known->size()};
+        } else {
+            Place const base = segment->BaseOf(member);
+            steps.push_back({std::move(segment), member, place});
+            place = base;
+        }
+        if (steps.size() > mostSteps)
+            throw Malformed();
+    }
+    for (; !steps.empty(); steps.pop_back()) {
+        Step const& step = steps.back();
+        auto const made = std::make_shared<const Bytes>(ApplyDifference(
+            connection_.compressor, form.bytes, step.member.own, static_cast<std::size_t>(step.member.formSize)));
+        cache_.Keep(step.place, made);
+        form = {made, *made, made->size()};
+    }
+    return form;
+}
+
+std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
+    Query query(database, "SELECT type, segment, member FROM objects WHERE id=?");
+    if (!query.With(DigestOf(id)).Next())
+        return std::nullopt;
+    std::int64_t const type = query.Number(0);
+    if (type < 0 || type > static_cast<std::int64_t>(StoredType::LargeBlob))
+        database.Fail(SQLITE_CORRUPT);
+    return ObjectRow{static_cast<StoredType>(type),
+                     {static_cast<std::uint64_t>(query.Number(1)), static_cast<std::uint64_t>(query.Number(2))}};
+}
+
+std::vector<Id> SqliteStore::PiecesOf(FormReader& reader, ObjectRow const& row) {
+    Form const form = reader.FormAt(row.place);
+    std::vector<Id> pieces;
+    for (ByteReader digests(form.bytes); !digests.Rest().empty();) {
+        Id::Digest digest{};
+        ByteView const bytes = digests.Take(digest.size());
+        std::copy(bytes.begin(), bytes.end(), std::as_writable_bytes(std::span(digest)).begin());
+        pieces.push_back(Id::FromDigest(digest));
+    }
+    return pieces;
+}
+
+} // namespace KivArchive

@@ -1,0 +1,100 @@
+#include "sqlite/Lineage.h"
+
+#include "Changes.h"
+#include "CompactForms.h"
+
+namespace KivArchive {
+
+namespace {
+
+/// Beyond this, differences take more memory than is good.
+constexpr std::uint64_t largestDifferenced = 16 * largestWholeContent;
+/// A difference must be this many times smaller than the form.
+constexpr std::size_t worthwhile = 3;
+
+/// Goes from @p place back to the version of generation @p wanted, or the nearest before it.
+void FindStoredBase(Prepared& prepared, Place place, std::uint64_t wanted, FormReader& reader) {
+    auto segment = reader.SegmentAt(place.segment);
+    Member member = segment->At(place.member);
+    while (member.generation > wanted) {
+        place = segment->BaseOf(member);
+        segment = reader.SegmentAt(place.segment);
+        Member const base = segment->At(place.member);
+        if (base.generation >= member.generation)
+            throw Malformed();
+        member = base;
+    }
+    if (member.type != prepared.item->type || member.formSize > largestDifferenced)
+        return;
+    prepared.baseForm = reader.FormAt(place);
+    prepared.storedBase = place;
+}
+
+} // namespace
+
+void MakeForm(Prepared& prepared) {
+    Item const& item = *prepared.item;
+    ByteView const data = BytesOf(item.data);
+    prepared.form = data;
+    if (item.type == StoredType::Tree || item.type == StoredType::Commit) {
+        auto compact = item.type == StoredType::Tree ? CompactTree(data) : CompactCommit(data);
+        prepared.member.isCompact = compact.has_value();
+        if (compact) {
+            prepared.compact = std::move(*compact);
+            prepared.form = prepared.compact;
+        }
+    }
+    prepared.member.type = item.type;
+    prepared.member.size = item.size;
+    prepared.member.formSize = prepared.form.size();
+    prepared.member.encoding = Encoding::Shared;
+}
+
+void FindBase(Prepared& prepared, Prepared const* earlier, FormReader& reader, Database& database) {
+    // What is damaged is no base; reading tells.
+    try {
+        std::optional<Place> place;
+        std::optional<std::pair<Id, Place>> relied;
+        if (earlier == nullptr) {
+            auto const row = FindRow(database, prepared.item->earlier);
+            if (!row)
+                return;
+            place = row->place;
+            relied.emplace(prepared.item->earlier, row->place);
+        }
+        std::uint64_t const generation =
+            1 + (place ? reader.SegmentAt(place->segment)->At(place->member) : earlier->member).generation;
+        std::uint64_t const wanted = generation & (generation - 1);
+        while (!place && earlier->member.generation > wanted) {
+            place = earlier->storedBase;
+            relied = earlier->relied;
+            earlier = earlier->preparedBase;
+        }
+        if (place)
+            FindStoredBase(prepared, *place, wanted, reader);
+        else if (earlier->member.type == prepared.item->type)
+            prepared.baseForm = {std::make_shared<int>(), earlier->form, 0};
+        prepared.preparedBase = place ? nullptr : earlier;
+        prepared.relied = relied;
+        prepared.generation = generation;
+    } catch (Malformed const&) {
+        prepared.baseForm = {};
+    }
+}
+
+void MakeDifference(Prepared& prepared, Compressor& compressor) {
+    bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
+                         prepared.item->type != StoredType::Commit;
+    if (isTried && AppendDifference(compressor, prepared.baseForm.bytes, prepared.form,
+                                    prepared.form.size() / worthwhile, prepared.difference)) {
+        prepared.member.encoding = Encoding::Difference;
+        prepared.member.generation = prepared.generation;
+    } else {
+        prepared.preparedBase = nullptr;
+        prepared.storedBase.reset();
+        prepared.relied.reset();
+    }
+    prepared.baseForm = {};
+}
+
+} // namespace KivArchive

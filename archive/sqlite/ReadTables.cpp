@@ -1,0 +1,144 @@
+#include "AncestryWalk.h"
+#include "Changes.h"
+#include "sqlite/SqliteStore.h"
+#include "sqlite/Writer.h"
+
+#include <map>
+
+namespace KivArchive {
+
+namespace {
+
+/// The most bytes that SQLite can be asked to give rows for at once stays bounded, whatever a host asks for.
+constexpr std::size_t mostRows = 1U << 20U;
+
+Ancestry FactsOf(Database& database, Id const& id, Query const& row, int firstColumn) {
+    Ancestry facts{id, row.Identifier(firstColumn), row.Identifier(firstColumn + 1), {}};
+    Query contained(database, "SELECT how, other FROM contained WHERE id=?");
+    contained.With(id);
+    while (contained.Next()) {
+        std::int64_t const how = contained.Number(0);
+        if (how < 0 || how > static_cast<std::int64_t>(Containment::FoundEqual))
+            database.Fail(SQLITE_CORRUPT);
+        facts.contains.push_back({static_cast<Containment>(how), contained.Identifier(1)});
+    }
+    return facts;
+}
+
+std::optional<Ancestry> FindFacts(Database& database, Id const& id) {
+    Query query(database, "SELECT parent, tree FROM ancestry WHERE id=?");
+    if (!query.With(DigestOf(id)).Next())
+        return std::nullopt;
+    return FactsOf(database, id, query, 0);
+}
+
+Buffer BufferOf(ByteView bytes) {
+    Buffer buffer;
+    buffer.Append(bytes.data(), bytes.size());
+    return buffer;
+}
+
+std::int64_t LimitOf(std::size_t limit) noexcept {
+    return static_cast<std::int64_t>(std::min(limit, mostRows));
+}
+
+} // namespace
+
+std::vector<Branch> SqliteArchive::ReadBranches() {
+    SqliteStore::Lease const connection(*store_);
+    // UTF-8 and UTF-16 order characters beyond U+FFFF differently.
+    std::map<KivStringT<char16_t>, Id> heads;
+    for (Query query(connection->database, "SELECT name, head FROM branches"); query.Next();)
+        heads.emplace(NameOfBytes(query.Blob(0)), query.Identifier(1));
+    std::vector<Branch> branches;
+    branches.reserve(heads.size());
+    for (auto const& [name, head] : heads)
+        branches.push_back({name, head});
+    return branches;
+}
+
+std::vector<Record> SqliteArchive::ReadRecords(std::span<const KivStringT<char16_t>> names) {
+    SqliteStore::Lease const connection(*store_);
+    Transaction transaction(connection->database, Transaction::Kind::Read);
+    std::map<KivStringT<char16_t>, Buffer> values;
+    for (auto const& name : names) {
+        Bytes const bytes = BytesOfName(name);
+        Query query(connection->database, "SELECT value FROM records WHERE name=?");
+        if (query.With(bytes).Next())
+            values.emplace(name, BufferOf(query.Blob(0)));
+    }
+    transaction.Commit();
+    std::vector<Record> records;
+    records.reserve(values.size());
+    for (auto const& [name, value] : values)
+        records.push_back({name, value});
+    return records;
+}
+
+std::vector<KivStringT<char16_t>> SqliteArchive::ListRecords() {
+    SqliteStore::Lease const connection(*store_);
+    std::vector<KivStringT<char16_t>> names;
+    for (Query query(connection->database, "SELECT name FROM records"); query.Next();)
+        names.push_back(NameOfBytes(query.Blob(0)));
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+std::vector<Ancestry> SqliteArchive::ReadAncestry(std::span<const Id> commits, Follow follow, std::size_t more) {
+    SqliteStore::Lease const connection(*store_);
+    Transaction transaction(connection->database, Transaction::Kind::Read);
+    auto walked =
+        WalkAncestry(commits, follow, more, [&](Id const& id) { return FindFacts(connection->database, id); });
+    transaction.Commit();
+    return walked;
+}
+
+std::vector<Ancestry> SqliteArchive::ListAncestry(Id const& after, std::size_t limit) {
+    SqliteStore::Lease const connection(*store_);
+    Transaction transaction(connection->database, Transaction::Kind::Read);
+    std::vector<Ancestry> listed;
+    Query query(connection->database, "SELECT id, parent, tree FROM ancestry WHERE id>? ORDER BY id LIMIT ?");
+    query.With(after).With(LimitOf(limit));
+    while (query.Next())
+        listed.push_back(FactsOf(connection->database, query.Identifier(0), query, 1));
+    return listed;
+}
+
+std::vector<ObjectInfo> SqliteArchive::ListObjects(Id const& after, std::size_t limit) {
+    SqliteStore::Lease const connection(*store_);
+    Transaction transaction(connection->database, Transaction::Kind::Read);
+    std::vector<Id> ids;
+    Query query(connection->database, "SELECT id FROM objects WHERE id>? AND type<>3 ORDER BY id LIMIT ?");
+    query.With(after).With(LimitOf(limit));
+    while (query.Next())
+        ids.push_back(query.Identifier(0));
+    return DescribeRows(*connection, store_->cache, ids, true);
+}
+
+ArchiveStatistics SqliteArchive::GetStatistics() {
+    SqliteStore::Lease const connection(*store_);
+    Database& database = connection->database;
+    Transaction transaction(database, Transaction::Kind::Read);
+    ArchiveStatistics statistics;
+    for (Query query(database, "SELECT type, count(*) FROM objects GROUP BY type"); query.Next();) {
+        auto const type = static_cast<StoredType>(query.Number(0));
+        auto const count = static_cast<std::uint64_t>(query.Number(1));
+        if (type == StoredType::Blob || type == StoredType::LargeBlob)
+            statistics.blobs += count;
+        else if (type == StoredType::Tree)
+            statistics.trees = count;
+        else if (type == StoredType::Commit)
+            statistics.commits = count;
+    }
+    auto const ask = [&database](const char* sql) { return static_cast<std::uint64_t>(database.Ask(sql)); };
+    statistics.ancestries = ask("SELECT count(*) FROM ancestry");
+    statistics.branches = ask("SELECT count(*) FROM branches");
+    statistics.records = ask("SELECT count(*) FROM records");
+    statistics.marked = ask("SELECT count(*) FROM marks JOIN objects USING(id) WHERE type<>3");
+    std::uint64_t const pageSize = ask("PRAGMA page_size");
+    statistics.bytes = ask("PRAGMA page_count") * pageSize;
+    statistics.unusedBytes = ask("PRAGMA freelist_count") * pageSize;
+    return statistics;
+}
+
+} // namespace KivArchive

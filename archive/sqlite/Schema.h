@@ -1,0 +1,14 @@
+#pragma once
+
+/// @file
+/// The tables of an archive's file.
+
+#include "sqlite/Database.h"
+
+namespace KivArchive {
+
+/// Makes the tables if the file is empty and @p make is set. Refuses every file that does not have exactly them.
+/// @throws ArchiveError
+void EnsureSchema(Database& database, bool make);
+
+} // namespace KivArchive

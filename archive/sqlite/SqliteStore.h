@@ -1,0 +1,142 @@
+#pragma once
+
+/// @file
+/// What the operations of `SqliteArchive` share.
+
+#include "KivArchive/SqliteArchive.h"
+#include "Segment.h"
+#include "sqlite/Database.h"
+
+#include <list>
+#include <map>
+#include <mutex>
+
+namespace KivArchive {
+
+/// A stored form, and what keeps its bytes.
+struct Form {
+    std::shared_ptr<const void> owner;
+    ByteView bytes;
+    /// How many bytes the owner keeps.
+    std::uint64_t held = 0;
+};
+
+/// The forms that were made last, up to a number of bytes, for those that are differences to them. Any number of
+/// threads may use it.
+class FormCache {
+public:
+    explicit FormCache(std::uint64_t budget) noexcept : budget_(budget) {}
+
+    /// Null if it is not there.
+    [[nodiscard]] std::shared_ptr<const Bytes> Find(Place const& place);
+    void Keep(Place const& place, std::shared_ptr<const Bytes> const& form);
+
+private:
+    struct Entry {
+        Place place;
+        std::shared_ptr<const Bytes> form;
+    };
+
+    std::mutex mutex_;
+    std::uint64_t budget_;
+    std::uint64_t size_ = 0;
+    std::list<Entry> newestFirst_;
+    std::map<Place, std::list<Entry>::iterator> entries_;
+};
+
+struct Connection {
+    Connection(std::string const& path, Database::Access access, std::chrono::milliseconds wait)
+        : database(path, access, wait) {}
+
+    Database database;
+    Compressor compressor;
+};
+
+/// Reads stored forms within one transaction.
+class FormReader {
+public:
+    FormReader(Connection& connection, FormCache& cache) : connection_(connection), cache_(cache) {}
+
+    /// @throws Malformed if there is no such segment
+    [[nodiscard]] std::shared_ptr<const Segment> SegmentAt(std::uint64_t number);
+    /// The stored form of a member, whatever it is a difference to. @throws Malformed
+    [[nodiscard]] Form FormAt(Place place);
+
+private:
+    [[nodiscard]] Form SharedForm(Segment const& segment, Member const& member);
+
+    Connection& connection_;
+    FormCache& cache_;
+    std::map<std::uint64_t, std::shared_ptr<const Segment>> segments_;
+    std::uint64_t held_ = 0;
+};
+
+/// What the table of objects tells.
+struct ObjectRow {
+    StoredType type = StoredType::Blob;
+    Place place;
+};
+
+/// The row of @p id; none if it is not there.
+[[nodiscard]] std::optional<ObjectRow> FindRow(Database& database, Id const& id);
+
+/// Something to be stored: an object, or a piece of a content.
+struct Item {
+    Id id;
+    StoredType type = StoredType::Blob;
+    /// The size of the data that it is, or stands for.
+    std::uint64_t size = 0;
+    Buffer data;
+    Id earlier;
+};
+
+/// What is behind one `SqliteArchive`.
+class SqliteStore {
+public:
+    SqliteStore(std::string path, SqliteOptions const& options);
+
+    /// A connection for the time of a call.
+    class Lease {
+    public:
+        explicit Lease(SqliteStore& store) : store_(store), connection_(store.Take()) {}
+        Lease(Lease const&) = delete;
+        Lease& operator=(Lease const&) = delete;
+        ~Lease() { store_.GiveBack(std::move(connection_)); }
+
+        Connection& operator*() const noexcept { return *connection_; }
+        Connection* operator->() const noexcept { return connection_.get(); }
+
+    private:
+        SqliteStore& store_;
+        std::unique_ptr<Connection> connection_;
+    };
+
+    [[nodiscard]] std::unique_ptr<Connection> Take();
+    void GiveBack(std::unique_ptr<Connection> connection) noexcept;
+
+    /// Stores @p items with the rest of @p change, which has no objects of its own.
+    [[nodiscard]] ChangeOutcome Store(std::vector<Item> const& items, Change const& change);
+
+    /// The digests of the pieces of a large content.
+    [[nodiscard]] static std::vector<Id> PiecesOf(FormReader& reader, ObjectRow const& row);
+
+    [[noreturn]] void ThrowDamaged(std::string const& what) const;
+
+    std::string path;
+    SqliteOptions options;
+    FormCache cache;
+    /// Writers of one process take turns here rather than by the file's lock, for which they would sleep.
+    std::mutex writing;
+    std::mutex connectionsMutex;
+    std::vector<std::unique_ptr<Connection>> connections;
+};
+
+/// Types and sizes of those of @p ids that are objects and readable, in this order; of all that are objects, those that
+/// are not with size 0, if @p all is set.
+[[nodiscard]] std::vector<ObjectInfo> DescribeRows(Connection& connection, FormCache& cache, std::span<const Id> ids,
+                                                   bool all);
+
+/// The time of marks: seconds since 1970.
+[[nodiscard]] std::int64_t SecondsNow();
+
+} // namespace KivArchive

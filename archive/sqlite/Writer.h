@@ -1,0 +1,42 @@
+#pragma once
+
+/// @file
+/// The statements of a transaction that stores.
+
+#include "sqlite/SqliteStore.h"
+
+namespace KivArchive {
+
+/// Writes within one transaction of a connection.
+class Writer {
+public:
+    explicit Writer(Database& database);
+
+    /// Whether branches and records are as @p change expects them.
+    [[nodiscard]] ChangeOutcome Compare(Change const& change);
+    /// Takes the mark of an object away. @return false if the object is not there
+    bool Use(Id const& id);
+    [[nodiscard]] bool IsAt(Id const& id, Place const& place);
+
+    /// The number of the first segment to be added. They are never used twice.
+    [[nodiscard]] std::uint64_t NextSegment();
+    void AddSegment(std::uint64_t number, ByteView form);
+    /// The first one of an identifier stays, and another one's place is left to be cleared.
+    void AddObject(Id const& id, StoredType type, Place const& place);
+    void AddDependency(std::uint64_t base, std::uint64_t segment);
+
+    /// Facts, branches and records, and what is relied on. @throws ArchiveError of kind `Collected`
+    void Write(Change const& change);
+
+private:
+    void WriteAncestry(std::vector<Ancestry> const& ancestry);
+
+    Database& database_;
+    bool hasMarks_;
+};
+
+/// The bytes that names are stored as, and the name that they stand for.
+[[nodiscard]] Bytes BytesOfName(KivStringT<char16_t> const& name);
+[[nodiscard]] KivStringT<char16_t> NameOfBytes(ByteView bytes);
+
+} // namespace KivArchive

@@ -1,0 +1,75 @@
+#pragma once
+
+/// @file
+/// An archive in one SQLite database file.
+
+#include "KivArchive/IArchive.h"
+
+#include <memory>
+#include <string>
+
+namespace KivArchive {
+
+class SqliteStore;
+
+struct SqliteOptions {
+    /// Whether to make the file, for its owner alone to read and write, if there is none.
+    bool create = true;
+    /// How long to wait while somebody else writes.
+    std::chrono::milliseconds wait{30000};
+    /// How many threads one call may use for compressing; 0 stands for as many as there are processors.
+    unsigned workers = 0;
+    /// About how much memory to keep stored forms in that differences refer to.
+    std::uint64_t cacheBytes = std::uint64_t{32} * 1024 * 1024;
+};
+
+/// An archive in one file, beside which SQLite keeps its write-ahead log while the file is open (names ending in "-wal"
+/// and "-shm"). docs/archive.md describes the schema and the stored forms.
+///
+/// Durable: what a call has stored when it returns outlives a crash and a power failure, as far as the disk keeps its
+/// promises. Several processes may use one file on one machine, not over a network file system. Readers and a writer do
+/// not wait for each other; writers take turns, each for as long as one transaction is written.
+///
+/// A file that is not exactly of this library's schema is refused before anything in it is used; triggers and views in
+/// it never run. Whatever its pages hold is bounded, checked and verified when it is read.
+class KIVARCHIVE_EXPORT SqliteArchive final : public IArchive {
+public:
+    /// Opens the file, or makes it.
+    /// @param path in the encoding of the file system
+    /// @throws ArchiveError of kind `Foreign` or `NewerFormat` if it is not an archive that this release can use, of
+    /// kind `Unavailable` if there is none and none is to be made, and as everything else
+    explicit SqliteArchive(std::string const& path, SqliteOptions const& options = {});
+    SqliteArchive(SqliteArchive const&) = delete;
+    SqliteArchive& operator=(SqliteArchive const&) = delete;
+    /// @pre no call is running
+    ~SqliteArchive() override;
+
+    [[nodiscard]] std::vector<Id> FindMissing(std::span<const Id> ids) override;
+    [[nodiscard]] std::vector<ObjectInfo> Describe(std::span<const Id> ids) override;
+    ReadOutcome Read(std::span<const Id> ids, ObjectReceiver const& receiver) override;
+    [[nodiscard]] std::optional<Buffer> ReadContent(Id const& id, std::uint64_t offset, std::uint64_t size) override;
+    bool StoreContent(Id const& id, StreamIO& content, Id const& earlier, IProgress* progress) override;
+    ChangeOutcome Apply(Change const& change) override;
+    [[nodiscard]] std::vector<Branch> ReadBranches() override;
+    [[nodiscard]] std::vector<Record> ReadRecords(std::span<const KivStringT<char16_t>> names) override;
+    [[nodiscard]] std::vector<KivStringT<char16_t>> ListRecords() override;
+    [[nodiscard]] std::vector<Ancestry> ReadAncestry(std::span<const Id> commits, Follow follow,
+                                                     std::size_t more) override;
+    [[nodiscard]] std::vector<Ancestry> ListAncestry(Id const& after, std::size_t limit) override;
+    [[nodiscard]] std::vector<ObjectInfo> ListObjects(Id const& after, std::size_t limit) override;
+    void Mark(std::span<const Id> ids) override;
+    void Unmark(std::span<const Id> ids) override;
+    [[nodiscard]] std::vector<Id> ListMarked(std::chrono::seconds grace, Id const& after, std::size_t limit) override;
+    std::vector<Id> Remove(std::span<const Id> ids, std::chrono::seconds grace) override;
+    std::uint64_t Compact(std::uint64_t bytes) override;
+    [[nodiscard]] ArchiveStatistics GetStatistics() override;
+
+    /// Copies the archive as it is at one moment to a new file, while others go on reading and writing.
+    /// @throws ArchiveError, `Unavailable` if @p path exists; nothing is left there after a failure
+    void Backup(std::string const& path, IProgress* progress);
+
+private:
+    std::unique_ptr<SqliteStore> store_;
+};
+
+} // namespace KivArchive
