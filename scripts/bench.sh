@@ -3,9 +3,9 @@
 #        scripts/bench.sh --check [--update]
 # Installs what is missing, builds the benchmarks and runs those whose names match FILTER, each workload and its floor in
 # turn, and prints one table with the medians over seven rounds; build/bench/result.json holds the numbers. --quick runs a
-# quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws docs/performance.svg.
+# quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws build/bench/performance.svg.
 # --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
-# tells by over 5 %; --update writes that file. docs/performance.md says what is measured.
+# says by over 5 %; --update writes that file. docs/performance.md says what is measured.
 
 . "$(dirname "$0")/lib.sh"
 
@@ -58,7 +58,7 @@ case $mode in
 --plot)
     install_packages plot
     measure growth "${1:-.}"
-    /usr/bin/python3 "$source_directory/bench/plot.py" "$result" "$source_directory/docs/performance.svg"
+    /usr/bin/python3 "$source_directory/bench/plot.py" "$result" "$build_directory/performance.svg"
     ;;
 *) measure whole "${1:-.}" ;;
 esac
