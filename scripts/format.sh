@@ -11,4 +11,4 @@ esac
 
 install_packages lint
 cd "$source_directory"
-find include src archive tests examples bench fuzz docs/snippets \( -name '*.h' -o -name '*.cpp' \) -print0 | xargs -0 clang-format-16 "${mode[@]}"
+find include src archive bindings tests examples bench fuzz docs/snippets \( -name '*.h' -o -name '*.cpp' \) -print0 | xargs -0 clang-format-16 "${mode[@]}"

@@ -63,6 +63,8 @@ packages_of() {
     x86) echo g++-i686-linux-gnu ;;
     aarch64) echo g++-aarch64-linux-gnu qemu-user ;;
     s390x) echo g++-s390x-linux-gnu qemu-user ;;
+    wasm) echo emscripten nodejs ;;
+    browser) echo chromium ;;
     windows) echo g++-mingw-w64-x86-64-posix wine wine64 ;;
     *) die "there is no package set '$1'" ;;
     esac
@@ -88,6 +90,9 @@ install_packages() {
 
 build_preset() {
     build_directory=$build_root/$1
+    case $1 in
+    wasm | js) export NODE_PATH=/usr/share/nodejs ;;
+    esac
     quietly cmake -S "$source_directory" --preset "$1" -B "$build_directory" || die "configuring '$1' failed"
     local build=(cmake --build "$build_directory" --parallel "$jobs")
     # On a terminal the build tool keeps to one line, which shows how far it is.

@@ -2,9 +2,11 @@
 # usage: scripts/portability.sh [PLATFORM...]
 # Installs what is missing, then builds the library and its tests for each platform and runs them: x86-64 (once in each of
 # four time zones), libcxx (clang with libc++ instead of libstdc++), x86, aarch64 and s390x (emulated), and windows (a DLL,
-# run by wine). All platforms without arguments.
+# run by wine), and wasm (WebAssembly, run by node). All platforms without arguments.
 # The identifiers that the tests expect are first compared with those which a script computes by other means. libcxx and x86
 # run the full tests, the others the quick ones.
+# wasm then prints, and fails beyond these, the size of the README's first program (250,000 bytes, 90,000 compressed) and what
+# the speed of kivvcs_speed is to that of the native build (4 times its time; twice for hashing).
 
 . "$(dirname "$0")/lib.sh"
 
@@ -19,9 +21,37 @@ compare_expected_identifiers() {
     done <<<"$expected"
 }
 
+# Fails where VALUE is more than LIMIT.
+report() {
+    local name=$1 value=$2 limit=$3 unit=$4
+    printf '%-28s %10s %s, at most %s\n' "$name" "$value" "$unit" "$limit"
+    awk -v value="$value" -v limit="$limit" 'BEGIN { exit !(value <= limit) }' || die "$name: $value is more than $limit"
+}
+
+report_sizes() {
+    local program=$build_directory/examples/first_program.wasm
+    [ "$(node --no-experimental-fetch "${program%wasm}js")" = 'docs/intro.txt changed' ] ||
+        die "the first program does not print what the README says"
+    report 'first program' "$(stat -c %s "$program")" 250000 bytes
+    report 'first program, compressed' "$(gzip -9 <"$program" | wc -c)" 90000 bytes
+}
+
+report_speed() {
+    local here there name value unit reference
+    there=$(node --no-experimental-fetch "$build_directory/bench/kivvcs_speed.js")
+    build_preset bench
+    here=$("$build_directory/bench/kivvcs_speed")
+    while read -r name value unit; do
+        reference=$(awk -v name="$name" '$1 == name { print $2 }' <<<"$here")
+        printf '%-28s %10s %s, natively %s\n' "$name" "$value" "$unit" "$reference"
+        report "$name" "$(awk -v a="$value" -v b="$reference" 'BEGIN { printf "%.2f", a / b }')" \
+            "$([ "$name" = hash ] && echo 2 || echo 4)" 'times the native time'
+    done <<<"$there"
+}
+
 install_packages build vault portability
 compare_expected_identifiers
-[ $# -gt 0 ] || set -- x86-64 libcxx x86 aarch64 s390x windows
+[ $# -gt 0 ] || set -- x86-64 libcxx x86 aarch64 s390x windows wasm
 for platform in "$@"; do
     printf '%s:\n' "$platform"
     install_packages "$platform"
@@ -50,6 +80,14 @@ for platform in "$@"; do
         wineserver --persistent
         quietly wine cmd /c exit
         run_tests quick
+        ;;
+    wasm)
+        install_packages bench
+        build_preset wasm
+        # Zones cannot be chosen; the one of the machine is the only one.
+        run_tests quick --exclude-regex KnowsTheLocalOffset
+        report_sizes
+        report_speed
         ;;
     *) usage 1 ;;
     esac
