@@ -58,6 +58,40 @@ TEST_F(Commits, HaveTheIdentifiersThatAnIndependentScriptComputes) {
     EXPECT_EQ(Bytes(Commit().GetData()), "tree \nauthor  <> 0 +0000\ncommitter  <> 0 +0000\n\n\n");
 }
 
+/// The examples of docs/formats.md. Their identifiers come from sha256sum.
+TEST_F(Commits, ThePackedFormsThatAreDocumentedAreExact) {
+    using namespace std::string_literals;
+    const std::string hello = "8aec4e4876f854f688d0ebfc8f37598f38e5fd6903cccc850ca36591175aeb60";
+    const std::string empty = "473a0f4c3be8a93681a267e3b1e9a7dcda1185436fe141f7749120a303721813";
+    const std::string directory = "b117f1534d71e974e052d4dfed4b624681f38c7f9308e72d80f5696f97ee1f72";
+    const std::string files = "4792f1fea516f48f7819b493f97f80ba6411780d1ed90cc3f7073affebc91587";
+    const std::string first = "78a3d5382550bb4805422f70e95b494fbdcd83289ed57853738f46471c82bb33";
+    Commit one = Signed(nullptr, u"Ada", u"ada@example.org", 1'700'000'000, 60, u"Start");
+    one.AddBlob(&repo, u"d/\u00e9.txt", Blob());
+    one.AddBlob(&repo, u"a.txt", MakeBlob("hello"));
+    Commit two = Signed(immu::make<Commit>(one), u"Ada", u"ada@example.org", 1'700'003'600, -330, u"Keep d");
+    two.ReplaceRoot(&repo, one.GetCommitTree()->GetTree(u"d"));
+    const auto root = one.GetCommitTree()->GetRoot();
+    const Tree none;
+    const std::string ada = "Ada <ada@example.org> ";
+    const std::tuple<Object const&, std::string, std::string> examples[] = {
+        {*one.GetBlob(u"d/\u00e9.txt"), empty, "blob 0\0"s},
+        {*one.GetBlob(u"a.txt"), hello, "blob 5\0hello"s},
+        {none, "6ef19b41225c5369f1c104d45d8d85efa9b057b53b14b4b9b939dd74decc5321", "tree 0\0"s},
+        {*root->GetLocalTree(u"d"), directory, "tree 83\0"s + "100644 blob \303\251.txt\0"s + empty},
+        {*root, files, "tree 159\0"s + "100644 blob a.txt\0"s + hello + "40000 tree d\0"s + directory},
+        {one, first,
+         "commit 172\0tree "s + files + "\nauthor " + ada + "1700000000 +0100\ncommitter " + ada +
+             "1700000000 +0100\n\nStart\n"},
+        {two, "f2212c3c905dfd34b2ce7ccdc9d6975843cc2b072b28b13a8479e34c4e8f6172",
+         "commit 245\0tree "s + directory + "\nparent " + first + "\nauthor " + ada + "1700003600 -0530\ncommitter " +
+             ada + "1700003600 -0530\n\nKeep d\n"}};
+    for (auto const& [object, id, packedForm] : examples) {
+        EXPECT_EQ(Bytes(object.GetPackedData()), packedForm);
+        EXPECT_EQ(IdText(object), id);
+    }
+}
+
 TEST_F(Commits, SignaturesTellSecondsIn32BitsAndTheOffsetInHoursAndMinutes) {
     const struct {
         std::int64_t seconds, minutes;

@@ -59,52 +59,16 @@ private:
     Countdown* countdown_;
 };
 
+/// Most of what a repository does asks its storage; the rest is counted here.
 class InterruptingRepository : public Repository {
-    using Name = KivStringViewT<char16_t>;
-
 public:
     InterruptingRepository(std::unique_ptr<IObjectsStorage>&& storage, Countdown& countdown)
         : Repository(std::move(storage)), countdown_(&countdown) {}
 
-    cow_ptr<Commit> DoCommit(Commit& commit) override { return Counted().Repository::DoCommit(commit); }
-    cow_ptr<Commit> GetHead() const override { return Counted().Repository::GetHead(); }
-    cow_ptr<Commit> GetHead(Name branch) const override { return Counted().Repository::GetHead(branch); }
-    KivStringT<char16_t> GetCurentBranch() const override { return Counted().Repository::GetCurentBranch(); }
-    cow_ptr<Commit> GetCommitFromStorage(Id const& id) const override {
-        return Counted().Repository::GetCommitFromStorage(id);
-    }
-    cow_ptr<Tree> GetTreeFromStorage(Id const& id) const override {
-        return Counted().Repository::GetTreeFromStorage(id);
-    }
-    cow_ptr<Blob> GetBlobFromStorage(Id const& id) const override {
-        return Counted().Repository::GetBlobFromStorage(id);
-    }
-    cow_ptr<Commit> SyncWithStorage(cow_ptr<Commit> commit) override {
-        return Counted().Repository::SyncWithStorage(std::move(commit));
-    }
-    cow_ptr<Tree> SyncWithStorage(cow_ptr<Tree> tree) override {
-        return Counted().Repository::SyncWithStorage(std::move(tree));
-    }
-    cow_ptr<Blob> SyncWithStorage(cow_ptr<Blob> blob) override {
-        return Counted().Repository::SyncWithStorage(std::move(blob));
-    }
-    void UpdateStorage() override { Counted().Repository::UpdateStorage(); }
     cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const override {
         return Counted().Repository::GetCommonBase(std::move(first), std::move(second));
     }
-    bool BranchExist(Name branch) override { return Counted().Repository::BranchExist(branch); }
-    bool CreateBranch(Name branch, cow_ptr<Commit> head) override {
-        return Counted().Repository::CreateBranch(branch, std::move(head));
-    }
-    bool MoveBranchTo(Name branch, cow_ptr<Commit> commit) override {
-        return Counted().Repository::MoveBranchTo(branch, std::move(commit));
-    }
-    bool FastForwardMerge(cow_ptr<Commit> commit) override {
-        return Counted().Repository::FastForwardMerge(std::move(commit));
-    }
-    bool Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) override {
-        return Counted().Repository::Merge3Way(std::move(commit), std::move(resolvers));
-    }
+    void UpdateStorage() override { Counted().Repository::UpdateStorage(); }
 
 private:
     InterruptingRepository const& Counted() const { return countdown_->Count(), *this; }
