@@ -96,6 +96,9 @@ public:
     [[nodiscard]] const C* GetString() const noexcept { return text_ == nullptr ? &terminator : Characters(); }
     operator const C*() const noexcept { return GetString(); }
 
+    /// Whether both are copies of one text, so that they are equal without a look at the characters.
+    [[nodiscard]] bool IsSharedWith(KivStringT const& other) const noexcept { return text_ == other.text_; }
+
     /// @pre 0 <= @p index <= GetLength(); the terminating NUL is at GetLength().
     [[nodiscard]] C operator[](int index) const noexcept { return GetString()[index]; }
     [[nodiscard]] C GetAt(int index) const noexcept { return GetString()[index]; }

@@ -13,6 +13,10 @@ namespace KivVcs {
 class IRepository;
 class Tree;
 
+namespace detail {
+struct TreeAccess;
+}
+
 /// Paths, relative to the tree that was asked, their components joined by "/", without a leading or trailing one.
 using PathList = std::vector<KivStringT<char16_t>>;
 
@@ -137,12 +141,20 @@ protected:
     [[nodiscard]] Id ComputeId() const override;
 
 private:
-    friend class detail::TableRelease;
-    friend struct detail::TableAccess;
+    friend struct detail::TreeAccess;
 
-    template <class T>
-    cow_ptr<T> SetLocalObject(IRepository& repo, KivStringViewT<char16_t> name, T const& object);
-    void SetLocalTree(IRepository& repo, KivStringViewT<char16_t> name, cow_ptr<Tree> tree);
+    using PathComponentsView = array_view<KivStringViewT<char16_t> const>;
+
+    /// Makes the storage's instance of @p object the entry @p name, which a new entry shares as @p text, and returns it;
+    /// null, doing nothing, for an empty name. @p own gives what is stored if the storage has none.
+    template <class T, class Own>
+    cow_ptr<T> SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own,
+                        KivStringT<char16_t> const* text = nullptr);
+    void EraseLocal(KivStringViewT<char16_t> name);
+    /// Private copies of the trees along @p names, new ones where there is none.
+    [[nodiscard]] std::vector<cow_ptr<Tree>> CopyWay(PathComponentsView names) const;
+    /// Stores the copies and enters them, from the bottom up; removes them instead where they are empty, if @p prunes.
+    void PutWayBack(IRepository* repo, PathComponentsView names, std::vector<cow_ptr<Tree>> way, bool prunes);
 
     detail::EntryTable entries_;
     detail::Published<Buffer> data_;

@@ -1,24 +1,30 @@
 #include "KivVcs/Tree.h"
 
-#include "KivVcs/IRepository.h"
 #include "objects/PathComponents.h"
-#include "tree/TableNode.h"
+#include "tree/Node.h"
+#include "tree/StoredInstance.h"
 
 namespace KivVcs {
 
-using detail::FindEntry;
+using detail::Held;
 
 namespace {
 
 using Components = array_view<KivStringViewT<char16_t> const>;
 
-/// How a repository looks up the objects of a kind.
-cow_ptr<Blob> FindStored(IRepository& repo, Id const& id, Blob const*) {
-    return repo.GetBlobFromStorage(id);
+Tree const* SubtreeOf(Tree const& tree, KivStringViewT<char16_t> name) noexcept {
+    Held const* const held = detail::TreeAccess::Find(tree, name);
+    return held == nullptr ? nullptr : held->GetTree();
 }
 
-cow_ptr<Tree> FindStored(IRepository& repo, Id const& id, Tree const*) {
-    return repo.GetTreeFromStorage(id);
+/// The tree below @p tree in which the last of @p components is looked up; null if there is none.
+Tree const* HolderOf(Tree const& tree, Components components) noexcept {
+    if (components.empty())
+        return nullptr;
+    Tree const* holder = &tree;
+    for (std::size_t level = 0; holder != nullptr && level + 1 < components.size(); ++level)
+        holder = SubtreeOf(*holder, components[level]);
+    return holder;
 }
 
 } // namespace
@@ -46,79 +52,75 @@ void Tree::ResetState() {
 }
 
 bool Tree::IsEmpty() const noexcept {
-    return entries_.Root() == nullptr;
+    return !entries_.Top();
 }
 
 std::uint64_t Tree::GetLocalObjectCount() const noexcept {
-    return IsEmpty() ? 0 : entries_.Root()->ElementCount();
+    return IsEmpty() ? 0 : entries_.Top()->Total().Objects();
 }
 
 std::uint64_t Tree::GetLocalBlobCount() const noexcept {
-    return IsEmpty() ? 0 : entries_.Root()->Total().blobs;
+    return IsEmpty() ? 0 : entries_.Top()->Total().blobs;
 }
 
-template <class T>
-cow_ptr<T> Tree::SetLocalObject(IRepository& repo, KivStringViewT<char16_t> name, T const& object) {
+template <class T, class Own>
+cow_ptr<T> Tree::SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own,
+                          KivStringT<char16_t> const* text) {
     if (name.IsEmpty())
         return nullptr;
-    cow_ptr<T> stored = FindStored(repo, object.GetId(), &object);
-    if (!stored)
-        stored = immu::make<T>(object);
-    stored = repo.SyncWithStorage(std::move(stored));
-    entries_.Set(name, stored);
+    cow_ptr<T> stored = StoredInstance(repo, object, own);
+    entries_.Set(name, stored, text);
     ResetState();
     return stored;
 }
 
 template <class T>
-void detail::TableAccess::AddRead(Tree& tree, IRepository& repo, KivStringT<char16_t> const& name, cow_ptr<T> object) {
-    if (name.IsEmpty() || name.Find(u"/") >= 0) {
+void detail::TreeAccess::AddRead(Tree& tree, IRepository& repo, KivStringT<char16_t> const& name, cow_ptr<T> object) {
+    if (name.Find(u"/") >= 0) {
         tree.AddObjectToTree<T>(&repo, PathComponents(name), *object);
         return;
     }
     // Only the caller knows of an object that nobody else holds, so that it needs no copy.
-    cow_ptr<T> stored = FindStored(repo, object->GetId(), object.get());
-    if (!stored)
-        stored = object.use_count() == 1 ? std::move(object) : immu::make<T>(*object);
-    tree.entries_.Set(name, repo.SyncWithStorage(std::move(stored)));
-    tree.ResetState();
+    const auto own = [&object] { return object.use_count() == 1 ? std::move(object) : immu::make<T>(*object); };
+    tree.SetLocal(repo, name, *object, own, &name);
 }
 
-template void detail::TableAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Blob>);
-template void detail::TableAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Tree>);
+template void detail::TreeAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Blob>);
+template void detail::TreeAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Tree>);
 
-void Tree::SetLocalTree(IRepository& repo, KivStringViewT<char16_t> name, cow_ptr<Tree> tree) {
-    if (name.IsEmpty())
-        return;
-    cow_ptr<Tree> stored = repo.GetTreeFromStorage(tree->GetId());
-    entries_.Set(name, repo.SyncWithStorage(stored ? std::move(stored) : std::move(tree)));
-    ResetState();
+std::vector<cow_ptr<Tree>> Tree::CopyWay(Components names) const {
+    std::vector<cow_ptr<Tree>> way(names.size());
+    Tree const* above = this;
+    for (std::size_t level = 0; level < way.size(); ++level) {
+        above = above == nullptr ? nullptr : SubtreeOf(*above, names[level]);
+        Tree* const copy = way[level].write();
+        if (above != nullptr)
+            copy->entries_ = above->entries_;
+    }
+    return way;
+}
+
+void Tree::PutWayBack(IRepository* repo, Components names, std::vector<cow_ptr<Tree>> way, bool prunes) {
+    for (std::size_t level = way.size(); level-- > 0;) {
+        Tree& parent = level == 0 ? *this : *way[level - 1].write();
+        cow_ptr<Tree>& tree = way[level];
+        if (prunes && tree->IsEmpty())
+            parent.EraseLocal(names[level]);
+        else if (repo != nullptr)
+            parent.SetLocal(*repo, names[level], *tree, [&tree] { return std::move(tree); });
+    }
 }
 
 template <class T>
 cow_ptr<T> Tree::AddObjectToTree(IRepository* repo, Components components, T const& object) {
     if (components.empty() || repo == nullptr)
         return nullptr;
-    if (components.size() == 1)
-        return SetLocalObject(*repo, components[0], object);
-
-    // Private copies of the trees below this one on the way; what is missing becomes a new tree.
-    std::vector<cow_ptr<Tree>> way(components.size() - 1);
-    Tree const* above = this;
-    for (std::size_t level = 0; level < way.size(); ++level) {
-        detail::Entry const* const entry =
-            above == nullptr ? nullptr : FindEntry(above->entries_.Root(), components[level], true);
-        above = entry == nullptr ? nullptr : entry->TreeChild();
-        Tree* const copy = way[level].write();
-        if (above != nullptr)
-            copy->entries_ = above->entries_;
-    }
-    cow_ptr<T> result = way.back().write()->SetLocalObject(*repo, components.back(), object);
-    for (std::size_t level = way.size(); level-- > 0;) {
-        Tree& parent = level == 0 ? *this : *way[level - 1].write();
-        parent.SetLocalTree(*repo, components[level], std::move(way[level]));
-    }
-    return result;
+    const auto leading = components.first(components.size() - 1);
+    std::vector<cow_ptr<Tree>> way = CopyWay(leading);
+    Tree& holder = way.empty() ? *this : *way.back().write();
+    cow_ptr<T> added = holder.SetLocal(*repo, components.back(), object, [&object] { return immu::make<T>(object); });
+    PutWayBack(repo, leading, std::move(way), false);
+    return added;
 }
 
 template cow_ptr<Blob> Tree::AddObjectToTree(IRepository*, Components, Blob const&);
@@ -151,54 +153,36 @@ bool Tree::RemoveObjectFromTree(IRepository* repo, Components components) {
         return false;
     const auto leading = components.first(components.size() - 1);
     const KivStringViewT<char16_t> name = components.back();
-    const cow_ptr<Tree> holder = leading.empty() ? nullptr : GetDeepTree(leading);
-    if (!leading.empty() && !holder)
+    Tree const* const holder = HolderOf(*this, components);
+    if (holder == nullptr || name.IsEmpty() || !holder->LocalObjectExists(name))
         return false;
-    if (name.IsEmpty() || !(holder ? *holder : *this).LocalObjectExists(name))
-        return false;
-    if (leading.empty()) {
-        entries_.Erase(name);
-        ResetState();
-        return true;
-    }
-
-    std::vector<cow_ptr<Tree>> way(leading.size());
-    Tree const* above = this;
-    for (std::size_t level = 0; level < way.size(); ++level) {
-        above = FindEntry(above->entries_.Root(), leading[level], true)->TreeChild();
-        way[level].write()->entries_ = above->entries_;
-    }
-    way.back().write()->entries_.Erase(name);
-    for (std::size_t level = way.size(); level-- > 0;) {
-        Tree& parent = level == 0 ? *this : *way[level - 1].write();
-        if (way[level]->IsEmpty()) {
-            parent.entries_.Erase(leading[level]);
-            parent.ResetState();
-        } else if (repo != nullptr) {
-            parent.SetLocalTree(*repo, leading[level], std::move(way[level]));
-        }
-    }
+    std::vector<cow_ptr<Tree>> way = CopyWay(leading);
+    (way.empty() ? *this : *way.back().write()).EraseLocal(name);
+    PutWayBack(repo, leading, std::move(way), true);
     return true;
 }
 
+void Tree::EraseLocal(KivStringViewT<char16_t> name) {
+    entries_.Erase(name);
+    ResetState();
+}
+
 bool Tree::LocalObjectExists(KivStringViewT<char16_t> name) const noexcept {
-    return FindEntry(entries_.Root(), name, false) != nullptr || FindEntry(entries_.Root(), name, true) != nullptr;
+    return entries_.Find(name) != nullptr;
 }
 
 cow_ptr<Object> Tree::GetLocalObject(KivStringViewT<char16_t> name) const noexcept {
-    if (cow_ptr<Blob> blob = GetLocalBlob(name))
-        return blob;
-    return GetLocalTree(name);
+    Held const* const held = entries_.Find(name);
+    return cow_ptr<Object>::share(held == nullptr ? nullptr : held->Visible());
 }
 
 cow_ptr<Blob> Tree::GetLocalBlob(KivStringViewT<char16_t> name) const noexcept {
-    detail::Entry const* const entry = FindEntry(entries_.Root(), name, false);
-    return cow_ptr<Blob>::share(entry == nullptr ? nullptr : entry->BlobChild());
+    Held const* const held = entries_.Find(name);
+    return cow_ptr<Blob>::share(held == nullptr ? nullptr : held->GetBlob());
 }
 
 cow_ptr<Tree> Tree::GetLocalTree(KivStringViewT<char16_t> name) const noexcept {
-    detail::Entry const* const entry = FindEntry(entries_.Root(), name, true);
-    return cow_ptr<Tree>::share(entry == nullptr ? nullptr : entry->TreeChild());
+    return cow_ptr<Tree>::share(SubtreeOf(*this, name));
 }
 
 cow_ptr<Object> Tree::GetDeepObject(KivStringViewT<char16_t> path) const {
@@ -206,10 +190,8 @@ cow_ptr<Object> Tree::GetDeepObject(KivStringViewT<char16_t> path) const {
 }
 
 cow_ptr<Object> Tree::GetDeepObject(Components components) const noexcept {
-    if (components.size() <= 1)
-        return components.empty() ? nullptr : GetLocalObject(components[0]);
-    const cow_ptr<Tree> holder = GetDeepTree(components.first(components.size() - 1));
-    return holder ? holder->GetLocalObject(components.back()) : nullptr;
+    Tree const* const holder = HolderOf(*this, components);
+    return holder == nullptr ? nullptr : holder->GetLocalObject(components.back());
 }
 
 cow_ptr<Blob> Tree::GetDeepBlob(KivStringViewT<char16_t> path) const {
@@ -217,10 +199,8 @@ cow_ptr<Blob> Tree::GetDeepBlob(KivStringViewT<char16_t> path) const {
 }
 
 cow_ptr<Blob> Tree::GetDeepBlob(Components components) const noexcept {
-    if (components.size() <= 1)
-        return components.empty() ? nullptr : GetLocalBlob(components[0]);
-    const cow_ptr<Tree> holder = GetDeepTree(components.first(components.size() - 1));
-    return holder ? holder->GetLocalBlob(components.back()) : nullptr;
+    Tree const* const holder = HolderOf(*this, components);
+    return holder == nullptr ? nullptr : holder->GetLocalBlob(components.back());
 }
 
 cow_ptr<Tree> Tree::GetDeepTree(KivStringViewT<char16_t> path) const {
@@ -228,16 +208,8 @@ cow_ptr<Tree> Tree::GetDeepTree(KivStringViewT<char16_t> path) const {
 }
 
 cow_ptr<Tree> Tree::GetDeepTree(Components components) const noexcept {
-    if (components.empty())
-        return nullptr;
-    Tree const* tree = this;
-    for (KivStringViewT<char16_t> name : components) {
-        detail::Entry const* const entry = FindEntry(tree->entries_.Root(), name, true);
-        if (entry == nullptr || entry->TreeChild() == nullptr)
-            return nullptr;
-        tree = entry->TreeChild();
-    }
-    return cow_ptr<Tree>::share(tree);
+    Tree const* const holder = HolderOf(*this, components);
+    return holder == nullptr ? nullptr : holder->GetLocalTree(components.back());
 }
 
 optional<Id> Tree::GetIdByPath(KivStringViewT<char16_t> path) const {

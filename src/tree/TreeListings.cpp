@@ -1,17 +1,18 @@
 #include "KivVcs/Tree.h"
 
-#include "tree/TableDifferences.h"
+#include "tree/Differences.h"
+
+#include <unordered_map>
 
 namespace KivVcs {
 
 using detail::Entry;
-using detail::NamedObjects;
-using detail::TableAccess;
-using detail::TableNode;
+using detail::Held;
+using detail::Node;
 
 namespace {
 
-/// Collects full paths below directories that are entered depth first.
+/// Collects full paths, directory by directory, the names of each in their order.
 class PathCollector {
 public:
     /// Goes to the directory @p name of the one whose paths begin with the first @p length code units of this one's.
@@ -19,37 +20,43 @@ public:
         prefix_.resize(length);
         prefix_.insert(prefix_.end(), name.GetString(), name.GetString() + name.GetLength());
         prefix_.push_back(u'/');
+        isFirst_ = true;
     }
 
     /// The length of what the paths of this directory begin with.
     [[nodiscard]] std::size_t PrefixLength() const noexcept { return prefix_.size(); }
 
     void Add(KivStringT<char16_t> const& name) {
-        if (prefix_.empty()) {
-            paths_.push_back(name);
-            return;
-        }
-        const std::size_t length = prefix_.size() + static_cast<std::size_t>(name.GetLength());
-        if (length > static_cast<std::size_t>(std::numeric_limits<int>::max()))
-            throw std::length_error("path longer than a signed 32-bit length can tell");
-        paths_.push_back(KivStringT<char16_t>::Build(static_cast<int>(length), [this, &name](char16_t* path) {
-            path = std::copy(prefix_.begin(), prefix_.end(), path);
-            std::copy_n(name.GetString(), name.GetLength(), path);
-        }));
+        paths_.push_back(prefix_.empty() ? name : PathOf(name));
+        // Within a directory paths ascend as names do.
+        if (std::exchange(isFirst_, false) && paths_.size() > 1)
+            isAscending_ = isAscending_ && paths_[paths_.size() - 2] < paths_.back();
     }
 
     /// The paths, sorted, each once.
     [[nodiscard]] PathList Take() {
-        // Names are visited in order, and only a directory whose name begins another entry's name breaks the order of paths.
-        if (!std::is_sorted(paths_.begin(), paths_.end()))
+        if (!isAscending_) {
             std::sort(paths_.begin(), paths_.end());
-        paths_.erase(std::unique(paths_.begin(), paths_.end()), paths_.end());
+            paths_.erase(std::unique(paths_.begin(), paths_.end()), paths_.end());
+        }
         return std::move(paths_);
     }
 
 private:
+    [[nodiscard]] KivStringT<char16_t> PathOf(KivStringT<char16_t> const& name) const {
+        const std::size_t length = prefix_.size() + static_cast<std::size_t>(name.GetLength());
+        if (length > static_cast<std::size_t>(std::numeric_limits<int>::max()))
+            throw std::length_error("path longer than a signed 32-bit length can tell");
+        return KivStringT<char16_t>::Build(static_cast<int>(length), [this, &name](char16_t* path) {
+            path = std::copy(prefix_.begin(), prefix_.end(), path);
+            std::copy_n(name.GetString(), name.GetLength(), path);
+        });
+    }
+
     std::vector<char16_t> prefix_;
     PathList paths_;
+    bool isFirst_ = false;
+    bool isAscending_ = true;
 };
 
 /// Two directories of the same path that are compared, either of which may be null, and how the path begins that their
@@ -61,37 +68,35 @@ struct DirectoryPair {
     std::size_t prefixLength;
 };
 
-/// Whether a comparison by name counts @p object as unchanged, given what the other side shows under that name.
-bool IsSame(Object const& object, Object const* other) {
-    return other != nullptr && object.HasSameId(*other);
+/// Whether a lookup by name finds something else on the other side than @p object, which may be null.
+bool IsMissingIn(Held const& other, Object const* object) {
+    return object != nullptr && (other.Visible() == nullptr || !object->HasSameId(*other.Visible()));
 }
 
-bool BlobDiffers(NamedObjects const& mine, NamedObjects const& theirs) {
-    return (mine.blob != nullptr && !IsSame(*mine.blob, theirs.Visible())) ||
-           (theirs.blob != nullptr && !IsSame(*theirs.blob, mine.Visible()));
+bool BlobDiffers(Held const& mine, Held const& theirs) {
+    return IsMissingIn(theirs, mine.GetBlob()) || IsMissingIn(mine, theirs.GetBlob());
 }
 
-bool TreeDiffers(NamedObjects const& mine, NamedObjects const& theirs) {
-    return (mine.tree != nullptr && !IsSame(*mine.tree, theirs.Visible())) ||
-           (theirs.tree != nullptr && !IsSame(*theirs.tree, mine.Visible()));
+bool TreeDiffers(Held const& mine, Held const& theirs) {
+    return (mine.HasTree() || theirs.HasTree()) &&
+           (IsMissingIn(theirs, mine.GetTree()) || IsMissingIn(mine, theirs.GetTree()));
 }
 
-TableNode const* RootOf(Tree const* tree) noexcept {
-    return tree == nullptr ? nullptr : TableAccess::Root(*tree);
+Node const* TopOf(Tree const* tree) noexcept {
+    return tree == nullptr ? nullptr : detail::TreeAccess::Top(*tree).get();
 }
 
 /// Adds the paths that differ right in a pair of directories, and puts the pairs of subdirectories that differ on @p open,
 /// the first one last.
 void CompareDirectories(Tree const* mine, Tree const* theirs, PathCollector& paths, std::vector<DirectoryPair>& open) {
     const auto before = static_cast<std::ptrdiff_t>(open.size());
-    detail::ForEachDifference(
-        RootOf(mine), RootOf(theirs),
-        [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
-            if (BlobDiffers(here, there))
-                paths.Add(name);
-            if (!name.IsEmpty() && TreeDiffers(here, there))
-                open.push_back({&name, here.tree, there.tree, paths.PrefixLength()});
-        });
+    detail::ForEachDifference(TopOf(mine), TopOf(theirs),
+                              [&](KivStringT<char16_t> const& name, Held const& here, Held const& there) {
+                                  if (BlobDiffers(here, there))
+                                      paths.Add(name);
+                                  if (TreeDiffers(here, there))
+                                      open.push_back({&name, here.GetTree(), there.GetTree(), paths.PrefixLength()});
+                              });
     std::reverse(open.begin() + before, open.end());
 }
 
@@ -109,11 +114,12 @@ PathList DeepBlobDiffs(Tree const* mine, Tree const* theirs) {
     return paths.Take();
 }
 
-PathList LocalPaths(Tree const& tree, bool wantTrees) {
+template <class Wanted>
+PathList LocalPaths(Tree const& tree, Wanted wanted) {
     PathList names;
-    detail::ForEachEntry(TableAccess::Root(tree), [&names, wantTrees](Entry const& entry) {
-        if (entry.IsTree() == wantTrees && entry.Child() != nullptr)
-            names.push_back(entry.Name());
+    detail::ForEachEntry(TopOf(&tree), [&names, wanted](Entry const& entry) {
+        if (wanted(entry.held) != nullptr)
+            names.push_back(entry.name);
     });
     return names;
 }
@@ -121,40 +127,49 @@ PathList LocalPaths(Tree const& tree, bool wantTrees) {
 template <class Differs>
 PathList LocalDiffs(Tree const& mine, Tree const* theirs, Differs differs) {
     PathList names;
-    detail::ForEachDifference(
-        TableAccess::Root(mine), RootOf(theirs),
-        [&](KivStringT<char16_t> const& name, NamedObjects const& here, NamedObjects const& there) {
-            if (differs(here, there))
-                names.push_back(name);
-        });
+    detail::ForEachDifference(TopOf(&mine), TopOf(theirs),
+                              [&](KivStringT<char16_t> const& name, Held const& here, Held const& there) {
+                                  if (differs(here, there))
+                                      names.push_back(name);
+                              });
     return names;
 }
 
 } // namespace
 
 std::uint64_t Tree::GetDeepBlobCount() const {
-    std::uint64_t count = 0;
+    // Every tree is counted once, when those below it have been, and its number added wherever it is named.
+    std::unordered_map<Tree const*, std::uint64_t> counts;
     std::vector<Tree const*> open{this};
-    while (!open.empty()) {
-        Tree const* const tree = open.back();
-        open.pop_back();
-        count += tree->GetLocalBlobCount();
-        if (tree->GetLocalBlobCount() == tree->GetLocalObjectCount())
+    for (; !open.empty();) {
+        Tree const& tree = *open.back();
+        const std::size_t waiting = open.size();
+        std::uint64_t count = tree.GetLocalBlobCount();
+        if (count != tree.GetLocalObjectCount() && !counts.contains(&tree)) {
+            detail::ForEachEntry(TopOf(&tree), [&](Entry const& entry) {
+                Tree const* const subtree = entry.held.GetTree();
+                if (subtree == nullptr)
+                    return;
+                if (const auto known = counts.find(subtree); known != counts.end())
+                    count += known->second;
+                else
+                    open.push_back(subtree);
+            });
+        }
+        if (open.size() > waiting)
             continue;
-        detail::ForEachEntry(tree->entries_.Root(), [&open](Entry const& entry) {
-            if (entry.TreeChild() != nullptr)
-                open.push_back(entry.TreeChild());
-        });
+        counts.try_emplace(&tree, count);
+        open.pop_back();
     }
-    return count;
+    return counts.at(this);
 }
 
 PathList Tree::GetLocalBlobPaths() const {
-    return LocalPaths(*this, false);
+    return LocalPaths(*this, [](Held const& held) { return held.GetBlob(); });
 }
 
 PathList Tree::GetLocalSubtreePaths() const {
-    return LocalPaths(*this, true);
+    return LocalPaths(*this, [](Held const& held) { return held.GetTree(); });
 }
 
 PathList Tree::GetLocalObjectPaths() const {

@@ -9,40 +9,42 @@ class Tree;
 
 namespace detail {
 
-class TableNode;
-class TableRelease;
-struct TableAccess;
+class Held;
+class Node;
 
-/// The entries of a tree: an ordered table whose copies share their nodes. Copying is O(1), an edit O(log n).
+/// The entries of a tree: an ordered table whose copies share their nodes. Copying is O(1), an edit O(log n). An edit that
+/// throws leaves the entries as they were.
 class EntryTable {
 public:
-    EntryTable() noexcept = default;
+    EntryTable() noexcept;
     EntryTable(EntryTable const& other) noexcept;
-    EntryTable(EntryTable&& other) noexcept : root_(std::exchange(other.root_, nullptr)) {}
-    EntryTable& operator=(EntryTable other) noexcept {
-        std::swap(root_, other.root_);
-        return *this;
-    }
+    EntryTable(EntryTable&& other) noexcept;
+    EntryTable& operator=(EntryTable const& other) noexcept;
+    EntryTable& operator=(EntryTable&& other) noexcept;
     ~EntryTable();
 
-    /// Null while there are no entries.
-    [[nodiscard]] TableNode const* Root() const noexcept { return root_; }
+    /// The topmost node; null while there are no entries.
+    [[nodiscard]] cow_ptr<Node> const& Top() const noexcept { return top_; }
 
-    /// Sets the entry @p name of the kind of @p child, which may be null; the entry of the other kind stays.
-    void Set(KivStringViewT<char16_t> name, cow_ptr<Blob> child);
-    void Set(KivStringViewT<char16_t> name, cow_ptr<Tree> child);
-    /// The same with a text that a new entry shares.
-    void Set(KivStringT<char16_t> const& name, cow_ptr<Blob> child);
-    void Set(KivStringT<char16_t> const& name, cow_ptr<Tree> child);
+    /// What is held under @p name; null if nothing is. Valid until the next edit.
+    [[nodiscard]] Held const* Find(KivStringViewT<char16_t> name) const noexcept;
 
-    /// Removes the entries @p name of both kinds. @pre There is one.
+    /// Makes @p child, a blob or a tree or null, what is held of its kind under @p name; the other kind stays beside it. A
+    /// new entry shares @p text, which is the name, if that is given.
+    template <class T>
+    void Set(KivStringViewT<char16_t> name, cow_ptr<T> child, KivStringT<char16_t> const* text = nullptr);
+
+    /// Removes all that is held under @p name. @pre something is
     void Erase(KivStringViewT<char16_t> name);
 
 private:
-    friend class TableRelease;
-    struct TableAccess;
+    struct Place;
 
-    TableNode* root_ = nullptr;
+    [[nodiscard]] Place FindPlace(KivStringViewT<char16_t> name) const noexcept;
+    /// The one edit: inserts, replaces or, if nothing is held then, removes an entry.
+    void Put(Place const& place, KivStringViewT<char16_t> name, KivStringT<char16_t> text, Held held);
+
+    cow_ptr<Node> top_;
 };
 
 } // namespace detail
