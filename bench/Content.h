@@ -18,7 +18,7 @@ using Path = KivStringT<char16_t>;
 /// The paths of @p count files, spread evenly over @p directories.
 [[nodiscard]] std::vector<Path> FilePaths(std::int64_t count, std::vector<int> const& directories);
 
-/// A short content that tells @p number and @p version.
+/// A short content that depends on @p number and @p version.
 [[nodiscard]] Buffer SmallContent(std::int64_t number, int version = 0);
 /// The contents of files 0 to @p count, as a host has them that has read them.
 [[nodiscard]] std::vector<Buffer> SmallContents(std::int64_t count, int version = 0);

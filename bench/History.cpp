@@ -116,7 +116,7 @@ double ReleaseDeepTree(std::int64_t depth) {
     return LibrarySecondsOf([&] { tree.reset(); });
 }
 
-/// The floor is four times what a quarter of the size takes, so that the ratio tells how far from linear it is.
+/// The floor is four times what a quarter of the size takes, so that the ratio shows how far from linear it is.
 template <class Release>
 Round Growth(std::int64_t size, Release release) {
     return [=] {

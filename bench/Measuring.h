@@ -17,7 +17,7 @@
 
 namespace KivVcs::Bench {
 
-/// One round of a workload. Memory is told only by rounds that are run while it is counted.
+/// One round of a workload. Memory is reported only by rounds that are run while it is counted.
 struct Measurement {
     double seconds = 0;
     double floorSeconds = 0;

@@ -22,7 +22,7 @@ void ForgetPeak() noexcept;
 void KeepFreedMemory();
 
 /// The most memory that the process has occupied since `ForgetResidentPeak`, in bytes; 0 where the system does not
-/// tell.
+/// know.
 [[nodiscard]] std::int64_t PeakResidentBytes();
 /// Gives back to the system what is not used, and forgets.
 void ForgetResidentPeak();

@@ -38,7 +38,7 @@ private:
     std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
 };
 
-/// The least time that @p round, which tells its own, takes.
+/// The least time that @p round, which returns its own, takes.
 template <class Round>
 double Fastest(Round round) {
     const Stopwatch all;

@@ -78,7 +78,7 @@ inline void RequireConsistency(IObjectsStorage const& storage) {
     for (auto const& [id, commit] : storage.GetCommits()) {
         Id parent;
         auto read = Commit::Deserialize(id, parent, repository.get(), loader);
-        Require(parent == (commit->GetParent() ? commit->GetParent()->GetId() : Id()), "a commit tells its parent");
+        Require(parent == (commit->GetParent() ? commit->GetParent()->GetId() : Id()), "a commit names its parent");
         read.write()->SetParent(commit->GetParent());
         Require(read->GetId() == id, "a commit reads back as it was");
     }

@@ -2,7 +2,7 @@
 
 /// Sequences of a repository's operations, over few names so that everything meets everything.
 ///
-/// An input is a sequence of operations, each a byte that tells which and bytes that tell its arguments.
+/// An input is a sequence of operations, each a byte for its kind and bytes for its arguments.
 
 namespace KivVcs::Fuzzing {
 namespace {

@@ -83,7 +83,7 @@ void Run(Input input) {
         Tree* const tree = world.tree.write();
         const auto found = tree->GetDeepObject(written);
         Text path;
-        // Identifiers tell nothing of a directory beside a blob of its name.
+        // Identifiers do not cover a directory beside a blob of its name.
         bool isBelowBlob = components.empty();
         for (auto const& component : components) {
             isBelowBlob = isBelowBlob || world.blobs.contains(path);

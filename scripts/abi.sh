@@ -41,7 +41,7 @@ compare() {
         printf '%s %s: another interface than %s, as the SONAME announces\n' "$name" "$new_version" "$old_version"
     else
         cat "$work/report" >&2
-        die "$name $new_version breaks programs that were built with $old_version, and its SONAME does not tell"
+        die "$name $new_version breaks programs that were built with $old_version, and its SONAME does not say so"
     fi
 }
 

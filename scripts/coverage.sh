@@ -1,7 +1,7 @@
 #!/bin/bash
 # usage: scripts/coverage.sh [GCOVR-OPTION...]
-# Runs the library's tests and tells which lines and branches of it they reach. With options such as --html-details FILE it
-# tells more. Of seven allocations only one fails.
+# Runs the library's tests and shows which lines and branches of it they reach. With options such as --html-details FILE it
+# shows more. Of seven allocations only one fails.
 # Fails below 98 % of the lines or 90 % of the branches.
 
 . "$(dirname "$0")/lib.sh"

@@ -1,6 +1,6 @@
 #!/bin/bash
 # usage: scripts/format.sh [--check]
-# Formats the sources with clang-format; with --check, only tells which files would change, and fails if there are any.
+# Formats the sources with clang-format; with --check, only lists the files that would change, and fails if there are any.
 
 . "$(dirname "$0")/lib.sh"
 case ${1:-} in

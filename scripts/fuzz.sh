@@ -2,7 +2,7 @@
 # usage: scripts/fuzz.sh [SECONDS] [TARGET...]
 # Installs what is missing, builds the fuzz targets with clang 14's libFuzzer under AddressSanitizer and
 # UndefinedBehaviorSanitizer, and lets each (readers, paths, operations) look for inputs that break something, for SECONDS of
-# CPU time (60 unless given) from the inputs in fuzz/corpus on. Fails at the first finding and tells where its input is kept.
+# CPU time (60 unless given) from the inputs in fuzz/corpus on. Fails at the first finding and says where its input is kept.
 # New inputs that reach more code are kept below the build directory, in corpus/TARGET, for the next time.
 
 . "$(dirname "$0")/lib.sh"

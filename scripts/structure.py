@@ -30,7 +30,7 @@ STANDS_ON = {
     "fuzz": ("archive",),
     "tests": ("archive",),
 }
-# The public headers of the core, whose directory does not tell their room.
+# The public headers of the core, whose directory does not say which room they are in.
 HEADERS = {
     "foundation": ("Foundation",),
     "identifiers": ("SHADigest256", "Id"),

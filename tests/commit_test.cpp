@@ -158,7 +158,7 @@ TEST_F(Commits, AreReadBackAsFarAsTheirTextTells) {
     EXPECT_FALSE(Commit::Deserialize(Id(), parentId, &repo, packed.Loader()));
     EXPECT_EQ(Narrow(parentId.GetText()), "former");
 
-    // The head lends its tree where none is told, and is the parent until the caller links the real one.
+    // The head lends its tree where none is named, and is the parent until the caller links the real one.
     Commit head(nullptr, false);
     head.AddBlob(&repo, u"h", MakeBlob("2"));
     const auto stored = repo.DoCommit(head);

@@ -44,7 +44,7 @@ Versions FreshCopies(Versions const& line) {
     return fresh;
 }
 
-/// Reads the versions in all ways, newest first, changes copies of them, and tells what it read.
+/// Reads the versions in all ways, newest first, changes copies of them, and returns what it read.
 std::string ReadAndDrop(Repository const& repository, Versions line) {
     std::string read;
     for (; line.size() > 1; line.pop_back()) {

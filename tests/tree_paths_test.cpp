@@ -7,7 +7,7 @@
 namespace KivVcs {
 namespace {
 
-/// Tells which objects trees ask for and hand over, and answers what it is told to.
+/// Records which objects trees ask for and hand over, and gives the answers that it is given.
 class TreeCalls : public Repository {
 public:
     TreeCalls() : Repository(std::make_unique<MemObjectsStorage>()) {}

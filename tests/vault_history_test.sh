@@ -45,7 +45,7 @@ MergesAskThePolicyAboutEveryConflict() {
         "$vault" verify >out
     done
     matches "$("$vault" log | head -n 1)" 'Ann Example <ann@example.org>  Merge side'
-    # The stamps tell who was later, whatever the heads' times say.
+    # The stamps say who was later, whatever the heads' times say.
     rm -r d vault.db && write d/x/f base
     "$vault" save d >out
     "$vault" branch side

@@ -86,7 +86,7 @@ int main() {
     const cow_ptr<Commit> root =
         LoadOne(oneOnly, head->GetParent()->GetId(), [&vault](Id const& id) { return Open(vault, id); });
 
-    // Bytes that somebody changed are read all the same; the identifier tells.
+    // Bytes that somebody changed are read all the same; the identifier shows it.
     vault.objects[head->GetId()] = vault.objects[root->GetId()];
     Repository deceived(std::make_unique<MemObjectsStorage>());
     Id parentId;

@@ -12,7 +12,7 @@ enum class ConflictPolicy {
     Left,
     Right,
     Base,
-    /// The side whose nearest stamp file tells the later time; where stamps do not tell, the side whose head was saved
+    /// The side whose nearest stamp file has the later time; where stamps do not decide, the side whose head was saved
     /// later.
     Newest,
     /// Nobody: the merge is called off.

@@ -24,14 +24,14 @@ public:
     [[nodiscard]] int Get() const noexcept { return descriptor_; }
     /// Somebody else closes it from now on.
     void Release() noexcept { descriptor_ = -1; }
-    /// Closes it now and tells whether everything written arrived.
+    /// Closes it now. @return whether everything written arrived
     [[nodiscard]] bool Close() noexcept { return close(std::exchange(descriptor_, -1)) == 0; }
 
 private:
     int descriptor_;
 };
 
-/// @throws Problem that tells the reason why the last system call failed
+/// @throws Problem with the reason why the last system call failed
 [[noreturn]] void ThrowSystemProblem(std::string const& what, std::string const& path);
 
 } // namespace vault

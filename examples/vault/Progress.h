@@ -7,7 +7,7 @@
 
 namespace vault {
 
-/// Tells on standard error how far long work has come, on one line that disappears at the end; silent unless that is a
+/// Shows on standard error how far long work has come, on one line that disappears at the end; silent unless that is a
 /// terminal.
 class Progress {
 public:

@@ -8,7 +8,7 @@
 
 namespace vault {
 
-/// The name of the files in which a directory's version tells when it last changed: seconds since 1970 in decimal.
+/// The name of the files in which a directory's version stores when it last changed: seconds since 1970 in decimal.
 inline constexpr char16_t stampName[] = u".vault-stamp";
 
 struct ScanOptions {

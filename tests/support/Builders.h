@@ -16,7 +16,7 @@ inline Blob MakeBlob(std::string const& content) {
     return Blob(std::move(data));
 }
 
-/// A tree told as in "name=content directory/name=content"; null for "-".
+/// A tree written as "name=content directory/name=content"; null for "-".
 inline cow_ptr<Tree> MakeTree(IRepository& repo, std::string const& files) {
     cow_ptr<Tree> tree;
     if (files == "-")
@@ -63,7 +63,7 @@ class History {
 public:
     explicit History(Repository& repo) : repo_(repo) {}
 
-    /// Commits told as in "root child:root other:root", each stored.
+    /// Commits written as "root child:root other:root", each stored.
     void Grow(std::string const& graph) {
         std::istringstream words(graph);
         for (std::string word; words >> word;) {
@@ -76,7 +76,7 @@ public:
         }
     }
 
-    /// Branches told as in "master=child topic=other", made if there are none of that name.
+    /// Branches written as "master=child topic=other", made if there are none of that name.
     void Point(std::string const& branches) {
         std::istringstream words(branches);
         for (std::string word; words >> word;) {

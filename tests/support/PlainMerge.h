@@ -7,7 +7,7 @@ namespace KivVcs {
 /// A merge as it is described: level by level, the files of a level before its directories.
 class PlainMerge {
 public:
-    /// Settles the conflict at a path as the numbers of the library's choices tell.
+    /// Settles the conflict at a path by a number of the library's choices.
     using Ask = std::function<int(std::string const& path, bool isTree)>;
     using Side = optional<PlainTree>;
 

@@ -6,7 +6,7 @@
 
 namespace KivVcs {
 
-/// What a commit should hold. As in the library, commits are told apart as objects and looked up by identifier.
+/// What a commit should hold. As in the library, commits are compared as objects and looked up by identifier.
 struct PlainCommit {
     using Pointer = std::shared_ptr<const PlainCommit>;
 
@@ -27,8 +27,8 @@ struct PlainCommit {
     }
 };
 
-/// What a repository should do, with the plainest tables. A tree is stored with what its blobs hide, of which its
-/// identifier does not tell: the first one of an identifier takes the place of all others.
+/// What a repository should do, with the plainest tables. A tree is stored with what its blobs hide, which its
+/// identifier does not cover: the first one of an identifier takes the place of all others.
 class PlainRepository {
 public:
     using Pointer = PlainCommit::Pointer;

@@ -6,7 +6,7 @@
 
 namespace KivVcs {
 
-/// Tells in order which overridable operations are called, and fails on request.
+/// Records in order which overridable operations are called, and fails on request.
 class RecordingRepository : public Repository {
 public:
     using Repository::Repository;
