@@ -84,8 +84,7 @@ for platform in "$@"; do
     wasm)
         install_packages bench
         build_preset wasm
-        # Zones cannot be chosen; the one of the machine is the only one.
-        run_tests quick --exclude-regex KnowsTheLocalOffset
+        run_tests quick
         report_sizes
         report_speed
         ;;
