@@ -2,10 +2,8 @@
 # Shared by the scripts beside it, which source it:
 #   install_packages SET...   installs with apt-get what is missing of the named sets, or says plainly what is missing
 #   build_preset PRESET       configures and builds a preset of CMakePresets.json; its directory is then in $build_directory
-#   run_tests TIER [OPTION...]
-#                             runs the tests of the directory built last that have a label, quick, full or soak, and of the
-#                             lesser ones (tests/CMakeLists.txt explains them), and shows only the summary when all pass; ctest
-#                             takes the options
+#   run_tests TIER            runs the tests of the directory built last that have the label quick, or full as well, or any
+#                             (tests/CMakeLists.txt explains them), and shows only the summary when all pass
 #   quietly COMMAND...        runs a command and shows its output only when it fails
 #   die MESSAGE               ends the script
 #   usage [STATUS]            shows the comment at the top of the script and ends it; -h and --help do so by themselves
@@ -101,7 +99,7 @@ build_preset() {
 }
 
 run_tests() {
-    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs" "${@:2}")
+    local tests=(ctest --test-dir "$build_directory" --output-on-failure --no-tests=error --parallel "$jobs")
     case $1 in
     quick) tests+=(--label-exclude 'full|soak') ;;
     full) tests+=(--label-exclude soak) ;;
