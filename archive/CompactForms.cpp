@@ -1,7 +1,8 @@
 #include "CompactForms.h"
 
+#include "Digits.h"
+
 #include <algorithm>
-#include <array>
 #include <cstring>
 #include <string_view>
 
@@ -15,20 +16,6 @@ constexpr std::string_view treeLine = "tree ";
 constexpr std::string_view parentLine = "parent ";
 constexpr std::string_view authorLine = "author ";
 constexpr std::string_view committerLine = "committer ";
-constexpr std::size_t digestSize = 32;
-constexpr std::size_t digitCount = 2 * digestSize;
-
-constexpr std::uint8_t noDigit = 0x80;
-
-constexpr auto digitValues = [] {
-    std::array<std::uint8_t, 256> values{};
-    values.fill(noDigit);
-    for (std::uint8_t digit = 0; digit < 10; ++digit)
-        values[static_cast<std::size_t>('0') + digit] = digit;
-    for (std::uint8_t digit = 10; digit < 16; ++digit)
-        values[static_cast<std::size_t>('a') + digit - 10U] = digit;
-    return values;
-}();
 
 constexpr auto digitPairs = [] {
     std::array<std::array<char, 2>, 256> pairs{};
@@ -37,18 +24,6 @@ constexpr auto digitPairs = [] {
         pairs[byte] = {digits[byte >> 4U], digits[byte & 15U]};
     return pairs;
 }();
-
-/// Writes the digest that 64 lowercase digits tell; false if they are none.
-bool ReadDigits(const char* digits, std::byte* digest) noexcept {
-    unsigned wrong = 0;
-    for (std::size_t i = 0; i < digestSize; ++i) {
-        unsigned const high = digitValues[static_cast<unsigned char>(digits[2 * i])];
-        unsigned const low = digitValues[static_cast<unsigned char>(digits[2 * i + 1])];
-        wrong |= high | low;
-        digest[i] = static_cast<std::byte>(high << 4U | low);
-    }
-    return (wrong & noDigit) == 0;
-}
 
 char* WriteDigits(ByteView digest, char* to) noexcept {
     for (std::byte const byte : digest) {

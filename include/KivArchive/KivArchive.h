@@ -8,3 +8,4 @@
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/Progress.h"
 #include "KivArchive/SqliteArchive.h"
+#include "KivArchive/Upkeep.h"

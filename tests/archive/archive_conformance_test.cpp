@@ -1,7 +1,7 @@
+#include "ArchiveFiles.h"
 #include "KivArchive/ArchiveConformance.h"
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/SqliteArchive.h"
-#include "TemporaryDirectory.h"
 
 #include <gtest/gtest.h>
 

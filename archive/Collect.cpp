@@ -1,0 +1,234 @@
+#include "KivArchive/Upkeep.h"
+#include "ObjectIndex.h"
+
+#include <deque>
+#include <unordered_map>
+#include <unordered_set>
+
+namespace KivArchive {
+
+namespace {
+
+/// How many trees and commits are read at once.
+constexpr std::size_t batchSize = 1000;
+
+/// Everything marked for @p grace.
+std::unordered_set<Id> ReadMarks(IArchive& archive, std::chrono::seconds grace) {
+    std::unordered_set<Id> marked;
+    for (Id after;;) {
+        auto const page = archive.ListMarked(grace, after, pageSize);
+        marked.insert(page.begin(), page.end());
+        if (page.size() < pageSize)
+            return marked;
+        after = page.back();
+    }
+}
+
+/// Follows what objects name, and what commits have merged.
+class Walk {
+public:
+    Walk(IArchive& archive, ObjectIndex const& index, IProgress* progress)
+        : archive_(archive), index_(index), progress_(progress), reached_(index.Size()) {}
+
+    [[nodiscard]] bool HasReached(std::size_t number) const noexcept { return reached_[number]; }
+    [[nodiscard]] bool HasReached(Id const& id) const {
+        auto const number = index_.Find(id);
+        return number ? reached_[*number] : later_.count(id) != 0;
+    }
+    [[nodiscard]] std::uint64_t CountReached() const noexcept { return count_; }
+
+    /// Reaches @p roots and everything below them.
+    /// @param needsAll whether it is a failure if something cannot be read; otherwise the rest is reached all the same
+    void From(std::vector<Id> const& roots, bool needsAll) {
+        for (Id const& root : roots)
+            Reach(root, true);
+        while (!open_.empty()) {
+            ReportProgress(progress_, {"looking for what is reached", count_, index_.Size()}, {});
+            std::size_t const size = std::min(open_.size(), batchSize);
+            std::vector<Id> const batch(open_.end() - static_cast<std::ptrdiff_t>(size), open_.end());
+            open_.resize(open_.size() - size);
+            Enter(batch, needsAll);
+        }
+    }
+
+private:
+    void Reach(Id const& id, bool isEntered) {
+        auto const number = index_.Find(id);
+        bool const isNew = number ? !reached_[*number] : later_.insert(id).second;
+        if (!isNew)
+            return;
+        if (number)
+            reached_[*number] = true;
+        ++count_;
+        if (isEntered)
+            open_.push_back(id);
+    }
+
+    void Enter(std::vector<Id> const& batch, bool needsAll) {
+        std::vector<Id> commits;
+        ReadOutcome const outcome = archive_.Read(batch, [&](ArchivedObject const& object) {
+            if (object.type == ObjectType::Commit)
+                commits.push_back(object.id);
+            std::vector<Link> links;
+            if (!ReadLinks(object.type, object.data, links) && needsAll)
+                ThrowUnreadable();
+            for (Link const& link : links)
+                Reach(link.id, link.type != ObjectType::Blob);
+        });
+        if (needsAll && !(outcome.damaged.empty() && outcome.missing.empty()))
+            ThrowUnreadable();
+        for (Ancestry const& facts : archive_.ReadAncestry(commits, Follow::Parents, 0))
+            for (ContainedCommit const& contained : facts.contains)
+                if (contained.how == Containment::Merged && index_.Find(contained.id))
+                    Reach(contained.id, true);
+    }
+
+    [[noreturn]] static void ThrowUnreadable() {
+        throw ArchiveError(Failure::Damaged, {},
+                           "Something that a branch reaches cannot be read, so that nothing can be collected.");
+    }
+
+    IArchive& archive_;
+    ObjectIndex const& index_;
+    IProgress* progress_;
+    std::vector<bool> reached_;
+    /// What was stored after the index was made.
+    std::unordered_set<Id> later_;
+    std::vector<Id> open_;
+    std::uint64_t count_ = 0;
+};
+
+/// Removes objects, those that name others before these. Others may come to use some meanwhile, which unmarks them: they
+/// and all that they reach stay.
+class Removal {
+public:
+    Removal(IArchive& archive, Walk& kept, CollectOptions const& options, IProgress* progress,
+            std::vector<Id> const& doomed)
+        : archive_(archive), kept_(kept), options_(options), progress_(progress) {
+        for (Id const& id : doomed)
+            namedBy_.emplace(id, 0);
+        for (std::size_t begin = 0; begin < doomed.size(); begin += batchSize) {
+            std::span<const Id> const batch(doomed.data() + begin, std::min(batchSize, doomed.size() - begin));
+            for (auto const& [id, links] : LinksOf(batch))
+                for (Id const& link : links)
+                    ++namedBy_.at(link);
+        }
+        for (Id const& id : doomed)
+            if (namedBy_.at(id) == 0)
+                ready_.push_back(id);
+    }
+
+    /// @return how many have been removed
+    std::uint64_t Run() {
+        std::uint64_t removed = 0;
+        for (std::vector<Id> slice = NextSlice(); !slice.empty(); slice = NextSlice()) {
+            ReportProgress(progress_, {"removing objects", removed, namedBy_.size()}, {});
+            removed += Remove(std::move(slice));
+        }
+        return removed;
+    }
+
+private:
+    /// Those of the doomed that each of @p ids names.
+    [[nodiscard]] std::unordered_map<Id, std::vector<Id>> LinksOf(std::span<const Id> ids) {
+        std::unordered_map<Id, std::vector<Id>> found;
+        archive_.Read(ids, [&](ArchivedObject const& object) {
+            std::vector<Link> links;
+            static_cast<void>(ReadLinks(object.type, object.data, links));
+            auto& doomed = found[object.id];
+            for (Link const& link : links)
+                if (namedBy_.count(link.id) != 0)
+                    doomed.push_back(link.id);
+        });
+        return found;
+    }
+
+    /// The next objects that nothing names but what is removed before or with them.
+    [[nodiscard]] std::vector<Id> NextSlice() {
+        std::vector<Id> slice;
+        while (!ready_.empty() && slice.size() < options_.slice) {
+            std::vector<Id> batch;
+            for (; !ready_.empty() && slice.size() + batch.size() < options_.slice; ready_.pop_front())
+                batch.push_back(ready_.front());
+            for (auto const& [id, links] : LinksOf(batch))
+                for (Id const& link : links)
+                    if (--namedBy_.at(link) == 0)
+                        ready_.push_back(link);
+            slice.insert(slice.end(), batch.begin(), batch.end());
+        }
+        return slice;
+    }
+
+    std::size_t Remove(std::vector<Id> slice) {
+        for (;;) {
+            std::erase_if(slice, [this](Id const& id) { return kept_.HasReached(id); });
+            if (slice.empty())
+                return 0;
+            std::vector<Id> const used = archive_.Remove(slice, options_.grace);
+            if (used.empty())
+                return slice.size();
+            kept_.From(used, false);
+        }
+    }
+
+    IArchive& archive_;
+    Walk& kept_;
+    CollectOptions const& options_;
+    IProgress* progress_;
+    std::unordered_map<Id, std::size_t> namedBy_;
+    std::deque<Id> ready_;
+};
+
+template <class Call>
+void InPages(std::vector<Id> const& ids, Call call) {
+    for (std::size_t begin = 0; begin < ids.size(); begin += pageSize)
+        call(std::span<const Id>(ids.data() + begin, std::min(pageSize, ids.size() - begin)));
+}
+
+} // namespace
+
+CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgress* progress) {
+    // In this order: what is used after its mark was read is unmarked then, which Remove sees.
+    std::unordered_set<Id> const due = ReadMarks(archive, options.grace);
+    std::unordered_set<Id> const marked = ReadMarks(archive, std::chrono::seconds(0));
+    ObjectIndex const index(archive, progress);
+    std::vector<Id> roots = options.kept;
+    for (Branch const& branch : archive.ReadBranches())
+        roots.push_back(branch.head);
+    Walk walk(archive, index, progress);
+    walk.From(roots, true);
+
+    CollectReport report;
+    report.reached = walk.CountReached();
+    std::vector<Id> unmarked;
+    for (Id const& id : marked)
+        if (walk.HasReached(id))
+            unmarked.push_back(id);
+    std::vector<Id> young;
+    std::vector<Id> newlyMarked;
+    for (std::size_t number = 0; number < index.Size(); ++number) {
+        Id const id = index.At(number);
+        if (walk.HasReached(number) || due.count(id) != 0)
+            continue;
+        young.push_back(id);
+        if (marked.count(id) == 0)
+            newlyMarked.push_back(id);
+    }
+    InPages(unmarked, [&](std::span<const Id> page) { archive.Unmark(page); });
+    InPages(newlyMarked, [&](std::span<const Id> page) { archive.Mark(page); });
+    report.unmarked = unmarked.size();
+    report.marked = newlyMarked.size();
+
+    // What is not due yet keeps all that it names.
+    walk.From(young, false);
+    std::vector<Id> doomed;
+    for (Id const& id : due)
+        if (!walk.HasReached(id))
+            doomed.push_back(id);
+    report.removed = Removal(archive, walk, options, progress, doomed).Run();
+    while (std::uint64_t const rest = archive.Compact(options.sliceBytes))
+        ReportProgress(progress, {"giving space back", 0, rest}, {});
+    return report;
+}
+
+} // namespace KivArchive

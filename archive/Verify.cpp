@@ -1,0 +1,131 @@
+#include "Changes.h"
+#include "KivArchive/Upkeep.h"
+#include "ObjectIndex.h"
+
+#include <algorithm>
+#include <unordered_set>
+
+namespace KivArchive {
+
+namespace {
+
+class Verification {
+public:
+    Verification(IArchive& archive, IProgress* progress)
+        : archive_(archive), progress_(progress), all_(archive, progress) {}
+
+    VerifyReport Run() {
+        for (std::size_t begin = 0; begin < all_.Size(); begin += pageSize) {
+            ReportProgress(progress_, {"verifying objects", begin, all_.Size()}, {});
+            std::vector<Id> page;
+            for (std::size_t i = begin; i < std::min(begin + pageSize, all_.Size()); ++i)
+                page.push_back(all_.At(i));
+            VerifyPage(page);
+        }
+        VerifyBranches();
+        ForgetWhatCameLater();
+        return std::move(report_);
+    }
+
+private:
+    void VerifyPage(std::vector<Id> const& page) {
+        std::vector<Id> large;
+        std::vector<Ancestry> told;
+        ReadOutcome const outcome = archive_.Read(page, [&](ArchivedObject const& object) {
+            ++report_.objects;
+            if (object.data.empty() && object.size > 0)
+                large.push_back(object.id);
+            else
+                VerifyLinks(object, told);
+        });
+        report_.damaged.insert(report_.damaged.end(), outcome.damaged.begin(), outcome.damaged.end());
+        for (Id const& id : large)
+            VerifyContent(id);
+        VerifyAncestry(told);
+    }
+
+    void VerifyLinks(ArchivedObject const& object, std::vector<Ancestry>& told) {
+        std::vector<Link> links;
+        if (!ReadLinks(object.type, object.data, links)) {
+            report_.damaged.push_back(object.id);
+            return;
+        }
+        if (object.type == ObjectType::Commit)
+            told.push_back({object.id, {}, {}, {}});
+        for (Link const& link : links) {
+            if (object.type == ObjectType::Commit)
+                (link.type == ObjectType::Tree ? told.back().tree : told.back().parent) = link.id;
+            if (!all_.Find(link.id) && missing_.insert(link.id).second)
+                report_.missing.push_back({link.id, object.id});
+        }
+    }
+
+    void VerifyContent(Id const& id) {
+        try {
+            StreamIO content = ContentStream(archive_, id);
+            std::vector<std::byte> piece(largestWholeContent);
+            std::uint64_t rest = content.GetSize();
+            for (bool isSound = true; isSound && rest > 0;) {
+                std::uint64_t const size = std::min<std::uint64_t>(rest, piece.size());
+                isSound = content.Read(piece.data(), size);
+                rest -= isSound ? size : 0;
+                ReportProgress(progress_, {"verifying a content", content.GetPosition(), content.GetSize()}, {});
+            }
+            if (rest == 0)
+                return;
+        } catch (ArchiveError const& error) {
+            if (error.GetKind() != Failure::Damaged)
+                throw;
+        }
+        report_.damaged.push_back(id);
+    }
+
+    void VerifyAncestry(std::vector<Ancestry> const& told) {
+        std::vector<Id> commits;
+        for (Ancestry const& facts : told)
+            commits.push_back(facts.commit);
+        auto known = archive_.ReadAncestry(commits, Follow::Parents, 0);
+        auto const less = [](Ancestry const& left, Ancestry const& right) {
+            return DigestOf(left.commit) < DigestOf(right.commit);
+        };
+        std::sort(known.begin(), known.end(), less);
+        for (Ancestry const& facts : told) {
+            auto const found = std::lower_bound(known.begin(), known.end(), facts, less);
+            if (found == known.end() || !(found->commit == facts.commit) || !(found->parent == facts.parent) ||
+                !(found->tree == facts.tree))
+                report_.ancestry.push_back(facts.commit);
+        }
+    }
+
+    /// What was stored while the objects were listed is not missing.
+    void ForgetWhatCameLater() {
+        std::vector<Id> const ids(missing_.begin(), missing_.end());
+        auto const missing = archive_.FindMissing(ids);
+        std::unordered_set<Id> const still(missing.begin(), missing.end());
+        std::erase_if(report_.missing, [&](MissingObject const& one) { return still.count(one.id) == 0; });
+    }
+
+    void VerifyBranches() {
+        for (Branch const& branch : archive_.ReadBranches()) {
+            bool isSound = false;
+            archive_.Read({&branch.head, 1},
+                          [&](ArchivedObject const& object) { isSound = object.type == ObjectType::Commit; });
+            if (!isSound)
+                report_.branches.push_back(branch);
+        }
+    }
+
+    IArchive& archive_;
+    IProgress* progress_;
+    ObjectIndex all_;
+    std::unordered_set<Id> missing_;
+    VerifyReport report_;
+};
+
+} // namespace
+
+VerifyReport Verify(IArchive& archive, IProgress* progress) {
+    return Verification(archive, progress).Run();
+}
+
+} // namespace KivArchive

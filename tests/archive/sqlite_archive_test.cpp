@@ -1,0 +1,307 @@
+#include "ArchiveFiles.h"
+
+#include <gtest/gtest.h>
+
+#include <csignal>
+#include <sqlite3.h>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+
+/// Archives in files: what is no archive, damage, kills, copies and what differences cost.
+
+namespace KivArchive {
+namespace {
+
+using namespace Conformance;
+
+void RunSql(std::string const& path, std::string const& sql) {
+    sqlite3* database = nullptr;
+    ASSERT_EQ(sqlite3_open(path.c_str(), &database), SQLITE_OK);
+    char* message = nullptr;
+    EXPECT_EQ(sqlite3_exec(database, sql.c_str(), nullptr, nullptr, &message), SQLITE_OK) << message << " by " << sql;
+    sqlite3_free(message);
+    sqlite3_close(database);
+}
+
+/// The kind of failure that opening ends in; none if it succeeds.
+std::optional<Failure> FailureOf(std::string const& path, SqliteOptions const& options = {}) {
+    try {
+        SqliteArchive archive(path, options);
+        return std::nullopt;
+    } catch (ArchiveError const& error) {
+        EXPECT_EQ(error.GetFile(), path);
+        EXPECT_NE(std::string(error.what()).find(path), std::string::npos) << error.what();
+        return error.GetKind();
+    }
+}
+
+std::string MakeArchive(std::string const& path, int versions) {
+    SqliteArchive archive(path);
+    SmallHost host(archive, 1);
+    for (int i = 0; i < versions; ++i)
+        EXPECT_TRUE(host.Publish());
+    return path;
+}
+
+TEST(SqliteArchive, RefusesWhatIsNoArchiveOfIts) {
+    TemporaryDirectory const directory;
+    SqliteOptions existing;
+    existing.create = false;
+    EXPECT_EQ(FailureOf(directory.Path("none"), existing), Failure::Unavailable);
+    EXPECT_EQ(FailureOf(directory.Path("no/directory")), Failure::Unavailable);
+    WriteFile(directory.Path("text"), std::string(5000, 'x'));
+    EXPECT_EQ(FailureOf(directory.Path("text")), Failure::Foreign);
+    RunSql(directory.Path("other"), "CREATE TABLE objects(id)");
+    EXPECT_EQ(FailureOf(directory.Path("other")), Failure::Foreign);
+
+    std::string const sound = ReadFile(MakeArchive(directory.Path("archive"), 2));
+    // What an application of ill will would plant, and what only time can bring.
+    for (const char* const change :
+         {"CREATE TRIGGER t AFTER INSERT ON segments BEGIN DELETE FROM branches; END",
+          "CREATE VIEW v AS WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) SELECT x FROM n",
+          "CREATE INDEX i ON objects(segment)", "ALTER TABLE records ADD COLUMN more BLOB", "DROP TABLE marks",
+          "DROP TABLE records; CREATE VIEW records AS SELECT name, head AS value FROM branches",
+          "PRAGMA application_id=7"}) {
+        std::string const path = directory.Path("changed");
+        WriteFile(path, sound);
+        RunSql(path, change);
+        EXPECT_EQ(FailureOf(path), Failure::Foreign) << change;
+    }
+    WriteFile(directory.Path("newer"), sound);
+    RunSql(directory.Path("newer"), "PRAGMA user_version=2");
+    EXPECT_EQ(FailureOf(directory.Path("newer")), Failure::NewerFormat);
+    EXPECT_EQ(FailureOf(directory.Path("archive"), existing), std::nullopt);
+    EXPECT_EQ(std::filesystem::status(directory.Path("archive")).permissions(), std::filesystem::perms(0600));
+}
+
+TEST(SqliteArchive, RunsNoTriggersThatArePlantedWhileItIsOpen) {
+    TemporaryDirectory const directory;
+    SqliteArchive archive(directory.Path("archive"));
+    SmallHost host(archive, 1);
+    ASSERT_TRUE(host.Publish());
+    RunSql(directory.Path("archive"), "CREATE TRIGGER t AFTER INSERT ON segments BEGIN DELETE FROM branches; END");
+    ASSERT_TRUE(host.Publish());
+    EXPECT_EQ(HeadOf(archive), host.Head());
+}
+
+TEST(SqliteArchive, WaitsForALockAsLongAsItIsTold) {
+    TemporaryDirectory const directory;
+    SqliteOptions impatient;
+    impatient.wait = std::chrono::milliseconds(50);
+    SqliteArchive archive(directory.Path("archive"), impatient);
+    SmallHost host(archive, 1);
+    sqlite3* other = nullptr;
+    sqlite3_open(directory.Path("archive").c_str(), &other);
+    sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
+    try {
+        host.Publish();
+        ADD_FAILURE() << "the archive is locked";
+    } catch (ArchiveError const& error) {
+        EXPECT_EQ(error.GetKind(), Failure::Locked);
+    }
+    EXPECT_TRUE(archive.ReadBranches().empty()) << "readers do not wait";
+    sqlite3_close(other);
+    EXPECT_TRUE(host.Publish());
+}
+
+TEST(SqliteArchive, CopiesOfAnOpenArchiveAreWholeAndOfOneMoment) {
+    TemporaryDirectory const directory;
+    SqliteArchive archive(directory.Path("archive"));
+    SmallHost host(archive, 1);
+    for (int i = 0; i < 12; ++i)
+        host.Publish();
+    struct Publishing final : IProgress {
+        bool Report(Progress const& /*progress*/) override { return host->Publish(); }
+        SmallHost* host = nullptr;
+    } publishing;
+    publishing.host = &host;
+    Id const head = host.Head();
+    archive.Backup(directory.Path("copy"), &publishing);
+    EXPECT_FALSE(host.Head() == head);
+    SqliteArchive copy(directory.Path("copy"));
+    EXPECT_EQ(HeadOf(copy), head);
+    EXPECT_EQ(ProblemsOf(copy), "");
+    EXPECT_THROW(archive.Backup(directory.Path("copy"), nullptr), ArchiveError);
+    EXPECT_EQ(ProblemsOf(copy), "") << "what is there stays";
+}
+
+/// Sizes are what differences are for: an edit costs what it changes, whatever it is an edit of.
+TEST(SqliteArchive, VersionsCostWhatTheyChange) {
+    TemporaryDirectory const directory;
+    SqliteArchive archive(directory.Path("archive"));
+    std::vector<std::pair<std::string, Id>> files;
+    for (int i = 0; i < 20000; ++i)
+        files.emplace_back(std::to_string(100000 + i), Object(ObjectType::Blob, std::to_string(i)).id);
+    std::string text = SomeNoise(1, 900000);
+    NewObject tree = Object(ObjectType::Tree, TreeOf(files));
+    NewObject blob = Object(ObjectType::Blob, text);
+    std::uint64_t first = 0;
+    constexpr int edits = 64;
+    std::vector<Id> ids;
+    for (int i = 0; i <= edits; ++i) {
+        Change change;
+        change.objects = {tree, blob};
+        archive.Apply(change);
+        ids.insert(ids.end(), {tree.id, blob.id});
+        if (i == 0)
+            first = archive.GetStatistics().bytes;
+        text.insert(static_cast<std::size_t>(i) * 13001, "an edit");
+        files[static_cast<std::size_t>(i) * 311].second = blob.id;
+        tree = Object(ObjectType::Tree, TreeOf(files), tree.id);
+        blob = Object(ObjectType::Blob, text, blob.id);
+    }
+    EXPECT_LT((archive.GetStatistics().bytes - first) / edits, 1000U);
+    // Version 64 is one step from a whole one, 63 is six.
+    EXPECT_EQ(ReadAll(archive, ids).size(), ids.size());
+}
+
+class Random {
+public:
+    explicit Random(std::uint32_t seed) : engine_(seed) {}
+    std::size_t Below(std::size_t end) { return static_cast<std::size_t>(engine_()) % end; }
+
+private:
+    std::mt19937 engine_;
+};
+
+/// One kind of damage after the other; the seed decides where.
+std::string Damage(std::string bytes, std::uint32_t seed) {
+    Random random(seed);
+    constexpr std::size_t page = 4096;
+    std::size_t const pages = bytes.size() / page;
+    auto const at = [&](std::size_t number) { return bytes.begin() + static_cast<std::ptrdiff_t>(number * page); };
+    switch (seed % 6) {
+    case 0:
+        for (std::size_t i = 0; i <= random.Below(20); ++i)
+            bytes[random.Below(bytes.size())] ^= static_cast<char>(1U << random.Below(8));
+        break;
+    case 1:
+        bytes.resize(random.Below(bytes.size()));
+        break;
+    case 2: {
+        std::size_t const one = 1 + random.Below(pages - 1);
+        std::size_t const other = 1 + random.Below(pages - 1);
+        if (one != other)
+            std::swap_ranges(at(one), at(one) + page, at(other));
+        break;
+    }
+    case 3: {
+        std::size_t const number = random.Below(pages);
+        std::fill(at(number), at(number) + page, static_cast<char>(random.Below(256)));
+        break;
+    }
+    case 4:
+        // Sizes and pointers at the beginnings of pages.
+        for (std::size_t i = 0; i < 4; ++i)
+            bytes[random.Below(pages) * page + random.Below(16)] = '\x7F';
+        break;
+    default:
+        bytes.insert(random.Below(bytes.size()), random.Below(page), 'x');
+        break;
+    }
+    return bytes;
+}
+
+TEST(SqliteArchive, TellsDamageAndGivesWhatIsSound) {
+    TemporaryDirectory const directory;
+    std::string const sound = ReadFile(MakeArchive(directory.Path("archive"), 20));
+    int const trials = CountFromEnvironment("KIVVCS_ARCHIVE_DAMAGES", 300);
+    int refused = 0;
+    int partial = 0;
+    std::uint64_t given = 0;
+    for (int trial = 0; trial < trials; ++trial) {
+        std::string const path = directory.Path("damaged");
+        WriteFile(path, Damage(sound, static_cast<std::uint32_t>(trial)));
+        try {
+            SqliteArchive archive(path);
+            // What is read is compared with its identifier there; nothing else counts as read.
+            VerifyReport const report = Verify(archive, nullptr);
+            partial += report.IsSound() ? 0 : 1;
+            given += report.objects;
+            SmallHost(archive, 9).Publish();
+        } catch (ArchiveError const& error) {
+            EXPECT_TRUE(error.GetKind() == Failure::Damaged || error.GetKind() == Failure::Foreign ||
+                        error.GetKind() == Failure::NewerFormat || error.GetKind() == Failure::Unavailable)
+                << error.what();
+            ++refused;
+        }
+    }
+    std::printf("%d damaged files: %d refused with a message, %d read in part, %llu objects read\n", trials, refused,
+                partial, static_cast<unsigned long long>(given));
+    EXPECT_GT(refused, 0);
+    EXPECT_GT(partial, 0);
+}
+
+/// Publishes and collects until it is killed, and tells every head that it has published.
+[[noreturn]] void PublishForever(std::string const& path, std::uint32_t seed, int told) {
+    try {
+        SqliteArchive archive(path);
+        SmallHost host(archive, seed);
+        for (int i = 1;; ++i) {
+            if (host.Publish()) {
+                Id::Digest const digest = *host.Head().GetDigest();
+                if (write(told, digest.data(), digest.size()) != static_cast<ssize_t>(digest.size()))
+                    _exit(1);
+            }
+            if (i % 5 == 0) {
+                CollectOptions options;
+                options.grace = std::chrono::seconds(0);
+                options.slice = 5;
+                Collect(archive, options, nullptr);
+            }
+        }
+    } catch (...) {
+        _exit(1);
+    }
+}
+
+/// The head that was told last before the end.
+Id LastTold(int pipe) {
+    Id last;
+    for (Id::Digest digest{}; read(pipe, digest.data(), digest.size()) == static_cast<ssize_t>(digest.size());)
+        last = Id::FromDigest(digest);
+    return last;
+}
+
+TEST(SqliteArchive, KilledWritersLoseNothingAndLockNobodyOut) {
+    TemporaryDirectory const directory;
+    std::string const path = directory.Path("archive");
+    MakeArchive(path, 1);
+    int const trials = CountFromEnvironment("KIVVCS_ARCHIVE_KILLS", 20);
+    Random random(4);
+    int published = 0;
+    for (int trial = 0; trial < trials; ++trial) {
+        int ends[2] = {};
+        ASSERT_EQ(pipe(ends), 0);
+        pid_t const child = fork();
+        ASSERT_GE(child, 0);
+        if (child == 0)
+            PublishForever(path, static_cast<std::uint32_t>(trial + 10), ends[1]);
+        close(ends[1]);
+        std::this_thread::sleep_for(std::chrono::microseconds(random.Below(150000)));
+        kill(child, SIGKILL);
+        int status = 0;
+        waitpid(child, &status, 0);
+        ASSERT_TRUE(WIFSIGNALED(status)) << "it failed before it was killed";
+        Id const told = LastTold(ends[0]);
+        close(ends[0]);
+
+        SqliteOptions options;
+        options.wait = std::chrono::milliseconds(0);
+        SqliteArchive archive(path, options);
+        ASSERT_EQ(ProblemsOf(archive), "") << "after kill " << trial;
+        Id const head = HeadOf(archive);
+        bool isKnown = told.IsEmpty();
+        for (Ancestry const& facts : archive.ReadAncestry({&head, 1}, Follow::Parents, 1U << 20U))
+            isKnown = isKnown || facts.commit == told;
+        EXPECT_TRUE(isKnown) << "a version that was published is lost";
+        published += told.IsEmpty() ? 0 : 1;
+        EXPECT_TRUE(SmallHost(archive, static_cast<std::uint32_t>(trial + 1000)).Publish());
+    }
+    std::printf("%d kills, %d of them after something was published\n", trials, published);
+    EXPECT_GT(published, 0);
+}
+
+} // namespace
+} // namespace KivArchive
