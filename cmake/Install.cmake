@@ -47,6 +47,6 @@ install(FILES ${CMAKE_CURRENT_BINARY_DIR}/KivVcs.pc DESTINATION ${CMAKE_INSTALL_
 # Where gdb looks for what belongs to a library: under the path that the library has when it is installed.
 if(BUILD_SHARED_LIBS AND UNIX AND NOT APPLE)
     install(FILES ${PROJECT_SOURCE_DIR}/gdb/printers.py COMPONENT development
-            DESTINATION ${CMAKE_INSTALL_DATADIR}/gdb/auto-load/\${CMAKE_INSTALL_PREFIX}/${CMAKE_INSTALL_LIBDIR}
+            DESTINATION ${CMAKE_INSTALL_DATADIR}/gdb/auto-load\${CMAKE_INSTALL_PREFIX}/${CMAKE_INSTALL_LIBDIR}
             RENAME $<TARGET_FILE_NAME:KivVcs>-gdb.py)
 endif()
