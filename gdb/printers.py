@@ -302,11 +302,49 @@ class CommitTreePrinter:
 
 
 class TreePrinter(ObjectPrinter):
+    """A directory by its names, each with what it holds."""
+
     def __init__(self, value):
-        self.value = value
+        self.top = value["entries_"]["top_"]
+        self.name = named("tree", value)
 
     def to_string(self):
-        return named("tree", self.value)
+        return self.name
+
+    def children(self):
+        if find_type("KivVcs::detail::Entry") is not None:
+            for entry in entries_below(self.top):
+                yield text_of(entry["name"]), "; ".join(held_by(entry["held"]["word_"]))
+
+
+def entries_below(handle):
+    """The entries below a node, in order."""
+    node = handle["counted_"].cast(gdb.lookup_type("KivVcs::detail::Node").pointer())
+    if int(node) == 0:
+        return
+    kind = "Entry" if int(node["height_"]) == 0 else "Child"
+    elements = (node + 1).cast(gdb.lookup_type("KivVcs::detail::" + kind).pointer())
+    for index in range(int(node["count_"])):
+        if kind == "Entry":
+            yield elements[index]
+        else:
+            yield from entries_below(elements[index]["node"])
+
+
+def held_by(word):
+    """What a name holds, told by the lowest bits of the address: a blob, a tree, or both."""
+    kind, address = int(word) & 3, int(word) & ~3
+    if kind == 3:
+        both = gdb.Value(address).cast(gdb.lookup_type("KivVcs::detail::Held::Both").pointer())
+        yield named_or_null("blob", pointee_of(both["blob"]))
+        yield named_or_null("tree", pointee_of(both["tree"]))
+    else:
+        thing = gdb.Value(address).cast(gdb.lookup_type("KivVcs::Object").pointer())
+        yield named_or_null("blob" if kind == 1 else "tree", thing.dereference() if address else None)
+
+
+def named_or_null(kind, thing):
+    return "null " + kind if thing is None else named(kind, thing)
 
 
 def make_printers():

@@ -26,6 +26,8 @@ expect() {
 }
 
 # sha256 of "blob 5", a zero byte and "hello", and of trees of it that Python's hashlib computed
+directory=8418b19103788eb3733a7d1ec6419bc8cea6377f5d89630505832c1281925b36
+root=84d52eb6de077aed1c9d7d009dd8c723700c818e29ca900130886a4a72e9d731
 hello=8aec4e4876f854f688d0ebfc8f37598f38e5fd6903cccc850ca36591175aeb60
 expect word 'u"Grüße"'
 expect view '"view"'
@@ -40,6 +42,7 @@ if [ "$extent" = whole ]; then
     expect blob "held [2-9] times = \\{object = blob ${hello:0:12}, 5 bytes \"hello\"\\}"
     expect object "held [2-9] times = \\{object = blob ${hello:0:12}, 5 bytes \"hello\"\\}"
     expect first 'held [2-9] times = \{object = commit [0-9a-f]{12} = \{description_ = u"Start", authorName_ = u"Ada", authorEmail_ = u"ada@example.org", commitTime_ = 20[-0-9]+ [0-9:]+ UTC, parent_ = none, .*'
+    expect tree "held [2-9] times = \\{object = tree ${root:0:12} = \\{a = \"?tree ${directory:0:12}\"?\\}\\}"
     expect next 'commit \(not identified yet\) = \{.* 2001-09-09 01:46:40 UTC, parent_ = commit [0-9a-f]{12}, .*'
 fi
 if grep -E 'Python Exception|Traceback' <<<"$output"; then
