@@ -9,7 +9,7 @@ extent=$3
 export ASAN_OPTIONS=detect_leaks=0 LC_ALL=C.UTF-8
 
 commands=(-ex 'set breakpoint pending on' -ex 'set width 0' -ex 'break Look' -ex run -ex up)
-for value in word view empty noId id content unidentified chain blob object first next tree nothing; do
+for value in word view empty noId id content unidentified chain blob object first next tree wide nothing; do
     commands+=(-ex "printf \"$value: \"" -ex "print $value")
 done
 output=$(gdb --batch --nx -x "$printers" "${commands[@]}" "$program" 2>&1) || true
@@ -39,10 +39,12 @@ if [ "$extent" = whole ]; then
     expect content '5 bytes "hello"'
     expect unidentified 'blob .not identified yet., 5 bytes "hello"'
     expect chain '100005 bytes "hello(\\000){195}"...'
-    expect blob "held [2-9] times = \\{object = blob ${hello:0:12}, 5 bytes \"hello\"\\}"
-    expect object "held [2-9] times = \\{object = blob ${hello:0:12}, 5 bytes \"hello\"\\}"
-    expect first 'held [2-9] times = \{object = commit [0-9a-f]{12} = \{description_ = u"Start", authorName_ = u"Ada", authorEmail_ = u"ada@example.org", commitTime_ = 20[-0-9]+ [0-9:]+ UTC, parent_ = none, .*'
-    expect tree "held [2-9] times = \\{object = tree ${root:0:12} = \\{a = \"?tree ${directory:0:12}\"?\\}\\}"
+    expect blob "held [0-9]+ times = \\{object = blob ${hello:0:12}, 5 bytes \"hello\"\\}"
+    expect object "held [0-9]+ times = \\{object = blob ${hello:0:12}, 5 bytes \"hello\"\\}"
+    expect first 'held [0-9]+ times = \{object = commit [0-9a-f]{12} = \{description_ = u"Start", authorName_ = u"Ada", authorEmail_ = u"ada@example.org", commitTime_ = 20[-0-9]+ [0-9:]+ UTC, parent_ = none, .*'
+    expect tree "held [0-9]+ times = \\{object = tree ${root:0:12} = \\{a = \"?tree ${directory:0:12}\"?\\}\\}"
+    blob="blob ${hello:0:12}"
+    expect wide "tree [^=]* = \\{00 = $blob; tree ${root:0:12}(, [0-9]{2} = $blob){98}, 99 = $blob\\}"
     expect next 'commit \(not identified yet\) = \{.* 2001-09-09 01:46:40 UTC, parent_ = commit [0-9a-f]{12}, .*'
 fi
 if grep -E 'Python Exception|Traceback' <<<"$output"; then

@@ -32,6 +32,14 @@ int main() {
     next.AddBlob(&repository, u"c.txt", Blob(content));
     const cow_ptr<Tree> tree = first->GetCommitTree()->GetRoot();
     const cow_ptr<Tree> nothing;
+    Tree wide;
+    for (char16_t tens = u'0'; tens <= u'9'; ++tens) {
+        for (char16_t ones = u'0'; ones <= u'9'; ++ones) {
+            const std::array<char16_t, 2> name{tens, ones};
+            wide.AddBlob(&repository, {name.data(), 2}, *blob);
+        }
+    }
+    wide.AddTree(&repository, u"00", *tree);
     const cow_ptr<Object> object = blob;
     Look();
     return word.IsEmpty() || view.IsEmpty() || !empty.IsEmpty() || !noId.IsEmpty() || id.IsEmpty() || nothing ||
