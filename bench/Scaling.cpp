@@ -75,6 +75,23 @@ bool Simplify(Repository& repo, bool) {
     return repo.SimplifyCommitGraph(true);
 }
 
+/// Directories that each name the next one twice.
+cow_ptr<Tree> NestTwice(Repository& repo, std::int64_t count) {
+    cow_ptr<Tree> tree = MakeTwoLevels(repo, 1, 1);
+    for (std::int64_t number = 0; number < count; ++number) {
+        Tree above;
+        above.AddTree(&repo, u"left", *tree);
+        above.AddTree(&repo, u"right", *tree);
+        tree = immu::make<Tree>(std::move(above));
+    }
+    return tree;
+}
+
+/// Counted by 64 bits, which so many files do not fit into.
+bool CountFiles(Repository&, cow_ptr<Tree> const& tree) {
+    return tree->GetDeepBlobCount() == 0;
+}
+
 } // namespace
 
 void AddScalingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
@@ -91,6 +108,7 @@ void AddScalingWorkloads(std::vector<Workload>& workloads, Divisors const& divis
     add("B15 purge, every second commit not stored", GrowHalfStored, Purge);
     add("B16 deletion, as many branches as commits", GrowBelowBranches, DeleteAll);
     add("B17 simplification, a branch from each commit", GrowBranches, Simplify);
+    add("B18 files counted below directories named twice", NestTwice, CountFiles);
 }
 
 } // namespace KivVcs::Bench
