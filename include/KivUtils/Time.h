@@ -38,7 +38,7 @@ public:
     /// The current time.
     [[nodiscard]] static Time Now() noexcept;
 
-    /// The time @p seconds after (before, if negative) 1970; seconds that ticks cannot tell (beyond the year 31197)
+    /// The time @p seconds after (before, if negative) 1970; seconds that ticks cannot hold (beyond the year 31197)
     /// give the nearest time that they can.
     [[nodiscard]] static Time FromTimeT(std::int64_t seconds, TimeZone) noexcept;
 
@@ -56,7 +56,7 @@ private:
 namespace DateTime {
 
 /// The offset from UTC that the local time zone has at @p time (positive east of Greenwich), to the second; zero where
-/// the platform cannot tell. Reads the environment, which no other thread may change meanwhile.
+/// the platform does not know it. Reads the environment, which no other thread may change meanwhile.
 [[nodiscard]] KIVVCS_EXPORT TimeDelta GetCurrentTimezoneBias(Time time) noexcept;
 
 } // namespace DateTime

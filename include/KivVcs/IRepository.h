@@ -45,7 +45,7 @@ public:
     [[nodiscard]] virtual std::uint64_t GetCommitCount() const = 0;
     [[nodiscard]] virtual std::uint64_t GetTreeCount() const = 0;
     [[nodiscard]] virtual std::uint64_t GetBlobCount() const = 0;
-    /// Deletes @p commit and everything below it on its chain, but for the commits that are branch heads: those are
+    /// Deletes @p commit and all its ancestors, but for the commits that are branch heads: those are
     /// stored anew, linked to each other in their old order, their branches moved, and unused objects purged. A root
     /// commit, and null, are left alone. Descendants of @p commit keep their old parents in memory.
     /// @return false without storage.
@@ -64,8 +64,8 @@ public:
     [[nodiscard]] virtual IObjectsStorage* GetStorage() = 0;
     [[nodiscard]] virtual IObjectsStorage const* GetStorage() const = 0;
     /// The commit at which the histories of both commits meet, compared by identifier; null if they never do. Follows
-    /// parent links, one step on each side in turn; when both arrive together the result is the object on the second
-    /// one's chain.
+    /// parent links, one step on each side in turn; when both arrive together the result is the object in the second
+    /// one's history.
     [[nodiscard]] virtual cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const = 0;
     /// Makes an existing branch current; false if there is none of that name.
     virtual bool Checkout(KivStringViewT<char16_t> branch) = 0;

@@ -69,7 +69,7 @@ struct Resolvers {
                                                                 TreeConflictResolver second);
 
 /// A resolver that lets the side with the later time win. A side's time is read by @p getTime from the first of the
-/// blobs @p names (relative paths, in order of preference) that tells one, looked up in the directory of the disputed
+/// blobs @p names (relative paths, in order of preference) that has one, looked up in the directory of the disputed
 /// entry and, while that decides nothing, in each directory above it. The path of the entry itself is tried as a
 /// directory first.
 ///

@@ -65,7 +65,7 @@ void DoTrivialChanges(IRepository* repo, cow_ptr<Tree>& result, MergeTrees const
         UseChangeFrom(repo, result, trees.left, name);
 }
 
-/// The user's resolvers together with the place of the merge that they are asked about.
+/// The host's resolvers together with the place of the merge that they are asked about.
 class SimpleResolvers {
 public:
     SimpleResolvers(MergeTrees trees, Resolvers resolvers)

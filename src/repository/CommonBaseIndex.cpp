@@ -17,8 +17,8 @@ CommonBaseIndex::CommonBaseIndex(std::vector<cow_ptr<Commit>> const& heads) {
     }
 }
 
-/// Every commit at which a path arrives that another one has passed is the base of two heads, and every base is one of
-/// these or a head itself, since an identifier determines the identifiers of all ancestors: paths that meet stay
+/// Every commit at which the way down from a head meets that of another one is the base of two heads, and every base is
+/// one of these or a head itself, since an identifier determines the identifiers of all ancestors: ways that meet stay
 /// together.
 /// @return false if there are two objects of one identifier: which of them is a base depends on who asks.
 bool CommonBaseIndex::AddNodes(std::vector<cow_ptr<Commit>> const& heads) {

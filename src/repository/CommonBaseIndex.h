@@ -22,15 +22,15 @@ public:
     [[nodiscard]] optional<Commit const*> Find(Commit const& first, Commit const& second) const;
 
 private:
-    /// A head, or a commit at which the paths down from two heads meet.
+    /// A head, or a commit at which the ways down from two heads meet.
     struct Node {
         Commit const* commit = nullptr;
-        /// The nearest node on the path down; null for the last one.
+        /// The nearest node on the way down; null for the last one.
         Node const* below = nullptr;
         /// A node further down, such that any depth is reached in a logarithmic number of steps; itself for the last
         /// one.
         Node const* jump = nullptr;
-        /// The number of nodes on the path, this one included; 0 until the node is linked.
+        /// The number of nodes on the way down, this one included; 0 until the node is linked.
         std::size_t depth = 0;
     };
 

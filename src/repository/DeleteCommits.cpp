@@ -4,7 +4,7 @@ namespace KivVcs {
 
 namespace {
 
-/// The branch heads of a deleted chain, newest first.
+/// The branch heads in a deleted history, newest first.
 struct KeptHeads {
     std::vector<cow_ptr<Commit>> former;
     /// Private copies without parents.
@@ -13,7 +13,7 @@ struct KeptHeads {
     std::vector<std::vector<KivStringT<char16_t>>> branches;
 };
 
-/// Takes the chain out of the storage. Of the old commits other than heads, one at a time is held, so that they die as
+/// Takes the history out of the storage. Of the old commits other than heads, one at a time is held, so that they die as
 /// soon as nobody else holds them.
 KeptHeads DeleteChain(IObjectsStorage& storage, cow_ptr<Commit> newest) {
     KeptHeads kept;

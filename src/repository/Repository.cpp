@@ -10,7 +10,7 @@ Repository::~Repository() = default;
 cow_ptr<Commit> Repository::DoCommit(Commit& commit) {
     if (storage_ == nullptr || (commit.IsAmend() && !GetHead()))
         return nullptr;
-    // Whole seconds, since that is what the commit's text tells.
+    // Whole seconds, which is all that a commit's text stores.
     const Time now = Time::FromTimeT(Time::Now().ToTimeT(TimeZone::Utc), TimeZone::Utc);
     commit.SetCommitTime(now);
     commit.SetCommitTimezoneBias(DateTime::GetCurrentTimezoneBias(now));

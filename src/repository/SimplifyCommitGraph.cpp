@@ -50,8 +50,9 @@ public:
     }
 
     /// Keeps every commit at which the way down from a head meets that of another one: the common bases of every two
-    /// heads, since an identifier of ours determines those of all ancestors, so that ways that meet stay together.
-    /// @return false, keeping none, if there are commits of a host's class, whose identifiers are what the host says.
+    /// heads, since the identifier of one of the library's commits determines those of all ancestors, so that ways that
+    /// meet stay together.
+    /// @return false, keeping none, if there are commits of a host's class, whose identifiers may be anything.
     bool KeepMeetings() {
         CommitSet visited;
         std::vector<Id> meetings;
@@ -113,7 +114,7 @@ private:
         child->second.isLinked = true;
     }
 
-    /// Depth-first, on a stack of its own since a chain may keep any number of commits.
+    /// Depth-first, on a stack of its own since a history may keep any number of commits.
     void RebuildFrom(Id const& root) const {
         struct Level {
             KeptCommit const* kept;

@@ -13,7 +13,7 @@ typename Table::mapped_type FindIn(Table const& table, Key const& key) {
 template <class T>
 void AddTo(std::unordered_map<Id, cow_ptr<T>>& table, cow_ptr<T> object) {
     Id id = object->GetId();
-    // Where most buckets are free, the bucket alone tells that an object is new, as most that are asked for are; otherwise
+    // Where most buckets are free, the bucket alone shows that an object is new, as most that are asked for are; otherwise
     // that takes a visit to a neighbour somewhere in memory. What is there already must not make the table grow, which
     // would change its order.
     if (table.size() >= table.bucket_count() / 4 && !table.contains(id))
