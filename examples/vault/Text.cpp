@@ -67,8 +67,4 @@ std::string Printable(std::string_view utf8) {
     return result;
 }
 
-std::string Printable(TextView text) {
-    return Printable(ToUtf8(text));
-}
-
 } // namespace vault

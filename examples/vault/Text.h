@@ -2,6 +2,7 @@
 
 #include <KivVcs/KivVcs.h>
 
+#include <concepts>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -28,6 +29,9 @@ using TextView = KivVcs::KivStringViewT<char16_t>;
 /// The text with control characters, and bytes that are not UTF-8, escaped: names and messages of other people cannot
 /// steer the terminal or fake a line.
 [[nodiscard]] std::string Printable(std::string_view utf8);
-[[nodiscard]] std::string Printable(TextView text);
+template <std::convertible_to<TextView> T>
+[[nodiscard]] std::string Printable(T const& text) {
+    return Printable(ToUtf8(text));
+}
 
 } // namespace vault

@@ -9,6 +9,7 @@
 #include <array>
 #include <atomic>
 #include <cstdint>
+#include <iosfwd>
 #include <utility>
 
 namespace KivPlatform {
@@ -63,6 +64,10 @@ public:
               for (char byte : KivStringViewT<char>(text))
                   *units++ = static_cast<unsigned char>(byte);
           })) {}
+
+    template <StandardEightBitText T>
+        requires std::same_as<C, char16_t>
+    KivStringT(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
 
     KivStringT(KivStringT const& other) noexcept : text_(other.text_) {
         if (text_ != nullptr)
@@ -131,6 +136,10 @@ public:
         return *this += static_cast<C>(static_cast<unsigned char>(character));
     }
 
+    template <StandardEightBitText T>
+        requires std::same_as<C, char16_t>
+    KivStringT& operator+=(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
+
     void Swap(KivStringT& other) noexcept { std::swap(text_, other.text_); }
 
     /// Makes a text of @p length code units and lets @p fill write them through the pointer that it is given.
@@ -194,6 +203,17 @@ template <class L, class R>
     KivStringT<char16_t> result{KivStringViewT<char16_t>(left)};
     return result += KivStringViewT<char16_t>(right);
 }
+
+template <class L, class R>
+    requires MixedTextPair<L, R>
+KivStringT<char16_t> operator+(L const& left, R const& right) = delete; // write u"..." or call FromUtf8(text)
+
+/// Writes a text: 8-bit text as it is, UTF-16 text in UTF-8. Width and fill of the stream count bytes.
+/// @throws std::bad_alloc, and what the stream throws
+KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringT<char> const& text);
+KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringT<char16_t> const& text);
+KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringViewT<char> const& text);
+KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringViewT<char16_t> const& text);
 
 // A DLL exports no inline members: there every program makes its own.
 #if !defined(_WIN32)

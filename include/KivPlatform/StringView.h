@@ -14,6 +14,7 @@
 #include <functional>
 #include <limits>
 #include <string_view>
+#include <type_traits>
 
 namespace KivPlatform {
 
@@ -23,6 +24,14 @@ class KIVVCS_EXPORT KivStringT;
 /// How texts are compared. `Exact`, the default everywhere, orders by unsigned code unit, a prefix before the longer
 /// text.
 enum class CompareCase : std::int32_t { Exact = 0 };
+
+/// 8-bit text of the standard library or the language: a literal, `std::string`, `std::string_view`.
+///
+/// UTF-16 texts and views are not made of such text, since it does not say its encoding: the constructors and operators
+/// that would take it are deleted, so that the compiler names the function to call, `FromUtf8`, right away.
+template <class T>
+concept StandardEightBitText =
+    std::convertible_to<T const&, std::string_view> && !std::same_as<std::remove_cvref_t<T>, std::nullptr_t>;
 
 /// A pointer and a length: text that somebody else owns. Lengths and positions are signed 32-bit code unit counts.
 ///
@@ -43,6 +52,10 @@ public:
         : text_(text), length_(text == nullptr || length < 0 ? 0 : length) {}
 
     KivStringViewT(KivStringT<C> const& text) noexcept;
+
+    template <StandardEightBitText T>
+        requires std::same_as<C, char16_t>
+    KivStringViewT(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
 
     [[nodiscard]] constexpr int GetLength() const noexcept { return length_; }
     [[nodiscard]] constexpr bool IsEmpty() const noexcept { return length_ == 0; }
@@ -140,6 +153,16 @@ template <class L, class R>
 [[nodiscard]] bool operator==(L const& left, R const& right) noexcept {
     return KivStringViewT<char16_t>(left).HasSameText(KivStringViewT<char16_t>(right));
 }
+
+/// A UTF-16 text of the library and 8-bit text that it cannot be compared with or joined to.
+template <class L, class R>
+concept MixedTextPair =
+    (StandardEightBitText<L> && (std::same_as<R, KivStringT<char16_t>> || std::same_as<R, KivStringViewT<char16_t>>)) ||
+    (StandardEightBitText<R> && (std::same_as<L, KivStringT<char16_t>> || std::same_as<L, KivStringViewT<char16_t>>));
+
+template <class L, class R>
+    requires MixedTextPair<L, R>
+bool operator==(L const& left, R const& right) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
 
 /// The order of `Compare`.
 template <class L, class R>

@@ -9,6 +9,7 @@
 #include "KivUtils/Encoding.h"
 #include "KivUtils/Stream.h"
 #include "KivUtils/Time.h"
+#include "KivUtils/Utf8.h"
 #include "KivUtils/cow_ptr.h"
 
 namespace KivVcs {
@@ -22,6 +23,7 @@ using KivUtils::array_view;
 using KivUtils::cow_ptr;
 using KivUtils::emplace;
 using KivUtils::emplace_t;
+using KivUtils::FromUtf8;
 using KivUtils::IStream;
 using KivUtils::MemStream;
 using KivUtils::optional;
@@ -29,6 +31,7 @@ using KivUtils::Stream;
 using KivUtils::Time;
 using KivUtils::TimeDelta;
 using KivUtils::TimeZone;
+using KivUtils::ToUtf8;
 using KivUtils::Memory::Buffer;
 using KivUtils::PortableVersion::Delegate;
 using KivUtils::Serialization::StreamIO;
