@@ -46,11 +46,14 @@ private:
     std::unique_ptr<IStream> stream_;
 };
 
-/// A stream on a buffer that somebody else owns and that must outlive it: reads it from its beginning, appends at its
-/// end.
+/// A stream on a buffer: reads it from its beginning, appends at its end.
 class KIVVCS_EXPORT MemStream final : public IStream {
 public:
+    /// On a buffer that somebody else owns and that must outlive the stream.
     [[nodiscard]] static Stream CreateOnRef(Memory::Buffer& buffer);
+    /// On a buffer of its own, which shares the chunks of @p content: nothing has to outlive the stream.
+    /// @throws std::bad_alloc
+    [[nodiscard]] static Stream CreateOnCopy(Memory::Buffer content);
 
     bool Read(void* destination, std::uint64_t size) override;
     /// @throws std::bad_alloc
@@ -71,7 +74,9 @@ private:
     friend class Serialization::StreamIO;
 
     explicit MemStream(Memory::Buffer& buffer) noexcept : buffer_(buffer) {}
+    explicit MemStream(Memory::Buffer&& content) noexcept : own_(std::move(content)), buffer_(own_) {}
 
+    Memory::Buffer own_;
     Memory::Buffer& buffer_;
     std::uint64_t position_ = 0;
 };

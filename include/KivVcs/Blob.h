@@ -5,6 +5,12 @@
 
 #include "KivVcs/Object.h"
 
+#include <cstddef>
+#include <iosfwd>
+#include <span>
+#include <string>
+#include <string_view>
+
 namespace KivVcs {
 
 /// An uninterpreted sequence of bytes. It has neither name nor metadata; names live in trees.
@@ -15,12 +21,30 @@ public:
     /// A blob with the content of @p data, whose chunks it shares.
     explicit Blob(Buffer data) noexcept : data_(std::move(data)) {}
 
+    /// A blob with a copy of @p text, whose bytes are taken as they are, of @p bytes, or of the @p size bytes at @p data.
+    /// @throws std::bad_alloc; std::length_error for a size that memory cannot hold
+    [[nodiscard]] static Blob CopyText(std::string_view text);
+    [[nodiscard]] static Blob CopyBytes(std::span<std::byte const> bytes);
+    [[nodiscard]] static Blob CopyBytes(const void* data, std::size_t size);
+    /// A blob with a copy of everything from the position of an open stream to its end, read in pieces; nothing if the
+    /// stream is not valid or reading failed on the way. Large chunks of a stream on a buffer are shared.
+    /// @throws as above, and what the stream throws
+    [[nodiscard]] static optional<Blob> CopyRest(StreamIO& stream);
+    [[nodiscard]] static optional<Blob> CopyRest(std::istream& stream);
+
     /// "blob"
     [[nodiscard]] KivStringT<char> GetHeader() const override;
     /// "100644"
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
     /// The content.
     Buffer const& GetData() const override { return data_; }
+
+    /// The content of `GetData` as one string, as chunks that stay valid as `GetData` does, and as a stream of its own
+    /// that shares the content and may outlive this blob.
+    /// @throws std::bad_alloc, and what an override of `GetData` throws
+    [[nodiscard]] std::string CopyToString() const;
+    [[nodiscard]] Memory::BufferChunks GetChunks() const { return GetData().LockForRead(); }
+    [[nodiscard]] StreamIO OpenStream() const { return StreamIO(MemStream::CreateOnCopy(GetData())); }
 
     /// Reads a blob from its packed form: everything behind the header's zero byte, whatever size the header tells.
     /// Large chunks of a stream on a buffer are shared, not copied.

@@ -6,6 +6,7 @@
 #include "KivVcs/Foundation.h"
 
 #include <cstddef>
+#include <string_view>
 #include <vector>
 
 namespace KivVcs {
@@ -24,6 +25,11 @@ namespace Helpers {
 KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, Buffer const& source);
 /// Appends the bytes of @p text.
 KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char> text);
+template <KivPlatform::StandardEightBitText T>
+void AppendToBuffer(Buffer& destination, T const& text) {
+    const std::string_view bytes = text;
+    destination.Append(bytes.data(), bytes.size());
+}
 /// Appends the UTF-8 encoding of @p text up to its first U+0000.
 KIVVCS_EXPORT void AppendToBuffer(Buffer& destination, KivStringViewT<char16_t> text);
 

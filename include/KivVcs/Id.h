@@ -7,9 +7,12 @@
 
 #include <array>
 #include <atomic>
+#include <compare>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <iosfwd>
+#include <string_view>
 #include <utility>
 
 namespace KivVcs {
@@ -35,6 +38,9 @@ public:
     explicit Id(KivStringT<char16_t> const& text);
     /// The identifier whose text tells @p digest.
     [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return {digest, HashOf(digest)}; }
+
+    /// The identifier that 64 hexadecimal digits, of either case, spell; nothing for any other text.
+    [[nodiscard]] static optional<Id> Parse(std::string_view digits) noexcept;
 
     Id(Id const& other) noexcept
         : digest_(other.digest_), hash_(other.hash_), text_(Share(other)), tellsDigest_(other.tellsDigest_) {}
@@ -76,6 +82,9 @@ public:
         return left.tellsDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
     }
 
+    /// The order of the texts.
+    friend std::strong_ordering operator<=>(Id const& left, Id const& right) noexcept { return Compare(left, right); }
+
 private:
     friend class detail::CachedId;
 
@@ -101,12 +110,16 @@ private:
     static void AddReference(Text const* text) noexcept;
     static void Drop(Text const* text) noexcept;
     static bool HaveSameText(Id const& left, Id const& right) noexcept;
+    static std::strong_ordering Compare(Id const& left, Id const& right) noexcept;
 
     Digest digest_{};
     std::size_t hash_ = hashOfNull;
     mutable std::atomic<Text const*> text_{nullptr};
     bool tellsDigest_ = false;
 };
+
+/// Writes the text of an identifier. @throws std::bad_alloc, and what the stream throws
+KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, Id const& id);
 
 } // namespace KivVcs
 

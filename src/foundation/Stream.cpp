@@ -12,6 +12,10 @@ Stream MemStream::CreateOnRef(Memory::Buffer& buffer) {
     return Stream(std::unique_ptr<IStream>(new MemStream(buffer)));
 }
 
+Stream MemStream::CreateOnCopy(Memory::Buffer content) {
+    return Stream(std::unique_ptr<IStream>(new MemStream(std::move(content))));
+}
+
 bool MemStream::Read(void* destination, std::uint64_t size) {
     if (!buffer_.Read(position_, destination, size))
         return false;

@@ -3,6 +3,9 @@
 #include "KivVcs/Helpers.h"
 #include "objects/PackedForm.h"
 
+#include <array>
+#include <istream>
+
 namespace KivVcs {
 
 KivStringT<char> Blob::GetHeader() const {
@@ -17,6 +20,48 @@ Id Blob::ComputeId() const {
     IdDigest digest("blob", data_.GetSize());
     digest.Feed(data_);
     return digest.Finish();
+}
+
+Blob Blob::CopyText(std::string_view text) {
+    return CopyBytes(text.data(), text.size());
+}
+
+Blob Blob::CopyBytes(std::span<std::byte const> bytes) {
+    return CopyBytes(bytes.data(), bytes.size());
+}
+
+Blob Blob::CopyBytes(const void* data, std::size_t size) {
+    Buffer content;
+    content.Append(data, size);
+    return Blob(std::move(content));
+}
+
+optional<Blob> Blob::CopyRest(StreamIO& stream) {
+    Buffer content;
+    if (!stream || !stream.ReadRest(content))
+        return {};
+    return Blob(std::move(content));
+}
+
+optional<Blob> Blob::CopyRest(std::istream& stream) {
+    Buffer content;
+    std::array<char, 65536> piece;
+    while (stream) {
+        stream.read(piece.data(), piece.size());
+        content.Append(piece.data(), static_cast<std::uint64_t>(stream.gcount()));
+    }
+    if (!stream.eof() || stream.bad())
+        return {};
+    return Blob(std::move(content));
+}
+
+std::string Blob::CopyToString() const {
+    std::string content;
+    Buffer const& data = GetData();
+    content.reserve(static_cast<std::size_t>(data.GetSize()));
+    for (auto const& chunk : data.LockForRead())
+        content.append(reinterpret_cast<const char*>(chunk.data()), chunk.size());
+    return content;
 }
 
 cow_ptr<Blob> Blob::Deserialize(StreamIO& stream) {

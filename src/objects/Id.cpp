@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <ostream>
 
 namespace KivVcs {
 
@@ -51,6 +52,16 @@ bool ParseDigest(KivStringViewT<char16_t> text, Id::Digest& digest) noexcept {
         digest[static_cast<std::size_t>(index / 2)] = static_cast<std::uint8_t>(high * 16 + low);
     }
     return true;
+}
+
+template <class Left, class Right>
+std::strong_ordering CompareUnits(Left const& left, Right const& right) noexcept {
+    const int common = std::min(left.GetLength(), right.GetLength());
+    for (int position = 0; position < common; ++position) {
+        if (left[position] != right[position])
+            return left[position] <=> right[position];
+    }
+    return left.GetLength() <=> right.GetLength();
 }
 
 } // namespace
@@ -108,6 +119,39 @@ void Id::AddReference(Text const* text) noexcept {
 void Id::Drop(Text const* text) noexcept {
     if (text->drop_reference())
         delete text;
+}
+
+optional<Id> Id::Parse(std::string_view digits) noexcept {
+    std::array<char16_t, digitCount> lowercase;
+    if (digits.size() != lowercase.size())
+        return {};
+    std::transform(digits.begin(), digits.end(), lowercase.begin(), [](char digit) {
+        return static_cast<char16_t>(digit >= 'A' && digit <= 'F' ? digit - 'A' + 'a'
+                                                                  : static_cast<unsigned char>(digit));
+    });
+    Digest digest;
+    if (!ParseDigest({lowercase.data(), digitCount}, digest))
+        return {};
+    return FromDigest(digest);
+}
+
+std::strong_ordering Id::Compare(Id const& left, Id const& right) noexcept {
+    if (left.tellsDigest_ && right.tellsDigest_)
+        return std::memcmp(left.digest_.data(), right.digest_.data(), left.digest_.size()) <=> 0;
+    // Without making a text of a digest, which may fail.
+    const auto withUnits = [](Id const& id, auto const& use) {
+        if (id.tellsDigest_)
+            return use(DigestDigits{id.digest_});
+        Text const* const text = id.text_.load(std::memory_order_relaxed);
+        return use(text == nullptr ? KivStringViewT<char16_t>() : KivStringViewT<char16_t>(text->text));
+    };
+    return withUnits(left, [&](auto const& mine) {
+        return withUnits(right, [&](auto const& theirs) { return CompareUnits(mine, theirs); });
+    });
+}
+
+std::ostream& operator<<(std::ostream& stream, Id const& id) {
+    return stream << id.GetText();
 }
 
 bool Id::HaveSameText(Id const& left, Id const& right) noexcept {

@@ -1,0 +1,197 @@
+#include "KivVcs/MergeOutcome.h"
+
+#include "KivVcs/Commit.h"
+#include "KivVcs/IRepository.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace KivVcs {
+
+namespace {
+
+using Path = array_view<KivStringViewT<char16_t> const>;
+
+/// What a tree holds at the place of a conflict.
+struct Held {
+    Id id;
+    bool isTree = false;
+};
+
+Held HeldBy(cow_ptr<Tree> const& tree, Path path, bool isDirectory) {
+    if (!tree)
+        return {};
+    if (const auto blob = isDirectory ? nullptr : tree->GetDeepBlob(path))
+        return {blob->GetId(), false};
+    const auto directory = path.empty() ? tree : tree->GetDeepTree(path);
+    return directory ? Held{directory->GetId(), true} : Held{};
+}
+
+ChangeKind ChangeOf(Held const& before, Held const& after) noexcept {
+    if (before.id == after.id)
+        return ChangeKind::Unchanged;
+    if (before.id.IsEmpty())
+        return ChangeKind::Added;
+    if (after.id.IsEmpty())
+        return ChangeKind::Removed;
+    if (before.isTree == after.isTree)
+        return ChangeKind::Changed;
+    return after.isTree ? ChangeKind::FileBecameDirectory : ChangeKind::DirectoryBecameFile;
+}
+
+KivStringT<char16_t> Join(Path path) {
+    KivStringT<char16_t> joined;
+    for (auto const& component : path) {
+        if (!joined.IsEmpty())
+            joined += u'/';
+        joined += component;
+    }
+    return joined;
+}
+
+cow_ptr<Tree> RootTreeOf(cow_ptr<Commit> const& commit) {
+    const auto tree = commit ? commit->GetCommitTree() : nullptr;
+    return tree ? tree->GetRoot() : nullptr;
+}
+
+ConflictSettlement SettlementOf(ConflictChoice choice) noexcept {
+    switch (choice) {
+    case ConflictChoice::Left:
+        return ConflictSettlement::Left;
+    case ConflictChoice::Right:
+        return ConflictSettlement::Right;
+    case ConflictChoice::Undecided:
+        return ConflictSettlement::Undecided;
+    case ConflictChoice::Root:
+        break;
+    }
+    return ConflictSettlement::Root;
+}
+
+optional<ConflictSettlement> SettlementOf(TreeConflictChoice choice) noexcept {
+    switch (choice) {
+    case TreeConflictChoice::Left:
+        return ConflictSettlement::Left;
+    case TreeConflictChoice::Right:
+        return ConflictSettlement::Right;
+    case TreeConflictChoice::Root:
+        return ConflictSettlement::Root;
+    case TreeConflictChoice::Undecided:
+        return ConflictSettlement::Undecided;
+    case TreeConflictChoice::Merge:
+        break;
+    }
+    return {};
+}
+
+/// Stands between a merge and the host's resolvers, and keeps what was asked and answered.
+class ConflictRecorder {
+public:
+    explicit ConflictRecorder(Resolvers resolvers) : resolvers_(std::move(resolvers)) {}
+
+    /// Valid as long as this recorder.
+    [[nodiscard]] Resolvers MakeResolvers() {
+        return {[this](Path path, MergeTrees const& trees) { return AskAboutBlob(path, trees); },
+                [this](Path path, MergeTrees const& trees) { return AskAboutTree(path, trees); }};
+    }
+
+    [[nodiscard]] bool GaveUp() const noexcept { return gaveUp_; }
+    [[nodiscard]] bool ChoseNoTree() const noexcept { return choseNoTree_; }
+
+    /// Everything recorded, and of @p all what lies neither there nor below a directory that was settled as a whole.
+    [[nodiscard]] std::vector<MergeConflict> TakeWithTheRestOf(std::vector<MergeConflict> all) {
+        PathList known;
+        for (auto const& conflict : conflicts_)
+            known.push_back(conflict.isDirectory && !conflict.path.IsEmpty() ? conflict.path + u"/" : conflict.path);
+        std::sort(known.begin(), known.end());
+        for (auto& conflict : all) {
+            if (!IsCovered(conflict.path, known))
+                conflicts_.push_back(std::move(conflict));
+        }
+        return Take();
+    }
+
+    [[nodiscard]] std::vector<MergeConflict> Take() noexcept { return std::move(conflicts_); }
+
+private:
+    ConflictChoice AskAboutBlob(Path path, MergeTrees const& trees) {
+        const ConflictChoice choice =
+            resolvers_.blobResolver ? resolvers_.blobResolver(path, trees) : ConflictChoice::Undecided;
+        Record(path, trees, false, SettlementOf(choice));
+        return choice;
+    }
+
+    TreeConflictChoice AskAboutTree(Path path, MergeTrees const& trees) {
+        const TreeConflictChoice choice =
+            resolvers_.treeResolver ? resolvers_.treeResolver(path, trees) : TreeConflictChoice::Merge;
+        if (const auto settlement = SettlementOf(choice))
+            Record(path, trees, true, *settlement);
+        return choice;
+    }
+
+    void Record(Path path, MergeTrees const& trees, bool isDirectory, ConflictSettlement settlement) {
+        conflicts_.push_back(DescribeConflict(path, trees, isDirectory, settlement));
+        gaveUp_ = gaveUp_ || settlement == ConflictSettlement::Undecided;
+        auto const& chosen = settlement == ConflictSettlement::Left    ? trees.left
+                             : settlement == ConflictSettlement::Right ? trees.right
+                                                                       : trees.root;
+        choseNoTree_ = choseNoTree_ || (path.empty() && !chosen);
+    }
+
+    /// Whether the path, or how it begins, is among @p known, which ends directories with "/".
+    static bool IsCovered(KivStringT<char16_t> const& path, PathList const& known) {
+        if (std::binary_search(known.begin(), known.end(), path) || (!known.empty() && known.front().IsEmpty()))
+            return true;
+        for (int end = path.Find(u"/"); end >= 0; end = path.Find(u"/", end + 1)) {
+            if (std::binary_search(known.begin(), known.end(), path.Left(end + 1)))
+                return true;
+        }
+        return false;
+    }
+
+    Resolvers resolvers_;
+    std::vector<MergeConflict> conflicts_;
+    bool gaveUp_ = false;
+    bool choseNoTree_ = false;
+};
+
+/// Without a moved branch only: what kept it where it was.
+MergeOutcome WhyNot(ConflictRecorder& recorder, MergeTrees trees) {
+    if (recorder.GaveUp())
+        return {MergeResult::GaveUp, recorder.TakeWithTheRestOf(FindConflicts(std::move(trees)))};
+    const bool noTree = recorder.ChoseNoTree() || (!trees.left && !trees.right);
+    return {noTree ? MergeResult::NothingToCommit : MergeResult::Refused, recorder.Take()};
+}
+
+} // namespace
+
+MergeConflict DescribeConflict(Path path, MergeTrees const& trees, bool isDirectory, ConflictSettlement settlement) {
+    const Held root = HeldBy(trees.root, path, isDirectory);
+    const Held left = HeldBy(trees.left, path, isDirectory);
+    const Held right = HeldBy(trees.right, path, isDirectory);
+    return {Join(path), isDirectory, ChangeOf(root, left), ChangeOf(root, right), root.id, left.id,
+            right.id,   settlement};
+}
+
+MergeOutcome MergeWithOutcome(IRepository& repository, cow_ptr<Commit> const& commit, Resolvers resolvers) {
+    if (!commit)
+        return {};
+    const auto head = repository.GetHead();
+    ConflictRecorder recorder(std::move(resolvers));
+    if (!head) {
+        const bool moved = repository.Merge(commit, recorder.MakeResolvers());
+        return {moved ? MergeResult::Forwarded : MergeResult::Refused, recorder.Take()};
+    }
+    const auto base = repository.GetCommonBase(head, commit);
+    if (base && base->GetId() == commit->GetId())
+        return {MergeResult::UpToDate, {}};
+    if (!repository.Merge(commit, recorder.MakeResolvers()))
+        return WhyNot(recorder, {RootTreeOf(head), RootTreeOf(base), RootTreeOf(commit)});
+    const auto moved = repository.GetHead();
+    const Id movedId = moved ? moved->GetId() : Id();
+    if (movedId == head->GetId())
+        return {MergeResult::UpToDate, recorder.Take()};
+    return {movedId == commit->GetId() ? MergeResult::Forwarded : MergeResult::Merged, recorder.Take()};
+}
+
+} // namespace KivVcs
