@@ -13,7 +13,7 @@ protected:
     IObjectsStorage& Storage() { return *repo.GetStorage(); }
 
     RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
-    History history{repo};
+    GrownHistory history{repo};
 };
 
 TEST_F(Histories, TheCommonBaseIsWhereTheChainsMeet) {
@@ -116,7 +116,7 @@ TEST_F(Histories, RewritingKeepsWhatBranchesNeedAndLetsGoOfTheRest) {
     for (auto const& [graph, branches, deleted, after, counts] : cases) {
         SCOPED_TRACE(std::string(graph) + " | " + branches);
         Repository each(std::make_unique<MemObjectsStorage>());
-        History line(each);
+        GrownHistory line(each);
         line.Grow(graph);
         line.Point(branches);
         auto commit = deleted == nullptr ? nullptr : line[deleted];
@@ -155,7 +155,7 @@ TEST_F(Histories, DeletingMovesBranchesNewestFirstAndSurvivesAFailure) {
         bool hasRefused = false;
     };
     Refusing refusing(std::make_unique<MemObjectsStorage>());
-    History line(refusing);
+    GrownHistory line(refusing);
     line.Grow("a b:a c:b");
     for (auto const& [branch, head] : {std::pair(u"one", "b"), {u"two", "b"}, {u"three", "c"}})
         refusing.CreateBranch(branch, line[head]);
@@ -197,7 +197,7 @@ TEST_F(Histories, SimplifyingAsksAboutPairsAndMakesRemovedBranchesAgain) {
         cow_ptr<Commit> kept;
     };
     Removing removing(std::make_unique<MemObjectsStorage>());
-    History line(removing);
+    GrownHistory line(removing);
     line.Grow("r a:r b:a");
     line.Point("topic=b");
     removing.kept = line["a"];
@@ -267,7 +267,7 @@ TEST(RandomHistories, SimplifyingKeepsWhatFollowingEveryPairKeeps) {
         Repository plain(std::make_unique<MemObjectsStorage>());
         FollowingRepository following(std::make_unique<MemObjectsStorage>());
         const auto simplified = [&](Repository& each) {
-            History line(each);
+            GrownHistory line(each);
             line.Grow(graph);
             line.Point(branches);
             line.Forget();

@@ -54,7 +54,7 @@ protected:
     [[nodiscard]] std::string FilesOfHead() const { return Files(repo.GetHead()->GetCommitTree()->GetRoot()); }
 
     RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
-    History history{repo};
+    GrownHistory history{repo};
 };
 
 TEST_F(Merging, AsksOnlyWhereBothSidesDisagreeAndDoesWhatItIsTold) {

@@ -138,7 +138,10 @@ public:
 
     template <StandardEightBitText T>
         requires std::same_as<C, char16_t>
-    KivStringT& operator+=(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
+    KivStringT& operator+=(T const&) {
+        static_assert(sizeof(T) == 0, "for UTF-16 text write u\"...\" or call FromUtf8(text)");
+        return *this;
+    }
 
     void Swap(KivStringT& other) noexcept { std::swap(text_, other.text_); }
 
@@ -206,7 +209,10 @@ template <class L, class R>
 
 template <class L, class R>
     requires MixedTextPair<L, R>
-KivStringT<char16_t> operator+(L const& left, R const& right) = delete; // write u"..." or call FromUtf8(text)
+KivStringT<char16_t> operator+(L const&, R const&) {
+    static_assert(sizeof(L) == 0, "for UTF-16 text write u\"...\" or call FromUtf8(text)");
+    return {};
+}
 
 /// Writes a text: 8-bit text as it is, UTF-16 text in UTF-8. Width and fill of the stream count bytes.
 /// @throws std::bad_alloc, and what the stream throws

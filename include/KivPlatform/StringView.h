@@ -27,8 +27,9 @@ enum class CompareCase : std::int32_t { Exact = 0 };
 
 /// 8-bit text of the standard library or the language: a literal, `std::string`, `std::string_view`.
 ///
-/// UTF-16 texts and views are not made of such text, since it does not say its encoding: the constructors and operators
-/// that would take it are deleted, so that the compiler names the function to call, `FromUtf8`, right away.
+/// UTF-16 texts and views are not made of such text, since it does not say its encoding: the constructors that would take it
+/// are deleted and the operators assert, so that the compiler names the function to call, `FromUtf8`, right away. Functions
+/// that a host overloads for `std::string_view` and for UTF-16 text take the latter by a template on what converts to it.
 template <class T>
 concept StandardEightBitText =
     std::convertible_to<T const&, std::string_view> && !std::same_as<std::remove_cvref_t<T>, std::nullptr_t>;
@@ -162,7 +163,10 @@ concept MixedTextPair =
 
 template <class L, class R>
     requires MixedTextPair<L, R>
-bool operator==(L const& left, R const& right) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
+bool operator==(L const&, R const&) {
+    static_assert(sizeof(L) == 0, "for UTF-16 text write u\"...\" or call FromUtf8(text)");
+    return false;
+}
 
 /// The order of `Compare`.
 template <class L, class R>

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <map>
+#include <random>
 #include <sstream>
 
 /// Objects made from short descriptions, and described again.
@@ -26,6 +27,21 @@ inline cow_ptr<Tree> MakeTree(IRepository& repo, std::string const& files) {
     for (std::string word; words >> word;) {
         const auto equals = word.find('=');
         writable->AddBlob(&repo, Wide(word.substr(0, equals)), MakeBlob(word.substr(equals + 1)));
+    }
+    return tree;
+}
+
+/// Edits a tree at random, among few names and contents, so that every shape of disagreement comes up.
+inline cow_ptr<Tree> EditAtRandom(std::mt19937& random, IRepository& repo, cow_ptr<Tree> tree) {
+    const auto below = [&random](unsigned limit) { return static_cast<unsigned>(random() % limit); };
+    for (unsigned edits = below(6); edits-- > 0;) {
+        std::string path(1, "abc"[below(3)]);
+        for (unsigned depth = below(3); depth-- > 0;)
+            path += std::string("/") + "abc"[below(3)];
+        if (below(3) == 0)
+            tree.write()->RemoveObject(&repo, Wide(path));
+        else
+            tree.write()->AddBlob(&repo, Wide(path), MakeBlob(std::string(1, "123"[below(3)])));
     }
     return tree;
 }
@@ -59,9 +75,9 @@ inline std::string NameOf(cow_ptr<Commit> const& commit) {
 }
 
 /// Grows commits with the given names as descriptions, each with a file of its name on top of its parent's files.
-class History {
+class GrownHistory {
 public:
-    explicit History(Repository& repo) : repo_(repo) {}
+    explicit GrownHistory(Repository& repo) : repo_(repo) {}
 
     /// Commits written as "root child:root other:root", each stored.
     void Grow(std::string const& graph) {
