@@ -36,11 +36,11 @@ HEADERS = {
     "identifiers": ("SHADigest256", "Id"),
     "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/Published"),
     "interface": ("IRepository",),
-    "tree": ("Tree", "CommitTree", "detail/EntryTable"),
-    "merge": ("Merge",),
-    "commit": ("Commit",),
-    "storage": ("Storage",),
-    "repository": ("Repository",),
+    "tree": ("Tree", "CommitTree", "Differences", "PortablePaths", "detail/EntryTable"),
+    "merge": ("Merge", "Conflicts"),
+    "commit": ("Commit", "History"),
+    "storage": ("Storage", "ShortIds"),
+    "repository": ("Repository", "MergeOutcome"),
     "core": ("KivVcs",),
 }
 ROOM_OF_HEADER = {f"include/KivVcs/{name}.h": room for room, names in HEADERS.items() for name in names}

@@ -193,7 +193,7 @@ TEST_F(Differing, HistoryShowsTheNewestThatChangedAPath) {
 TEST(PortablePaths, NameWhatAFileSystemCannotHold) {
     const auto problem = [](KivStringViewT<char16_t> path) {
         const auto found = PortablePathProblem(path);
-        return found ? optional(found->kind) : std::nullopt;
+        return found ? optional<PathProblemKind>(found->kind) : std::nullopt;
     };
     const std::u16string long255(255, u'x');
     for (auto const* fine : {u"a/b", u"/a//b/", u"console.txt", u".profile", u" a", u"com10", u"auxiliary/lpt",

@@ -33,6 +33,12 @@ void MergeAndReadBack(Repository& repository, cow_ptr<Commit> const& root, std::
     const auto right = Grow(repository, Grow(repository, root, directory + "1", "right"), directory + "2", "");
     EXPECT_EQ(ToNames(right->GetCommitTree()->GetBlobDiffs(root->GetCommitTree())),
               (Names{directory + "1", directory + "2"}));
+    EXPECT_EQ(Differences(root->GetCommitTree(), right->GetCommitTree())[1].path, Wide(directory + "2"));
+    const auto conflicts = FindConflicts(
+        {left->GetCommitTree()->GetRoot(), root->GetCommitTree()->GetRoot(), right->GetCommitTree()->GetRoot()});
+    ASSERT_EQ(conflicts.size(), 1U);
+    EXPECT_EQ(conflicts[0].path, Wide(directory + "1"));
+    EXPECT_TRUE(FindCaseCollisions(right->GetCommitTree()->GetRoot()).empty());
     repository.MoveBranchTo(u"master", left);
     const auto merge = [](auto const&, auto const&) { return TreeConflictChoice::Merge; };
     EXPECT_TRUE(repository.Merge(right, {AlwaysChooseRight(), merge}));
@@ -60,6 +66,11 @@ void LiveThroughALongHistory() {
     auto side = Grow(*repository, middle, "side", "");
     EXPECT_TRUE(repository->GetCommonBase(tip, side) == middle);
     EXPECT_TRUE(repository->GetCommonBase(side, tip) == middle);
+    int walked = 0;
+    for (auto const& commit : History(tip))
+        walked += commit ? 1 : 0;
+    EXPECT_EQ(walked, commitCount);
+    EXPECT_TRUE(History(tip).Changing(u"side").begin() == History::Iterator());
     repository->MoveBranchTo(u"master", std::exchange(tip, nullptr));
     repository->CreateBranch(u"side", std::exchange(side, nullptr));
     EXPECT_EQ(repository->GetCommitCount(), commitCount + 1U);

@@ -6,6 +6,7 @@
 #include "KivVcs/Blob.h"
 #include "KivVcs/Commit.h"
 #include "KivVcs/CommitTree.h"
+#include "KivVcs/Conflicts.h"
 #include "KivVcs/Differences.h"
 #include "KivVcs/Foundation.h"
 #include "KivVcs/Helpers.h"

@@ -1,4 +1,4 @@
-#include "KivVcs/MergeOutcome.h"
+#include "KivVcs/Conflicts.h"
 
 #include <algorithm>
 #include <iterator>
@@ -7,6 +7,45 @@
 namespace KivVcs {
 
 namespace {
+
+using Path = array_view<KivStringViewT<char16_t> const>;
+
+/// What a tree holds at the place of a conflict.
+struct Held {
+    Id id;
+    bool isTree = false;
+};
+
+Held HeldBy(cow_ptr<Tree> const& tree, Path path, bool isDirectory) {
+    if (!tree)
+        return {};
+    if (const auto blob = isDirectory ? nullptr : tree->GetDeepBlob(path))
+        return {blob->GetId(), false};
+    const auto directory = path.empty() ? tree : tree->GetDeepTree(path);
+    return directory ? Held{directory->GetId(), true} : Held{};
+}
+
+ChangeKind ChangeOf(Held const& before, Held const& after) noexcept {
+    if (before.id == after.id)
+        return ChangeKind::Unchanged;
+    if (before.id.IsEmpty())
+        return ChangeKind::Added;
+    if (after.id.IsEmpty())
+        return ChangeKind::Removed;
+    if (before.isTree == after.isTree)
+        return ChangeKind::Changed;
+    return after.isTree ? ChangeKind::FileBecameDirectory : ChangeKind::DirectoryBecameFile;
+}
+
+KivStringT<char16_t> Join(Path path) {
+    KivStringT<char16_t> joined;
+    for (auto const& component : path) {
+        if (!joined.IsEmpty())
+            joined += u'/';
+        joined += component;
+    }
+    return joined;
+}
 
 /// A directory that both sides changed differently, and how deep it lies.
 struct OpenDirectory {
@@ -79,6 +118,14 @@ private:
 };
 
 } // namespace
+
+MergeConflict DescribeConflict(Path path, MergeTrees const& trees, bool isDirectory, ConflictSettlement settlement) {
+    const Held root = HeldBy(trees.root, path, isDirectory);
+    const Held left = HeldBy(trees.left, path, isDirectory);
+    const Held right = HeldBy(trees.right, path, isDirectory);
+    return {Join(path), isDirectory, ChangeOf(root, left), ChangeOf(root, right), root.id, left.id,
+            right.id,   settlement};
+}
 
 std::vector<MergeConflict> FindConflicts(MergeTrees trees) {
     return ConflictWalk(std::move(trees)).Run();

@@ -1,0 +1,52 @@
+#pragma once
+
+/// @file
+/// What both sides of a merge changed differently.
+
+#include "KivVcs/Differences.h"
+#include "KivVcs/Merge.h"
+
+#include <vector>
+
+namespace KivVcs {
+
+/// How a conflict was settled.
+enum class ConflictSettlement : std::int32_t {
+    Undecided = 0,
+    Left = 1,
+    Right = 2,
+    /// As it was before either side changed it.
+    Root = 3,
+    /// By something that neither side had: merged content, or both kept under two names. Resolvers of this library cannot
+    /// answer so; merges that stand on it may.
+    Combined = 4,
+};
+
+/// A path that both sides changed differently.
+struct MergeConflict {
+    /// Empty for the whole tree.
+    KivStringT<char16_t> path;
+    /// Whether it is about a directory as a whole, and the identifiers are those of directories.
+    bool isDirectory = false;
+    /// What each side did since the root: `Unchanged` only for a directory.
+    ChangeKind leftChange = ChangeKind::Unchanged;
+    ChangeKind rightChange = ChangeKind::Unchanged;
+    /// What the root and each side hold there; null for nothing.
+    Id rootId;
+    Id leftId;
+    Id rightId;
+    ConflictSettlement settlement = ConflictSettlement::Undecided;
+};
+
+/// The conflict at @p path, given as components counted from the top of @p trees: what a resolver that is asked about it
+/// looks at. An empty path means the trees themselves.
+[[nodiscard]] KIVVCS_EXPORT MergeConflict DescribeConflict(array_view<KivStringViewT<char16_t> const> path,
+                                                           MergeTrees const& trees, bool isDirectory,
+                                                           ConflictSettlement settlement);
+
+/// The paths about which `ThreeWayMerge` would ask its blob resolver if its tree resolver always answered `Merge`, in that
+/// order, undecided. Merges, stores and fetches nothing: for a look before a merge.
+/// @complexity as of the merge @throws std::bad_alloc, and what hosts' objects throw
+[[nodiscard]] KIVVCS_EXPORT std::vector<MergeConflict> FindConflicts(MergeTrees trees);
+
+} // namespace KivVcs
