@@ -160,7 +160,7 @@ protected:
     }
 
     NotingRepository repo{std::make_unique<MemObjectsStorage>()};
-    History history{repo};
+    GrownHistory history{repo};
 };
 
 TEST_F(Rewriting, IsToldToTheHostBeforeBranchesMoveAndAnythingIsPurged) {
@@ -205,7 +205,7 @@ TEST_F(Rewriting, LetsThePurgeHaveTheOldCommitsAndNotTheNewOnes) {
         std::uint64_t countBefore = 0;
     };
     Refusing refusing(std::make_unique<MemObjectsStorage>());
-    History line(refusing);
+    GrownHistory line(refusing);
     line.Grow("a b:a c:b d:c");
     refusing.CreateBranch(u"topic", line["b"]);
     refusing.MoveBranchTo(u"master", line["d"]);
