@@ -145,7 +145,7 @@ bool Repository::RemoveBranch(KivStringViewT<char16_t> branch) {
 void Repository::CommitRewritten(cow_ptr<Commit>, cow_ptr<Commit>) {}
 
 void Repository::AnnounceRewrite(cow_ptr<Commit> const& old, cow_ptr<Commit> const& rebuilt) {
-    if (rebuilt && *old != *rebuilt)
+    if (rebuilt && !old->HasSameId(*rebuilt))
         CommitRewritten(old, rebuilt);
 }
 

@@ -5,6 +5,7 @@
 
 #include <typeinfo>
 #include <unordered_map>
+#include <unordered_set>
 
 namespace KivVcs {
 
@@ -50,21 +51,22 @@ public:
     }
 
     /// Keeps every commit at which the way down from a head meets that of another one: the common bases of every two
-    /// heads, since the identifier of one of the library's commits determines those of all ancestors, so that ways that
-    /// meet stay together.
-    /// @return false, keeping none, if there are commits of a host's class, whose identifiers may be anything.
+    /// heads, as long as equal commits have equal ancestors, so that ways that meet stay together.
+    /// @return false, keeping none, if they have not: identifiers of a host's classes are what the host says.
     bool KeepMeetings() {
         CommitSet visited;
+        std::unordered_set<Commit const*> compared;
         std::vector<Id> meetings;
         for (auto const& branch : branches_) {
-            for (Commit const* commit = branch.head.get(); commit != nullptr; commit = commit->GetParent().get()) {
-                if (typeid(*commit) != typeid(Commit))
-                    return false;
-                if (visited.Insert(*commit) != nullptr) {
-                    meetings.push_back(commit->GetId());
-                    break;
-                }
-            }
+            Commit const* met = nullptr;
+            Commit const* commit = branch.head.get();
+            while (commit != nullptr && (met = visited.Insert(*commit)) == nullptr)
+                commit = commit->GetParent().get();
+            if (commit == nullptr)
+                continue;
+            if (!HaveEqualAncestors(*met, *commit, compared))
+                return false;
+            meetings.push_back(commit->GetId());
         }
         for (auto& id : meetings)
             kept_.try_emplace(std::move(id));
@@ -100,6 +102,22 @@ public:
     }
 
 private:
+    /// @param compared the other objects of visited commits that have been found to have equal ancestors
+    static bool HaveEqualAncestors(Commit const& visited, Commit const& other,
+                                   std::unordered_set<Commit const*>& compared) {
+        Commit const* left = &visited;
+        Commit const* right = &other;
+        while (left != right && compared.insert(right).second) {
+            left = left->GetParent().get();
+            right = right->GetParent().get();
+            if (left == right)
+                return true;
+            if (left == nullptr || right == nullptr || !left->HasSameId(*right))
+                return false;
+        }
+        return true;
+    }
+
     void LinkChain(KeptCommits::iterator child, Commit const& head) {
         for (Commit const* commit = head.GetParent().get(); commit != nullptr && !child->second.isLinked;
              commit = commit->GetParent().get()) {
