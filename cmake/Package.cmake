@@ -5,6 +5,8 @@
 set(CPACK_PACKAGE_NAME kivvcs)
 set(CPACK_PACKAGE_VENDOR KivVcs)
 set(CPACK_PACKAGE_CONTACT "The maintainers of KivVcs")
+# Each package describes itself.
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "")
 set(CPACK_STRIP_FILES ON)
 
 set(CPACK_SOURCE_GENERATOR TGZ)
