@@ -59,6 +59,8 @@ TEST_F(Differing, PairsRenamedFilesByContentAndRatherByName) {
     EXPECT_EQ(Told(Between("a/n=1 b/m=1 c=1", "x/m=1 y/n=1 z/o=1 z/p=1", renames)), ">b/m>x/m >a/n>y/n >c>z/o +z/p");
     EXPECT_EQ(Told(Between("a=1 b=1 c=1", "d=1", renames)), "-b -c >a>d");
     EXPECT_EQ(Told(Between("d/x=1", "d=1", renames)), "fd -d/x");
+    EXPECT_EQ(Told(Between("a=1", "b=2", renames)), "-a +b");
+    EXPECT_EQ(Told(Between("a=2", "b=1", renames)), "-a +b");
 }
 
 TEST_F(Differing, AgreesWithListingsAndLookupsOverRandomTrees) {
@@ -217,14 +219,17 @@ TEST(PortablePaths, NameWhatAFileSystemCannotHold) {
 
 TEST_F(Differing, FindsNamesThatDifferInCaseOnly) {
     cow_ptr<Tree> tree;
-    for (auto const* path : {u"d/Read", u"d/READ", u"d/read/x", u"d/Reed", u"D", u"\u00C9t\u00E9", u"\u00E9T\u00C9",
-                             u"e\u0301t\u00E9", u"\u03A3", u"\u03C2", u"\u03C3", u"\U00010400", u"\U00010428",
-                             u"\u0130", u"i", u"stra\u00DFe", u"strasse", u"\u212A", u"k"})
+    for (auto const* path : {u"d/Read",        u"d/READ",        u"d/read/x",       u"d/Reed", u"D",
+                             u"\u00C9t\u00E9", u"\u00E9T\u00C9", u"e\u0301t\u00E9", u"\u03A3", u"\u03C2",
+                             u"\u03C3",        u"\U00010400",    u"\U00010428",     u"\u0130", u"i",
+                             u"stra\u00DFe",   u"strasse",       u"\u212A",         u"k",      u"\u0100",
+                             u"\u0101",        u"both",          u"both/x"})
         ASSERT_TRUE(tree.write()->AddBlob(&repo, path, Blob()));
     EXPECT_EQ(FindCaseCollisions(tree), (std::vector<PathList>{{u"D", u"d"},
                                                                {u"d/READ", u"d/Read", u"d/read"},
                                                                {u"k", u"\u212A"},
                                                                {u"\u00C9t\u00E9", u"\u00E9T\u00C9"},
+                                                               {u"\u0100", u"\u0101"},
                                                                {u"\u03A3", u"\u03C2", u"\u03C3"},
                                                                {u"\U00010400", u"\U00010428"}}));
     EXPECT_TRUE(FindCaseCollisions(nullptr).empty());

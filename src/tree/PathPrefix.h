@@ -2,9 +2,10 @@
 
 #include "KivVcs/Foundation.h"
 
+#include <algorithm>
 #include <limits>
 #include <stdexcept>
-#include <string>
+#include <vector>
 
 namespace KivVcs {
 
@@ -13,10 +14,10 @@ namespace KivVcs {
 class PathPrefix {
 public:
     /// Goes to the directory @p name of the one whose prefix has the first @p length code units of this one.
-    void Enter(std::size_t length, KivStringViewT<char16_t> name) {
+    void Enter(std::size_t length, KivStringT<char16_t> const& name) {
         text_.resize(length);
-        text_.append(name.GetString(), static_cast<std::size_t>(name.GetLength()));
-        text_ += u'/';
+        text_.insert(text_.end(), name.GetString(), name.GetString() + name.GetLength());
+        text_.push_back(u'/');
     }
 
     [[nodiscard]] std::size_t GetLength() const noexcept { return text_.size(); }
@@ -25,14 +26,17 @@ public:
     [[nodiscard]] KivStringT<char16_t> PathOf(KivStringT<char16_t> const& name) const {
         if (text_.empty())
             return name;
-        if (text_.size() > static_cast<std::size_t>(std::numeric_limits<int>::max()))
+        const std::size_t length = text_.size() + static_cast<std::size_t>(name.GetLength());
+        if (length > static_cast<std::size_t>(std::numeric_limits<int>::max()))
             throw std::length_error("path longer than a signed 32-bit length can tell");
-        KivStringT<char16_t> path(text_.data(), static_cast<int>(text_.size()));
-        return path += name;
+        return KivStringT<char16_t>::Build(static_cast<int>(length), [this, &name](char16_t* path) {
+            path = std::copy(text_.begin(), text_.end(), path);
+            std::copy_n(name.GetString(), name.GetLength(), path);
+        });
     }
 
 private:
-    std::u16string text_;
+    std::vector<char16_t> text_;
 };
 
 } // namespace KivVcs

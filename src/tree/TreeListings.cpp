@@ -1,6 +1,7 @@
 #include "KivVcs/Tree.h"
 
 #include "tree/Differences.h"
+#include "tree/PathPrefix.h"
 
 #include <unordered_map>
 
@@ -15,19 +16,16 @@ namespace {
 /// Collects full paths, directory by directory, the names of each in their order.
 class PathCollector {
 public:
-    /// Goes to the directory @p name of the one whose paths begin with the first @p length code units of this one's.
     void Enter(std::size_t length, KivStringT<char16_t> const& name) {
-        prefix_.resize(length);
-        prefix_.insert(prefix_.end(), name.GetString(), name.GetString() + name.GetLength());
-        prefix_.push_back(u'/');
+        prefix_.Enter(length, name);
         isFirst_ = true;
     }
 
     /// The length of what the paths of this directory begin with.
-    [[nodiscard]] std::size_t PrefixLength() const noexcept { return prefix_.size(); }
+    [[nodiscard]] std::size_t PrefixLength() const noexcept { return prefix_.GetLength(); }
 
     void Add(KivStringT<char16_t> const& name) {
-        paths_.push_back(prefix_.empty() ? name : PathOf(name));
+        paths_.push_back(prefix_.PathOf(name));
         // Within a directory paths ascend as names do.
         if (std::exchange(isFirst_, false) && paths_.size() > 1)
             isAscending_ = isAscending_ && paths_[paths_.size() - 2] < paths_.back();
@@ -43,17 +41,7 @@ public:
     }
 
 private:
-    [[nodiscard]] KivStringT<char16_t> PathOf(KivStringT<char16_t> const& name) const {
-        const std::size_t length = prefix_.size() + static_cast<std::size_t>(name.GetLength());
-        if (length > static_cast<std::size_t>(std::numeric_limits<int>::max()))
-            throw std::length_error("path longer than a signed 32-bit length can tell");
-        return KivStringT<char16_t>::Build(static_cast<int>(length), [this, &name](char16_t* path) {
-            path = std::copy(prefix_.begin(), prefix_.end(), path);
-            std::copy_n(name.GetString(), name.GetLength(), path);
-        });
-    }
-
-    std::vector<char16_t> prefix_;
+    PathPrefix prefix_;
     PathList paths_;
     bool isFirst_ = false;
     bool isAscending_ = true;
