@@ -8,4 +8,5 @@
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/Progress.h"
 #include "KivArchive/SqliteArchive.h"
+#include "KivArchive/TextLines.h"
 #include "KivArchive/Upkeep.h"

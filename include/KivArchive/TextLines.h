@@ -1,0 +1,104 @@
+#pragma once
+
+/// @file
+/// Texts compared and merged line by line.
+///
+/// A line ends behind its line feed, so that line ends of either kind are part of their line and kept; only the last line
+/// may lack one. A content that has a zero byte, or more bytes than allowed, is no text.
+///
+/// Threads: any number of calls may run concurrently.
+///
+/// Cost: proportional to the contents where they differ in a few places; at most proportional to the number of lines times
+/// its square root, whatever the contents: where very much differs, the changes found may not be the fewest. At most some
+/// dozen bytes of memory for each line.
+
+#include "KivArchive/Export.h"
+
+#include <KivVcs/Foundation.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <vector>
+
+namespace KivArchive {
+
+inline constexpr std::uint64_t largestText = 64 * 1024 * 1024;
+
+/// Lines that were replaced by others, removed (nothing on the new side), or added (nothing on the old side). Lines are
+/// counted from 0; the ends are those behind the last.
+struct LineChange {
+    std::size_t oldBegin = 0;
+    std::size_t oldEnd = 0;
+    std::size_t newBegin = 0;
+    std::size_t newEnd = 0;
+
+    friend bool operator==(LineChange const&, LineChange const&) noexcept = default;
+};
+
+/// What makes one text of another one, from the beginning on, with equal lines between the changes:
+///
+///     for (auto const& change : DiffTextLines(before, after))
+struct TextDifferences {
+    /// False if one of the contents is no text; there are no changes then.
+    bool areTexts = false;
+    std::vector<LineChange> changes;
+
+    [[nodiscard]] std::vector<LineChange>::const_iterator begin() const noexcept { return changes.begin(); }
+    [[nodiscard]] std::vector<LineChange>::const_iterator end() const noexcept { return changes.end(); }
+};
+
+[[nodiscard]] KIVARCHIVE_EXPORT TextDifferences DiffTextLines(KivVcs::Buffer const& before, KivVcs::Buffer const& after,
+                                                              std::uint64_t mostBytes = largestText);
+
+struct UnifiedTextOptions {
+    /// Behind "---" and "+++".
+    KivVcs::KivStringT<char> oldLabel = "old";
+    KivVcs::KivStringT<char> newLabel = "new";
+    /// How many equal lines are shown around changes.
+    std::size_t context = 3;
+    std::uint64_t mostBytes = largestText;
+};
+
+/// The differences as text for people and for `patch`; empty if nothing differs.
+/// @return nothing if one of them is no text.
+[[nodiscard]] KIVARCHIVE_EXPORT std::optional<KivVcs::Buffer>
+UnifiedText(KivVcs::Buffer const& before, KivVcs::Buffer const& after, UnifiedTextOptions const& options = {});
+
+enum class TextMergeResult : std::uint8_t {
+    Merged,    ///< Nothing is left to settle.
+    Conflicts, ///< Both sides changed the same lines, or lines beside each other, differently.
+    GaveUp,    ///< One of the contents is no text.
+};
+
+struct TextMergeOptions {
+    /// Whether a merge with conflicts gives a text that shows them:
+    ///
+    ///     <<<<<<< left
+    ///     what the left side has
+    ///     ||||||| base
+    ///     what both started from
+    ///     =======
+    ///     what the right side has
+    ///     >>>>>>> right
+    bool showConflicts = false;
+    KivVcs::KivStringT<char> leftLabel = "left";
+    KivVcs::KivStringT<char> baseLabel = "base";
+    KivVcs::KivStringT<char> rightLabel = "right";
+    std::uint64_t mostBytes = largestText;
+};
+
+struct TextMerge {
+    TextMergeResult result = TextMergeResult::GaveUp;
+    /// The merged text; with conflicts, empty or the text that shows them.
+    KivVcs::Buffer text;
+    std::size_t conflicts = 0;
+};
+
+/// Brings what @p left and @p right changed of @p base together, as `diff3` does: changes in different places are taken
+/// from both, equal changes once, and everything else that overlaps or touches is a conflict.
+[[nodiscard]] KIVARCHIVE_EXPORT TextMerge MergeTextLines(KivVcs::Buffer const& base, KivVcs::Buffer const& left,
+                                                         KivVcs::Buffer const& right,
+                                                         TextMergeOptions const& options = {});
+
+} // namespace KivArchive
