@@ -84,7 +84,9 @@ const Action actions[] = {
          Expect("the clone's trees", clone.GetTreeCount(), w.repository.GetTreeCount());
      }},
     {"EnsureCommonRootFor", 2, [](World& w) {
-         const auto [one, other, root] = std::tuple{w.PickBranch(), w.PickBranch(), w.PickBranch()};
+         const std::string one = w.PickBranch();
+         const std::string other = w.PickBranch();
+         const std::string root = w.PickBranch();
          w.InterruptInClone([&](Repository& clone) { clone.EnsureCommonRootFor(Wide(one), Wide(other), Wide(root)); });
          const bool done = w.plain.EnsureCommonRoot(one, other, root);
          Expect("done", w.repository.EnsureCommonRootFor(Wide(one), Wide(other), Wide(root)), done);
