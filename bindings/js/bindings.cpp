@@ -13,6 +13,7 @@ namespace KivVcs::JavaScript {
 namespace {
 
 using emscripten::val;
+using Path = array_view<KivStringViewT<char16_t> const>;
 
 constexpr std::int64_t ticksPerMinute = 600'000'000;
 
@@ -58,6 +59,19 @@ val ToArray(Texts const& texts) {
     for (auto const& text : texts)
         array.call<void>("push", ToJavaScript(text));
     return array;
+}
+
+val ToObject(MergeConflict const& conflict) {
+    val object = val::object();
+    object.set("path", ToJavaScript(conflict.path));
+    object.set("isDirectory", conflict.isDirectory);
+    object.set("leftChange", static_cast<int>(conflict.leftChange));
+    object.set("rightChange", static_cast<int>(conflict.rightChange));
+    object.set("rootId", ToJavaScript(conflict.rootId));
+    object.set("leftId", ToJavaScript(conflict.leftId));
+    object.set("rightId", ToJavaScript(conflict.rightId));
+    object.set("settlement", static_cast<int>(conflict.settlement));
+    return object;
 }
 
 /// The identifier of @p object and whether it is a directory; null if there is none.
@@ -124,9 +138,18 @@ public:
         return lists;
     }
 
-    /// The paths of the files that differ from those of @p older, which may be null.
-    [[nodiscard]] val GetDifferences(CommitHandle const* older) const {
-        return ToArray(Root().GetDeepBlobDiffs(RootOf(From(older))));
+    [[nodiscard]] val GetDifferences(CommitHandle const* older, bool findRenames) const {
+        val list = val::array();
+        for (auto const& difference : Differences(RootOf(From(older)), RootOf(commit_), {.findRenames = findRenames})) {
+            val item = val::object();
+            item.set("kind", static_cast<int>(difference.kind));
+            item.set("path", ToJavaScript(difference.path));
+            item.set("oldPath", ToJavaScript(difference.oldPath));
+            item.set("oldId", ToJavaScript(difference.oldId));
+            item.set("newId", ToJavaScript(difference.newId));
+            list.call<void>("push", item);
+        }
+        return list;
     }
 
 private:
@@ -138,6 +161,29 @@ private:
 
     cow_ptr<Commit> commit_;
 };
+
+/// Where a walk along a history is.
+class Walk {
+public:
+    explicit Walk(History const& history) : next_(history.begin()) {}
+
+    /// The commit here, and one step on; null at the end.
+    val Next() {
+        if (next_ == History::Iterator())
+            return val::null();
+        val commit = CommitHandle::Of(*next_);
+        ++next_;
+        return commit;
+    }
+
+private:
+    History::Iterator next_;
+};
+
+Walk WalkHistory(CommitHandle const& head, val const& path) {
+    const History history(head.Get());
+    return Walk(path.isNull() ? history : history.Changing(FromJavaScript(path.as<std::u16string>())));
+}
 
 /// A version while it is being put together; used up by `Commit` or `Store`. The repository outlives it.
 class Draft {
@@ -222,17 +268,23 @@ public:
 
     Draft Edit(CommitHandle const* parent, bool amend) { return {repository_, CommitHandle::From(parent), amend}; }
 
-    /// The identifier of the merged tree of two commits that grew from @p base, which may be null; empty if a resolver
-    /// gave up. @p file and @p directory are given a path and what each side has there, and tell the number of a choice.
-    std::u16string MergeTrees(CommitHandle const& left, CommitHandle const* base, CommitHandle const& right,
-                              val const& file, val const& directory) {
-        const auto merged = ThreeWayMerge(
-            &repository_, {RootOf(left.Get()), RootOf(CommitHandle::From(base)), RootOf(right.Get())},
-            {[&file](auto path, KivVcs::MergeTrees const& trees) { return Ask<ConflictChoice>(file, path, trees); },
-             [&directory](auto path, KivVcs::MergeTrees const& trees) {
-                 return Ask<TreeConflictChoice>(directory, path, trees);
-             }});
-        return merged ? ToJavaScript(repository_.SyncWithStorage(merged)->GetId()) : std::u16string();
+    /// @p file and @p directory are given a conflict and tell the number of a choice.
+    val Merge(CommitHandle const& commit, val const& file, val const& directory) {
+        const MergeOutcome merged =
+            MergeWithOutcome(repository_, commit.Get(),
+                             {[&file](Path path, MergeTrees const& trees) {
+                                  return static_cast<ConflictChoice>(Ask(file, path, trees, false));
+                              },
+                              [&directory](Path path, MergeTrees const& trees) {
+                                  return static_cast<TreeConflictChoice>(Ask(directory, path, trees, true));
+                              }});
+        val conflicts = val::array();
+        for (auto const& conflict : merged.conflicts)
+            conflicts.call<void>("push", ToObject(conflict));
+        val outcome = val::object();
+        outcome.set("result", static_cast<int>(merged.result));
+        outcome.set("conflicts", conflicts);
+        return outcome;
     }
 
     val Rebase(CommitHandle const& commit, CommitHandle const* base, CommitHandle const& onto) {
@@ -280,20 +332,8 @@ public:
     }
 
 private:
-    template <class Choice>
-    static Choice Ask(val const& resolver, array_view<KivStringViewT<char16_t> const> path,
-                      KivVcs::MergeTrees const& trees) {
-        KivStringT<char16_t> joined;
-        for (auto const& component : path) {
-            if (!joined.IsEmpty())
-                joined += u'/';
-            joined += component;
-        }
-        const auto side = [&](cow_ptr<Tree> const& tree) {
-            return tree ? Describe(path.empty() ? cow_ptr<Object>(tree) : tree->GetDeepObject(path)) : val::null();
-        };
-        return static_cast<Choice>(
-            resolver(ToJavaScript(joined), side(trees.left), side(trees.root), side(trees.right)).template as<int>());
+    static int Ask(val const& resolver, Path path, MergeTrees const& trees, bool isDirectory) {
+        return resolver(ToObject(DescribeConflict(path, trees, isDirectory, ConflictSettlement::Undecided))).as<int>();
     }
 
     [[nodiscard]] cow_ptr<Object> FindObject(Id const& id) const {
@@ -337,6 +377,8 @@ EMSCRIPTEN_BINDINGS(KivVcs) {
         .function("read", &CommitHandle::Read)
         .function("list", &CommitHandle::List)
         .function("differences", &CommitHandle::GetDifferences, allow_raw_pointers());
+    function("walkHistory", &WalkHistory);
+    class_<Walk>("Walk").function("next", &Walk::Next);
     class_<Draft>("Draft")
         .function("add", &Draft::Add)
         .function("addObject", &Draft::AddObject)
@@ -360,7 +402,7 @@ EMSCRIPTEN_BINDINGS(KivVcs) {
         .function("find", &RepositoryHandle::Find)
         .function("commonBase", &RepositoryHandle::GetCommonBase)
         .function("edit", &RepositoryHandle::Edit, allow_raw_pointers())
-        .function("mergeTrees", &RepositoryHandle::MergeTrees, allow_raw_pointers())
+        .function("merge", &RepositoryHandle::Merge)
         .function("rebase", &RepositoryHandle::Rebase, allow_raw_pointers())
         .function("simplify", &RepositoryHandle::Simplify)
         .function("ensureCommonRoot", &RepositoryHandle::EnsureCommonRoot)

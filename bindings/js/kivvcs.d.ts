@@ -47,11 +47,19 @@ export interface Entry {
     kind: EntryKind;
 }
 
-export type DifferenceKind = "added" | "removed" | "changed" | "directory became file" | "file became directory";
+export type DifferenceKind =
+    | "added"
+    | "removed"
+    | "changed"
+    | "directory became file"
+    | "file became directory"
+    | "renamed";
 
 export interface Difference {
     path: Path;
     kind: DifferenceKind;
+    /** Where a renamed file was before; null for other kinds. */
+    oldPath: Path | null;
     /** What was at the path before; null if nothing was. */
     oldId: Id | null;
     newId: Id | null;
@@ -73,8 +81,11 @@ export class Commit implements Handle {
 
     /** What it was made from; null for the first. */
     parent(): Commit | null;
-    /** This commit and those before it, newest first. Each is an object of its own, which the caller may free. */
-    history(options?: { limit?: number }): Generator<Commit, void, undefined>;
+    /**
+     * This commit and those before it, newest first. Each is an object of its own, which the caller may free.
+     * @param options `path`: only those that changed what is at that path; `limit`: at most so many
+     */
+    history(options?: { limit?: number; path?: Path | null }): Generator<Commit, void, undefined>;
 
     /** The paths of all files, sorted. */
     paths(): Path[];
@@ -86,8 +97,11 @@ export class Commit implements Handle {
     text(path: Path): string | null;
     /** The names in a directory, subdirectories first; null if there is no such directory. Without it, the top. */
     list(directory?: Path): { name: string; kind: EntryKind }[] | null;
-    /** The files that differ from those of an older commit, by path; all of them for null. */
-    differences(older: Commit | null): Difference[];
+    /**
+     * The files that differ from those of an older commit, by path; all of them for null. With `findRenames`, files that were
+     * removed are paired with files of equal content that were added.
+     */
+    differences(older: Commit | null, options?: { findRenames?: boolean }): Difference[];
 
     readonly isDeleted: boolean;
     delete(): void;
@@ -116,9 +130,14 @@ export interface Conflict {
     path: Path;
     kind: EntryKind;
     /** What the current branch, the common base and the other commit have there; null for nothing. */
-    left: Entry | null;
-    root: Entry | null;
-    right: Entry | null;
+    left: Id | null;
+    root: Id | null;
+    right: Id | null;
+    /** What each side did since the base. */
+    leftChange: DifferenceKind | "unchanged";
+    rightChange: DifferenceKind | "unchanged";
+    /** Whose version was taken; "undecided" where nobody has decided, as when a resolver is asked. */
+    settlement: "undecided" | "left" | "right" | "root" | "combined";
 }
 
 export type FileChoice = "left" | "right" | "root" | "undecided";
@@ -136,9 +155,11 @@ export interface MergeOptions {
 export interface MergeOutcome {
     /**
      * "up to date": the other commit was part of the branch; "forwarded": the branch moved to it; "merged": there is a new
-     * commit on the branch; "gave up": nothing has changed, and `conflicts` tells all that is undecided.
+     * commit on the branch; "gave up": nothing has changed, since conflicts are undecided; "nothing to commit": the resolvers
+     * left nothing at all.
      */
-    kind: "up to date" | "forwarded" | "merged" | "gave up";
+    kind: "up to date" | "forwarded" | "merged" | "gave up" | "nothing to commit" | "refused";
+    /** Those that were settled, and after a merge that gave up all others behind them. */
     conflicts: Conflict[];
 }
 

@@ -27,7 +27,7 @@ async function start(source) {
         throw new KivVcsError(`kivvcs.wasm cannot be used: ${reason}`);
     };
     core = await instantiate({ wasmBinary, onAbort: abort, print() {}, printErr() {} });
-    for (const raw of [core.Repository, core.Commit, core.Draft])
+    for (const raw of [core.Repository, core.Commit, core.Draft, core.Walk])
         explainFailuresOf(raw.prototype);
 }
 
@@ -175,13 +175,17 @@ export class Commit extends Handle {
         return wrap(this[rawOf].parent());
     }
 
-    *history({ limit = Infinity } = {}) {
-        let raw = this[rawOf].clone();
-        for (let count = 0; raw !== null && count < limit; ++count) {
-            const commit = new Commit(raw);
-            // Before the commit is handed out: who gets it may delete it.
-            raw = count + 1 < limit ? raw.parent() : null;
-            yield commit;
+    *history({ limit = Infinity, path = null } = {}) {
+        const walk = core.walkHistory(this[rawOf], path === null ? null : checkText(path, "A path"));
+        try {
+            for (let count = 0; count < limit; ++count) {
+                const raw = walk.next();
+                if (raw === null)
+                    return;
+                yield new Commit(raw);
+            }
+        } finally {
+            walk.delete();
         }
     }
 
@@ -210,40 +214,54 @@ export class Commit extends Handle {
         );
     }
 
-    differences(older) {
+    differences(older, { findRenames = false } = {}) {
         const former = older === null ? null : rawCommit(older, "What a Commit is compared with");
-        return this[rawOf].differences(former).map((path) => {
-            const was = toEntry(former && former.find(path));
-            const is = toEntry(this[rawOf].find(path));
-            return { path, kind: kindOfDifference(was, is), oldId: was?.id ?? null, newId: is?.id ?? null };
-        });
+        return this[rawOf].differences(former, findRenames).map(({ kind, path, oldPath, oldId, newId }) => ({
+            path,
+            kind: changeKinds[kind],
+            oldPath: oldPath || null,
+            oldId: oldId || null,
+            newId: newId || null,
+        }));
     }
 }
 
-function kindOfDifference(was, is) {
-    if (was === null)
-        return "added";
-    if (is === null)
-        return "removed";
-    if (was.kind === is.kind)
-        return "changed";
-    return was.kind === "directory" ? "directory became file" : "file became directory";
-}
-
+// In the order of the library's numbers.
+const changeKinds = [
+    "unchanged",
+    "added",
+    "removed",
+    "changed",
+    "directory became file",
+    "file became directory",
+    "renamed",
+];
+const settlements = ["undecided", "left", "right", "root", "combined"];
+const mergeResults = ["up to date", "forwarded", "merged", "gave up", "nothing to commit", "refused"];
 const fileChoices = ["left", "right", "root", "undecided"];
 const directoryChoices = ["merge", "left", "right", "root", "undecided"];
 
-/** A resolver for the module that asks `resolver` and notes what stays undecided, which it answers by `meanwhile`. */
-function collecting(conflicts, kind, resolver, choices, otherwise, meanwhile) {
-    return (path, left, root, right) => {
-        const conflict = { path, kind, left: toEntry(left), root: toEntry(root), right: toEntry(right) };
+const toConflict = (raw) => ({
+    path: raw.path,
+    kind: raw.isDirectory ? "directory" : "file",
+    left: raw.leftId || null,
+    root: raw.rootId || null,
+    right: raw.rightId || null,
+    leftChange: changeKinds[raw.leftChange],
+    rightChange: changeKinds[raw.rightChange],
+    settlement: settlements[raw.settlement],
+});
+
+/** A resolver for the module, which asks `resolver`; what that leaves open is answered by `otherwise`. */
+function numbered(resolver, choices, otherwise) {
+    return (raw) => {
+        const conflict = toConflict(raw);
         const choice = resolver?.(conflict) ?? otherwise;
         if (!choices.includes(choice))
-            throw new KivVcsError(`A resolver of ${kind} conflicts answers ${choices.join(", ")}, and not ${choice}.`);
-        if (choice !== "undecided")
-            return choices.indexOf(choice);
-        conflicts.push(conflict);
-        return choices.indexOf(meanwhile);
+            throw new KivVcsError(
+                `A resolver of ${conflict.kind} conflicts answers ${choices.join(", ")}, and not ${choice}.`,
+            );
+        return choices.indexOf(choice);
     };
 }
 
@@ -334,42 +352,17 @@ export class Repository extends Handle {
         });
     }
 
-    merge(other, { file, directory, author = {}, description = "" } = {}) {
-        const raw = this[rawOf];
-        const theirs = rawCommit(other, "What is merged");
+    merge(other, { file, directory, author, description } = {}) {
         this.#checkBranch(this.branch);
-        const outcome = (kind, conflicts = []) => ({ kind, conflicts });
-        return using([raw.head(this.branch)], (head) => {
-            if (head === null) {
-                raw.moveBranch(this.branch, theirs);
-                return outcome("forwarded");
-            }
-            return using([raw.commonBase(head, theirs)], (base) => {
-                if (base?.id() === theirs.id())
-                    return outcome("up to date");
-                if (base?.id() === head.id()) {
-                    raw.moveBranch(this.branch, theirs);
-                    return outcome("forwarded");
-                }
-                const conflicts = [];
-                const tree = raw.mergeTrees(
-                    head,
-                    base,
-                    theirs,
-                    collecting(conflicts, "file", file, fileChoices, "undecided", "left"),
-                    collecting(conflicts, "directory", directory, directoryChoices, "merge", "merge"),
-                );
-                if (tree === "" || conflicts.length > 0)
-                    return outcome("gave up", conflicts);
-                return using([raw.edit(head, false)], (draft) => {
-                    draft.useTree(tree);
-                    sign(draft, author);
-                    draft.setDescription(checkText(description, "A description"));
-                    draft.commit().delete();
-                    return outcome("merged");
-                });
-            });
-        });
+        const { result, conflicts } = this[rawOf].merge(
+            rawCommit(other, "What is merged"),
+            numbered(file, fileChoices, "undecided"),
+            numbered(directory, directoryChoices, "merge"),
+        );
+        const kind = mergeResults[result];
+        if (kind === "merged" && (author !== undefined || description !== undefined))
+            this.commit({ amend: true, author, description }).delete();
+        return { kind, conflicts: conflicts.map(toConflict) };
     }
 
     rebase(tip, onto, base) {

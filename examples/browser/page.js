@@ -190,7 +190,8 @@ async function bringTogether() {
     const [mine, theirs] = panels.map(({ replica }) => replica);
     let outcome = await mine.merge(theirs);
     if (outcome.kind === "gave up") {
-        const choices = await ask(outcome.conflicts, mine, theirs);
+        const undecided = outcome.conflicts.filter(({ settlement }) => settlement === "undecided");
+        const choices = await ask(undecided, mine, theirs);
         if (choices === null)
             return "Nothing was changed.";
         outcome = await mine.merge(theirs, choices);

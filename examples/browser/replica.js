@@ -115,9 +115,9 @@ export class Replica {
         return outcome;
     }
 
-    /** The text of a file or of nothing. */
-    textOf(entry) {
-        return entry === null ? null : new TextDecoder().decode(this.#repository.readFile(entry.id));
+    /** The text of a file; null for none. */
+    textOf(id) {
+        return id === null ? null : new TextDecoder().decode(this.#repository.readFile(id));
     }
 
     /** Makes the versions last. Fulfilled, with the id of the version that is shown, when they do. */

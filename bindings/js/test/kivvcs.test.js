@@ -77,6 +77,12 @@ test("files are listed, read and compared", () => {
     assert.equal(after.text("same"), "\ufeff4");
     assert.deepEqual([after.read("new"), after.find("nowhere"), after.list("nowhere")], [null, null, null]);
     assert.deepEqual(after.list("new"), [{ name: "deep", kind: "directory" }]);
+    assert.deepEqual([...after.history({ path: "same" })].map(({ id }) => id), [before.id]);
+    const moved = repository.commit({ remove: ["same"], files: { "new/same": { id: before.find("same").id } } });
+    assert.deepEqual(moved.differences(after, { findRenames: true }), [
+        { path: "new/same", kind: "renamed", oldPath: "same", oldId: before.find("same").id, newId: before.find("same").id },
+    ]);
+    repository.moveBranch("master", after);
     assert.equal(after.parent().id, before.id);
     assert.equal(before.parent(), null);
     assert.equal(repository.commit({ amend: true, description: "Amended" }).parent().id, before.id);
@@ -86,8 +92,11 @@ test("a merge tells all conflicts, asks its resolvers, and lets their exceptions
     const { repository, base, mine, theirs } = twoSides();
     const { kind, conflicts } = repository.merge(theirs);
     assert.equal(kind, "gave up");
-    assert.deepEqual(conflicts.map(({ path, left }) => [path, left.id]), [["a", mine.find("a").id]]);
-    assert.equal(new TextDecoder().decode(repository.readFile(conflicts[0].right.id)), "theirs");
+    assert.deepEqual(conflicts, [
+        { path: "a", kind: "file", left: mine.find("a").id, root: base.find("a").id, right: theirs.find("a").id,
+          leftChange: "changed", rightChange: "changed", settlement: "undecided" },
+    ]);
+    assert.equal(new TextDecoder().decode(repository.readFile(conflicts[0].right)), "theirs");
     const mistake = new RangeError("a mistake of the page");
     assert.throws(() => repository.merge(theirs, { file() { throw mistake; } }), (error) => error === mistake);
     refuses(() => repository.merge(theirs, { file: () => "both" }), /answers left, right, root, undecided, and not both/);
