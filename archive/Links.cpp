@@ -21,7 +21,7 @@ bool TakeIdentifier(std::string_view& text, ObjectType type, std::vector<Link>& 
     if (text.size() < digitCount || !ReadDigits(text.data(), std::as_writable_bytes(std::span(digest)).data()))
         return false;
     text.remove_prefix(digitCount);
-    links.push_back({type, Id::FromDigest(digest)});
+    links.push_back({type, Id::FromDigest(digest), {}});
     return true;
 }
 
@@ -33,9 +33,11 @@ bool ReadTreeLinks(std::string_view text, std::vector<Link>& links) {
         std::size_t const end = text.find('\0');
         if (end == std::string_view::npos)
             return false;
+        std::string_view const name = text.substr(0, end);
         text.remove_prefix(end + 1);
         if (!TakeIdentifier(text, isTree ? ObjectType::Tree : ObjectType::Blob, links))
             return false;
+        links.back().name = name;
     }
     return true;
 }

@@ -12,25 +12,39 @@ namespace {
 /// The most bytes that SQLite can be asked to give rows for at once stays bounded, whatever a host asks for.
 constexpr std::size_t mostRows = 1U << 20U;
 
-Ancestry FactsOf(Database& database, Id const& id, Query const& row, int firstColumn) {
-    Ancestry facts{id, row.Identifier(firstColumn), row.Identifier(firstColumn + 1), {}};
-    Query contained(database, "SELECT how, other FROM contained WHERE id=?");
-    contained.With(id);
-    while (contained.Next()) {
-        std::int64_t const how = contained.Number(0);
-        if (how < 0 || how > static_cast<std::int64_t>(Containment::FoundEqual))
-            database.Fail(SQLITE_CORRUPT);
-        facts.contains.push_back({static_cast<Containment>(how), contained.Identifier(1)});
-    }
-    return facts;
-}
+/// Reads facts within one transaction.
+class FactsReader {
+public:
+    explicit FactsReader(Database& database)
+        : database_(database), hasContained_(database.Ask("SELECT EXISTS(SELECT 1 FROM contained)") != 0) {}
 
-std::optional<Ancestry> FindFacts(Database& database, Id const& id) {
-    Query query(database, "SELECT parent, tree FROM ancestry WHERE id=?");
-    if (!query.With(DigestOf(id)).Next())
-        return std::nullopt;
-    return FactsOf(database, id, query, 0);
-}
+    [[nodiscard]] std::optional<Ancestry> Find(Id const& id) {
+        Query query(database_, "SELECT parent, tree FROM ancestry WHERE id=?");
+        if (!query.With(DigestOf(id)).Next())
+            return std::nullopt;
+        return FactsOf(id, query.Identifier(0), query.Identifier(1));
+    }
+
+    [[nodiscard]] Ancestry FactsOf(Id const& id, Id parent, Id tree) {
+        Ancestry facts{id, std::move(parent), std::move(tree), {}};
+        // Many histories have never merged.
+        if (!hasContained_)
+            return facts;
+        Query contained(database_, "SELECT how, other FROM contained WHERE id=?");
+        contained.With(id);
+        while (contained.Next()) {
+            std::int64_t const how = contained.Number(0);
+            if (how < 0 || how > static_cast<std::int64_t>(Containment::FoundEqual))
+                database_.Fail(SQLITE_CORRUPT);
+            facts.contains.push_back({static_cast<Containment>(how), contained.Identifier(1)});
+        }
+        return facts;
+    }
+
+private:
+    Database& database_;
+    bool hasContained_;
+};
 
 Buffer BufferOf(ByteView bytes) {
     Buffer buffer;
@@ -87,8 +101,8 @@ std::vector<KivStringT<char16_t>> SqliteArchive::ListRecords() {
 std::vector<Ancestry> SqliteArchive::ReadAncestry(std::span<const Id> commits, Follow follow, std::size_t more) {
     SqliteStore::Lease const connection(*store_);
     Transaction transaction(connection->database, Transaction::Kind::Read);
-    auto walked =
-        WalkAncestry(commits, follow, more, [&](Id const& id) { return FindFacts(connection->database, id); });
+    FactsReader reader(connection->database);
+    auto walked = WalkAncestry(commits, follow, more, [&](Id const& id) { return reader.Find(id); });
     transaction.Commit();
     return walked;
 }
@@ -96,11 +110,12 @@ std::vector<Ancestry> SqliteArchive::ReadAncestry(std::span<const Id> commits, F
 std::vector<Ancestry> SqliteArchive::ListAncestry(Id const& after, std::size_t limit) {
     SqliteStore::Lease const connection(*store_);
     Transaction transaction(connection->database, Transaction::Kind::Read);
+    FactsReader reader(connection->database);
     std::vector<Ancestry> listed;
     Query query(connection->database, "SELECT id, parent, tree FROM ancestry WHERE id>? ORDER BY id LIMIT ?");
     query.With(after).With(LimitOf(limit));
     while (query.Next())
-        listed.push_back(FactsOf(connection->database, query.Identifier(0), query, 1));
+        listed.push_back(reader.FactsOf(query.Identifier(0), query.Identifier(1), query.Identifier(2)));
     return listed;
 }
 

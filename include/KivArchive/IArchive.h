@@ -142,7 +142,7 @@ struct Change {
     std::vector<NewObject> objects;
     /// Objects that `objects` name, that are not among them, and that the archive was found to have. A tree relied on
     /// vouches for all that it reaches, so that a new version of a directory relies on the earlier one and on what that
-    /// one does not name.
+    /// one does not name. Commits that one among `objects` has merged belong here, too.
     std::vector<Id> relied;
     /// The facts of every commit among `objects`, and any further ones.
     std::vector<Ancestry> ancestry;

@@ -5,12 +5,16 @@
 
 #include "KivArchive/IArchive.h"
 
+#include <string_view>
+
 namespace KivArchive {
 
 /// An object as another one names it.
 struct Link {
     ObjectType type = ObjectType::Blob;
     Id id;
+    /// An entry's name in UTF-8, within the data that it was read from; empty in a commit.
+    std::string_view name;
 };
 
 /// What the data of a tree or a commit names: files and directories, or the root tree and the parent. A blob names
@@ -81,5 +85,58 @@ struct CollectReport {
 /// @param progress may be null
 /// @throws ArchiveError, of kind `Damaged` before anything is removed if a tree or commit that is reached cannot be read
 KIVARCHIVE_EXPORT CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgress* progress);
+
+/// A branch of one archive, and the name under which another one gets it.
+struct SynchronizedBranch {
+    KivStringT<char16_t> from;
+    /// Empty if no branch is to be moved there.
+    KivStringT<char16_t> to;
+};
+
+struct SynchronizeOptions {
+    /// Those that the source does not have are left out.
+    std::vector<SynchronizedBranch> branches;
+    /// Records that are copied over what is there; likewise.
+    std::vector<KivStringT<char16_t>> records;
+    /// Says whether a host can have an entry of that name, which comes from the source and may be anything, such as "..",
+    /// "/" or empty. Empty accepts all.
+    std::function<bool(KivStringViewT<char16_t> name)> acceptsName;
+};
+
+struct SynchronizeReport {
+    /// The branches asked for that the source has, under its names.
+    std::vector<Branch> heads;
+    /// What was stored.
+    std::uint64_t objects = 0;
+    std::uint64_t ancestries = 0;
+};
+
+/// Copies what the branches of @p from reach and @p to lacks, along parents, trees, contents and what was merged; then all
+/// facts of ancestry; and in the last transaction it moves the branches, whatever they stood at, and sets the records.
+///
+/// Objects are stored children first, those of older commits before those of newer ones, so that an interrupted call is
+/// gone on with by the next one. Everything is compared with its identifier, and read as what it is said to be, before it
+/// is stored. Subtrees that @p to has are not entered.
+///
+/// Holds the identifiers of the commits that are missing, the trees that a hundred of them bring, and a few MiB.
+/// @param progress may be null
+/// @throws ArchiveError of kind `Damaged` if the source lacks something or has it damaged, and of kind
+/// `Unrepresentable` for a name that is not accepted; of kind `Collected` if somebody collects in @p to meanwhile.
+/// What has been stored until then stays, and no branch has moved
+KIVARCHIVE_EXPORT SynchronizeReport Synchronize(IArchive& from, IArchive& to, SynchronizeOptions const& options,
+                                                IProgress* progress);
+
+/// What became of what was damaged or missing.
+struct RepairReport {
+    std::vector<Id> repaired;
+    /// Not to be had from the source either.
+    std::vector<Id> lost;
+};
+
+/// Verifies @p archive, and takes what is damaged or missing in it from @p source, as far as that has it and it is what
+/// its identifier says. Whatever else is in @p archive stays as it is.
+/// @param progress may be null
+/// @throws ArchiveError for what concerns an archive as a whole
+KIVARCHIVE_EXPORT RepairReport Repair(IArchive& archive, IArchive& source, IProgress* progress);
 
 } // namespace KivArchive

@@ -1,0 +1,405 @@
+#include "Changes.h"
+#include "KivArchive/Upkeep.h"
+
+#include <algorithm>
+#include <unordered_map>
+#include <unordered_set>
+
+namespace KivArchive {
+
+namespace {
+
+/// How many identifiers are asked about at once, how many commits are taken together, and how much one change stores.
+constexpr std::size_t batchSize = 1000;
+constexpr std::size_t commitsTogether = 100;
+constexpr std::uint64_t changeSize = 8 * largestWholeContent;
+
+/// A tree or commit on its way.
+struct Arriving {
+    ObjectType type = ObjectType::Tree;
+    Buffer data;
+    std::vector<Link> links;
+    Id earlier;
+};
+
+[[noreturn]] void Fail(Failure kind, std::string const& sentence) {
+    throw ArchiveError(kind, {}, sentence);
+}
+
+/// Reads and checks all of @p ids, which are said to be of one type.
+std::unordered_map<Id, Arriving> Fetch(IArchive& from, std::vector<Id> const& ids, ObjectType type) {
+    std::unordered_map<Id, Arriving> fetched;
+    for (std::size_t begin = 0; begin < ids.size(); begin += batchSize) {
+        std::span<const Id> const batch(ids.data() + begin, std::min(batchSize, ids.size() - begin));
+        from.Read(batch, [&](ArchivedObject const& object) {
+            Arriving arriving{object.type, {}, {}, {}};
+            arriving.data.Append(object.data.data(), object.data.size());
+            if (object.type != type || !(Identify(object.type, object.data) == object.id) ||
+                !ReadLinks(object.type, BytesOf(arriving.data), arriving.links))
+                Fail(Failure::Damaged, "The archive to copy from has something that is not what its identifier says.");
+            fetched.insert_or_assign(object.id, std::move(arriving));
+        });
+    }
+    for (Id const& id : ids)
+        if (fetched.count(id) == 0)
+            Fail(Failure::Damaged, "The archive to copy from lacks something that it names, or has it damaged.");
+    return fetched;
+}
+
+/// Missing commits, parents and what was merged before those who have them.
+class MissingCommits {
+public:
+    MissingCommits(IArchive& from, IArchive& to, std::vector<Id> const& heads, IProgress* progress)
+        : from_(from), to_(to) {
+        for (std::vector<Id> open = heads; !open.empty();) {
+            ReportProgress(progress, {"looking for missing versions", facts_.size(), 0}, {});
+            open = Discover(std::move(open));
+        }
+        for (Id const& head : heads)
+            Order(head);
+    }
+
+    [[nodiscard]] std::vector<Id> const& InOrder() const noexcept { return inOrder_; }
+    [[nodiscard]] Ancestry const& FactsOf(Id const& id) const { return facts_.at(id); }
+
+private:
+    /// Takes in those of @p open that are missing. @return what these lead to
+    std::vector<Id> Discover(std::vector<Id> open) {
+        std::erase_if(open, [this](Id const& id) { return facts_.count(id) != 0; });
+        std::vector<Id> const missing = to_.FindMissing(open);
+        auto known = from_.ReadAncestry(missing, Follow::Parents, 0);
+        std::vector<Id> next;
+        for (Ancestry& facts : known) {
+            std::vector<Id> const before = Before(facts);
+            next.insert(next.end(), before.begin(), before.end());
+            Id const commit = facts.commit;
+            facts_.insert_or_assign(commit, std::move(facts));
+        }
+        for (Id const& id : missing)
+            if (facts_.count(id) == 0)
+                Fail(Failure::Damaged, "The archive to copy from does not know the ancestry of one of its versions.");
+        return next;
+    }
+
+    /// What a commit comes after. A merged one that the source has collected is missed by nobody.
+    [[nodiscard]] std::vector<Id> Before(Ancestry const& facts) {
+        std::vector<Id> before;
+        for (ContainedCommit const& contained : facts.contains)
+            if (contained.how == Containment::Merged)
+                before.push_back(contained.id);
+        for (Id const& gone : from_.FindMissing(before))
+            std::erase(before, gone);
+        if (!facts.parent.IsEmpty())
+            before.push_back(facts.parent);
+        return before;
+    }
+
+    void Order(Id const& head) {
+        std::vector<std::pair<Id, bool>> open{{head, false}};
+        while (!open.empty()) {
+            auto const [id, isDone] = open.back();
+            open.pop_back();
+            auto const found = facts_.find(id);
+            if (found == facts_.end())
+                continue;
+            if (isDone) {
+                if (ordered_.insert(id).second)
+                    inOrder_.push_back(id);
+                continue;
+            }
+            if (!entered_.insert(id).second)
+                continue;
+            open.emplace_back(id, true);
+            for (Id const& before : Before(found->second))
+                open.emplace_back(before, false);
+        }
+    }
+
+    IArchive& from_;
+    IArchive& to_;
+    std::unordered_map<Id, Ancestry> facts_;
+    std::unordered_set<Id> entered_;
+    std::unordered_set<Id> ordered_;
+    std::vector<Id> inOrder_;
+};
+
+/// Copies the commits that it is given, with all that they bring.
+class Copying {
+public:
+    Copying(IArchive& from, IArchive& to, SynchronizeOptions const& options, IProgress* progress)
+        : from_(from), to_(to), options_(options), progress_(progress) {}
+
+    [[nodiscard]] std::uint64_t CountStored() const noexcept { return stored_; }
+
+    void Copy(std::span<const Id> commits, MissingCommits const& missing) {
+        arriving_ = Fetch(from_, {commits.begin(), commits.end()}, ObjectType::Commit);
+        FetchTrees(commits, missing);
+        StoreBlobs();
+        for (Id const& commit : commits) {
+            StoreWithTrees(commit);
+            RelyOnMerged(missing.FactsOf(commit));
+            change_.ancestry.push_back(missing.FactsOf(commit));
+        }
+        Flush();
+        arriving_.clear();
+        blobs_.clear();
+        hasStored_.clear();
+    }
+
+private:
+    struct Pair {
+        Id id;
+        Id earlier;
+    };
+
+    void RelyOnMerged(Ancestry const& facts) {
+        std::vector<Id> merged;
+        for (ContainedCommit const& contained : facts.contains)
+            if (contained.how == Containment::Merged)
+                merged.push_back(contained.id);
+        for (Id const& gone : to_.FindMissing(merged))
+            std::erase(merged, gone);
+        change_.relied.insert(change_.relied.end(), merged.begin(), merged.end());
+    }
+
+    /// Level by level, so that the number of calls depends on the depth.
+    void FetchTrees(std::span<const Id> commits, MissingCommits const& missing) {
+        std::vector<Pair> level;
+        for (Id const& commit : commits) {
+            Ancestry const& facts = missing.FactsOf(commit);
+            Id tree;
+            Id parentId;
+            for (Link const& link : arriving_.at(commit).links)
+                (link.type == ObjectType::Tree ? tree : parentId) = link.id;
+            if (!(tree == facts.tree) || !(parentId == facts.parent))
+                Fail(Failure::Damaged, "The archive to copy from knows another ancestry than its versions have.");
+            auto const parent =
+                from_.ReadAncestry({&facts.parent, facts.parent.IsEmpty() ? 0U : 1U}, Follow::Parents, 0);
+            if (!tree.IsEmpty())
+                level.push_back({tree, parent.empty() ? Id() : parent.front().tree});
+        }
+        while (!level.empty())
+            level = FetchLevel(std::move(level));
+    }
+
+    std::vector<Pair> FetchLevel(std::vector<Pair> level) {
+        ReportProgress(progress_, {"reading directories", stored_, 0}, {});
+        std::erase_if(level, [this](Pair const& pair) { return arriving_.count(pair.id) != 0; });
+        std::unordered_set<Id> const missing = Missing(level);
+        std::erase_if(level, [&](Pair const& pair) { return missing.count(pair.id) == 0; });
+        std::vector<Id> wanted(missing.begin(), missing.end());
+        auto trees = Fetch(from_, wanted, ObjectType::Tree);
+        std::vector<Id> earlier;
+        for (Pair const& pair : level)
+            if (!pair.earlier.IsEmpty() && trees.count(pair.earlier) == 0 && arriving_.count(pair.earlier) == 0)
+                earlier.push_back(pair.earlier);
+        // A hint only: what the source has dropped is none.
+        for (Id const& gone : from_.FindMissing(earlier))
+            std::erase(earlier, gone);
+        auto const before = Fetch(from_, earlier, ObjectType::Tree);
+        std::vector<Pair> blobs;
+        std::vector<Pair> next;
+        for (Pair const& pair : level) {
+            auto const tree = trees.find(pair.id);
+            if (tree == trees.end() || arriving_.count(pair.id) != 0)
+                continue;
+            std::unordered_map<std::string_view, Link const*> names;
+            for (auto const* known : {&before, &std::as_const(arriving_), &std::as_const(trees)})
+                if (auto const found = known->find(pair.earlier); found != known->end() && names.empty())
+                    for (Link const& link : found->second.links)
+                        names.emplace(link.name, &link);
+            for (Link const& link : tree->second.links) {
+                CheckName(link.name);
+                auto const same = names.find(link.name);
+                Id const earlierId = same != names.end() && same->second->type == link.type ? same->second->id : Id();
+                // What the earlier tree names, too, comes or is there with that one.
+                if (!(earlierId == link.id))
+                    (link.type == ObjectType::Tree ? next : blobs).push_back({link.id, earlierId});
+            }
+            tree->second.earlier = pair.earlier;
+        }
+        for (auto& [id, tree] : trees)
+            arriving_.try_emplace(id, std::move(tree));
+        std::unordered_set<Id> const missingBlobs = Missing(blobs);
+        for (Pair const& pair : blobs)
+            if (missingBlobs.count(pair.id) != 0 && wantedBlobs_.insert(pair.id).second)
+                blobs_.push_back(pair);
+        return next;
+    }
+
+    [[nodiscard]] std::unordered_set<Id> Missing(std::vector<Pair> const& pairs) {
+        std::vector<Id> ids;
+        for (Pair const& pair : pairs)
+            ids.push_back(pair.id);
+        auto const missing = to_.FindMissing(ids);
+        return {missing.begin(), missing.end()};
+    }
+
+    void CheckName(std::string_view name) const {
+        if (!options_.acceptsName)
+            return;
+        auto const text = KivVcs::String::ToStringW(KivStringViewT<char>(name.data(), static_cast<int>(name.size())));
+        if (!options_.acceptsName(text))
+            Fail(Failure::Unrepresentable, "The name \"" + std::string(name) + "\" cannot be had here.");
+    }
+
+    void StoreBlobs() {
+        std::unordered_map<Id, Id> earlier;
+        for (Pair const& pair : blobs_)
+            earlier.emplace(pair.id, pair.earlier);
+        for (std::size_t begin = 0; begin < blobs_.size(); begin += batchSize) {
+            std::vector<Id> batch;
+            for (std::size_t i = begin; i < std::min(begin + batchSize, blobs_.size()); ++i)
+                batch.push_back(blobs_[i].id);
+            std::vector<Id> large;
+            std::size_t given = 0;
+            from_.Read(batch, [&](ArchivedObject const& object) {
+                ++given;
+                if (object.type != ObjectType::Blob)
+                    Fail(Failure::Damaged, "The archive to copy from has something else for a file.");
+                if (object.data.empty() && object.size > 0) {
+                    large.push_back(object.id);
+                    return;
+                }
+                if (!(Identify(object.type, object.data) == object.id))
+                    Fail(Failure::Damaged, "The archive to copy from has a file that is not what its identifier says.");
+                Buffer data;
+                data.Append(object.data.data(), object.data.size());
+                Add({object.id, object.type, std::move(data), earlier.at(object.id)});
+            });
+            if (given < batch.size())
+                Fail(Failure::Damaged, "The archive to copy from lacks a file, or has it damaged.");
+            for (Id const& id : large)
+                StoreLarge(id, earlier.at(id));
+        }
+        wantedBlobs_.clear();
+    }
+
+    void StoreLarge(Id const& id, Id const& earlier) {
+        StreamIO content = ContentStream(from_, id);
+        if (!content || !to_.StoreContent(id, content, earlier, progress_))
+            Fail(Failure::Damaged, "The archive to copy from has a file that is not what its identifier says.");
+        ++stored_;
+    }
+
+    /// Stores a tree or commit behind all that it names.
+    void StoreWithTrees(Id const& root) {
+        std::vector<std::pair<Id, bool>> open{{root, false}};
+        while (!open.empty()) {
+            auto const [id, isDone] = open.back();
+            open.pop_back();
+            auto const found = arriving_.find(id);
+            if (found == arriving_.end() || hasStored_.count(id) != 0)
+                continue;
+            Arriving const& object = found->second;
+            if (!isDone) {
+                open.emplace_back(id, true);
+                for (Link const& link : object.links)
+                    if (link.type == ObjectType::Tree)
+                        open.emplace_back(link.id, false);
+                continue;
+            }
+            hasStored_.insert(id);
+            for (Link const& link : object.links)
+                change_.relied.push_back(link.id);
+            Add({id, object.type, object.data, object.earlier});
+        }
+    }
+
+    void Add(NewObject object) {
+        size_ += object.data.GetSize();
+        ++stored_;
+        change_.objects.push_back(std::move(object));
+        if (size_ > changeSize)
+            Flush();
+    }
+
+    void Flush() {
+        ReportProgress(progress_, {"storing objects", stored_, 0}, {});
+        to_.Apply(change_);
+        change_ = {};
+        size_ = 0;
+    }
+
+    IArchive& from_;
+    IArchive& to_;
+    SynchronizeOptions const& options_;
+    IProgress* progress_;
+    std::unordered_map<Id, Arriving> arriving_;
+    std::vector<Pair> blobs_;
+    std::unordered_set<Id> wantedBlobs_;
+    std::unordered_set<Id> hasStored_;
+    Change change_;
+    std::uint64_t size_ = 0;
+    std::uint64_t stored_ = 0;
+};
+
+/// Adds the facts that @p to lacks. @return of how many commits
+std::uint64_t CopyAncestry(IArchive& from, IArchive& to, IProgress* progress) {
+    std::uint64_t copied = 0;
+    for (Id after;;) {
+        ReportProgress(progress, {"copying ancestry", copied, 0}, {});
+        auto const page = from.ListAncestry(after, batchSize);
+        std::vector<Id> ids;
+        for (Ancestry const& facts : page)
+            ids.push_back(facts.commit);
+        std::unordered_map<Id, std::size_t> known;
+        for (Ancestry const& facts : to.ReadAncestry(ids, Follow::Parents, 0))
+            known.emplace(facts.commit, facts.contains.size());
+        Change change;
+        for (Ancestry const& facts : page)
+            if (auto const found = known.find(facts.commit);
+                found == known.end() || found->second < facts.contains.size())
+                change.ancestry.push_back(facts);
+        if (!change.ancestry.empty())
+            to.Apply(change);
+        copied += change.ancestry.size();
+        if (page.size() < batchSize)
+            return copied;
+        after = page.back().commit;
+    }
+}
+
+void MoveBranches(IArchive& from, IArchive& to, SynchronizeOptions const& options, std::vector<Branch> const& heads) {
+    Change change;
+    for (Record& record : from.ReadRecords(options.records))
+        change.records.push_back({std::move(record), false, {}});
+    for (;;) {
+        change.branches.clear();
+        auto const present = to.ReadBranches();
+        for (Branch const& head : heads)
+            for (SynchronizedBranch const& branch : options.branches) {
+                if (!(branch.from == head.name) || branch.to.IsEmpty())
+                    continue;
+                auto const now = std::find_if(present.begin(), present.end(),
+                                              [&](Branch const& one) { return one.name == branch.to; });
+                change.branches.push_back({branch.to, now == present.end() ? Id() : now->head, head.head});
+            }
+        if (to.Apply(change).applied)
+            return;
+    }
+}
+
+} // namespace
+
+SynchronizeReport Synchronize(IArchive& from, IArchive& to, SynchronizeOptions const& options, IProgress* progress) {
+    SynchronizeReport report;
+    std::vector<Id> heads;
+    for (Branch const& branch : from.ReadBranches())
+        if (std::any_of(options.branches.begin(), options.branches.end(),
+                        [&](SynchronizedBranch const& wanted) { return wanted.from == branch.name; })) {
+            report.heads.push_back(branch);
+            heads.push_back(branch.head);
+        }
+    MissingCommits const missing(from, to, heads, progress);
+    Copying copying(from, to, options, progress);
+    std::span<const Id> rest(missing.InOrder());
+    for (; !rest.empty(); rest = rest.subspan(std::min(commitsTogether, rest.size())))
+        copying.Copy(rest.first(std::min(commitsTogether, rest.size())), missing);
+    report.objects = copying.CountStored();
+    report.ancestries = CopyAncestry(from, to, progress);
+    MoveBranches(from, to, options, report.heads);
+    return report;
+}
+
+} // namespace KivArchive

@@ -1,0 +1,219 @@
+#include "ArchiveFiles.h"
+#include "FaultyFiles.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <new>
+
+/// Operations during which one allocation, or one access to the disk, after the other fails. The archive must be whole
+/// after each, and the next operation must succeed.
+
+namespace {
+
+/// What this program's operators `new` and `delete` do, and SQLite's allocations. On one thread only.
+struct Allocations {
+    bool isCounting = false;
+    long failing = 0;
+    long made = 0;
+};
+Allocations allocations;
+
+bool Fails() {
+    return allocations.isCounting && ++allocations.made == allocations.failing;
+}
+
+sqlite3_mem_methods plainMemory;
+
+void* AllocateForSqlite(int size) {
+    return Fails() ? nullptr : plainMemory.xMalloc(size);
+}
+
+void* ReallocateForSqlite(void* memory, int size) {
+    return Fails() ? nullptr : plainMemory.xRealloc(memory, size);
+}
+
+} // namespace
+
+// Inlined, they would look mismatched to the compiler.
+[[gnu::noinline]] void* operator new(std::size_t size) {
+    void* const memory = Fails() ? nullptr : std::malloc(size == 0 ? 1 : size);
+    if (memory == nullptr)
+        throw std::bad_alloc();
+    return memory;
+}
+[[gnu::noinline]] void operator delete(void* memory) noexcept {
+    std::free(memory);
+}
+[[gnu::noinline]] void operator delete(void* memory, std::size_t /*size*/) noexcept {
+    std::free(memory);
+}
+
+namespace KivArchive {
+namespace {
+
+using namespace Conformance;
+
+constexpr const char* pathOfStart = "start";
+
+/// What may be interrupted; each begins with the same archive.
+struct Operation {
+    const char* name;
+    void (*run)(std::string const& path);
+};
+
+SqliteOptions OneWorker() {
+    SqliteOptions options;
+    options.workers = 1;
+    options.wait = std::chrono::milliseconds(0);
+    return options;
+}
+
+void Open(std::string const& path) {
+    SqliteArchive const archive(path, OneWorker());
+}
+
+void MakeNew(std::string const& path) {
+    SqliteArchive const archive(path + ".new", OneWorker());
+}
+
+void Publish(std::string const& path) {
+    SqliteArchive archive(path, OneWorker());
+    SmallHost host(archive, 3);
+    for (int i = 0; i < 4; ++i)
+        host.Publish();
+}
+
+void CollectAll(std::string const& path) {
+    SqliteArchive archive(path, OneWorker());
+    CollectOptions options;
+    options.grace = std::chrono::seconds(0);
+    options.slice = 4;
+    for (int i = 0; i < 2; ++i)
+        Collect(archive, options, nullptr);
+}
+
+void Copy(std::string const& path) {
+    SqliteArchive archive(path, OneWorker());
+    archive.Backup(path + ".copy", nullptr);
+}
+
+constexpr Operation operations[] = {
+    {"Open", Open}, {"MakeNew", MakeNew}, {"Publish", Publish}, {"Collect", CollectAll}, {"Copy", Copy}};
+
+/// An archive with versions that nothing reaches any more, beside some that are.
+std::string MakeStart(std::string const& path) {
+    {
+        SqliteArchive archive(path, OneWorker());
+        SmallHost host(archive, 1);
+        for (int i = 0; i < 9; ++i)
+            host.Publish();
+        Id const head = host.Head();
+        Change change;
+        change.branches = {{u"master", head, archive.ReadAncestry({&head, 1}, Follow::Parents, 4).back().commit}};
+        archive.Apply(change);
+    }
+    return ReadFile(path);
+}
+
+/// What `Report` makes of each fault, counted.
+struct Outcomes {
+    int faults = 0;
+    int refused = 0;
+};
+
+class ArchiveFaults : public testing::TestWithParam<Operation> {
+protected:
+    /// Runs the operation with fault after fault until it meets none any more.
+    /// @param arm makes the given one fail @param disarm ends that, and says whether it has failed
+    template <class Arm, class Disarm>
+    void TryAll(const char* kind, Arm arm, Disarm disarm) {
+        std::string const path = directory_.Path("archive");
+        std::string const start = MakeStart(directory_.Path(pathOfStart));
+        int const stride = CountFromEnvironment("KIVVCS_ARCHIVE_FAULT_STRIDE", 7);
+        Outcomes outcomes;
+        bool hasFailed = true;
+        for (long fault = 1; hasFailed; fault += fault < 100 ? 1 : stride) {
+            WriteFile(path, start);
+            WriteFile(path + ".new", {});
+            std::filesystem::remove(path + ".new");
+            std::filesystem::remove(path + ".copy");
+            bool isRefused = false;
+            arm(fault);
+            try {
+                GetParam().run(path);
+            } catch (ArchiveError const&) {
+                isRefused = true;
+            } catch (std::bad_alloc const&) {
+                isRefused = true;
+            }
+            hasFailed = disarm();
+            outcomes.faults += hasFailed ? 1 : 0;
+            outcomes.refused += isRefused ? 1 : 0;
+            EXPECT_TRUE(hasFailed || !isRefused) << kind << ": refused without a fault";
+            ASSERT_NO_FATAL_FAILURE(CheckWhole(path, kind, fault));
+        }
+        std::printf("%s, %s: %d faults, %d of them reported\n", GetParam().name, kind, outcomes.faults,
+                    outcomes.refused);
+        EXPECT_GT(outcomes.refused, 0);
+    }
+
+    void CheckWhole(std::string const& path, const char* kind, long fault) {
+        for (std::string const& file : {path, path + ".new"}) {
+            SqliteArchive archive(file, OneWorker());
+            ASSERT_EQ(ProblemsOf(archive), "") << kind << ": after fault " << fault;
+            ASSERT_TRUE(SmallHost(archive, 5).Publish()) << kind << ": after fault " << fault;
+        }
+        // A copy is there whole or not at all.
+        if (std::filesystem::exists(path + ".copy")) {
+            SqliteArchive copy(path + ".copy", OneWorker());
+            ASSERT_EQ(ProblemsOf(copy), "") << kind << ": after fault " << fault;
+        }
+    }
+
+    TemporaryDirectory directory_;
+};
+
+TEST_P(ArchiveFaults, OfMemory) {
+    TryAll(
+        "memory",
+        [](long fault) {
+            allocations = {true, fault, 0};
+        },
+        [] {
+            allocations.isCounting = false;
+            return allocations.made >= allocations.failing;
+        });
+}
+
+TEST_P(ArchiveFaults, OfTheDisk) {
+    for (auto const& [kind, code, staysSo] : {std::tuple{"input and output", SQLITE_IOERR, false},
+                                              {"input and output from then on", SQLITE_IOERR, true},
+                                              {"full disk", SQLITE_FULL, true}}) {
+        bool const isOnlyWrites = code == SQLITE_FULL;
+        TryAll(
+            kind,
+            [&, code = code, staysSo = staysSo](long fault) {
+                FaultyFiles::Arm({fault, code, staysSo, isOnlyWrites});
+            },
+            [] { return FaultyFiles::Disarm(); });
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(During, ArchiveFaults, testing::ValuesIn(operations),
+                         [](auto const& operation) { return operation.param.name; });
+
+} // namespace
+} // namespace KivArchive
+
+/// Before anything else uses SQLite.
+int main(int count, char** arguments) {
+    sqlite3_config(SQLITE_CONFIG_GETMALLOC, &plainMemory);
+    sqlite3_mem_methods faulty = plainMemory;
+    faulty.xMalloc = AllocateForSqlite;
+    faulty.xRealloc = ReallocateForSqlite;
+    sqlite3_config(SQLITE_CONFIG_MALLOC, &faulty);
+    KivArchive::FaultyFiles::Install();
+    testing::InitGoogleTest(&count, arguments);
+    return RUN_ALL_TESTS();
+}
