@@ -36,7 +36,8 @@ bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& r
 } // namespace
 
 Bytes BytesOfName(KivStringT<char16_t> const& name) {
-    KivStringT<char> const text = KivVcs::DataEncoding::Utf8Encode(name);
+    // As a view, so that the zeros of a name are kept.
+    KivStringT<char> const text = KivVcs::DataEncoding::Utf8Encode(KivStringViewT<char16_t>(name));
     Bytes bytes(static_cast<std::size_t>(text.GetLength()));
     std::transform(text.GetString(), text.GetString() + text.GetLength(), bytes.begin(),
                    [](char byte) { return static_cast<std::byte>(byte); });
