@@ -93,7 +93,7 @@ def id_of(identifier):
 def known_id_of(thing):
     """The identifier that an object has computed already; None otherwise."""
     cached = thing["id_"]
-    if int(atomic_value(cached["state_"])) != ID_STATE_SET:
+    if int(atomic_value(cached["state_"])) < ID_STATE_SET:
         return None
     return array_bytes(cached["digest_"]).hex()
 

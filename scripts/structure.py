@@ -34,11 +34,11 @@ STANDS_ON = {
 HEADERS = {
     "foundation": ("Foundation",),
     "identifiers": ("SHADigest256", "Id"),
-    "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/Published"),
+    "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/KeptForm", "detail/Published"),
     "interface": ("IRepository",),
     "tree": ("Tree", "CommitTree", "Differences", "PortablePaths", "detail/EntryTable"),
     "merge": ("Merge", "Conflicts"),
-    "commit": ("Commit", "History"),
+    "commit": ("Commit", "History", "detail/DeferredLinks"),
     "storage": ("Storage", "ShortIds"),
     "repository": ("Repository", "MergeOutcome"),
     "core": ("KivVcs",),

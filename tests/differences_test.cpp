@@ -115,9 +115,6 @@ public:
     }
     Id GetId() const override { return id_; }
 
-protected:
-    Id ComputeId() const override { return id_; }
-
 private:
     Id id_;
     int* fetched_;

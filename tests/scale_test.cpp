@@ -203,5 +203,35 @@ TEST_P(OnStacksOf, ADirectoryOfHalfAMillionEntriesIsEditedMergedReadBackAndRelea
 
 INSTANTIATE_TEST_SUITE_P(Bytes, OnStacksOf, testing::Values(std::size_t{1} << 20U, std::size_t{0}));
 
+TEST(LongHistories, AreFetchedCommitByCommit) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    constexpr int length = 1'000'000;
+    // Each commit is told apart by its time, which is the number of commits below it.
+    std::vector<Id> ids;
+    const Commit::FetchCommit fetch = [&](Id const& id) {
+        Commit commit;
+        const auto position = static_cast<std::int64_t>(ids.size() - 1);
+        ids.pop_back();
+        commit.SetCommitTime(Time::FromTimeT(position, TimeZone::Utc));
+        if (!ids.empty())
+            commit.DeferParent(ids.back(), fetch);
+        EXPECT_TRUE(commit.GetId() == id);
+        return immu::make<Commit>(std::move(commit));
+    };
+    for (int position = 0; position < length; ++position) {
+        Commit commit;
+        commit.SetCommitTime(Time::FromTimeT(position, TimeZone::Utc));
+        if (!ids.empty())
+            commit.DeferParent(ids.back(), fetch);
+        ids.push_back(commit.GetId());
+    }
+    Commit newest;
+    newest.DeferParent(ids.back(), fetch);
+    Commit other;
+    other.SetDescription(u"other");
+    EXPECT_FALSE(repo.GetCommonBase(immu::make<Commit>(newest), immu::make<Commit>(other)));
+    EXPECT_TRUE(ids.empty());
+}
+
 } // namespace
 } // namespace KivVcs

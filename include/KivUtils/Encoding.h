@@ -16,6 +16,13 @@ namespace DataEncoding {
 /// three-byte form, so that no two texts share an encoding.
 /// @throws std::bad_alloc; std::length_error if the result is longer than a string can be
 [[nodiscard]] KIVVCS_EXPORT KivPlatform::KivStringT<char> Utf8Encode(KivPlatform::KivStringViewT<char16_t> text);
+/// The same for NUL-terminated text, and for a string up to its first NUL.
+[[nodiscard]] inline KivPlatform::KivStringT<char> Utf8Encode(const char16_t* text) {
+    return Utf8Encode(KivPlatform::KivStringViewT<char16_t>(text));
+}
+[[nodiscard]] inline KivPlatform::KivStringT<char> Utf8Encode(KivPlatform::KivStringT<char16_t> const& text) {
+    return Utf8Encode(text.GetString());
+}
 
 /// The number of bytes that `Utf8Encode` writes for @p text.
 [[nodiscard]] KIVVCS_EXPORT std::size_t Utf8Length(KivPlatform::KivStringViewT<char16_t> text) noexcept;

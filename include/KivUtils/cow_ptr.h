@@ -6,6 +6,7 @@
 #include "KivPlatform/Export.h"
 
 #include <atomic>
+#include <concepts>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -145,7 +146,8 @@ public:
     }
     cow_ptr(cow_ptr&& other) noexcept : counted_(std::exchange(other.counted_, nullptr)) {}
 
-    /// Shares the object as one of its base class. A write through the result copies, if it has to, as the base class.
+    /// Shares the object as one of its base class. A write through the result copies, if it has to, as the base class
+    /// does.
     /// @throws std::invalid_argument if the classes do not count themselves and the base is not at the object's
     /// beginning
     template <class Derived>
@@ -183,14 +185,15 @@ public:
     void reset() noexcept { cow_ptr().swap(*this); }
     void swap(cow_ptr& other) noexcept { std::swap(counted_, other.counted_); }
 
-    /// The object for writing: null for null; the object itself for a sole owner; otherwise a copy made with the copy
-    /// constructor of `T`, which this pointer then owns alone, the other owners keeping the unchanged object.
+    /// The object for writing: null for null; the object itself for a sole owner; otherwise a copy, which this pointer
+    /// then owns alone, the other owners keeping the unchanged object. It is made by `CopyOf(T const&)` if there is such
+    /// a function beside `T`, otherwise by the copy constructor of `T`.
     /// @throws what copying throws; the pointer is unchanged then.
     T* write_if_there() {
         if (counted_ == nullptr)
             return nullptr;
         if (counted_->reference_count() != 1)
-            cow_ptr(emplace, *object()).swap(*this);
+            copy(*object()).swap(*this);
         return object();
     }
 
@@ -223,6 +226,15 @@ private:
 
     // Not a constant: T may be incomplete where the class is named.
     [[nodiscard]] static constexpr bool is_self_counted() noexcept { return std::is_base_of_v<reference_counted, T>; }
+
+    [[nodiscard]] static cow_ptr copy(T const& object) {
+        if constexpr (requires {
+                          { CopyOf(object) } -> std::same_as<cow_ptr>;
+                      })
+            return CopyOf(object);
+        else
+            return cow_ptr(emplace, object);
+    }
 
     template <class Counted>
     void adopt(Counted* counted) noexcept {

@@ -51,12 +51,24 @@ public:
     /// @return null if the stream is not valid, cannot be read, or its header does not begin with "blob".
     static cow_ptr<Blob> Deserialize(StreamIO& stream);
 
+    [[nodiscard]] bool IsOfHostClass() const noexcept final;
+
 protected:
-    [[nodiscard]] Id ComputeId() const override;
+    /// A copy of an object of a host's class, which nobody else holds; by default a `Blob` with what `GetData` gives. The
+    /// library does not ask objects of exactly this class.
+    [[nodiscard]] virtual cow_ptr<Blob> Copy() const;
 
 private:
+    friend KIVVCS_EXPORT cow_ptr<Blob> CopyOf(Blob const& blob);
+
+    [[nodiscard]] Id ComputeId() const final;
+
     Buffer data_;
 };
+
+/// A copy that the caller owns alone: of an object of a host's class the one that its `Copy` makes, or a `Blob` if that
+/// is null or somebody else's.
+[[nodiscard]] KIVVCS_EXPORT cow_ptr<Blob> CopyOf(Blob const& blob);
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Blob> dll_wrapped_shared(std::unique_ptr<Blob> blob);
 

@@ -4,6 +4,8 @@
 /// One version of the whole file set.
 
 #include "KivVcs/CommitTree.h"
+#include "KivVcs/detail/DeferredLinks.h"
+#include "KivVcs/detail/Published.h"
 
 namespace KivVcs {
 
@@ -13,6 +15,9 @@ namespace KivVcs {
 /// and stores a copy, and from then on read through shared pointers. Every edit of the files stores the new trees at
 /// once.
 ///
+/// Parent and root may be deferred: given as an identifier and a function that fetches the object when somebody first
+/// asks for it, a walk of this library included (`DeferParent`, `DeferRoot`).
+///
 /// Exceptions: nothing throws for bad data. What allocation and the repository throw passes through; the commit then
 /// has its former content, or the complete new one.
 ///
@@ -20,14 +25,14 @@ namespace KivVcs {
 class KIVVCS_EXPORT Commit : public Object {
 public:
     /// Everything empty, null or zero; unlike after the other constructors there is no tree holder either.
-    Commit() noexcept = default;
+    Commit() noexcept;
     /// A new commit on top of @p parent, sharing its tree; or, if @p amend, one in its place: with its parent, tree,
     /// author and description. A missing tree becomes an empty holder. A null parent makes a root commit.
     Commit(cow_ptr<Commit> parent, bool amend);
     /// The same with the head of the current branch as parent; a null repository counts as no parent.
     Commit(IRepository* repository, bool amend);
-    Commit(Commit const& other) = default;
-    Commit(Commit&& other) noexcept = default;
+    Commit(Commit const& other);
+    Commit(Commit&& other) noexcept;
     Commit& operator=(Commit const& other);
     Commit& operator=(Commit&& other) noexcept;
     ~Commit() override;
@@ -45,9 +50,17 @@ public:
     [[nodiscard]] KivStringT<char16_t> const& GetDescription() const noexcept { return description_; }
     [[nodiscard]] Time GetCommitTime() const noexcept { return commitTime_; }
     [[nodiscard]] TimeDelta GetCommitTimezoneBias() const noexcept { return timezoneBias_; }
-    /// References into the commit, so that long histories are walked without touching use counts.
-    [[nodiscard]] cow_ptr<Commit> const& GetParent() const noexcept { return parent_; }
-    [[nodiscard]] cow_ptr<CommitTree> const& GetCommitTree() const noexcept { return tree_; }
+    /// The parent, and the holder of the root tree; null if there is none. What is deferred is fetched first.
+    /// @throws what fetching throws; std::runtime_error if the function that fetches gives null or another object
+    [[nodiscard]] cow_ptr<Commit> GetParent() const;
+    [[nodiscard]] cow_ptr<CommitTree> GetCommitTree() const;
+    /// The same without fetching: null also for what is deferred and has not been fetched.
+    [[nodiscard]] cow_ptr<Commit> GetHeldParent() const noexcept;
+    [[nodiscard]] cow_ptr<CommitTree> GetHeldCommitTree() const noexcept;
+    /// The identifiers that the commit's text shows, without fetching; the null identifier if there is no parent, or no
+    /// root.
+    [[nodiscard]] Id GetParentId() const;
+    [[nodiscard]] Id GetRootId() const;
     [[nodiscard]] bool IsAmend() const noexcept { return amend_; }
 
     /// Setters; each calls `ResetState`.
@@ -58,6 +71,27 @@ public:
     void SetCommitTime(Time const& time);
     void SetCommitTimezoneBias(TimeDelta const& bias);
     void SetParent(cow_ptr<Commit> parent);
+
+    /// Functions that fetch what is deferred: they are given the identifier and return the one living object that has it.
+    using FetchCommit = PortableVersion::Delegate<cow_ptr<Commit>(Id const&)>;
+    using FetchTree = PortableVersion::Delegate<cow_ptr<Tree>(Id const&)>;
+
+    /// Makes the commit of identifier @p id the parent without having it; each calls `ResetState`. The first operation
+    /// that needs the parent itself calls @p fetch, once, and the commit holds what it returns from then on. The
+    /// identifier, the text, copying, comparing, purging and destroying never fetch, and what is not fetched is not held.
+    /// The null identifier stands for no parent.
+    ///
+    /// A function that throws, returns null or an object of another identifier leaves the parent deferred, so that it is
+    /// called again; the one who asked gets an exception, never "no parent". It must not ask the same commit for what it
+    /// is to fetch. It may store what it fetches, which is up to it (nothing in this library iterates over a storage while
+    /// it is called), has to keep alive what it needs itself, and is kept by every copy of the commit.
+    ///
+    /// Cost: what walks a whole history (common bases, fast-forward, simplifying, joining, deleting) fetches all of it.
+    /// Threads: concurrent readers may ask; one of them calls @p fetch while the others wait for it.
+    void DeferParent(Id const& id, FetchCommit fetch);
+    /// The same for the root tree, which gets a holder of its own; a commit made on top of this one takes the deferral
+    /// over.
+    void DeferRoot(Id const& id, FetchTree fetch);
 
     /// Takes author and description over from @p other; time and bias stay.
     void ResetPropertiesForAmend(Commit const& other);
@@ -75,8 +109,8 @@ public:
     /// A new holder of the subtree at @p path; null if there is none.
     [[nodiscard]] cow_ptr<CommitTree> GetTree(KivStringViewT<char16_t> path) const;
 
-    /// Replaces the whole root tree, then `RebuildTree`. The cached identifier and text stay until the next
-    /// `ResetState`.
+    /// Replaces the whole root tree, then `RebuildTree`. An identifier or text that is known stays until the next
+    /// `ResetState`, of both operations.
     void ReplaceRoot(IRepository* repo, cow_ptr<Tree> root);
     /// Makes the root the storage's instance of itself, storing it if the storage has none. A null @p repo changes
     /// nothing.
@@ -110,17 +144,32 @@ public:
     static cow_ptr<Commit> Deserialize(Id const& id, Id& parentId, IRepository* repository,
                                        PortableVersion::Delegate<StreamIO(Id const&)> loader);
 
+    [[nodiscard]] bool IsOfHostClass() const noexcept final;
+
 protected:
-    [[nodiscard]] Id ComputeId() const override;
+    /// A copy of an object of a host's class, which nobody else holds; by default a `Commit` with the same fields. The
+    /// library does not ask objects of exactly this class.
+    [[nodiscard]] virtual cow_ptr<Commit> Copy() const;
 
 private:
+    friend class AncestorIterator;
+    friend KIVVCS_EXPORT cow_ptr<Commit> CopyOf(Commit const& commit);
+
+    [[nodiscard]] Id ComputeId() const final;
     template <class Add>
     auto EditTree(IRepository* repo, Add add);
+    /// The one way to the parent for walks: as `GetParent`, without a share of it, which this commit has.
+    [[nodiscard]] Commit const* Parent() const { return parent_ ? parent_.get() : DeferredParent(); }
+    [[nodiscard]] Commit const* DeferredParent() const;
+    [[nodiscard]] bool HasParent() const noexcept { return parent_ || deferred_.ParentId() != nullptr; }
+    void SetTree(cow_ptr<CommitTree> tree) noexcept;
+    void KeepText() const;
     void IdentifyAncestors() const;
     void ReleaseHistory() noexcept;
 
-    // First, beside the cached identifier: walks over the history visit nothing else.
+    // First, beside the cached identifier: walks over the history visit nothing else. Null where the link is deferred.
     cow_ptr<Commit> parent_;
+    detail::DeferredLinks deferred_;
     cow_ptr<CommitTree> tree_;
     KivStringT<char16_t> description_;
     KivStringT<char16_t> authorName_;
@@ -130,6 +179,10 @@ private:
     bool amend_ = false;
     detail::Published<Buffer> data_;
 };
+
+/// A copy that the caller owns alone: of an object of a host's class the one that its `Copy` makes, or a `Commit` if that
+/// is null or somebody else's.
+[[nodiscard]] KIVVCS_EXPORT cow_ptr<Commit> CopyOf(Commit const& commit);
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Commit> dll_wrapped_shared(std::unique_ptr<Commit> commit);
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<std::vector<cow_ptr<Commit>>>

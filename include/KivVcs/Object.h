@@ -5,11 +5,12 @@
 
 #include "KivVcs/Id.h"
 #include "KivVcs/detail/CachedId.h"
-#include "KivVcs/detail/Published.h"
+#include "KivVcs/detail/KeptForm.h"
 
 #include <cstdint>
 #include <cstring>
 #include <memory>
+#include <utility>
 
 namespace KivVcs {
 
@@ -19,7 +20,7 @@ public:
     /// Whether both objects have the same identifier, and so the same content.
     virtual bool operator==(IObject const& other) const = 0;
     virtual bool operator!=(IObject const& other) const = 0;
-    /// The identifier of the packed form.
+    /// The identifier of the packed form. A commit asks its parent's: hosts identify long chains as they build them.
     virtual Id GetId() const = 0;
     /// The type word: "blob", "tree" or "commit".
     [[nodiscard]] virtual KivStringT<char> GetHeader() const = 0;
@@ -44,10 +45,18 @@ protected:
 /// The base of blobs, trees and commits: caches the identifier and the packed form of the content.
 ///
 /// What is asked for is computed on first use and kept until `ResetState`; references to packed forms and data are
-/// valid until then, or until the object dies. A copy carries the caches.
+/// valid until then, or until the object dies. A copy carries what is kept. What is kept is of one state: a packed form that is asked for after the
+/// identifier is the one that the identifier is computed from, even if the content has changed without `ResetState`.
+///
+/// Hosts may derive from the library's classes and override what they like: of such an object everything is asked of
+/// its virtual operations. Objects of exactly `Blob`, `Tree` or `Commit` are known to do as those classes do.
+///
+/// An object that has to be changed or stored apart from a shared one is copied by `CopyOf`, which `cow_ptr::write` uses,
+/// too. A host's class that holds more than its base overrides `Copy`, as `return immu::make<HostBlob>(*this);`.
 ///
 /// Threads: all `const` operations may run concurrently on one object. A change needs exclusive use of the object.
-/// @throws std::bad_alloc from everything that computes; the object is as before then.
+/// @throws std::bad_alloc from everything that computes; the object is as before then. What a host's operations throw
+/// passes through likewise.
 class KIVVCS_EXPORT Object : public IObject {
 public:
     bool operator==(IObject const& other) const override;
@@ -59,46 +68,89 @@ public:
     [[nodiscard]] KivStringT<char16_t> ToString() const override;
     void ResetState() override;
 
-    /// Whether both objects have the same identifier; without touching it when they are one object.
-    [[nodiscard]] bool HasSameId(Object const& other) const;
+    /// Whether a host derived the class of this object. False for objects of exactly `Blob`, `Tree` and `Commit`.
+    [[nodiscard]] virtual bool IsOfHostClass() const noexcept { return true; }
 
-    /// A part of the identifier that tells nearly all objects apart.
-    [[nodiscard]] std::uint64_t GetIdPrefix() const {
-        Id::Digest const* const known = GetKnownDigest();
-        return known == nullptr ? PrefixOf(*Object::GetId().GetDigest()) : PrefixOf(*known);
+    /// The digest that the identifier tells, valid until `ResetState`; null if that would have to be asked for: of an
+    /// object of a host's class, and of one whose identifier has not been computed yet.
+    [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept {
+        if (id_.IsOwn())
+            return &id_.Digest();
+        return id_.IsCopied() ? ConfirmCopiedDigest() : nullptr;
     }
 
-    /// The digest that the identifier tells, valid until `ResetState`; null if the identifier has not been computed.
-    [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept { return id_.IsSet() ? &id_.Digest() : nullptr; }
+    /// Whether both objects have the same identifier: by the known digests, otherwise by `GetId` of both. An object has
+    /// its own identifier, which is not asked for.
+    [[nodiscard]] bool HasSameId(Object const& other) const {
+        Id::Digest const* const mine = GetKnownDigest();
+        Id::Digest const* const theirs = other.GetKnownDigest();
+        return mine != nullptr && theirs != nullptr ? *mine == *theirs : this == &other || GetId() == other.GetId();
+    }
+
+    /// A number that is the same for equal identifiers and tells nearly all others apart; by the known digest, otherwise
+    /// by `GetId`.
+    [[nodiscard]] std::uint64_t GetIdPrefix() const {
+        Id::Digest const* const known = GetKnownDigest();
+        return known == nullptr ? PrefixOf(GetId()) : PrefixOf(*known);
+    }
 
 protected:
     Object() noexcept = default;
-    Object(Object const&) = default;
-    Object(Object&&) noexcept = default;
+    Object(Object const& other) : IObject(other) { TakeKept(other); }
+    Object(Object&& other) noexcept : IObject(other) { TakeKept(std::move(other)); }
     Object& operator=(Object const& other) {
-        // First what may fail, so that the identifier stays that of the content.
-        packedData_ = other.packedData_;
-        id_ = other.id_;
+        if (this != &other) {
+            detail::KeptForm form;
+            form.Copy(other.packedData_, other.IsOfHostClass());
+            Object::ResetState();
+            id_.Copy(other.id_, other.IsOfHostClass());
+            packedData_.Swap(form);
+        }
         return *this;
     }
-    Object& operator=(Object&&) noexcept = default;
-
-    /// The identifier of what `GetPackedData` gives. Overridden where it can be had without putting the packed form
-    /// together.
-    [[nodiscard]] virtual Id ComputeId() const;
+    Object& operator=(Object&& other) noexcept {
+        if (this != &other) {
+            Object::ResetState();
+            TakeKept(std::move(other));
+        }
+        return *this;
+    }
 
     /// Whether the identifier has been computed since the last change.
-    [[nodiscard]] bool IsIdentified() const noexcept { return id_.IsSet(); }
+    [[nodiscard]] bool IsIdentified() const noexcept {
+        return GetKnownDigest() != nullptr || (id_.IsHosts() && IsOfHostClass());
+    }
+
+    /// The identifier of an object of one of the library's classes, without its packed form being put together.
+    [[nodiscard]] Id ComputePackedId() const;
 
 private:
+    /// What the identifier of an object of one of the library's classes is computed by. Never asked of others.
+    [[nodiscard]] virtual Id ComputeId() const;
+
+    [[nodiscard]] Id::Digest const* ConfirmCopiedDigest() const noexcept;
+    void TakeKept(Object const& other) {
+        const bool isHosts = other.IsOfHostClass();
+        packedData_.Copy(other.packedData_, isHosts);
+        id_.Copy(other.id_, isHosts);
+    }
+    void TakeKept(Object&& other) noexcept {
+        packedData_.Swap(other.packedData_);
+        id_.Copy(other.id_, other.IsOfHostClass());
+        other.id_.Reset();
+    }
     static std::uint64_t PrefixOf(Id::Digest const& digest) noexcept {
         std::uint64_t prefix = 0;
         std::memcpy(&prefix, digest.data(), sizeof prefix);
         return prefix;
     }
+    static std::uint64_t PrefixOf(Id const& id) noexcept {
+        Id::Digest const* const digest = id.GetDigest();
+        return digest == nullptr ? id.Hash() : PrefixOf(*digest);
+    }
 
     detail::CachedId id_;
-    detail::Published<Buffer> packedData_;
+    detail::KeptForm packedData_;
 };
 
 /// Takes over an object made by `new` on either side of the library's boundary; null gives null.

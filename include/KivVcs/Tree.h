@@ -5,6 +5,7 @@
 
 #include "KivVcs/Blob.h"
 #include "KivVcs/detail/EntryTable.h"
+#include "KivVcs/detail/Published.h"
 
 #include <vector>
 
@@ -137,10 +138,15 @@ public:
     static cow_ptr<Tree> Deserialize(Id const& id, IRepository* repo,
                                      PortableVersion::Delegate<StreamIO(Id const&)> loader);
 
+    [[nodiscard]] bool IsOfHostClass() const noexcept final;
+
 protected:
-    [[nodiscard]] Id ComputeId() const override;
+    /// A copy of an object of a host's class, which nobody else holds; by default a `Tree` with the same entries. The
+    /// library does not ask objects of exactly this class.
+    [[nodiscard]] virtual cow_ptr<Tree> Copy() const;
 
 private:
+    friend KIVVCS_EXPORT cow_ptr<Tree> CopyOf(Tree const& tree);
     friend struct detail::TreeAccess;
 
     using PathComponentsView = array_view<KivStringViewT<char16_t> const>;
@@ -155,6 +161,7 @@ private:
     [[nodiscard]] std::vector<cow_ptr<Tree>> CopyWay(PathComponentsView names) const;
     /// Stores the copies and enters them, from the bottom up; removes them instead where they are empty, if @p prunes.
     void PutWayBack(IRepository* repo, PathComponentsView names, std::vector<cow_ptr<Tree>> way, bool prunes);
+    [[nodiscard]] Id ComputeId() const final;
 
     detail::EntryTable entries_;
     detail::Published<Buffer> data_;
@@ -164,6 +171,10 @@ extern template KIVVCS_EXPORT cow_ptr<Blob>
 Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>, Blob const&);
 extern template KIVVCS_EXPORT cow_ptr<Tree>
 Tree::AddObjectToTree(IRepository*, array_view<KivStringViewT<char16_t> const>, Tree const&);
+
+/// A copy that the caller owns alone: of an object of a host's class the one that its `Copy` makes, or a `Tree` if that
+/// is null or somebody else's.
+[[nodiscard]] KIVVCS_EXPORT cow_ptr<Tree> CopyOf(Tree const& tree);
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Tree> dll_wrapped_shared(std::unique_ptr<Tree> tree);
 

@@ -2,13 +2,19 @@
 
 #include "KivVcs/IRepository.h"
 
+#include <typeinfo>
+
 namespace KivVcs {
+
+Commit::Commit() noexcept = default;
 
 Commit::Commit(cow_ptr<Commit> parent, bool amend) : amend_(amend) {
     if (parent) {
         tree_ = parent->tree_;
+        deferred_.CopyRoot(parent->deferred_);
         if (amend) {
             parent_ = parent->parent_;
+            deferred_.CopyParent(parent->deferred_);
             description_ = parent->description_;
             authorName_ = parent->authorName_;
             authorEmail_ = parent->authorEmail_;
@@ -16,13 +22,15 @@ Commit::Commit(cow_ptr<Commit> parent, bool amend) : amend_(amend) {
             parent_ = std::move(parent);
         }
     }
-    if (!tree_)
+    if (!tree_ && deferred_.RootId() == nullptr)
         tree_.write();
 }
 
 Commit::Commit(IRepository* repository, bool amend)
     : Commit(repository == nullptr ? nullptr : repository->GetHead(), amend) {}
 
+Commit::Commit(Commit const& other) = default;
+Commit::Commit(Commit&& other) noexcept = default;
 Commit& Commit::operator=(Commit const& other) {
     return *this = Commit(other);
 }
@@ -34,9 +42,31 @@ Commit::~Commit() {
 
 void Commit::ReleaseHistory() noexcept {
     // Ancestors that nobody else holds die here one after the other: left to their own destructors, they would take stack
-    // for every commit of the history.
-    while (const std::unique_ptr<Commit> last = parent_.release_if_last())
-        parent_ = std::move(last->parent_);
+    // for every commit of the history. Each is whole until its destructor has run, which finds its parent held by this
+    // loop, too, and leaves it alone.
+    cow_ptr<Commit> oldest = std::move(parent_);
+    if (!oldest) {
+        oldest = GetHeldParent();
+        deferred_ = {};
+    }
+    while (std::unique_ptr<Commit> last = oldest.release_if_last()) {
+        cow_ptr<Commit> parent = last->GetHeldParent();
+        last.reset();
+        oldest = std::move(parent);
+    }
+}
+
+bool Commit::IsOfHostClass() const noexcept {
+    return &typeid(*this) != &typeid(Commit);
+}
+
+cow_ptr<Commit> Commit::Copy() const {
+    return immu::make<Commit>(*this);
+}
+
+cow_ptr<Commit> CopyOf(Commit const& commit) {
+    cow_ptr<Commit> copy = commit.IsOfHostClass() ? commit.Copy() : nullptr;
+    return copy.use_count() == 1 ? copy : immu::make<Commit>(commit);
 }
 
 void Commit::ResetState() {
@@ -71,7 +101,69 @@ void Commit::SetCommitTimezoneBias(TimeDelta const& bias) {
 
 void Commit::SetParent(cow_ptr<Commit> parent) {
     parent_ = std::move(parent);
+    deferred_.ClearParent();
     ResetState();
+}
+
+void Commit::DeferParent(Id const& id, FetchCommit fetch) {
+    if (id.IsEmpty())
+        deferred_.ClearParent();
+    else
+        deferred_.SetParent(id, std::move(fetch));
+    parent_.reset();
+    ResetState();
+}
+
+void Commit::DeferRoot(Id const& id, FetchTree fetch) {
+    if (id.IsEmpty())
+        deferred_.ClearRoot();
+    else
+        deferred_.SetRoot(id, std::move(fetch));
+    tree_.reset();
+    ResetState();
+}
+
+cow_ptr<Commit> Commit::GetParent() const {
+    return cow_ptr<Commit>::share(Parent());
+}
+
+Commit const* Commit::DeferredParent() const {
+    cow_ptr<Commit> const* const parent = deferred_.Parent();
+    return parent == nullptr ? nullptr : parent->get();
+}
+
+cow_ptr<CommitTree> Commit::GetCommitTree() const {
+    cow_ptr<CommitTree> const* const deferred = tree_ ? nullptr : deferred_.Root();
+    return deferred == nullptr ? tree_ : *deferred;
+}
+
+cow_ptr<Commit> Commit::GetHeldParent() const noexcept {
+    cow_ptr<Commit> const* const fetched = parent_ ? nullptr : deferred_.HeldParent();
+    return fetched == nullptr ? parent_ : *fetched;
+}
+
+cow_ptr<CommitTree> Commit::GetHeldCommitTree() const noexcept {
+    cow_ptr<CommitTree> const* const fetched = tree_ ? nullptr : deferred_.HeldRoot();
+    return fetched == nullptr ? tree_ : *fetched;
+}
+
+Id Commit::GetParentId() const {
+    if (parent_)
+        return parent_->GetId();
+    Id const* const deferred = deferred_.ParentId();
+    return deferred == nullptr ? Id() : *deferred;
+}
+
+Id Commit::GetRootId() const {
+    if (tree_)
+        return tree_->GetRootId();
+    Id const* const deferred = deferred_.RootId();
+    return deferred == nullptr ? Id() : *deferred;
+}
+
+void Commit::SetTree(cow_ptr<CommitTree> tree) noexcept {
+    tree_ = std::move(tree);
+    deferred_.ClearRoot();
 }
 
 void Commit::ResetPropertiesForAmend(Commit const& other) {
@@ -99,12 +191,12 @@ void AnchorRoot(cow_ptr<CommitTree>& tree, IRepository& repo) {
 template <class Edit>
 auto Commit::EditTree(IRepository* repo, Edit edit) {
     // Edited aside and taken over when everything is done, so that an exception half-way leaves the commit as it was.
-    cow_ptr<CommitTree> edited = tree_;
+    cow_ptr<CommitTree> edited = GetCommitTree();
     auto result = edit(*edited.write());
     if (result) {
         if (repo != nullptr)
             AnchorRoot(edited, *repo);
-        tree_ = std::move(edited);
+        SetTree(std::move(edited));
         ResetState();
     }
     return result;
@@ -123,32 +215,42 @@ cow_ptr<Object> Commit::AddObject(IRepository* repo, KivStringViewT<char16_t> pa
 }
 
 bool Commit::RemoveObject(IRepository* repo, KivStringViewT<char16_t> path) {
-    return tree_ && EditTree(repo, [&](CommitTree& tree) { return tree.RemoveObject(repo, path); });
+    return GetCommitTree() && EditTree(repo, [&](CommitTree& tree) { return tree.RemoveObject(repo, path); });
 }
 
 cow_ptr<Blob> Commit::GetBlob(KivStringViewT<char16_t> path) const {
-    return tree_ ? tree_->GetBlob(path) : nullptr;
+    const cow_ptr<CommitTree> files = GetCommitTree();
+    return files ? files->GetBlob(path) : nullptr;
 }
 
 cow_ptr<CommitTree> Commit::GetTree(KivStringViewT<char16_t> path) const {
-    cow_ptr<Tree> tree = tree_ ? tree_->GetTree(path) : nullptr;
+    const cow_ptr<CommitTree> files = GetCommitTree();
+    cow_ptr<Tree> tree = files ? files->GetTree(path) : nullptr;
     return tree ? immu::make<CommitTree>(std::move(tree)) : nullptr;
 }
 
-void Commit::ReplaceRoot(IRepository* repo, cow_ptr<Tree> root) {
-    // The identifier stays until the state is reset, and so does the text that it tells.
+void Commit::KeepText() const {
+    // Of what is known of a state, the rest is made while it still can be.
     if (IsIdentified())
         static_cast<void>(GetPackedData());
-    cow_ptr<CommitTree> edited = tree_;
+}
+
+void Commit::ReplaceRoot(IRepository* repo, cow_ptr<Tree> root) {
+    KeepText();
+    cow_ptr<CommitTree> edited = GetHeldCommitTree();
     edited.write()->ReplaceRoot(repo, std::move(root));
     if (repo != nullptr)
         AnchorRoot(edited, *repo);
-    tree_ = std::move(edited);
+    SetTree(std::move(edited));
 }
 
 void Commit::RebuildTree(IRepository* repo) {
-    if (repo != nullptr)
-        AnchorRoot(tree_, *repo);
+    if (repo == nullptr)
+        return;
+    KeepText();
+    if (!tree_)
+        SetTree(GetCommitTree());
+    AnchorRoot(tree_, *repo);
 }
 
 bool Commit::MakeCommitLinksInOrder(std::vector<cow_ptr<Commit>>& commits, IRepository* repo) {

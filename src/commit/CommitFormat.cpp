@@ -39,35 +39,40 @@ struct Signature {
     TimeDelta bias;
 };
 
+/// The text up to its first U+0000, beyond which a packed form shows nothing.
+KivStringViewT<char16_t> UntilZero(KivStringViewT<char16_t> text) {
+    const int end = text.Find(KivStringViewT<char16_t>(u"", 1));
+    return end < 0 ? text : text.Left(end);
+}
+
 /// An identifier as the lines of a commit show it.
 KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
     KivStringT<char> line = key.ToString();
     if (Id::Digest const* const digest = id.GetDigest())
         line += KivStringT<char>::Build(64, [digest](char* digits) { WriteDigits(*digest, digits); });
+    else
+        line += DataEncoding::Utf8Encode(UntilZero(id.GetText()));
     return line += "\n";
 }
 
-/// The text of @p commit.
-KivStringT<char> TextOf(Commit const& commit) {
+/// The text of @p commit. A parent is shown also if its identifier is the null one.
+KivStringT<char> TextOf(Commit const& commit, bool hasParent) {
     const KivStringT<char16_t> author =
         Commit::GetAuthorInfo(u"author", commit.GetAuthorName(), commit.GetAuthorEmail(), commit.GetCommitTime(),
                               commit.GetCommitTimezoneBias());
     // The committer is always the author, at the same time.
     const KivStringT<char> signature = DataEncoding::Utf8Encode(author.Mid(6));
-    KivStringViewT<char16_t> description = commit.GetDescription();
-    if (const int end = description.Find(KivStringViewT<char16_t>(u"", 1)); end >= 0)
-        description = description.Left(end);
 
-    KivStringT<char> text = LineOfId("tree ", commit.GetCommitTree() ? commit.GetCommitTree()->GetRootId() : Id());
-    if (commit.GetParent())
-        text += LineOfId("parent ", commit.GetParent()->GetId());
+    KivStringT<char> text = LineOfId("tree ", commit.GetRootId());
+    if (hasParent)
+        text += LineOfId("parent ", commit.GetParentId());
     for (KivStringViewT<char> role : {"author", "committer"}) {
         text += role;
         text += signature;
         text += "\n";
     }
     text += "\n";
-    text += DataEncoding::Utf8Encode(description);
+    text += DataEncoding::Utf8Encode(UntilZero(commit.GetDescription()));
     return text += "\n";
 }
 
@@ -83,8 +88,10 @@ KivStringT<char> Commit::GetStoragePrefix() const {
 
 void Commit::IdentifyAncestors() const {
     // Oldest first: asked from the newest on, each commit would ask its parent in turn, one call deeper for every commit.
+    // Only the library's own commits do that; the identifier of a deferred parent is known.
     std::vector<Commit const*> unidentified;
-    for (Commit const* ancestor = parent_.get(); ancestor != nullptr && !ancestor->IsIdentified();
+    for (Commit const* ancestor = parent_.get();
+         ancestor != nullptr && ancestor->GetKnownDigest() == nullptr && !ancestor->IsOfHostClass();
          ancestor = ancestor->parent_.get())
         unidentified.push_back(ancestor);
     for (; !unidentified.empty(); unidentified.pop_back())
@@ -94,7 +101,7 @@ void Commit::IdentifyAncestors() const {
 Buffer const& Commit::GetData() const {
     return data_.GetOrMake([this] {
         Buffer data;
-        Helpers::AppendToBuffer(data, TextOf(*this));
+        Helpers::AppendToBuffer(data, TextOf(*this, HasParent()));
         return data;
     });
 }
@@ -102,9 +109,9 @@ Buffer const& Commit::GetData() const {
 Id Commit::ComputeId() const {
     IdentifyAncestors();
     if (data_.Get() != nullptr)
-        return Object::ComputeId();
+        return ComputePackedId();
     // The text is not kept: it is asked for far less often than the identifier, and every commit of a history has one.
-    const KivStringT<char> text = TextOf(*this);
+    const KivStringT<char> text = TextOf(*this, HasParent());
     const auto size = static_cast<std::size_t>(text.GetLength());
     IdDigest digest("commit", size);
     digest.Feed(text.GetString(), size);
@@ -164,7 +171,7 @@ cow_ptr<Commit> Commit::Deserialize(Id const& id, Id& parentId, IRepository* rep
     commit.SetCommitTime(author.time);
     commit.SetCommitTimezoneBias(author.bias);
     if (!treeId.IsEmpty())
-        commit.tree_ = CommitTree::Deserialize(treeId, repository, std::move(loader));
+        commit.SetTree(CommitTree::Deserialize(treeId, repository, std::move(loader)));
     commit.RebuildTree(repository);
     commit.ResetState();
     return immu::make<Commit>(std::move(commit));

@@ -1,5 +1,7 @@
 #include "KivUtils/Encoding.h"
 
+#include "foundation/HexDigits.h"
+
 #include <algorithm>
 #include <limits>
 #include <stdexcept>
@@ -168,8 +170,8 @@ KivStringT<char16_t> DataEncoding::HexEncode(const void* data, std::size_t size)
         CheckedLength(size > std::numeric_limits<std::size_t>::max() / 2 ? size : size * 2),
         [bytes, size](char16_t* digits) {
             for (std::size_t index = 0; index < size; ++index) {
-                *digits++ = u"0123456789abcdef"[bytes[index] >> 4];
-                *digits++ = u"0123456789abcdef"[bytes[index] & 15];
+                *digits++ = HexDigit<char16_t>(bytes[index] >> 4U);
+                *digits++ = HexDigit<char16_t>(bytes[index] & 15U);
             }
         });
 }

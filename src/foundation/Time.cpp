@@ -1,6 +1,7 @@
 #include "KivUtils/Time.h"
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstdlib>
 #include <ctime>
@@ -20,11 +21,15 @@ bool LocalCalendarTime(std::int64_t seconds, std::tm& calendar) noexcept {
     return localtime_s(&calendar, &time) == 0;
 #else
     // Unlike localtime, localtime_r need not notice that the process has changed its time zone. Where it has none of its
-    // own, looking for a change of the system's would ask the file system for every commit, so a zone that was taken away
-    // again is noticed only when somebody calls tzset.
+    // own, looking for a change of the system's would ask the file system for every commit; that is done once after the
+    // process has given up its own, of which the C library keeps no memory that could be asked.
+    static constinit std::atomic<bool> hadZone{true};
     // NOLINTNEXTLINE(concurrency-mt-unsafe): reads the environment as the functions of the C library below do
-    if (std::getenv("TZ") != nullptr)
+    const bool hasZone = std::getenv("TZ") != nullptr;
+    if (hasZone || hadZone.load(std::memory_order_acquire)) {
         tzset();
+        hadZone.store(hasZone, std::memory_order_release);
+    }
     return localtime_r(&time, &calendar) != nullptr;
 #endif
 }

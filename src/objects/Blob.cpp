@@ -5,6 +5,7 @@
 
 #include <array>
 #include <istream>
+#include <typeinfo>
 
 namespace KivVcs {
 
@@ -14,6 +15,14 @@ KivStringT<char> Blob::GetHeader() const {
 
 KivStringT<char> Blob::GetStoragePrefix() const {
     return "100644";
+}
+
+bool Blob::IsOfHostClass() const noexcept {
+    return &typeid(*this) != &typeid(Blob);
+}
+
+cow_ptr<Blob> Blob::Copy() const {
+    return immu::make<Blob>(GetData());
 }
 
 Id Blob::ComputeId() const {
@@ -71,6 +80,11 @@ cow_ptr<Blob> Blob::Deserialize(StreamIO& stream) {
     if (!stream.ReadRest(data))
         return nullptr;
     return immu::make<Blob>(std::move(data));
+}
+
+cow_ptr<Blob> CopyOf(Blob const& blob) {
+    cow_ptr<Blob> copy = blob.IsOfHostClass() ? blob.Copy() : nullptr;
+    return copy.use_count() == 1 ? copy : immu::make<Blob>(blob);
 }
 
 cow_ptr<Blob> dll_wrapped_shared(std::unique_ptr<Blob> blob) {

@@ -1,6 +1,7 @@
 #include "KivVcs/Id.h"
 
 #include "KivVcs/SHADigest256.h"
+#include "foundation/HexDigits.h"
 
 #include <algorithm>
 #include <cstring>
@@ -18,7 +19,7 @@ struct DigestDigits {
     [[nodiscard]] int GetLength() const noexcept { return digitCount; }
     char16_t operator[](int position) const noexcept {
         const std::uint8_t byte = digest[static_cast<std::size_t>(position / 2)];
-        return u"0123456789abcdef"[position % 2 == 0 ? byte >> 4 : byte & 15];
+        return KivUtils::HexDigit<char16_t>(position % 2 == 0 ? byte >> 4U : byte & 15U);
     }
 };
 
@@ -34,24 +35,8 @@ std::size_t SampledHash(Text const& text) noexcept {
     return static_cast<std::size_t>(hash);
 }
 
-/// The value of a lowercase hexadecimal digit, or -1.
-constexpr int DigitValue(char16_t unit) noexcept {
-    if (unit >= u'0' && unit <= u'9')
-        return unit - u'0';
-    return unit >= u'a' && unit <= u'f' ? unit - u'a' + 10 : -1;
-}
-
 bool ParseDigest(KivStringViewT<char16_t> text, Id::Digest& digest) noexcept {
-    if (text.GetLength() != digitCount)
-        return false;
-    for (int index = 0; index < digitCount; index += 2) {
-        const int high = DigitValue(text[index]);
-        const int low = DigitValue(text[index + 1]);
-        if (high < 0 || low < 0)
-            return false;
-        digest[static_cast<std::size_t>(index / 2)] = static_cast<std::uint8_t>(high * 16 + low);
-    }
-    return true;
+    return text.GetLength() == digitCount && KivUtils::ReadHexDigits(text.GetString(), digest);
 }
 
 template <class Left, class Right>

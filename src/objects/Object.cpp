@@ -15,28 +15,44 @@ bool Object::operator!=(IObject const& other) const {
 }
 
 Id Object::GetId() const {
-    if (id_.IsSet())
+    if (GetKnownDigest() != nullptr)
         return id_.Get();
-    Id id = ComputeId();
-    id_.Keep(id);
+    const bool isHosts = IsOfHostClass();
+    if (id_.IsHosts() && isHosts)
+        return id_.Get();
+    Id id = isHosts ? Id(GetPackedData()) : ComputeId();
+    id_.Keep(id, isHosts);
     return id;
 }
 
 Buffer const& Object::GetPackedData() const {
-    return packedData_.GetOrMake([this] {
+    return packedData_.GetOrMake(IsOfHostClass(), [this] {
+        const KivStringT<char> header = GetHeader();
         Buffer const& data = GetData();
         Buffer packed;
-        AppendPackedHeader(packed, GetHeader(), data.GetSize());
+        AppendPackedHeader(packed, header, data.GetSize());
         packed.Append(data);
         return packed;
     });
 }
 
 Id Object::ComputeId() const {
+    return ComputePackedId();
+}
+
+Id Object::ComputePackedId() const {
+    const KivStringT<char> header = GetHeader();
     Buffer const& data = GetData();
-    IdDigest digest(GetHeader(), data.GetSize());
+    IdDigest digest(header, data.GetSize());
     digest.Feed(data);
     return digest.Finish();
+}
+
+Id::Digest const* Object::ConfirmCopiedDigest() const noexcept {
+    if (IsOfHostClass())
+        return nullptr;
+    id_.Confirm();
+    return &id_.Digest();
 }
 
 KivStringT<char16_t> Object::ToString() const {
@@ -56,12 +72,6 @@ KivStringT<char16_t> Object::ToString() const {
 void Object::ResetState() {
     id_.Reset();
     packedData_.Reset();
-}
-
-bool Object::HasSameId(Object const& other) const {
-    if (this == &other || id_.Equals(other.id_))
-        return true;
-    return !(id_.IsSet() && other.id_.IsSet()) && GetId() == other.GetId();
 }
 
 cow_ptr<Object> dll_wrapped_shared(std::unique_ptr<Object> object) {

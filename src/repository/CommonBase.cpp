@@ -1,5 +1,6 @@
 #include "KivVcs/Repository.h"
 
+#include "commit/Ancestors.h"
 #include "repository/CommitSet.h"
 #include "repository/CommonBaseIndex.h"
 
@@ -13,15 +14,17 @@ cow_ptr<Commit> Repository::GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit>
             return cow_ptr<Commit>::share(*base);
     }
     CommitSet visited;
-    Commit const* left = first.get();
-    Commit const* right = second.get();
-    while (left != nullptr || right != nullptr) {
-        if (left != nullptr && visited.Insert(*left) != nullptr)
-            return cow_ptr<Commit>::share(left);
-        if (right != nullptr && visited.Insert(*right) != nullptr)
-            return cow_ptr<Commit>::share(right);
-        left = left == nullptr ? nullptr : left->GetParent().get();
-        right = right == nullptr ? nullptr : right->GetParent().get();
+    AncestorIterator left(first.get());
+    AncestorIterator right(second.get());
+    while (left || right) {
+        if (left && visited.Insert(*left) != nullptr)
+            return cow_ptr<Commit>::share(left.Get());
+        if (right && visited.Insert(*right) != nullptr)
+            return cow_ptr<Commit>::share(right.Get());
+        if (left)
+            ++left;
+        if (right)
+            ++right;
     }
     return nullptr;
 }

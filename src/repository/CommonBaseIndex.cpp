@@ -1,5 +1,6 @@
 #include "repository/CommonBaseIndex.h"
 
+#include "commit/Ancestors.h"
 #include "repository/CommitSet.h"
 
 #include <algorithm>
@@ -27,22 +28,23 @@ bool CommonBaseIndex::AddNodes(std::vector<cow_ptr<Commit>> const& heads) {
         if (!head)
             continue;
         nodes_.try_emplace(head.get());
-        Commit const* commit = head.get();
-        Commit const* met = nullptr;
-        while (commit != nullptr && (met = visited.Insert(*commit)) == nullptr)
-            commit = commit->GetParent().get();
-        if (met != commit)
-            return false;
-        if (met != nullptr)
+        for (Commit const& commit : Ancestors(head.get())) {
+            Commit const* const met = visited.Insert(commit);
+            if (met == nullptr)
+                continue;
+            if (met != &commit)
+                return false;
             nodes_.try_emplace(met);
+            break;
+        }
     }
     return true;
 }
 
 void CommonBaseIndex::LinkPath(Commit const& head) {
     std::vector<Node*> path;
-    for (Commit const* commit = &head; commit != nullptr; commit = commit->GetParent().get()) {
-        const auto found = nodes_.find(commit);
+    for (Commit const& commit : Ancestors(&head)) {
+        const auto found = nodes_.find(&commit);
         if (found == nodes_.end())
             continue;
         Node& node = found->second;
@@ -50,7 +52,7 @@ void CommonBaseIndex::LinkPath(Commit const& head) {
             path.back()->below = &node;
         if (node.depth > 0)
             break;
-        node.commit = commit;
+        node.commit = &commit;
         path.push_back(&node);
     }
     std::reverse(path.begin(), path.end());

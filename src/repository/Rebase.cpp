@@ -1,5 +1,7 @@
 #include "KivVcs/Repository.h"
 
+#include "commit/Ancestors.h"
+
 #include <algorithm>
 
 namespace KivVcs {
@@ -8,11 +10,11 @@ namespace {
 
 /// The commits above @p base up to @p commit, oldest first; @p commit itself in any case.
 std::vector<cow_ptr<Commit>> LineAbove(cow_ptr<Commit> const& base, cow_ptr<Commit> const& commit) {
-    std::vector<cow_ptr<Commit>> line{commit};
     if (commit == base)
-        return line;
-    while (line.back()->GetParent() && !(line.back()->GetParent() == base))
-        line.push_back(line.back()->GetParent());
+        return {commit};
+    std::vector<cow_ptr<Commit>> line;
+    for (Commit const& moved : Ancestors(commit.get(), base.get()))
+        line.push_back(cow_ptr<Commit>::share(&moved));
     std::reverse(line.begin(), line.end());
     return line;
 }

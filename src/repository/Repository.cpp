@@ -17,7 +17,7 @@ cow_ptr<Commit> Repository::DoCommit(Commit& commit) {
 
     cow_ptr<Commit> stored = GetCommitFromStorage(commit.GetId());
     if (!stored)
-        stored = SyncWithStorage(immu::make<Commit>(commit));
+        stored = SyncWithStorage(CopyOf(commit));
     // A current branch that has been removed is not moved; the commit is stored all the same.
     storage_->UpdateBranch(Repository::GetCurentBranch(), stored);
     return stored;

@@ -1,5 +1,6 @@
 #include "KivVcs/Repository.h"
 
+#include "commit/Ancestors.h"
 #include "repository/CommitSet.h"
 #include "repository/CommonBaseIndex.h"
 
@@ -58,15 +59,15 @@ public:
         std::unordered_set<Commit const*> compared;
         std::vector<Id> meetings;
         for (auto const& branch : branches_) {
-            Commit const* met = nullptr;
-            Commit const* commit = branch.head.get();
-            while (commit != nullptr && (met = visited.Insert(*commit)) == nullptr)
-                commit = commit->GetParent().get();
-            if (commit == nullptr)
-                continue;
-            if (!HaveEqualAncestors(*met, *commit, compared))
-                return false;
-            meetings.push_back(commit->GetId());
+            for (Commit const& commit : Ancestors(branch.head.get())) {
+                Commit const* const met = visited.Insert(commit);
+                if (met == nullptr)
+                    continue;
+                if (!HaveEqualAncestors(*met, commit, compared))
+                    return false;
+                meetings.push_back(commit.GetId());
+                break;
+            }
         }
         for (auto& id : meetings)
             kept_.try_emplace(std::move(id));
@@ -105,22 +106,21 @@ private:
     /// @param compared the other objects of visited commits that have been found to have equal ancestors
     static bool HaveEqualAncestors(Commit const& visited, Commit const& other,
                                    std::unordered_set<Commit const*>& compared) {
-        Commit const* left = &visited;
-        Commit const* right = &other;
-        while (left != right && compared.insert(right).second) {
-            left = left->GetParent().get();
-            right = right->GetParent().get();
+        AncestorIterator left(&visited);
+        AncestorIterator right(&other);
+        while (left != right && compared.insert(right.Get()).second) {
+            ++left;
+            ++right;
             if (left == right)
                 return true;
-            if (left == nullptr || right == nullptr || !left->HasSameId(*right))
+            if (!left || !right || !left->HasSameId(*right))
                 return false;
         }
         return true;
     }
 
     void LinkChain(KeptCommits::iterator child, Commit const& head) {
-        for (Commit const* commit = head.GetParent().get(); commit != nullptr && !child->second.isLinked;
-             commit = commit->GetParent().get()) {
+        for (AncestorIterator commit(&head); ++commit && !child->second.isLinked;) {
             const auto kept = kept_.find(commit->GetId());
             if (kept == kept_.end())
                 continue;

@@ -8,8 +8,8 @@ namespace {
 
 /// Appends the objects of its own kind that an object holds.
 void AddHeld(Commit const& commit, std::vector<cow_ptr<Commit>>& held) {
-    if (commit.GetParent())
-        held.push_back(commit.GetParent());
+    if (auto parent = commit.GetHeldParent())
+        held.push_back(std::move(parent));
 }
 
 /// By name and not by path, which shows a blob where a subtree has the same name.

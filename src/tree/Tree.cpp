@@ -4,6 +4,8 @@
 #include "tree/Node.h"
 #include "tree/StoredInstance.h"
 
+#include <typeinfo>
+
 namespace KivVcs {
 
 using detail::Held;
@@ -46,6 +48,19 @@ KivStringT<char> Tree::GetStoragePrefix() const {
     return "40000";
 }
 
+bool Tree::IsOfHostClass() const noexcept {
+    return &typeid(*this) != &typeid(Tree);
+}
+
+cow_ptr<Tree> Tree::Copy() const {
+    return immu::make<Tree>(*this);
+}
+
+cow_ptr<Tree> CopyOf(Tree const& tree) {
+    cow_ptr<Tree> copy = tree.IsOfHostClass() ? tree.Copy() : nullptr;
+    return copy.use_count() == 1 ? copy : immu::make<Tree>(tree);
+}
+
 void Tree::ResetState() {
     Object::ResetState();
     data_.Reset();
@@ -81,7 +96,7 @@ void detail::TreeAccess::AddRead(Tree& tree, IRepository& repo, KivStringT<char1
         return;
     }
     // Only the caller knows of an object that nobody else holds, so that it needs no copy.
-    const auto own = [&object] { return object.use_count() == 1 ? std::move(object) : immu::make<T>(*object); };
+    const auto own = [&object] { return object.use_count() == 1 ? std::move(object) : CopyOf(*object); };
     tree.SetLocal(repo, name, *object, own, &name);
 }
 
@@ -118,7 +133,7 @@ cow_ptr<T> Tree::AddObjectToTree(IRepository* repo, Components components, T con
     const auto leading = components.first(components.size() - 1);
     std::vector<cow_ptr<Tree>> way = CopyWay(leading);
     Tree& holder = way.empty() ? *this : *way.back().write();
-    cow_ptr<T> added = holder.SetLocal(*repo, components.back(), object, [&object] { return immu::make<T>(object); });
+    cow_ptr<T> added = holder.SetLocal(*repo, components.back(), object, [&object] { return CopyOf(object); });
     PutWayBack(repo, leading, std::move(way), false);
     return added;
 }

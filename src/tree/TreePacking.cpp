@@ -4,7 +4,6 @@
 
 #include <array>
 #include <string_view>
-#include <typeinfo>
 
 namespace KivVcs {
 
@@ -62,7 +61,7 @@ char* PackName(KivStringViewT<char16_t> name, char* out) noexcept {
 /// Whether a packed form shows an object of a host's class.
 bool ShowsHostObject(Held const& held) noexcept {
     Object const* const object = held.Packed();
-    return object != nullptr && typeid(*object) != (held.HasBlob() ? typeid(Blob) : typeid(Tree));
+    return object != nullptr && object->IsOfHostClass();
 }
 
 std::string_view WordsFor(Held const& held) noexcept {
@@ -186,7 +185,7 @@ Id Tree::ComputeId() const {
     // How much a host's objects show is not known before they were asked. The data is kept, so that the identifier and a
     // packed form that is asked for later are of one state.
     if (top != nullptr && top->Total().hosts != 0)
-        return Object::ComputeId();
+        return ComputePackedId();
     IdDigest digest("tree", top == nullptr ? 0 : top->Total().packedSize);
     if (top != nullptr)
         PackEntries(*top, [&digest](auto const&... piece) { digest.Feed(piece...); });

@@ -8,64 +8,61 @@
 
 namespace KivVcs::detail {
 
-/// An identifier that is computed on first use, by whichever thread comes first.
+/// An identifier that is computed on first use, by whichever thread comes first, and what kind of object it is that of:
+/// one of the library's classes, or one of a class that a host derived.
+///
+/// A copy takes it along before anybody knows of which class the copy will be. It counts for an object of the kind that
+/// it is that of; for another it is never looked at, and gives way to the one that the object computes itself.
 class CachedId {
 public:
     CachedId() noexcept = default;
-    CachedId(CachedId const& other) noexcept { Take(other); }
-    CachedId(CachedId&& other) noexcept {
-        Take(other);
-        other.Reset();
-    }
-    CachedId& operator=(CachedId const& other) noexcept {
-        if (this != &other) {
-            Reset();
-            Take(other);
-        }
-        return *this;
-    }
-    CachedId& operator=(CachedId&& other) noexcept {
-        if (this != &other) {
-            *this = other;
-            other.Reset();
-        }
-        return *this;
-    }
+    CachedId(CachedId const&) = delete;
+    CachedId& operator=(CachedId const&) = delete;
     ~CachedId() = default;
 
-    [[nodiscard]] bool IsSet() const noexcept { return state_.load(std::memory_order_acquire) == State::Set; }
+    /// Whether there is an identifier that is known to be that of a library's object.
+    [[nodiscard]] bool IsOwn() const noexcept { return Current() == State::Own; }
+    /// Whether there is one that will be, should the object be a library's.
+    [[nodiscard]] bool IsCopied() const noexcept { return Current() == State::Copied; }
+    /// Whether there is one that counts, should the object be of a host's class.
+    [[nodiscard]] bool IsHosts() const noexcept { return Current() == State::Hosts; }
 
-    /// The identifier, and the digest that it tells. @pre IsSet()
+    /// The identifier, and the digest that it tells. @pre there is one
     [[nodiscard]] Id Get() const noexcept { return {digest_, hash_}; }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
-    /// Whether both are there and equal; false tells nothing if one is missing.
-    [[nodiscard]] bool Equals(CachedId const& other) const noexcept {
-        return IsSet() && other.IsSet() && digest_ == other.digest_;
+    /// Says that the object with a copied identifier is a library's.
+    void Confirm() const noexcept {
+        State expected = State::Copied;
+        state_.compare_exchange_strong(expected, State::Own, std::memory_order_acq_rel);
     }
 
-    /// Keeps @p id, which must tell a digest, unless another thread is doing so.
-    void Keep(Id const& id) const noexcept {
-        State expected = State::Empty;
-        if (!state_.compare_exchange_strong(expected, State::Writing, std::memory_order_relaxed))
+    /// Keeps @p id, which must tell a digest, for an object of the given kind, unless another thread is doing so.
+    void Keep(Id const& id, bool isHosts) const noexcept {
+        State expected = Current();
+        if (expected == State::Writing || expected == (isHosts ? State::Hosts : State::Own) ||
+            !state_.compare_exchange_strong(expected, State::Writing, std::memory_order_relaxed))
             return;
         digest_ = *id.GetDigest();
         hash_ = id.Hash();
-        state_.store(State::Set, std::memory_order_release);
+        state_.store(isHosts ? State::Hosts : State::Own, std::memory_order_release);
+    }
+
+    /// Takes along what @p other, that of an object of the given kind, has. @pre there is none here
+    void Copy(CachedId const& other, bool isHosts) noexcept {
+        if (isHosts ? !other.IsHosts() : !other.IsOwn() && !other.IsCopied())
+            return;
+        digest_ = other.digest_;
+        hash_ = other.hash_;
+        state_.store(isHosts ? State::Hosts : State::Copied, std::memory_order_relaxed);
     }
 
     void Reset() noexcept { state_.store(State::Empty, std::memory_order_relaxed); }
 
 private:
-    enum class State : std::uint8_t { Empty, Writing, Set };
+    enum class State : std::uint8_t { Empty, Writing, Own, Copied, Hosts };
 
-    void Take(CachedId const& other) noexcept {
-        if (!other.IsSet())
-            return;
-        digest_ = other.digest_;
-        hash_ = other.hash_;
-        state_.store(State::Set, std::memory_order_relaxed);
-    }
+    [[nodiscard]] State Current() const noexcept { return state_.load(std::memory_order_acquire); }
 
     mutable std::atomic<State> state_{State::Empty};
     mutable Id::Digest digest_{};

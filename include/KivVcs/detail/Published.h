@@ -24,8 +24,8 @@ public:
         return *this;
     }
     Published& operator=(Published&& other) noexcept {
-        T* const mine = value_.load(std::memory_order_relaxed);
-        value_.store(other.value_.exchange(mine, std::memory_order_relaxed), std::memory_order_relaxed);
+        T* const taken = other.value_.exchange(nullptr, std::memory_order_relaxed);
+        delete value_.exchange(taken, std::memory_order_relaxed);
         return *this;
     }
     ~Published() { delete value_.load(std::memory_order_acquire); }

@@ -1,0 +1,55 @@
+#pragma once
+
+#include "support/Builders.h"
+
+/// Objects of classes that a host derives, which count what they are asked.
+
+namespace KivVcs {
+
+/// A blob that knows its identifier and gets its content when somebody asks for it.
+class LazyBlob final : public Blob {
+public:
+    /// @param fetched counts how often the content is asked for
+    LazyBlob(std::string const& content, int& fetched)
+        : id_(MakeBlob(content).GetId()), content_(MakeBlob(content).GetData()), fetched_(&fetched) {}
+
+    Id GetId() const override { return id_; }
+    Buffer const& GetData() const override { return ++*fetched_, content_; }
+
+protected:
+    cow_ptr<Blob> Copy() const override { return immu::make<LazyBlob>(*this); }
+
+private:
+    Id id_;
+    Buffer content_;
+    int* fetched_;
+};
+
+/// A commit whose identifier is what it is told to be, which counts how often it is asked for it and looks at its parent
+/// as it dies.
+class NamedCommit : public Commit {
+public:
+    struct Log {
+        int asked = 0;
+        int died = 0;
+        int diedWithParent = 0;
+    };
+
+    NamedCommit(KivStringT<char16_t> const& name, cow_ptr<Commit> parent, Log& log)
+        : Commit(std::move(parent), false), name_(name), log_(&log) {}
+    ~NamedCommit() override {
+        ++log_->died;
+        log_->diedWithParent += GetParent() ? 1 : 0;
+    }
+
+    Id GetId() const override { return ++log_->asked, Id(name_); }
+
+protected:
+    cow_ptr<Commit> Copy() const override { return immu::make<NamedCommit>(*this); }
+
+private:
+    KivStringT<char16_t> name_;
+    Log* log_;
+};
+
+} // namespace KivVcs
