@@ -1,3 +1,4 @@
+#include "support/HostObjects.h"
 #include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
@@ -219,6 +220,54 @@ TEST_F(Rewriting, LetsThePurgeHaveTheOldCommitsAndNotTheNewOnes) {
     EXPECT_EQ(line.Counts(), "2 3 4");
     refusing.UpdateStorage();
     EXPECT_EQ(line.Counts(), "0 2 2");
+}
+
+TEST(HostObjects, MeetAreStoredAndAreRewrittenByTheirOwnIdentifiers) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    NamedCommit::Log log;
+    const auto named = [&](const char16_t* name, cow_ptr<Commit> parent) {
+        return repo.SyncWithStorage(cow_ptr<Commit>(immu::make<NamedCommit>(name, std::move(parent), log)));
+    };
+    const auto base = named(u"base", named(u"root", nullptr));
+    const auto left = named(u"left", base);
+    const cow_ptr<Commit> twin = immu::make<NamedCommit>(u"base", nullptr, log);
+    const auto right = named(u"right", twin);
+    EXPECT_TRUE(repo.GetCommonBase(left, right) == twin && repo.GetCommonBase(right, left) == base);
+    EXPECT_FALSE(repo.GetCommonBase(left, immu::make<NamedCommit>(u"other", nullptr, log)));
+
+    // The branches' commits, and the one in which they meet, with the identifiers that they had.
+    repo.CreateBranch(u"left", left);
+    repo.CreateBranch(u"right", right);
+    EXPECT_TRUE(repo.SimplifyCommitGraph(true));
+    EXPECT_TRUE(repo.GetHead(u"left") == left && repo.GetHead(u"right") == right);
+
+    NamedCommit draft(u"draft", left, log);
+    const auto stored = repo.DoCommit(draft);
+    EXPECT_TRUE(repo.GetCommitFromStorage(Id(u"draft")) == stored && repo.GetHead() == stored);
+    EXPECT_NE(dynamic_cast<NamedCommit const*>(stored.get()), nullptr);
+}
+
+TEST(HostObjects, AreMergedAndPurgedWithoutTheirContentsAndStayWhatTheyAre) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    int fetched = 0;
+    const auto committed = [&](cow_ptr<Commit> parent, std::string const& files) {
+        Commit commit(std::move(parent), false);
+        std::istringstream words(files);
+        for (std::string word; words >> word;)
+            commit.AddBlob(&repo, Wide(word.substr(0, word.find('='))), LazyBlob(word, fetched));
+        return repo.DoCommit(commit);
+    };
+    const auto base = committed(nullptr, "a=0 d/b=0 d/c=0");
+    const auto right = committed(base, "a=2 d/b=2 e/n=2");
+    repo.MoveBranchTo(u"master", base);
+    committed(base, "a=1 d/c=1 d/n=1");
+    EXPECT_TRUE(
+        repo.Merge(right, {AlwaysChooseRight(), always_return_t<TreeConflictChoice>{TreeConflictChoice::Merge}}));
+    repo.UpdateStorage();
+    for (auto const& path : repo.GetHead()->GetCommitTree()->GetAllBlobPaths())
+        EXPECT_NE(dynamic_cast<LazyBlob const*>(repo.GetHead()->GetBlob(path).get()), nullptr) << Narrow(path);
+    EXPECT_EQ(fetched, 0);
+    EXPECT_EQ(Files(repo.GetHead()->GetCommitTree()->GetRoot()), "a=a=2 d/b=d/b=2 d/c=d/c=1 d/n=d/n=1 e/n=e/n=2");
 }
 
 /// A line of commits and a nest of directories, stored but for every second one.

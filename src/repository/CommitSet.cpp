@@ -16,6 +16,7 @@ void CommitSet::Grow() {
     allocated_ = std::move(larger);
     slots_ = allocated_.data();
     mask_ = slotCount - 1;
+    free_ = slotCount / 4 * 3 - slotCount / 8 * 3;
 }
 
 } // namespace KivVcs

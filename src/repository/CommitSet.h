@@ -26,7 +26,7 @@ public:
         if (slot->commit != nullptr)
             return slot->commit;
         *slot = {prefix, &commit};
-        if (++count_ > mask_ - mask_ / 4)
+        if (--free_ == 0)
             Grow();
         return nullptr;
     }
@@ -54,7 +54,8 @@ private:
     std::vector<Slot> allocated_;
     Slot* slots_ = first_.data();
     std::size_t mask_ = slotsAtFirst - 1;
-    std::size_t count_ = 0;
+    /// How many commits can be inserted before the set grows, at three quarters of its slots.
+    std::size_t free_ = slotsAtFirst / 4 * 3;
 };
 
 } // namespace KivVcs

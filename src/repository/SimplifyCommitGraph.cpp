@@ -55,6 +55,8 @@ public:
     /// heads, as long as equal commits have equal ancestors, so that ways that meet stay together.
     /// @return false, keeping none, if they have not: identifiers of a host's classes are what the host says.
     bool KeepMeetings() {
+        if (kept_.size() < 2)
+            return true;
         CommitSet visited;
         std::unordered_set<Commit const*> compared;
         std::vector<Id> meetings;
