@@ -24,7 +24,8 @@ public:
     static cow_ptr<CommitTree> Deserialize(Id const& id, IRepository* repo,
                                            PortableVersion::Delegate<StreamIO(Id const&)> loader);
 
-    /// As the operations of `Tree`, on a root that is made if there is none, even if nothing is added then.
+    /// As the operations of `Tree`, on a root that is made if there is none, even if nothing is added then. A first add
+    /// that throws leaves the holder without a root, as it was.
     cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
     cow_ptr<Tree> AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree);
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);

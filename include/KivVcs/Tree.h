@@ -52,8 +52,9 @@ public:
     [[nodiscard]] KivStringT<char> GetHeader() const override;
     /// "40000"
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
-    /// The entries in name order, each as mode, blank, type, blank, name in UTF-8, a zero byte and 64 digits of
-    /// identifier.
+    /// The entries in name order, each as mode, blank, type, blank, name in UTF-8, a zero byte and identifier: the
+    /// `GetStoragePrefix`, `GetHeader` and `GetId` of its object, which are asked of objects of hosts' classes and are 64
+    /// digits of identifier at the end for all others. @throws what hosts' objects throw
     Buffer const& GetData() const override;
     void ResetState() override;
 
@@ -62,7 +63,7 @@ public:
     [[nodiscard]] std::uint64_t GetLocalObjectCount() const noexcept;
     /// The number of blob entries. O(1).
     [[nodiscard]] std::uint64_t GetLocalBlobCount() const noexcept;
-    /// The number of blob entries at any depth; proportional to the number of subtrees, each counted wherever it is named.
+    /// The number of blob entries at any depth, each subtree counted wherever it is named. Linear in distinct subtrees.
     [[nodiscard]] std::uint64_t GetDeepBlobCount() const;
 
     /// Adds a blob under @p path, making the trees on the way that are missing and replacing a blob of that name. A
@@ -131,7 +132,8 @@ public:
     /// The tree of identifier @p id: the one that @p repo holds already, otherwise read through @p loader with
     /// everything below it. Blobs and subtrees that cannot be loaded are left out. A tree that names itself, directly
     /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable. An entry whose name holds "/" is
-    /// added by that path, as `AddBlob` and `AddTree` do, each time storing the directories on its way.
+    /// added by that path, as `AddBlob` and `AddTree` do, each time storing the directories on its way. A packed form is
+    /// read once however often it is named.
     /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not
     /// begin with "tree", no entries, or an entry that is neither tree nor blob.
     /// @throws what @p loader and @p repo throw

@@ -1,7 +1,5 @@
 #include "tree/Node.h"
 
-#include <array>
-
 namespace KivVcs::detail {
 
 namespace {
@@ -11,38 +9,10 @@ namespace {
 constexpr int fewElements = Node::mostElements / 4;
 constexpr int mostJoinedElements = Node::mostElements * 3 / 4;
 
-/// The nodes from the top of a table down to a leaf, each with the index of the child that leads on.
-class Descent {
-public:
-    struct Step {
-        Node* node;
-        int child;
-    };
-
-    void Add(Node& node, int child) noexcept { steps_[length_++] = {&node, child}; }
-    [[nodiscard]] Node& Leaf() const noexcept { return *steps_[length_ - 1].node; }
-
-    void AddToTotals(Tally const& added, Tally const& removed) const noexcept {
-        for (std::size_t index = 0; index < length_; ++index)
-            steps_[index].node->AddToTotal(added, removed);
-    }
-
-    /// Removes the nodes without elements, but for the topmost.
-    void RemoveEmptied() noexcept {
-        for (; length_ > 1 && Leaf().Count() == 0; --length_) {
-            Step const& above = steps_[length_ - 2];
-            above.node->Erase<Child>(above.child, above.child + 1);
-        }
-    }
-
-private:
-    std::array<Step, Node::greatestHeight> steps_;
-    std::size_t length_ = 0;
-};
-
 /// Splits the full child @p index of @p parent, which is writable and has room, so that @p name can be inserted below:
 /// in the middle, or at its end for a new last name, so that names added in ascending order fill their nodes.
-void SplitChild(Node& parent, int index, KivStringViewT<char16_t> name) {
+/// @return the index of the child for that name
+int SplitChild(Node& parent, int index, KivStringViewT<char16_t> name) {
     cow_ptr<Node>& left = parent.ChildAt(index).node;
     const int count = left->Count();
     int at = count / 2;
@@ -50,16 +20,18 @@ void SplitChild(Node& parent, int index, KivStringViewT<char16_t> name) {
         at = left->IsLeaf() ? count : count - 1;
 
     KivStringT<char16_t> separator;
-    if (at == count)
-        separator = name.ToString();
-    else
+    if (at < count)
         separator = left->IsLeaf() ? left->EntryAt(at).name : left->ChildAt(at).separator;
+    else
+        separator = name.ToString();
     cow_ptr<Node> right = left->CopyOf(at, count, std::min(Node::mostElements - (count - at), 4));
     if (at < count && left.use_count() == 1)
         Node::Of(left).Truncate(at);
     else if (at < count)
         left = left->CopyOf(0, at, 1);
+    const bool belongsRight = name.Compare(separator) >= 0;
     parent.Insert(index + 1, Child{std::move(separator), std::move(right)});
+    return belongsRight ? index + 1 : index;
 }
 
 /// Joins the child @p index of @p parent, which is writable, with a neighbour if both are small.
@@ -89,38 +61,6 @@ int JoinSmallChild(Node& parent, int index) {
     return left;
 }
 
-/// Makes the way from @p top to the leaf for @p name writable, for an edit by which that leaf grows by @p growth entries:
-/// 1, 0 or -1. Everything that can fail happens here and leaves the entries as they are: nodes are copied, split where
-/// they are full, joined where they are small, so that the edit itself finds room.
-Descent OpenWay(cow_ptr<Node>& top, KivStringViewT<char16_t> name, int growth) {
-    if (!top)
-        top = Node::Make(0, 1);
-    if (growth > 0 && top->IsFull()) {
-        cow_ptr<Node> raised = Node::Make(top->Height() + 1, 2);
-        Node& node = Node::Of(raised);
-        node.AddToTotal(top->Total(), {});
-        node.Insert(0, Child{{}, std::move(top)});
-        top = std::move(raised);
-    }
-    Descent descent;
-    cow_ptr<Node>* handle = &top;
-    while (!(*handle)->IsLeaf()) {
-        int index = (*handle)->ChildFor(name);
-        const bool splits = growth > 0 && (*handle)->ChildAt(index).node->IsFull();
-        Node& node = Node::Writable(*handle, splits ? 1 : 0);
-        if (splits) {
-            SplitChild(node, index, name);
-            index = node.ChildFor(name);
-        } else if (growth < 0) {
-            index = JoinSmallChild(node, index);
-        }
-        descent.Add(node, index);
-        handle = &node.ChildAt(index).node;
-    }
-    descent.Add(Node::Writable(*handle, std::max(growth, 0)), 0);
-    return descent;
-}
-
 } // namespace
 
 /// Where in its leaf an entry is, or where it belongs.
@@ -148,32 +88,70 @@ Held const* EntryTable::Find(KivStringViewT<char16_t> name) const noexcept {
     return entry == nullptr ? nullptr : &entry->held;
 }
 
-void EntryTable::Put(Place const& place, KivStringViewT<char16_t> name, KivStringT<char16_t> text, Held held) {
-    int growth = 1;
-    Tally added;
-    Tally removed;
-    if (place.entry != nullptr)
-        growth = held.IsNothing() ? -1 : 0;
-    if (growth != 0 || !CountAlike(held, place.entry->held)) {
-        added = TallyOf(name, held);
-        removed = growth > 0 ? Tally() : TallyOf(name, place.entry->held);
+/// The one edit of an entry: inserts it, replaces what is held or, if that is nothing, removes it.
+struct EntryTable::Edit {
+    KivStringViewT<char16_t> name;
+    Place place;
+    Entry entry;
+    /// By how many entries the leaf grows: 1, 0 or -1.
+    int growth = 0;
+    /// What the totals grow by; where they shrink, the numbers wrap around.
+    Tally difference{};
+
+    /// Makes the nodes from @p handle down to the leaf writable, changes the leaf and mends the totals on the way back. What
+    /// can fail happens on the way down and leaves the entries as they are: nodes are copied, split where they are full,
+    /// joined where they are small, so that the change itself finds room.
+    // NOLINTNEXTLINE(misc-no-recursion): as deep as the table is high
+    void Apply(cow_ptr<Node>& handle) {
+        int at = handle->IsLeaf() ? 0 : handle->ChildFor(name);
+        const bool grows = growth > 0 && (handle->IsLeaf() || handle->ChildAt(at).node->IsFull());
+        Node& node = Node::Writable(handle, grows ? 1 : 0);
+        if (node.IsLeaf()) {
+            ChangeLeaf(node);
+        } else {
+            if (grows)
+                at = SplitChild(node, at, name);
+            else if (growth < 0)
+                at = JoinSmallChild(node, at);
+            cow_ptr<Node>& child = node.ChildAt(at).node;
+            Apply(child);
+            if (child->Count() == 0)
+                node.Erase<Child>(at, at + 1);
+        }
+        node.AddToTotal(difference);
     }
-    Descent descent = OpenWay(top_, name, growth);
 
-    Node& leaf = descent.Leaf();
-    // A leaf that was split or joined on the way has another size.
-    const int index = leaf.Count() == place.leafCount ? place.index : leaf.EntryFor(name);
-    if (growth > 0)
-        leaf.Insert(index, Entry{std::move(text), std::move(held)});
-    else if (growth < 0)
-        leaf.Erase<Entry>(index, index + 1);
-    else
-        std::swap(leaf.EntryAt(index).held, held);
-    leaf.DropPackedRun();
-    if (added.names != 0 || removed.names != 0)
-        descent.AddToTotals(added, removed);
+    void ChangeLeaf(Node& leaf) noexcept {
+        // A leaf that was split or joined on the way has another size.
+        const int at = leaf.Count() == place.leafCount ? place.index : leaf.EntryFor(name);
+        if (growth > 0)
+            leaf.Insert(at, std::move(entry));
+        else if (growth < 0)
+            leaf.Erase<Entry>(at, at + 1);
+        else
+            std::swap(leaf.EntryAt(at).held, entry.held);
+        leaf.DropPackedRun();
+    }
+};
 
-    descent.RemoveEmptied();
+void EntryTable::Put(Place const& place, KivStringViewT<char16_t> name, KivStringT<char16_t> text, Held held) {
+    Edit edit{name, place, {std::move(text), std::move(held)}};
+    Entry const* const old = place.entry;
+    edit.growth = (edit.entry.held.IsNothing() ? 0 : 1) - (old == nullptr ? 0 : 1);
+    if (old == nullptr || !CountAlike(old->held, edit.entry.held)) {
+        edit.difference = TallyOf(name, edit.entry.held);
+        if (old != nullptr)
+            edit.difference -= TallyOf(name, old->held);
+    }
+    if (!top_)
+        top_ = Node::Make(0, 1);
+    if (edit.growth > 0 && top_->IsFull()) {
+        cow_ptr<Node> raised = Node::Make(top_->Height() + 1, 2);
+        Node::Of(raised).AddToTotal(top_->Total());
+        Node::Of(raised).Insert(0, Child{{}, std::move(top_)});
+        top_ = std::move(raised);
+    }
+    edit.Apply(top_);
     if (top_->Count() == 0)
         top_.reset();
     while (top_ && !top_->IsLeaf() && top_->Count() == 1)

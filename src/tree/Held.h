@@ -14,12 +14,12 @@ namespace KivVcs::detail {
 class Held {
 public:
     Held() noexcept = default;
-    explicit Held(cow_ptr<Blob> blob) noexcept : word_(WordOf(cow_ptr<Object>(std::move(blob)), Kind::Blob)) {}
-    explicit Held(cow_ptr<Tree> tree) noexcept : word_(WordOf(cow_ptr<Object>(std::move(tree)), Kind::Tree)) {}
+    explicit Held(cow_ptr<Blob> blob) noexcept : word_(WordOf(cow_ptr<Object>(std::move(blob))) | blobBit) {}
+    explicit Held(cow_ptr<Tree> tree) noexcept : word_(WordOf(cow_ptr<Object>(std::move(tree))) | treeBit) {}
     Held(cow_ptr<Blob> blob, cow_ptr<Tree> tree)
-        : word_(WordOf(immu::make<Both>(std::move(blob), std::move(tree)), Kind::Both)) {}
+        : word_(WordOf(immu::make<Both>(std::move(blob), std::move(tree))) | blobBit | treeBit) {}
     Held(Held const& other) noexcept : word_(other.word_) {
-        if (IsKind(Kind::Both))
+        if (HasBoth())
             As<Both>()->add_reference();
         else if (Object const* const object = As<Object>())
             object->add_reference();
@@ -30,14 +30,16 @@ public:
         return *this;
     }
     ~Held() {
-        if (word_ > kindBits)
-            Release();
+        if (HasBoth())
+            static_cast<void>(cow_ptr<Both>::attach(As<Both>()));
+        else
+            static_cast<void>(cow_ptr<Object>::attach(As<Object>()));
     }
 
     [[nodiscard]] bool IsNothing() const noexcept { return word_ == 0; }
-    [[nodiscard]] bool HasBlob() const noexcept { return (word_ & static_cast<std::uintptr_t>(Kind::Blob)) != 0; }
-    [[nodiscard]] bool HasTree() const noexcept { return (word_ & static_cast<std::uintptr_t>(Kind::Tree)) != 0; }
-    [[nodiscard]] bool HasBoth() const noexcept { return IsKind(Kind::Both); }
+    [[nodiscard]] bool HasBlob() const noexcept { return (word_ & blobBit) != 0; }
+    [[nodiscard]] bool HasTree() const noexcept { return (word_ & treeBit) != 0; }
+    [[nodiscard]] bool HasBoth() const noexcept { return (word_ & kindBits) == kindBits; }
 
     [[nodiscard]] Blob const* GetBlob() const noexcept {
         if (HasBoth())
@@ -49,15 +51,13 @@ public:
             return As<Both>()->tree.get();
         return HasTree() ? static_cast<Tree const*>(As<Object>()) : nullptr;
     }
-    /// What a lookup by name finds: the subtree if there is no blob, or only a null one.
-    [[nodiscard]] Object const* Visible() const noexcept {
-        if (!HasBoth())
-            return As<Object>();
-        Object const* const blob = As<Both>()->blob.get();
-        return blob != nullptr ? blob : As<Both>()->tree.get();
-    }
     /// What a packed form shows: a blob hides the subtree even if it is null.
     [[nodiscard]] Object const* Packed() const noexcept { return HasBoth() ? As<Both>()->blob.get() : As<Object>(); }
+    /// What a lookup by name finds: the subtree if there is no blob, or only a null one.
+    [[nodiscard]] Object const* Visible() const noexcept {
+        Object const* const packed = Packed();
+        return packed != nullptr ? packed : GetTree();
+    }
 
     /// Whether both are the same objects, and not only equal ones.
     [[nodiscard]] bool IsSame(Held const& other) const noexcept { return word_ == other.word_; }
@@ -70,22 +70,21 @@ public:
         return HasBlob() ? Held(cow_ptr<Blob>::share(GetBlob()), std::move(tree)) : Held(std::move(tree));
     }
 
-    /// Gives up what is held. The result is the subtree, unless others share the object that holds it together with a blob.
+    /// Gives up what is held. The result is the subtree, and the last handle to it if this was the last to hold it.
+    /// @pre HasTree()
     [[nodiscard]] cow_ptr<Tree> GiveUp() noexcept {
-        if (HasBoth()) {
-            auto both = cow_ptr<Both>::attach(As<Both>());
-            word_ = 0;
-            const std::unique_ptr<Both> last = both.release_if_last();
-            return last == nullptr ? nullptr : std::move(last->tree);
-        }
-        auto tree = cow_ptr<Tree>::share(GetTree());
-        *this = Held();
+        auto tree = HasBoth() ? cow_ptr<Tree>::share(GetTree()) : cow_ptr<Tree>::attach(GetTree());
+        Held given;
+        std::swap(word_, given.word_);
+        if (!given.HasBoth())
+            given.word_ = 0;
         return tree;
     }
 
 private:
-    enum class Kind : std::uintptr_t { Blob = 1, Tree = 2, Both = 3 };
-    static constexpr std::uintptr_t kindBits = 3;
+    static constexpr std::uintptr_t blobBit = 1;
+    static constexpr std::uintptr_t treeBit = 2;
+    static constexpr std::uintptr_t kindBits = blobBit | treeBit;
 
     struct Both final : KivUtils::reference_counted {
         Both(cow_ptr<Blob> heldBlob, cow_ptr<Tree> heldTree) noexcept
@@ -96,22 +95,13 @@ private:
     };
 
     template <class T>
-    [[nodiscard]] static std::uintptr_t WordOf(cow_ptr<T> held, Kind kind) noexcept {
+    [[nodiscard]] static std::uintptr_t WordOf(cow_ptr<T> held) noexcept {
         static_assert(alignof(T) > kindBits);
-        return reinterpret_cast<std::uintptr_t>(held.detach()) | static_cast<std::uintptr_t>(kind);
-    }
-    [[nodiscard]] bool IsKind(Kind kind) const noexcept {
-        return (word_ & kindBits) == static_cast<std::uintptr_t>(kind);
+        return reinterpret_cast<std::uintptr_t>(held.detach());
     }
     template <class T>
     [[nodiscard]] T const* As() const noexcept {
         return reinterpret_cast<T const*>(word_ & ~kindBits);
-    }
-    void Release() noexcept {
-        if (IsKind(Kind::Both))
-            static_cast<void>(cow_ptr<Both>::attach(As<Both>()));
-        else
-            static_cast<void>(cow_ptr<Object>::attach(As<Object>()));
     }
 
     std::uintptr_t word_ = 0;

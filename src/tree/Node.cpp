@@ -38,56 +38,42 @@ cow_ptr<Node> Node::Make(int height, int capacity) {
 }
 
 Node::~Node() {
-    if (IsLeaf())
-        Erase<Entry>(0, count_);
-    else
-        Erase<Child>(0, count_);
+    IsLeaf() ? Erase<Entry>(0, count_) : Erase<Child>(0, count_);
 }
 
-/// The nodes whose last owner is gone, destroyed one after the other.
-class Node::Dying {
-public:
-    explicit Dying(Node* first) noexcept : first_(first) {}
+namespace {
 
-    void Destroy() noexcept {
-        while (Node* const node = first_) {
-            first_ = node->nextDying_;
-            GiveUpElements(*node);
-            const std::size_t bytes = BytesFor(node->capacity_);
-            node->~Node();
-            std::allocator<std::byte>().deallocate(reinterpret_cast<std::byte*>(node), bytes);
-        }
-    }
+/// Gives up what is held. The result is what was below a subtree that nobody else held; that tree was whole until its
+/// destructor had run.
+cow_ptr<Node> EntriesOfLast(Held& held) noexcept {
+    const std::unique_ptr<Tree> last = held.GiveUp().release_if_last();
+    return last == nullptr ? nullptr : TreeAccess::Top(*last);
+}
 
-private:
-    void GiveUp(cow_ptr<Node> node) noexcept {
-        if (Node* const last = node.release_if_last().release())
-            last->nextDying_ = std::exchange(first_, last);
-    }
-
-    void GiveUpElements(Node& node) noexcept {
-        if (!node.IsLeaf()) {
-            for (Child& child : node.Children())
-                GiveUp(std::move(child.node));
-            return;
-        }
-        for (Entry& entry : node.Entries()) {
-            if (!entry.held.HasTree())
-                continue;
-            if (std::unique_ptr<Tree> last = entry.held.GiveUp().release_if_last()) {
-                // Its entries outlive the tree, which is whole until its destructor has run.
-                cow_ptr<Node> below = TreeAccess::Top(*last);
-                last.reset();
-                GiveUp(std::move(below));
-            }
-        }
-    }
-
-    Node* first_;
-};
+} // namespace
 
 void Node::operator delete(Node* node, std::destroying_delete_t) noexcept {
-    Dying(node).Destroy();
+    // The nodes whose last owner is gone.
+    Node* dying = node;
+    const auto giveUp = [&dying](cow_ptr<Node> share) {
+        if (Node* const last = share.release_if_last().release())
+            last->nextDying_ = std::exchange(dying, last);
+    };
+    while ((node = dying) != nullptr) {
+        dying = node->nextDying_;
+        if (node->IsLeaf()) {
+            for (Entry& entry : node->Entries()) {
+                if (entry.held.HasTree())
+                    giveUp(EntriesOfLast(entry.held));
+            }
+        } else {
+            for (Child& child : node->Children())
+                giveUp(std::move(child.node));
+        }
+        const std::size_t bytes = BytesFor(node->capacity_);
+        node->~Node();
+        std::allocator<std::byte>().deallocate(reinterpret_cast<std::byte*>(node), bytes);
+    }
 }
 
 template <class Element>

@@ -103,15 +103,13 @@ public:
     /// Appends copies of all elements of @p other, a node of the same height.
     void Append(Node const& other) noexcept;
 
-    void AddToTotal(Tally const& added, Tally const& removed) noexcept { (total_ += added) -= removed; }
+    void AddToTotal(Tally const& difference) noexcept { total_ += difference; }
 
     /// The packed form of a leaf's entries, made on first use and kept with the leaf. @pre there are no hosts' objects
     [[nodiscard]] Buffer const& PackedRun() const;
     void DropPackedRun() noexcept { packedRun_.Reset(); }
 
 private:
-    class Dying;
-
     Node(int height, int capacity) noexcept
         : capacity_(static_cast<std::uint8_t>(capacity)), height_(static_cast<std::uint8_t>(height)) {}
 

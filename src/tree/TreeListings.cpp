@@ -1,6 +1,6 @@
 #include "KivVcs/Tree.h"
 
-#include "tree/Differences.h"
+#include "tree/ForEachDifference.h"
 #include "tree/PathPrefix.h"
 
 #include <unordered_map>
@@ -102,16 +102,6 @@ PathList DeepBlobDiffs(Tree const* mine, Tree const* theirs) {
     return paths.Take();
 }
 
-template <class Wanted>
-PathList LocalPaths(Tree const& tree, Wanted wanted) {
-    PathList names;
-    detail::ForEachEntry(TopOf(&tree), [&names, wanted](Entry const& entry) {
-        if (wanted(entry.held) != nullptr)
-            names.push_back(entry.name);
-    });
-    return names;
-}
-
 template <class Differs>
 PathList LocalDiffs(Tree const& mine, Tree const* theirs, Differs differs) {
     PathList names;
@@ -153,11 +143,11 @@ std::uint64_t Tree::GetDeepBlobCount() const {
 }
 
 PathList Tree::GetLocalBlobPaths() const {
-    return LocalPaths(*this, [](Held const& held) { return held.GetBlob(); });
+    return LocalDiffs(*this, nullptr, BlobDiffers);
 }
 
 PathList Tree::GetLocalSubtreePaths() const {
-    return LocalPaths(*this, [](Held const& held) { return held.GetTree(); });
+    return LocalDiffs(*this, nullptr, TreeDiffers);
 }
 
 PathList Tree::GetLocalObjectPaths() const {

@@ -3,6 +3,7 @@
 #include "tree/Cursor.h"
 
 #include <array>
+#include <cstring>
 #include <string_view>
 
 namespace KivVcs {
@@ -13,7 +14,6 @@ using detail::Cursor;
 using detail::Entry;
 using detail::Held;
 using detail::Node;
-using detail::Tally;
 
 /// Trees with at least this many objects keep the packed form of each leaf with the leaf, so that a version that changes one
 /// entry packs one leaf anew; for smaller ones that would cost more memory than the entries themselves.
@@ -23,8 +23,11 @@ bool KeepsRuns(Node const& top) noexcept {
     return top.Total().Objects() >= fewestObjectsWithKeptRuns;
 }
 
+/// Mode and type of our own objects, with the blanks behind them. The copy of either takes as many bytes, the shorter one's
+/// terminator among them, so that it is no call.
 constexpr std::string_view blobWords = "100644 blob ";
 constexpr std::string_view treeWords = "40000 tree ";
+constexpr std::size_t pieceSize = 4096;
 constexpr std::size_t idLength = 2 * std::tuple_size_v<Id::Digest>;
 
 /// Hands the code units of a name to @p take as a packed form shows them, up to the first U+0000.
@@ -32,10 +35,8 @@ constexpr std::size_t idLength = 2 * std::tuple_size_v<Id::Digest>;
 template <class Take>
 bool ForEachAsciiUnit(KivStringViewT<char16_t> name, Take take) noexcept {
     for (const char16_t unit : name) {
-        if (unit == 0)
-            break;
-        if (unit >= 0x80)
-            return false;
+        if (static_cast<char16_t>(unit - 1) >= 0x7F)
+            return unit == 0;
         take(static_cast<char>(unit));
     }
     return true;
@@ -81,33 +82,40 @@ public:
             return;
         const std::size_t most = blobWords.size() + 3 * static_cast<std::size_t>(entry.name.GetLength()) + 1 + idLength;
         if (most > bytes_.size())
-            return AddAsking(entry);
+            return AddAsking(entry.name, *object);
         if (most > bytes_.size() - used_)
             Flush();
         const std::string_view words = WordsFor(entry.held);
-        char* out = std::copy(words.begin(), words.end(), bytes_.data() + used_);
-        out = PackName(entry.name, out);
+        char* out = bytes_.data() + used_;
+        std::memcpy(out, words.data(), blobWords.size());
+        out = PackName(entry.name, out + words.size());
         *out++ = '\0';
         Id::Digest const* const known = object->GetKnownDigest();
         // NOLINTNEXTLINE(clang-analyzer-core.NonNullParamChecker): an identifier that is computed tells a digest
-        out = WriteDigits(known == nullptr ? *object->Object::GetId().GetDigest() : *known, out);
+        out = WriteDigits(known == nullptr ? *object->GetId().GetDigest() : *known, out);
         used_ = static_cast<std::size_t>(out - bytes_.data());
     }
 
     /// Packs any entry, asking its object what to show.
-    void AddAsking(Entry const& entry) {
-        Object const* const object = entry.held.Packed();
-        if (object == nullptr)
-            return;
+    void AddAsking(KivStringViewT<char16_t> name, Object const& object) {
         Buffer packed;
-        Helpers::AppendToBuffer(packed, object->GetStoragePrefix());
+        Helpers::AppendToBuffer(packed, object.GetStoragePrefix());
         packed.Append(" ", 1);
-        Helpers::AppendToBuffer(packed, object->GetHeader());
+        Helpers::AppendToBuffer(packed, object.GetHeader());
         packed.Append(" ", 1);
-        Helpers::AppendToBuffer(packed, KivStringViewT<char16_t>(entry.name));
+        Helpers::AppendToBuffer(packed, name);
         packed.Append("", 1);
-        Helpers::AppendToBuffer(packed, KivStringViewT<char16_t>(object->GetId().GetText()));
+        Helpers::AppendToBuffer(packed, KivStringViewT<char16_t>(object.GetId().GetText()));
         Add(packed);
+    }
+
+    void Add(Node const& leaf) {
+        for (Entry const& entry : leaf.Entries()) {
+            if (leaf.Total().hosts != 0 && ShowsHostObject(entry.held))
+                AddAsking(entry.name, *entry.held.Packed());
+            else
+                Add(entry);
+        }
     }
 
     void Add(Buffer const& packed) {
@@ -120,7 +128,7 @@ public:
 private:
     Take take_;
     std::size_t used_ = 0;
-    std::array<char, 4096> bytes_;
+    std::array<char, pieceSize> bytes_;
 };
 
 /// Hands the packed form of all entries below @p top, in order, to @p take.
@@ -131,21 +139,23 @@ void PackEntries(Node const& top, Take take) {
     for (Cursor cursor(&top); !cursor.AtEnd(); cursor.NextLeaf()) {
         Node const& leaf = cursor.Leaf();
         // What hosts' objects show is theirs to say, each time.
-        if (keepsRuns && leaf.Total().hosts == 0) {
+        if (keepsRuns && leaf.Total().hosts == 0)
             packer.Add(leaf.PackedRun());
-            continue;
-        }
-        for (Entry const& entry : leaf.Entries())
-            leaf.Total().hosts != 0 && ShowsHostObject(entry.held) ? packer.AddAsking(entry) : packer.Add(entry);
+        else
+            packer.Add(leaf);
     }
     packer.Flush();
 }
 
-/// The same as a buffer, which shares the runs that are kept and is one piece of its exact size otherwise.
-Buffer PackedEntries(Node const& top) {
-    Buffer data;
-    PackEntries(top, [&data](auto const&... piece) { data.Append(piece...); });
-    if (KeepsRuns(top))
+struct AppendTo {
+    Buffer& data;
+
+    void operator()(auto const&... piece) const { data.Append(piece...); }
+};
+
+/// @p data without the room that is left from appending to it.
+Buffer WithoutRoom(Buffer const& data) {
+    if (data.GetSize() <= pieceSize)
         return data;
     return Buffer::Build(data.GetSize(), [&data](std::byte* out) {
         for (auto const& chunk : data.LockForRead())
@@ -175,7 +185,13 @@ bool CountAlike(Held const& left, Held const& right) noexcept {
 }
 
 Buffer const& Node::PackedRun() const {
-    return packedRun_.GetOrMake([this] { return PackedEntries(*this); });
+    return packedRun_.GetOrMake([this] {
+        Buffer run;
+        EntryPacker packer(AppendTo{run});
+        packer.Add(*this);
+        packer.Flush();
+        return WithoutRoom(run);
+    });
 }
 
 } // namespace detail
@@ -193,7 +209,13 @@ Id Tree::ComputeId() const {
 }
 
 Buffer const& Tree::GetData() const {
-    return data_.GetOrMake([this] { return entries_.Top() ? PackedEntries(*entries_.Top()) : Buffer(); });
+    return data_.GetOrMake([this] {
+        Buffer data;
+        if (!IsEmpty())
+            PackEntries(*entries_.Top(), AppendTo{data});
+        // Runs that are kept are shared.
+        return IsEmpty() || KeepsRuns(*entries_.Top()) ? data : WithoutRoom(data);
+    });
 }
 
 } // namespace KivVcs

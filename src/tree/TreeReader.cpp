@@ -1,7 +1,7 @@
 #include "KivVcs/Helpers.h"
+#include "KivVcs/IRepository.h"
 #include "objects/PackedForm.h"
 #include "tree/Node.h"
-#include "tree/StoredInstance.h"
 
 #include <map>
 
@@ -11,29 +11,12 @@ namespace {
 
 using Loader = PortableVersion::Delegate<StreamIO(Id const&)>;
 
-/// One entry of a tree's data as it was read.
-struct ParsedEntry {
-    KivStringViewT<char> type;
-    KivStringViewT<char> name;
-    KivStringViewT<char> id;
-};
-
-/// Takes the entry at @p position off @p data and moves to the next one; whatever is missing is cut off at the end of the data.
-ParsedEntry ParseEntry(KivStringViewT<char> data, int& position) noexcept {
-    const int length = data.GetLength();
-    const auto findFrom = [data, length](KivStringViewT<char> wanted, int start) {
-        const int found = data.Find(wanted, start);
-        return found < 0 ? length : found;
-    };
-    const auto after = [length](int end) { return end < length ? end + 1 : length; };
-    const int type = after(findFrom(" ", position));
-    const int typeEnd = findFrom(" ", type);
-    const int name = after(typeEnd);
-    const int nameEnd = findFrom(KivStringViewT<char>("", 1), name);
-    const int id = after(nameEnd);
-    const KivStringViewT<char> idText = data.Mid(id, 64);
-    position = id + idText.GetLength();
-    return {data.Mid(type, typeEnd - type), data.Mid(name, nameEnd - name), idText};
+/// Takes the text up to the next @p end off @p rest, and the end with it; all of it if there is none.
+KivStringViewT<char> TakeUntil(KivStringViewT<char>& rest, KivStringViewT<char> end) noexcept {
+    const int found = rest.Find(end);
+    const KivStringViewT<char> taken = found < 0 ? rest : rest.Left(found);
+    rest = found < 0 ? KivStringViewT<char>() : rest.Mid(found + 1);
+    return taken;
 }
 
 /// Some order of identifiers. Those that packed forms name are the host's, and their hashes may all be equal.
@@ -64,7 +47,8 @@ private:
     struct Frame {
         Id id;
         KivStringT<char> data;
-        int position = 0;
+        /// What has not been read yet.
+        KivStringViewT<char> rest = data;
         Tree tree{};
         /// The name of the entry whose subtree is being read.
         KivStringT<char16_t> name{};
@@ -92,15 +76,19 @@ private:
     /// Reads the next entry of the innermost frame, or finishes it.
     void NextEntry() {
         Frame& frame = frames_.back();
-        if (frame.position >= frame.data.GetLength())
+        if (frame.rest.IsEmpty())
             return FinishFrame(repo_.SyncWithStorage(immu::make<Tree>(std::move(frame.tree))));
-        const ParsedEntry entry = ParseEntry(frame.data, frame.position);
-        if (entry.type == "tree") {
-            frame.name = String::ToStringW(entry.name);
-            BeginTree(ReadId(entry.id));
-        } else if (entry.type == "blob") {
-            if (cow_ptr<Blob> blob = FindOrReadBlob(ReadId(entry.id)))
-                detail::TreeAccess::AddRead(frame.tree, repo_, String::ToStringW(entry.name), std::move(blob));
+        TakeUntil(frame.rest, " ");
+        const KivStringViewT<char> type = TakeUntil(frame.rest, " ");
+        const KivStringViewT<char> name = TakeUntil(frame.rest, KivStringViewT<char>("", 1));
+        const KivStringViewT<char> id = frame.rest.Left(64);
+        frame.rest = frame.rest.Mid(64);
+        if (type == "tree") {
+            frame.name = String::ToStringW(name);
+            BeginTree(ReadId(id));
+        } else if (type == "blob") {
+            if (cow_ptr<Blob> blob = FindOrReadBlob(ReadId(id)))
+                detail::TreeAccess::AddRead(frame.tree, repo_, String::ToStringW(name), std::move(blob));
         } else {
             FinishFrame(nullptr);
         }

@@ -2,6 +2,8 @@
 
 #include "support/Builders.h"
 
+#include <functional>
+
 /// Objects of classes that a host derives, which count what they are asked.
 
 namespace KivVcs {
@@ -23,6 +25,48 @@ private:
     Id id_;
     Buffer content_;
     int* fetched_;
+};
+
+/// A blob that shows in trees what a host says, and fetches its content when somebody asks for it.
+class HostBlob : public Blob {
+public:
+    HostBlob(std::string const& knownId, std::function<std::string()> fetch)
+        : id(Wide(knownId)), fetch_(std::move(fetch)) {}
+
+    Id GetId() const override { return Id(id); }
+    KivStringT<char> GetHeader() const override { return header.c_str(); }
+    KivStringT<char> GetStoragePrefix() const override { return prefix.c_str(); }
+    Buffer const& GetData() const override {
+        const std::string content = fetch_();
+        fetched_ = Buffer();
+        fetched_.Append(content.data(), content.size());
+        return fetched_;
+    }
+
+    KivStringT<char16_t> id;
+    std::string header = "blob";
+    std::string prefix = "100644";
+
+protected:
+    cow_ptr<Blob> Copy() const override { return immu::make<HostBlob>(*this); }
+
+private:
+    std::function<std::string()> fetch_;
+    mutable Buffer fetched_;
+};
+
+/// A directory that shows itself to a host before it is gone.
+class HostTree : public Tree {
+public:
+    HostTree(Tree const& entries, std::function<void(Tree const&)> leave) : Tree(entries), leave_(std::move(leave)) {}
+    HostTree(HostTree const&) = default;
+    ~HostTree() override { leave_(*this); }
+
+protected:
+    cow_ptr<Tree> Copy() const override { return immu::make<HostTree>(*this); }
+
+private:
+    std::function<void(Tree const&)> leave_;
 };
 
 /// A commit whose identifier is what it is told to be, which counts how often it is asked for it and looks at its parent

@@ -39,9 +39,9 @@ public:
 
 private:
     struct Place;
+    struct Edit;
 
     [[nodiscard]] Place FindPlace(KivStringViewT<char16_t> name) const noexcept;
-    /// The one edit: inserts, replaces or, if nothing is held then, removes an entry.
     void Put(Place const& place, KivStringViewT<char16_t> name, KivStringT<char16_t> text, Held held);
 
     cow_ptr<Node> top_;

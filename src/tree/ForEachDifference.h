@@ -25,14 +25,8 @@ namespace KivVcs::detail {
     return mine.IsSharedWith(theirs) ? 0 : mine.Compare(theirs);
 }
 
-/// Whether no lookup by name can tell what is below two nodes apart because it is the same. A subtree hidden behind a blob
-/// differs even from itself.
-[[nodiscard]] inline bool IsSharedBelow(Node const* left, Node const* right) noexcept {
-    return left == right && (left == nullptr || !left->Total().HasSharedNames());
-}
-
 /// Hands every name below two nodes, either of which may be null, to @p visit, in order and with what both sides hold under
-/// it; but not what both hold as the same objects and no lookup by name can tell apart. Recurses only with the height.
+/// it; but not what both share and no lookup by name can tell apart. Recurses only with the height.
 template <class Visit>
 // NOLINTNEXTLINE(misc-no-recursion): as deep as the table is high
 void ForEachDifference(Node const* left, Node const* right, Visit const& visit) {
@@ -40,7 +34,8 @@ void ForEachDifference(Node const* left, Node const* right, Visit const& visit) 
         for (int index = 0; index < left->Count(); ++index) {
             Node const* const mine = left->ChildAt(index).node.get();
             Node const* const theirs = right->ChildAt(index).node.get();
-            if (!IsSharedBelow(mine, theirs))
+            // A subtree hidden behind a blob differs even from itself when it is looked up by name.
+            if (mine != theirs || mine->Total().HasSharedNames())
                 ForEachDifference(mine, theirs, visit);
         }
         return;
