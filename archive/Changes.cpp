@@ -28,7 +28,7 @@ void CheckRecord(std::optional<Buffer> const& value, std::string const& file) {
 Id::Digest const& DigestOf(Id const& id) {
     Id::Digest const* const digest = id.GetDigest();
     if (digest == nullptr)
-        throw std::invalid_argument("an identifier of an archive tells a digest");
+        throw std::invalid_argument("an identifier of an archive is a digest");
     return *digest;
 }
 

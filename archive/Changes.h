@@ -14,10 +14,10 @@ namespace KivArchive {
 /// The most bytes that a record may have.
 inline constexpr std::uint64_t largestRecord = 16 * largestWholeContent;
 
-/// The digest of an identifier that must tell one. @throws std::invalid_argument
+/// The digest of an identifier that must be one. @throws std::invalid_argument
 [[nodiscard]] Id::Digest const& DigestOf(Id const& id);
 
-/// Throws unless @p change can be stored anywhere: all its identifiers tell digests where they have to, and nothing is
+/// Throws unless @p change can be stored anywhere: all its identifiers are digests where they have to be, and nothing is
 /// too large. @throws std::invalid_argument, ArchiveError
 void CheckChange(Change const& change, std::string const& file);
 

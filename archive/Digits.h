@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Digests as the 64 lowercase hexadecimal digits that packed forms tell them by.
+/// Digests as the 64 lowercase hexadecimal digits that packed forms show.
 
 #include <array>
 #include <cstddef>
@@ -25,7 +25,7 @@ inline constexpr auto digitValues = [] {
     return values;
 }();
 
-/// Writes the digest that 64 digits tell; false if they are none.
+/// Writes the digest that 64 digits stand for; false if they are none.
 inline bool ReadDigits(const char* digits, std::byte* digest) noexcept {
     unsigned wrong = 0;
     for (std::size_t i = 0; i < digestSize; ++i) {

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Segments: what stored forms are kept in, many small ones or one large one. docs/archive.md tells the bytes.
+/// Segments: what stored forms are kept in, many small ones or one large one. docs/archive.md has the bytes.
 
 #include "Compression.h"
 #include "KivArchive/IArchive.h"

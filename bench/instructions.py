@@ -1,7 +1,7 @@
 """usage: bench/instructions.py DUMPS BASELINE TOOLS [--update]
 
 Compares the instructions that the dumps in the directory DUMPS counted, one for each workload, with those that the file
-BASELINE keeps, and ends with 1 if one has grown beyond the tolerance; --update writes BASELINE instead. TOOLS tells what
+BASELINE keeps, and ends with 1 if one has grown beyond the tolerance; --update writes BASELINE instead. TOOLS says what
 built and counted. What the compression function of SHA-256 takes is counted apart: it would hide everything else, and it is
 another one where the counting machine knows the processor's instructions for it.
 """

@@ -248,7 +248,7 @@ void SweepPieces(Connection& connection, SqliteStore& store) {
             if (Id const id = pieces.Identifier(0); inUse.count(DigestOf(id)) == 0)
                 unused.push_back(id);
     } catch (Malformed const&) {
-        // Which pieces a damaged content has cannot be told.
+        // Which pieces a damaged content has is not known.
         return;
     }
     if (unused.empty())

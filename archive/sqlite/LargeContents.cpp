@@ -10,7 +10,7 @@ namespace {
 /// How much is stored in one transaction.
 constexpr std::size_t piecesAtOnce = 8;
 
-/// Reads a content piece by piece, and tells in the end whether it is the one expected.
+/// Reads a content piece by piece, and says in the end whether it is the one expected.
 class PieceReader {
 public:
     PieceReader(StreamIO& content, std::uint64_t size)

@@ -51,7 +51,7 @@ void MakeForm(Prepared& prepared) {
 }
 
 void FindBase(Prepared& prepared, Prepared const* earlier, FormReader& reader, Database& database) {
-    // What is damaged is no base; reading tells.
+    // What is damaged is no base; reading finds out.
     try {
         std::optional<Place> place;
         std::optional<std::pair<Id, Place>> relied;

@@ -43,7 +43,7 @@ std::vector<Wanted> Locate(Database& database, std::span<const Id> ids, std::vec
     return wanted;
 }
 
-/// Runs @p read and tells whether what it reads is sound.
+/// Runs @p read. @return whether what it reads is sound
 template <class Read>
 bool IsSound(Read read) {
     try {

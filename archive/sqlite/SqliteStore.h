@@ -71,7 +71,7 @@ private:
     std::uint64_t held_ = 0;
 };
 
-/// What the table of objects tells.
+/// What the table of objects stores.
 struct ObjectRow {
     StoredType type = StoredType::Blob;
     Place place;

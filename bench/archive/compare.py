@@ -2,7 +2,7 @@
 """usage: compare.py PROGRAM [--quick]
 
 Runs kivvcs_archive_bench beside git, in turns, and prints one table: what was done, git, the archive, the ratio and the
-limit that docs/archive.md tells. Times are medians of five runs (of one with --quick), sizes sums of file sizes.
+limit that docs/archive.md sets. Times are medians of five runs (of one with --quick), sizes sums of file sizes.
 """
 
 import os

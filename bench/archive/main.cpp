@@ -1,6 +1,6 @@
 // What `scripts/bench.sh archive` runs beside git: kivvcs_archive_bench COMMAND ARCHIVE [ARGUMENT...]
 //   import ARCHIVE DIRECTORY      publishes a directory as one version
-//   versions ARCHIVE              publishes versions told on standard input: "F PATH SIZE\nBYTES\n", then "C\n" for each
+//   versions ARCHIVE              publishes versions given on standard input: "F PATH SIZE\nBYTES\n", then "C\n" for each
 //   restore ARCHIVE DIRECTORY     writes the newest version to a new directory
 //   log ARCHIVE COUNT             prints the newest commits
 //   diff ARCHIVE                  prints what differs between the newest version and the oldest one

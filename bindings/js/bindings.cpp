@@ -268,7 +268,7 @@ public:
 
     Draft Edit(CommitHandle const* parent, bool amend) { return {repository_, CommitHandle::From(parent), amend}; }
 
-    /// @p file and @p directory are given a conflict and tell the number of a choice.
+    /// @p file and @p directory are given a conflict and return the number of a choice.
     val Merge(CommitHandle const& commit, val const& file, val const& directory) {
         const MergeOutcome merged =
             MergeWithOutcome(repository_, commit.Get(),

@@ -1,6 +1,6 @@
 // Version control in memory: commits of named files on branches, for pages and for node.
 
-/** What goes wrong, told in a sentence. What the caller's own functions throw passes through as it is. */
+/** What goes wrong, in a sentence. What the caller's own functions throw passes through as it is. */
 export class KivVcsError extends Error {}
 
 /**

@@ -2,7 +2,7 @@
 
 /// @file
 /// What every archive must do, for those who write one: hand `CheckArchiveConformance` a way to make empty archives and
-/// a place to tell failures to. Needs no test framework and no more than the library.
+/// a place to report failures to. Needs no test framework and no more than the library.
 
 #include "KivArchive/IArchive.h"
 
@@ -21,7 +21,7 @@ namespace KivArchive {
 /// An archive is tried with nothing but what is in it; each case begins with an empty one.
 using ArchiveMaker = std::function<std::unique_ptr<IArchive>()>;
 
-/// Told what is wrong, in a sentence that begins with the case. May throw, which ends the check.
+/// Receives what is wrong, in a sentence that begins with the case. May throw, which ends the check.
 using ConformanceFailure = std::function<void(std::string const&)>;
 
 namespace Conformance {
@@ -183,12 +183,12 @@ private:
             Expect(data != found.end() && data->second == TextOf(object.data), "objects come back as they were stored");
             auto const info = archive.Describe({&object.id, 1});
             Expect(info.size() == 1 && info[0].type == object.type && info[0].size == object.data.GetSize(),
-                   "types and sizes are told");
+                   "types and sizes are reported");
         }
         Id const unknown = Object(ObjectType::Blob, "unknown").id;
         std::vector<Id> const asked{ids[1], unknown, ids[7]};
         ReadOutcome const outcome = archive.Read(asked, [](ArchivedObject const&) {});
-        Expect(outcome.missing == std::vector<Id>{unknown} && outcome.damaged.empty(), "missing objects are told");
+        Expect(outcome.missing == std::vector<Id>{unknown} && outcome.damaged.empty(), "missing objects are reported");
 
         // Page by page in ascending order.
         std::vector<Id> listed;
@@ -265,7 +265,7 @@ private:
                        archive.FindMissing({&id, 1}).empty(),
                    "a large content is stored");
             auto const info = archive.Describe({&id, 1});
-            Expect(info.size() == 1 && info[0].size == data.size(), "its size is told");
+            Expect(info.size() == 1 && info[0].size == data.size(), "its size is reported");
             std::size_t taken = 0;
             archive.Read({&id, 1}, [&](ArchivedObject const& object) {
                 taken += object.data.empty() && object.size == data.size() ? 1U : 100U;
@@ -307,7 +307,7 @@ private:
                    {two.object}));
         Expect(!outcome.applied && outcome.movedBranches.size() == 1 && outcome.movedBranches[0].name == odd &&
                    outcome.movedBranches[0].head == one.object.id,
-               "a lost race tells the branch and its head");
+               "a lost race names the branch and its head");
         Expect(archive.FindMissing({&two.object.id, 1}).size() == 1 && archive.ReadBranches().size() == 2,
                "a lost race stores nothing");
         Expect(
@@ -347,7 +347,7 @@ private:
         auto const outcome = archive.Apply(Setting(u"settings", BufferOf("2"), true, BufferOf("0")));
         Expect(!outcome.applied && outcome.changedRecords.size() == 1 &&
                    TextOf(outcome.changedRecords[0].value.value_or(Buffer())) == "1",
-               "a lost race tells the value");
+               "a lost race gives the value");
         Expect(!archive.Apply(Setting(odd, BufferOf("x"), true)).applied, "an empty record is not a missing one");
         Expect(archive.Apply(Setting(u"settings", BufferOf("2"), true, BufferOf("1"))).applied, "a record is changed");
         Expect(archive.ListRecords() == std::vector<KivStringT<char16_t>>{odd, u"settings"}, "records are listed");
@@ -395,11 +395,11 @@ private:
                "parents come nearest first, as many as asked for");
         std::vector<Id> const starts{ids[1], ids[0], Object(ObjectType::Blob, "unknown").id, ids[1]};
         Expect(idsOf(archive.ReadAncestry(starts, Follow::Everything, 100)) == std::vector<Id>{ids[1], ids[0]},
-               "each commit is told once, unknown ones are not");
+               "each commit is reported once, unknown ones are not");
         Expect(archive.ReadAncestry({&ids[49], 1}, Follow::Parents, 100).size() == 50 &&
                    archive.ReadAncestry({&ids[49], 1}, Follow::Reachable, 100).size() == 51 &&
                    archive.ReadAncestry({&ids[49], 1}, Follow::Everything, 100).size() == 52,
-               "walks follow what they are told to, and end");
+               "walks follow what they are asked to, and end");
         Expect(archive.ListAncestry({}, 30).size() == 30 &&
                    archive.ListAncestry(archive.ListAncestry({}, 30).back().commit, 30).size() == 22 &&
                    archive.GetStatistics().ancestries == 52,
@@ -422,7 +422,7 @@ private:
         archive.Mark(ids);
         archive.Mark(std::vector<Id>{Object(ObjectType::Blob, "unknown").id});
         Expect(marked(none) == 3 && marked(hour) == 0 && archive.GetStatistics().marked == 3,
-               "marks are told once their time has come");
+               "marks are reported once their time has come");
         Expect(archive.Remove(ids, hour) == ids, "nothing is removed before its time");
         Change reliance;
         reliance.relied = {tree.id};
@@ -484,7 +484,7 @@ private:
         } catch (std::invalid_argument const&) {
             refused = true;
         }
-        Expect(refused, "identifiers must tell digests");
+        Expect(refused, "identifiers must be digests");
 
         NewObject const object = Object(ObjectType::Blob, "sound");
         Store(archive, {object});

@@ -184,12 +184,12 @@ struct ArchiveStatistics {
 /// branches and records move in the last one. What was stored ahead and never reached by a branch is invisible and
 /// becomes `Collect`'s.
 ///
-/// All identifiers given tell digests (`Id::GetDigest` is not null), except where null is allowed. An empty batch is
-/// allowed everywhere. Where an order is not told there is none.
+/// All identifiers given are digests (`Id::GetDigest` is not null), except where null is allowed. An empty batch is
+/// allowed everywhere. Where no order is given there is none.
 ///
 /// Threads: all operations may run concurrently on one archive, which several repositories may share.
 /// @throws ArchiveError from every operation, for what concerns the archive as a whole; std::bad_alloc;
-/// std::invalid_argument for an identifier that tells no digest
+/// std::invalid_argument for an identifier that is no digest
 class KIVARCHIVE_EXPORT IArchive {
 public:
     virtual ~IArchive();
@@ -201,7 +201,7 @@ public:
     [[nodiscard]] virtual std::vector<ObjectInfo> Describe(std::span<const Id> ids) = 0;
 
     /// Hands those of @p ids that are there to @p receiver, each at least once, in the order that is cheapest. The
-    /// identifiers may stay in use by the receiver's copies only. Damage is local: it is told in the outcome, and the
+    /// identifiers may stay in use by the receiver's copies only. Damage is local: it is reported in the outcome, and the
     /// rest is given.
     virtual ReadOutcome Read(std::span<const Id> ids, ObjectReceiver const& receiver) = 0;
 
@@ -248,7 +248,7 @@ public:
     /// @p after on; null begins with the first.
     [[nodiscard]] virtual std::vector<Ancestry> ListAncestry(Id const& after, std::size_t limit) = 0;
 
-    /// Up to @p limit objects, in the same manner. Objects that are damaged so that their size cannot be told have
+    /// Up to @p limit objects, in the same manner. Objects that are damaged so that their size is not known have
     /// size 0.
     [[nodiscard]] virtual std::vector<ObjectInfo> ListObjects(Id const& after, std::size_t limit) = 0;
 

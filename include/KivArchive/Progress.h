@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// How long operations tell how far they are, and how a host stops them.
+/// How long operations report how far they are, and how a host stops them.
 
 #include "KivArchive/Export.h"
 

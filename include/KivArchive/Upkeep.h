@@ -40,7 +40,7 @@ struct VerifyReport {
     std::vector<MissingObject> missing;
     /// Branches whose head is not a commit that is there and sound.
     std::vector<Branch> branches;
-    /// Commits that are there and whose facts are missing, or tell another parent or tree than they do.
+    /// Commits that are there and whose facts are missing, or name another parent or tree than they do.
     std::vector<Id> ancestry;
 
     [[nodiscard]] bool IsSound() const noexcept {

@@ -36,7 +36,7 @@ public:
     Id(Buffer const& packed);
     /// The identifier with the given text, whatever it is. @throws std::bad_alloc
     explicit Id(KivStringT<char16_t> const& text);
-    /// The identifier whose text tells @p digest.
+    /// The identifier whose text stands for @p digest.
     [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return {digest, HashOf(digest)}; }
 
     /// The identifier that 64 hexadecimal digits, of either case, spell; nothing for any other text.
@@ -72,13 +72,13 @@ public:
     /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
     [[nodiscard]] std::size_t Hash() const noexcept { return hash_; }
 
-    /// The digest that the text tells; null if it is not 64 lowercase hexadecimal digits.
+    /// The digest that the text stands for; null if it is not 64 lowercase hexadecimal digits.
     [[nodiscard]] Digest const* GetDigest() const noexcept { return tellsDigest_ ? &digest_ : nullptr; }
 
     friend bool operator==(Id const& left, Id const& right) noexcept {
         if (left.hash_ != right.hash_ || left.tellsDigest_ != right.tellsDigest_)
             return false;
-        // A text that tells a digest is always kept as one, so that the two kinds never have the same text.
+        // A text that stands for a digest is always kept as one, so that the two kinds never have the same text.
         return left.tellsDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
     }
 

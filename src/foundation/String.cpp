@@ -20,7 +20,7 @@ KivStringT<C>& KivStringT<C>::operator+=(View text) {
         return *this;
     const int length = GetLength();
     if (text.GetLength() > std::numeric_limits<int>::max() - length)
-        throw std::length_error("text longer than a signed 32-bit length can tell");
+        throw std::length_error("text longer than a signed 32-bit length can hold");
     const int joined = length + text.GetLength();
     const bool fits =
         text_ != nullptr && text_->references.load(std::memory_order_acquire) == 1 && text_->capacity >= joined;

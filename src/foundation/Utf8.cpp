@@ -13,7 +13,7 @@ using KivPlatform::KivStringViewT;
 
 KivStringT<char16_t> FromUtf8(std::string_view bytes) {
     if (bytes.size() > static_cast<std::size_t>(std::numeric_limits<int>::max()))
-        throw std::length_error("text longer than a signed 32-bit length can tell");
+        throw std::length_error("text longer than a signed 32-bit length can hold");
     return String::ToStringW(KivStringViewT<char>(bytes.data(), static_cast<int>(bytes.size())));
 }
 

@@ -12,7 +12,7 @@ void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t
 /// `Id::GetText` it leaves nothing behind.
 char* WriteDigits(Id::Digest const& digest, char* out) noexcept;
 
-/// The identifier that @p text tells, as packed forms show it. @throws std::bad_alloc
+/// The identifier of @p text, as packed forms show it. @throws std::bad_alloc
 [[nodiscard]] Id ReadId(KivStringViewT<char> text);
 
 /// Computes the identifier of a packed form that is fed piece by piece instead of being put together.

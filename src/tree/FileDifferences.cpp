@@ -98,7 +98,7 @@ KivStringViewT<char16_t> NameOf(KivStringT<char16_t> const& path) noexcept {
 }
 
 /// Makes every file that went and one of equal content that came one renamed file, where @p keyOf, which begins with the
-/// identifier, tells both the same; of several such the first ones.
+/// identifier, has both the same; of several such the first ones.
 template <class KeyOf>
 void PairRenames(std::vector<Difference>& differences, KeyOf keyOf) {
     std::vector<Difference*> gone;

@@ -28,7 +28,7 @@ public:
             return name;
         const std::size_t length = text_.size() + static_cast<std::size_t>(name.GetLength());
         if (length > static_cast<std::size_t>(std::numeric_limits<int>::max()))
-            throw std::length_error("path longer than a signed 32-bit length can tell");
+            throw std::length_error("path longer than a signed 32-bit length can hold");
         return KivStringT<char16_t>::Build(static_cast<int>(length), [this, &name](char16_t* path) {
             path = std::copy(text_.begin(), text_.end(), path);
             std::copy_n(name.GetString(), name.GetLength(), path);

@@ -118,7 +118,7 @@ private:
     std::string text_;
 };
 
-/// A number that the environment tells, for trials that can be made longer.
+/// A number that the environment sets, for trials that can be made longer.
 inline int CountFromEnvironment(const char* name, int otherwise) {
     const char* const value = std::getenv(name);
     return value == nullptr ? otherwise : std::atoi(value);

@@ -233,7 +233,7 @@ TEST(SqliteArchive, TellsDamageAndGivesWhatIsSound) {
     EXPECT_GT(partial, 0);
 }
 
-/// Publishes and collects until it is killed, and tells every head that it has published.
+/// Publishes and collects until it is killed, and reports every head that it has published.
 [[noreturn]] void PublishForever(std::string const& path, std::uint32_t seed, int told) {
     try {
         SqliteArchive archive(path);
@@ -256,7 +256,7 @@ TEST(SqliteArchive, TellsDamageAndGivesWhatIsSound) {
     }
 }
 
-/// The head that was told last before the end.
+/// The head that was reported last before the end.
 Id LastTold(int pipe) {
     Id last;
     for (Id::Digest digest{}; read(pipe, digest.data(), digest.size()) == static_cast<ssize_t>(digest.size());)

@@ -10,7 +10,7 @@ namespace KivVcs {
 
 struct Interruption : std::exception {};
 
-/// Counts the calls to a host, and throws at the one that it is told, unless that is 0.
+/// Counts the calls to a host, and throws at the given one, unless that is 0.
 class Countdown {
 public:
     void Start(unsigned calls) { left_ = calls; }

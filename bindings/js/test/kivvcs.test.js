@@ -88,7 +88,7 @@ test("files are listed, read and compared", () => {
     assert.equal(repository.commit({ amend: true, description: "Amended" }).parent().id, before.id);
 });
 
-test("a merge tells all conflicts, asks its resolvers, and lets their exceptions pass", () => {
+test("a merge lists all conflicts, asks its resolvers, and lets their exceptions pass", () => {
     const { repository, base, mine, theirs } = twoSides();
     const { kind, conflicts } = repository.merge(theirs);
     assert.equal(kind, "gave up");
@@ -144,7 +144,7 @@ test("packed forms rebuild a history, and nothing of it if one is missing or dam
     await assert.rejects(new Repository().read(second.treeId, (id) => store.get(id)), /not one of a commit/);
 });
 
-test("mistakes are told in sentences and change nothing", () => {
+test("mistakes are explained in sentences and change nothing", () => {
     const { repository, mine, theirs } = twoSides();
     const before = repository.counts();
     refuses(() => repository.commit({ files: { "a/b": "1" } }), /"a" is a file; remove it first/);

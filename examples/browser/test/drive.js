@@ -203,7 +203,7 @@ const versions = published.Ada.length + published.Bo.length;
 assert.deepEqual(complaints, []);
 console.log(`${reloads} reloads at random moments, ${versions} times a version was saved, none was lost`);
 
-// A damaged store is told, and not used.
+// A damaged store is reported, and not used.
 const damaged = (await stored("Ada")).heads.newest;
 await page.evaluate(async (id) => {
     const { Store } = await import("./store.js");
