@@ -14,4 +14,5 @@ cd "$source_directory"
 KIVVCS_VERSION=$(sed -n 's/^project(KivVcs VERSION \([0-9.]*\).*/\1/p' CMakeLists.txt)
 export KIVVCS_VERSION KIVVCS_SITE=$site KIVVCS_SOURCE=$source_directory
 quietly doxygen docs/Doxyfile || die "building the site failed"
+python3 docs/check_links.py "$site/html" || die "the site has dead links"
 printf 'The site is in %s\n' "$site/html/index.html"

@@ -46,7 +46,7 @@ packages_of() {
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
     abi) echo abigail-tools xz-utils ;;
-    docs) echo doxygen doxygen-awesome-css ;;
+    docs) echo doxygen doxygen-awesome-css python3 ;;
     lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck python3 ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 ;;
     plot) echo python3-matplotlib ;;
