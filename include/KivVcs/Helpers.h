@@ -9,10 +9,8 @@
 #include <string_view>
 #include <vector>
 
-namespace KivVcs {
-
 /// What every object format uses.
-namespace Helpers {
+namespace KivVcs::Helpers {
 
 /// The SHA-256 digest of @p size bytes as 64 lowercase hexadecimal digits; the empty text if @p data is null, also for
 /// size 0.
@@ -48,6 +46,4 @@ KIVVCS_EXPORT bool ShiftObjectIdentifier(StreamIO& stream, KivStringViewT<char> 
 /// The segments between the "/" of @p path, in order, without the empty ones; views into @p path.
 [[nodiscard]] KIVVCS_EXPORT std::vector<KivStringViewT<char16_t>> SplitVcsPath(KivStringViewT<char16_t> path);
 
-} // namespace Helpers
-
-} // namespace KivVcs
+} // namespace KivVcs::Helpers

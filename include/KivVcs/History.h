@@ -60,6 +60,7 @@ public:
     [[nodiscard]] reference operator*() const noexcept { return commit_; }
     [[nodiscard]] pointer operator->() const noexcept { return &commit_; }
     Iterator& operator++();
+    // NOLINTNEXTLINE(cert-dcl21-cpp): as iterators of the standard do
     Iterator operator++(int) {
         Iterator before = *this;
         ++*this;

@@ -70,7 +70,7 @@ History::Iterator& History::Iterator::operator++() {
 }
 
 Differences DifferencesFromParent(Commit const& commit, DifferenceOptions const& options) {
-    const cow_ptr<Commit> parent = commit.GetParent();
+    auto const& parent = commit.GetParent();
     return {parent ? parent->GetCommitTree() : cow_ptr<CommitTree>(), commit.GetCommitTree(), options};
 }
 
