@@ -189,7 +189,7 @@ ChangeOutcome MemArchive::Apply(Change const& change) {
     CheckChange(change, {});
     std::map<Digest, StoredObject> added;
     for (NewObject const& object : change.objects)
-        added.try_emplace(DigestOf(object.id), object.type, Joined(object.data));
+        added.try_emplace(DigestOf(object.id), StoredObject{object.type, Joined(object.data)});
 
     std::scoped_lock const lock(state_->mutex);
     ChangeOutcome outcome = state_->Compare(change);

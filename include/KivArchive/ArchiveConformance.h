@@ -257,7 +257,9 @@ private:
         std::string const first = SomeNoise(5, 3500000) + SomeText(6, 3500000);
         std::string second = first;
         second.insert(1234567, "inserted");
-        for (auto const& [data, earlier] : {std::pair{first, Id()}, {second, Object(ObjectType::Blob, first).id}}) {
+        for (auto const& content : {std::pair{first, Id()}, {second, Object(ObjectType::Blob, first).id}}) {
+            std::string const& data = content.first;
+            Id const& earlier = content.second;
             Id const id = Object(ObjectType::Blob, data).id;
             Expect(!StoreStream(archive, id, data + "x", earlier) && archive.FindMissing({&id, 1}).size() == 1,
                    "a content that has changed is not stored");
