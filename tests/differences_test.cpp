@@ -8,18 +8,15 @@
 namespace KivVcs {
 namespace {
 
-const std::map<ChangeKind, std::string> kindWords{{ChangeKind::Unchanged, "="},
-                                                  {ChangeKind::Added, "+"},
-                                                  {ChangeKind::Removed, "-"},
-                                                  {ChangeKind::Changed, "*"},
-                                                  {ChangeKind::DirectoryBecameFile, "f"},
-                                                  {ChangeKind::FileBecameDirectory, "d"},
-                                                  {ChangeKind::Renamed, ">"}};
+std::string WordOf(ChangeKind kind) {
+    return {"=+-*fd>"[static_cast<int>(kind)]};
+}
 
 std::string Told(Differences const& differences) {
     std::vector<std::string> words;
+    words.reserve(differences.GetCount());
     for (auto const& each : differences)
-        words.push_back(kindWords.at(each.kind) + (each.oldPath.IsEmpty() ? "" : Narrow(each.oldPath) + ">") +
+        words.push_back(WordOf(each.kind) + (each.oldPath.IsEmpty() ? "" : Narrow(each.oldPath) + ">") +
                         Narrow(each.path));
     return Joined(words);
 }
@@ -80,7 +77,7 @@ TEST_F(Differing, AgreesWithListingsAndLookupsOverRandomTrees) {
             };
             const std::map<std::string, std::string> expected{
                 {"ff", "*"}, {"f ", "-"}, {" f", "+"}, {"fd", "d"}, {"df", "f"}};
-            EXPECT_EQ(kindWords.at(each.kind), expected.at({kindOf(before), kindOf(after)})) << seed;
+            EXPECT_EQ(WordOf(each.kind), expected.at({kindOf(before), kindOf(after)})) << seed;
         }
         EXPECT_EQ(paths, before->GetDeepBlobDiffs(after)) << seed;
     }

@@ -13,6 +13,7 @@ using Path = array_view<KivStringViewT<char16_t> const>;
 /// "path:LR=S": what left and right did, and how it was settled; directories end with "/".
 std::string Told(std::vector<MergeConflict> const& conflicts) {
     std::vector<std::string> words;
+    words.reserve(conflicts.size());
     for (auto const& each : conflicts)
         words.push_back(Narrow(each.path) + (each.isDirectory ? "/" : "") + ":" +
                         "=+-*fd>"[static_cast<int>(each.leftChange)] + "=+-*fd>"[static_cast<int>(each.rightChange)] +

@@ -114,6 +114,7 @@ TEST(HostIds, ReadEitherCaseAndAreOrderedAsTheirTexts) {
     for (auto const& text : texts)
         ids.insert(Id(Wide(text)));
     std::vector<std::string> printed;
+    printed.reserve(ids.size());
     for (auto const& id : ids)
         printed.push_back(Printed(id));
     EXPECT_EQ(printed, std::vector<std::string>(texts.begin(), texts.end()));
