@@ -6,6 +6,8 @@
 
 #include <typeinfo>
 
+#include <typeinfo>
+
 namespace KivVcs {
 
 using detail::Held;
