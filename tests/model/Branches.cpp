@@ -9,6 +9,7 @@ namespace {
 const Action actions[] = {
     {"DoCommit", 14, [](World& w) {
          const auto done = w.repository.DoCommit(w.draft);
+         w.NeedHost();
          Expect("whether it is committed", !!done, !w.draft.IsAmend() || w.plain.Head());
          if (!done)
              return;
@@ -19,7 +20,7 @@ const Action actions[] = {
      }},
     {"store the commit", 6, [](World& w) {
          const auto branch = w.PickBranch();
-         const auto stored = w.repository.SyncWithStorage(immu::make<Commit>(w.draft));
+         const auto stored = w.repository.SyncWithStorage(w.PickClass(w.draft));
          const bool done = w.plain.Move(branch, w.plain.Store(w.plainDraft));
          Expect("done", w.repository.MoveBranchTo(Wide(branch), stored), done);
      }},

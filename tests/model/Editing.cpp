@@ -9,13 +9,13 @@ namespace {
 const Action actions[] = {
     {"AddBlob", 24, [](World& w) {
          const std::string content = w.PickContent();
-         const Blob blob = MakeBlob(content);
-         w.EditPath([&](auto& to, auto const& path) { return !!to.AddBlob(&w.repository, path, blob); }, content);
+         const auto blob = w.PickClass(content);
+         w.EditPath([&](auto& to, auto const& path) { return !!to.AddBlob(&w.repository, path, *blob); }, content);
      }},
     {"AddTree", 6, [](World& w) {
          const Side side = w.PickSide();
-         const Tree added = side.tree ? *side.tree : Tree();
-         w.EditPath([&](auto& to, auto const& path) { return !!to.AddTree(&w.repository, path, added); },
+         const auto added = w.PickClass(side.tree ? *side.tree : Tree());
+         w.EditPath([&](auto& to, auto const& path) { return !!to.AddTree(&w.repository, path, *added); },
                     side.plain.value_or(PlainTree()));
      }},
     {"AddObject", 6, [](World& w) {
@@ -43,7 +43,7 @@ const Action actions[] = {
          w.plainTree = side.plain.value_or(PlainTree());
      }},
     {"ReplaceRoot", 2, [](World& w) {
-         w.draft.ReplaceRoot(&w.repository, immu::make<Tree>(w.tree));
+         w.draft.ReplaceRoot(&w.repository, w.PickClass(w.tree));
          w.draft.ResetState();
          w.plainDraft.root = w.plain.Intern(w.plainTree);
      }},
@@ -61,7 +61,10 @@ const Action actions[] = {
     {"begin a commit", 16, [](World& w) {
          const bool isAmend = w.Below(4) == 0;
          const Version on = w.Below(2) == 0 ? Version{w.repository.GetHead(), w.plain.Head()} : w.PickVersion();
-         w.draft = Commit(on.commit, isAmend);
+         Commit begun(on.commit, isAmend);
+         if (on.plain && w.Below(4) == 0)
+             w.Defer(begun, on);
+         w.draft = std::move(begun);
          w.plainDraft = on.plain ? *on.plain : PlainCommit();
          if (!isAmend)
              w.plainDraft = {.parent = on.plain, .root = w.plainDraft.root};
@@ -79,7 +82,7 @@ const Action actions[] = {
              Tree tree = base.tree ? *base.tree : Tree();
              PlainTree plain = base.plain.value_or(PlainTree());
              for (auto const& [names, edit] : ordered) {
-                 tree.AddBlob(&w.repository, edit.first, MakeBlob(edit.second));
+                 tree.AddBlob(&w.repository, edit.first, *w.PickClass(edit.second));
                  w.plain.AddTo(plain, names, edit.second);
              }
              Expect("the tree", Narrow(tree.GetId().GetText()), IdOf(plain));

@@ -17,7 +17,7 @@ const Action actions[] = {
          Expect("mirrored", w.Merge(left, root, right, {salt}), w.Merge(right, root, left, {salt, true}));
          if (!left.tree)
              return;
-         const Side equal{immu::make<Tree>(*left.tree), left.plain};
+         const Side equal{w.PickClass(*left.tree), left.plain};
          Expect("merge(a, r, a)", w.Merge(left, root, equal, {1}), IdText(left.plain));
          // A tree with a name of both kinds differs from itself there, so that its side counts as changed.
          const auto isDoubled = [&root](auto const& below) { return root.plain->blobs.contains(below.first); };

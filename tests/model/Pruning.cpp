@@ -43,6 +43,7 @@ const Action actions[] = {
          const bool hasEmpty = version.files.empty() || (version.files + " ").find("/ ") != std::string::npos;
          if (hasEmpty || !version.plain || !w.plain.commits.contains(version.plain->id))
              return;
+         w.NeedHost();
          PackedFormsOf forms(w.repository);
          Repository mirror(std::make_unique<MemObjectsStorage>());
          Id parent;

@@ -76,9 +76,10 @@ struct Answers {
         return isMirrored && decided != root ? (isTree ? 3 : 1) - decided : decided;
     }
 
-    Resolvers AsResolvers() {
+    Resolvers AsResolvers(HostCalls& calls) {
         using Path = array_view<KivStringViewT<char16_t> const>;
-        const auto ask = [this](Path path, bool isTree) {
+        const auto ask = [this, &calls](Path path, bool isTree) {
+            calls.Count();
             std::string text;
             for (auto name : path)
                 text += Narrow(name) + "/";
@@ -105,6 +106,25 @@ struct World {
     std::string Note(std::string const& text) {
         log += " " + (text.empty() ? "''" : text);
         return text;
+    }
+
+    /// An object as it is, or one of a host's class that stands for it.
+    cow_ptr<Blob> PickClass(std::string const& content) {
+        return Below(3) == 0 ? cow_ptr<Blob>(immu::make<FetchedBlob>(content, calls))
+                             : immu::make<Blob>(MakeBlob(content));
+    }
+    template <class T>
+    cow_ptr<T> PickClass(T const& object) {
+        return Below(3) == 0 ? cow_ptr<T>(immu::make<HostsOwn<T>>(object, calls)) : immu::make<T>(object);
+    }
+
+    /// Lets @p begun, which was begun on @p on, fetch parent and root when they are asked for.
+    void Defer(Commit& begun, Version const& on) {
+        kept.push_back(on);
+        if (const auto parent = begun.GetParent())
+            begun.DeferParent(parent->GetId(), [this, parent](Id const&) { return calls.Count(), parent; });
+        if (const auto root = begun.GetCommitTree()->GetRoot())
+            begun.DeferRoot(root->GetId(), [this, root](Id const&) { return calls.Count(), root; });
     }
 
     std::string PickContent() { return Note(std::to_string(Below(3))); }
@@ -138,7 +158,7 @@ struct World {
     /// The host's tree, or the root of a commit unless that has grown large.
     Side PickSide() {
         if (Below(6) == 0 && Files(plainTree).size() < 300)
-            return {immu::make<Tree>(tree), plainTree};
+            return {PickClass(tree), plainTree};
         const Version version = PickVersion();
         const bool isSmall = version.plain && version.files.size() < 300;
         return isSmall ? Side{RootOf(version.commit), version.plain->root} : Side();
@@ -169,7 +189,7 @@ struct World {
     /// Merges here and there. @return the identifier of the result
     std::string Merge(Side const& left, Side const& root, Side const& right, Answers answers) {
         Answers plainAnswers = answers;
-        const auto merged = ThreeWayMerge(&repository, {left.tree, root.tree, right.tree}, answers.AsResolvers());
+        const auto merged = ThreeWayMerge(&repository, {left.tree, root.tree, right.tree}, answers.AsResolvers(calls));
         const auto expected = MergePlainly(left.plain, root.plain, right.plain, plainAnswers);
         Expect("the merged tree", IdText(merged), IdText(expected));
         Expect("what is asked", answers.asked, plainAnswers.asked);
@@ -186,9 +206,9 @@ struct World {
         Answers plainAnswers = answers;
         const PlainCommit::Pointer head = plain.Head();
         bool expected = false;
-        const bool done = alwaysByTrees ? repository.Merge3Way(version.commit, answers.AsResolvers())
-                                        : repository.Merge(version.commit, answers.AsResolvers());
-        countdown.Stop();
+        const bool done = alwaysByTrees ? repository.Merge3Way(version.commit, answers.AsResolvers(calls))
+                                        : repository.Merge(version.commit, answers.AsResolvers(calls));
+        NeedHost();
         if (version.plain && !alwaysByTrees)
             expected = head ? plain.FastForward(version.plain) : plain.Move(plain.current, version.plain);
         if (version.plain && head && !expected) {
@@ -208,8 +228,9 @@ struct World {
 
     void Purge() {
         std::vector<PlainCommit::Pointer> commits{std::make_shared<PlainCommit>(plainDraft)};
-        for (Version const& version : held)
-            commits.push_back(version.plain);
+        for (auto const* versions : {&held, &kept})
+            for (Version const& version : *versions)
+                commits.push_back(version.plain);
         plain.Purge(std::move(commits), {&plainTree});
     }
 
@@ -217,36 +238,50 @@ struct World {
     /// it was, but for what may have been stored already.
     void Run(auto action, unsigned number) {
         random.seed(number);
-        if (number % 4 != 0)
-            return action(*this);
-        auto former = std::tuple(plain, plainDraft, plainTree);
-        countdown.Start(1 + number / 4 % 24);
-        try {
+        calls.PermitContent(false);
+        if (number % 4 != 0) {
             action(*this);
-            countdown.Stop();
-        } catch (Interruption const&) {
-            countdown.Stop();
-            log += "\ninterrupted, and once more";
-            std::tie(plain, plainDraft, plainTree) = std::move(former);
-            TakeTime(plainDraft, draft);
-            repository.UpdateStorage();
-            Purge();
-            CheckAll();
-            random.seed(number);
-            action(*this);
+        } else {
+            auto former = std::tuple(plain, plainDraft, plainTree);
+            calls.InterruptAt(1 + number / 4 % 24);
+            try {
+                action(*this);
+            } catch (Interruption const&) {
+                log += "\ninterrupted, and once more";
+                std::tie(plain, plainDraft, plainTree) = std::move(former);
+                Recover();
+                random.seed(number);
+                calls.PermitContent(false);
+                action(*this);
+            }
         }
+        NeedHost();
+    }
+
+    /// Nothing fails from now on, and content may be asked for.
+    void NeedHost() {
+        calls.InterruptAt(0);
+        calls.PermitContent(true);
+    }
+
+    /// Purges what was stored before an interruption, and expects everything else as it was.
+    void Recover() {
+        NeedHost();
+        TakeTime(plainDraft, draft);
+        repository.UpdateStorage();
+        Purge();
+        CheckAll();
     }
 
     /// Runs an operation that may stop halfway in a clone, and expects that each head has the content that it had.
     void InterruptInClone(auto operation) {
-        countdown.Stop();
-        InterruptingRepository clone(repository.GetStorage()->Clone(), countdown);
-        countdown.Start(1 + static_cast<unsigned>(Below(60)));
+        InterruptingRepository clone(repository.GetStorage()->Clone(), calls);
+        calls.InterruptAt(1 + static_cast<unsigned>(Below(60)));
         try {
             operation(clone);
         } catch (Interruption const&) {
         }
-        countdown.Stop();
+        NeedHost();
         for (auto const& [name, head] : plain.branches) {
             if (!head)
                 continue;
@@ -299,14 +334,16 @@ struct World {
         Expect("the differences", Joined(ToNames(tree.GetDeepBlobDiffs(other.tree))), Joined(Sorted(differing)));
     }
 
-    Countdown countdown;
-    InterruptingRepository repository{std::make_unique<InterruptingStorage>(countdown), countdown};
+    HostCalls calls;
+    InterruptingRepository repository{std::make_unique<InterruptingStorage>(calls), calls};
     PlainRepository plain;
     Commit draft{cow_ptr<Commit>(), false};
     PlainCommit plainDraft;
     Tree tree;
     PlainTree plainTree;
     std::vector<Version> held;
+    /// What functions that fetch have to keep alive.
+    std::vector<Version> kept;
     std::minstd_rand random;
     std::string log;
 };

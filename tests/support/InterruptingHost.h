@@ -1,34 +1,42 @@
 #pragma once
 
-#include "KivVcs/KivVcs.h"
+#include "support/Builders.h"
 
 #include <exception>
+#include <stdexcept>
 
-/// A host whose operations fail in the middle of what the library does.
+/// A host whose storage, repository and objects fail in the middle of what the library does.
 
 namespace KivVcs {
 
 struct Interruption : std::exception {};
 
 /// Counts the calls to a host, and throws at the given one, unless that is 0.
-class Countdown {
+class HostCalls {
 public:
-    void Start(unsigned calls) { left_ = calls; }
-    void Stop() { left_ = 0; }
+    void InterruptAt(unsigned call) { left_ = call; }
     void Count() {
         if (left_ != 0 && --left_ == 0)
             throw Interruption();
     }
+    /// Whether content may be asked for.
+    void PermitContent(bool isPermitted) { isContentPermitted_ = isPermitted; }
+    void CountContent() {
+        if (!isContentPermitted_)
+            throw std::logic_error("content was asked for that is not needed");
+        Count();
+    }
 
 private:
     unsigned left_ = 0;
+    bool isContentPermitted_ = true;
 };
 
 class InterruptingStorage : public MemObjectsStorage {
     using Name = KivStringViewT<char16_t>;
 
 public:
-    explicit InterruptingStorage(Countdown& countdown) : countdown_(&countdown) {}
+    explicit InterruptingStorage(HostCalls& calls) : calls_(&calls) {}
 
     std::unique_ptr<IObjectsStorage> Clone() const override { return std::make_unique<InterruptingStorage>(*this); }
     cow_ptr<Commit> GetCommit(Id const& id) const override { return Counted().MemObjectsStorage::GetCommit(id); }
@@ -53,17 +61,17 @@ public:
     }
 
 private:
-    InterruptingStorage const& Counted() const { return countdown_->Count(), *this; }
-    InterruptingStorage& Counted() { return countdown_->Count(), *this; }
+    InterruptingStorage const& Counted() const { return calls_->Count(), *this; }
+    InterruptingStorage& Counted() { return calls_->Count(), *this; }
 
-    Countdown* countdown_;
+    HostCalls* calls_;
 };
 
 /// Most of what a repository does asks its storage; the rest is counted here.
 class InterruptingRepository : public Repository {
 public:
-    InterruptingRepository(std::unique_ptr<IObjectsStorage>&& storage, Countdown& countdown)
-        : Repository(std::move(storage)), countdown_(&countdown) {}
+    InterruptingRepository(std::unique_ptr<IObjectsStorage>&& storage, HostCalls& calls)
+        : Repository(std::move(storage)), calls_(&calls) {}
 
     cow_ptr<Commit> GetCommonBase(cow_ptr<Commit> first, cow_ptr<Commit> second) const override {
         return Counted().Repository::GetCommonBase(std::move(first), std::move(second));
@@ -71,10 +79,45 @@ public:
     void UpdateStorage() override { Counted().Repository::UpdateStorage(); }
 
 private:
-    InterruptingRepository const& Counted() const { return countdown_->Count(), *this; }
-    InterruptingRepository& Counted() { return countdown_->Count(), *this; }
+    InterruptingRepository const& Counted() const { return calls_->Count(), *this; }
+    InterruptingRepository& Counted() { return calls_->Count(), *this; }
 
-    Countdown* countdown_;
+    HostCalls* calls_;
+};
+
+/// A blob that knows its identifier, and fetches its content when it is asked for it.
+class FetchedBlob final : public Blob {
+public:
+    FetchedBlob(std::string const& content, HostCalls& calls)
+        : fetched_(MakeBlob(content).GetData()), id_(MakeBlob(content).GetId()), calls_(&calls) {}
+
+    Id GetId() const override { return calls_->Count(), id_; }
+    Buffer const& GetData() const override { return calls_->CountContent(), fetched_; }
+
+protected:
+    cow_ptr<Blob> Copy() const override { return immu::make<FetchedBlob>(*this); }
+
+private:
+    Buffer fetched_;
+    Id id_;
+    HostCalls* calls_;
+};
+
+/// A tree or a commit of a host's class, which does what the library's does.
+template <class Base>
+class HostsOwn final : public Base {
+public:
+    HostsOwn(Base const& base, HostCalls& calls) : Base(base), calls_(&calls) {}
+
+    Id GetId() const override { return calls_->Count(), Base::GetId(); }
+    Buffer const& GetData() const override { return calls_->Count(), Base::GetData(); }
+    KivStringT<char> GetHeader() const override { return calls_->Count(), Base::GetHeader(); }
+
+protected:
+    cow_ptr<Base> Copy() const override { return immu::make<HostsOwn>(*this); }
+
+private:
+    HostCalls* calls_;
 };
 
 } // namespace KivVcs
