@@ -332,7 +332,7 @@ def entries_below(handle):
 
 
 def held_by(word):
-    """What a name holds, told by the lowest bits of the address: a blob, a tree, or both."""
+    """What a name holds, by the lowest bits of the address: a blob, a tree, or both."""
     kind, address = int(word) & 3, int(word) & ~3
     if kind == 3:
         both = gdb.Value(address).cast(gdb.lookup_type("KivVcs::detail::Held::Both").pointer())

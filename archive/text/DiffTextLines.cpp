@@ -15,7 +15,7 @@ std::string_view ViewOf(KivVcs::KivStringT<char> const& text) {
     return {text.GetString(), static_cast<std::size_t>(text.GetLength())};
 }
 
-/// "3", "3,4"; no lines are told by the line before them.
+/// "3", "3,4"; an empty range is given by the line before it.
 std::string RangeText(std::size_t begin, std::size_t end) {
     const std::string number = std::to_string(begin == end ? begin : begin + 1);
     return end - begin == 1 ? number : number + "," + std::to_string(end - begin);

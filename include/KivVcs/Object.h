@@ -71,7 +71,7 @@ public:
     /// Whether a host derived the class of this object. False for objects of exactly `Blob`, `Tree` and `Commit`.
     [[nodiscard]] virtual bool IsOfHostClass() const noexcept { return true; }
 
-    /// The digest that the identifier tells, valid until `ResetState`; null if that would have to be asked for: of an
+    /// The digest of the identifier, valid until `ResetState`; null if that would have to be asked for: of an
     /// object of a host's class, and of one whose identifier has not been computed yet.
     [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept {
         if (id_.IsOwn())
@@ -87,7 +87,7 @@ public:
         return mine != nullptr && theirs != nullptr ? *mine == *theirs : this == &other || GetId() == other.GetId();
     }
 
-    /// A number that is the same for equal identifiers and tells nearly all others apart; by the known digest, otherwise
+    /// A number that is the same for equal identifiers and different for nearly all others; by the known digest, otherwise
     /// by `GetId`.
     [[nodiscard]] std::uint64_t GetIdPrefix() const {
         Id::Digest const* const known = GetKnownDigest();

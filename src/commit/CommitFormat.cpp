@@ -12,7 +12,7 @@ namespace {
 constexpr std::int64_t ticksPerHour = 36'000'000'000;
 constexpr std::int64_t ticksPerMinute = 600'000'000;
 
-/// The bias that an offset such as "+0545" tells.
+/// The bias that an offset such as "+0545" stands for.
 TimeDelta BiasFromOffset(KivStringT<char16_t> const& offset) {
     const std::int64_t sign = offset.StartsWith(u"+") ? 1 : -1;
     const std::int64_t hours = String::IntFromString(offset.Mid(1, 2));
@@ -20,7 +20,7 @@ TimeDelta BiasFromOffset(KivStringT<char16_t> const& offset) {
     return TimeDelta(hours * sign * ticksPerHour + minutes * sign * ticksPerMinute);
 }
 
-/// What the line of an author tells.
+/// What the line of an author stores.
 struct Signature {
     explicit Signature(KivStringT<char> const& line) {
         const int emailStart = line.Find("<");

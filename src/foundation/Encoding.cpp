@@ -56,7 +56,7 @@ constexpr std::size_t EncodedLength(char32_t codePoint) noexcept {
 
 int CheckedLength(std::size_t length) {
     if (length > static_cast<std::size_t>(std::numeric_limits<int>::max()))
-        throw std::length_error("text longer than a signed 32-bit length can tell");
+        throw std::length_error("text longer than a signed 32-bit length can hold");
     return static_cast<int>(length);
 }
 

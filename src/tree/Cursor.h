@@ -37,7 +37,7 @@ private:
     Entry const* end_ = nullptr;
     std::size_t height_ = 0;
     /// By height, from the leaf on.
-    std::array<Step, Node::greatestHeight> steps_;
+    std::array<Step, Node::maxHeight> steps_;
 };
 
 /// Hands every entry below @p top, which may be null, to @p visit in order.

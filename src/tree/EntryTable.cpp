@@ -6,8 +6,8 @@ namespace {
 
 /// Fewer elements than this make a node a candidate for being joined with its neighbour, up to the size below, so that
 /// the joined node does not split again at the next insertion.
-constexpr int fewElements = Node::mostElements / 4;
-constexpr int mostJoinedElements = Node::mostElements * 3 / 4;
+constexpr int fewElements = Node::maxElements / 4;
+constexpr int maxJoinedElements = Node::maxElements * 3 / 4;
 
 /// Splits the full child @p index of @p parent, which is writable and has room, so that @p name can be inserted below:
 /// in the middle, or at its end for a new last name, so that names added in ascending order fill their nodes.
@@ -24,7 +24,7 @@ int SplitChild(Node& parent, int index, KivStringViewT<char16_t> name) {
         separator = left->IsLeaf() ? left->EntryAt(at).name : left->ChildAt(at).separator;
     else
         separator = name.ToString();
-    cow_ptr<Node> right = left->CopyOf(at, count, std::min(Node::mostElements - (count - at), 4));
+    cow_ptr<Node> right = left->CopyOf(at, count, std::min(Node::maxElements - (count - at), 4));
     if (at < count && left.use_count() == 1)
         Node::Of(left).Truncate(at);
     else if (at < count)
@@ -41,9 +41,9 @@ int JoinSmallChild(Node& parent, int index) {
     int left = -1;
     if (count(index) > fewElements)
         return index;
-    if (index + 1 < parent.Count() && count(index) + count(index + 1) <= mostJoinedElements)
+    if (index + 1 < parent.Count() && count(index) + count(index + 1) <= maxJoinedElements)
         left = index;
-    else if (index > 0 && count(index - 1) + count(index) <= mostJoinedElements)
+    else if (index > 0 && count(index - 1) + count(index) <= maxJoinedElements)
         left = index - 1;
     if (left < 0)
         return index;

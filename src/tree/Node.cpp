@@ -113,7 +113,7 @@ Node& Node::Writable(cow_ptr<Node>& handle, int room) {
         // built does.
         handle = node.CopyOf(0, count, room);
     } else if (node.capacity_ - count < room) {
-        const int spare = std::clamp(count, std::min(4, mostElements - count), mostElements - count);
+        const int spare = std::clamp(count, std::min(4, maxElements - count), maxElements - count);
         cow_ptr<Node> larger = Make(node.height_, count + spare);
         node.IsLeaf() ? Of(larger).Take(node.Entries()) : Of(larger).Take(node.Children());
         Of(larger).total_ = node.total_;

@@ -54,8 +54,8 @@ struct Tally {
 /// node. Nodes are shared by the versions of a directory, and changed only where one version owns them alone.
 class Node final : public KivUtils::reference_counted {
 public:
-    static constexpr int mostElements = 32;
-    static constexpr int greatestHeight = 16;
+    static constexpr int maxElements = 32;
+    static constexpr int maxHeight = 16;
 
     /// A node without elements; a leaf has height 0. @throws std::bad_alloc
     [[nodiscard]] static cow_ptr<Node> Make(int height, int capacity);
@@ -76,7 +76,7 @@ public:
     [[nodiscard]] bool IsLeaf() const noexcept { return height_ == 0; }
     [[nodiscard]] int Height() const noexcept { return height_; }
     [[nodiscard]] int Count() const noexcept { return count_; }
-    [[nodiscard]] bool IsFull() const noexcept { return count_ == mostElements; }
+    [[nodiscard]] bool IsFull() const noexcept { return count_ == maxElements; }
     [[nodiscard]] Tally const& Total() const noexcept { return total_; }
 
     [[nodiscard]] std::span<Entry const> Entries() const noexcept { return Elements<Entry>(); }

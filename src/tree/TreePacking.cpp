@@ -17,10 +17,10 @@ using detail::Node;
 
 /// Trees with at least this many objects keep the packed form of each leaf with the leaf, so that a version that changes one
 /// entry packs one leaf anew; for smaller ones that would cost more memory than the entries themselves.
-constexpr std::uint64_t fewestObjectsWithKeptRuns = 256;
+constexpr std::uint64_t minObjectsWithKeptRuns = 256;
 
 bool KeepsRuns(Node const& top) noexcept {
-    return top.Total().Objects() >= fewestObjectsWithKeptRuns;
+    return top.Total().Objects() >= minObjectsWithKeptRuns;
 }
 
 /// Mode and type of our own objects, with the blanks behind them. The copy of either takes as many bytes, the shorter one's
@@ -91,7 +91,7 @@ public:
         out = PackName(entry.name, out + words.size());
         *out++ = '\0';
         Id::Digest const* const known = object->GetKnownDigest();
-        // NOLINTNEXTLINE(clang-analyzer-core.NonNullParamChecker): an identifier that is computed tells a digest
+        // NOLINTNEXTLINE(clang-analyzer-core.NonNullParamChecker): an identifier that is computed is a digest
         out = WriteDigits(known == nullptr ? *object->GetId().GetDigest() : *known, out);
         used_ = static_cast<std::size_t>(out - bytes_.data());
     }

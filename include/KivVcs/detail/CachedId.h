@@ -27,7 +27,7 @@ public:
     /// Whether there is one that counts, should the object be of a host's class.
     [[nodiscard]] bool IsHosts() const noexcept { return Current() == State::Hosts; }
 
-    /// The identifier, and the digest that it tells. @pre there is one
+    /// The identifier, and its digest. @pre there is one
     [[nodiscard]] Id Get() const noexcept { return {digest_, hash_}; }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
@@ -37,7 +37,7 @@ public:
         state_.compare_exchange_strong(expected, State::Own, std::memory_order_acq_rel);
     }
 
-    /// Keeps @p id, which must tell a digest, for an object of the given kind, unless another thread is doing so.
+    /// Keeps @p id, which must be a digest, for an object of the given kind, unless another thread is doing so.
     void Keep(Id const& id, bool isHosts) const noexcept {
         State expected = Current();
         if (expected == State::Writing || expected == (isHosts ? State::Hosts : State::Own) ||
