@@ -18,8 +18,9 @@ constexpr int commitCount = 10'000;
 constexpr int fileCount = 10'000;
 constexpr std::size_t hashedBytes = 16 << 20;
 
-KivStringT<char16_t> Path(int number) {
-    return String::ToStringW(("directory" + std::to_string(number % 100) + "/file" + std::to_string(number)).c_str());
+KivStringT<char16_t> Path(int number, int directories) {
+    return String::ToStringW(
+        ("directory" + std::to_string(number % directories) + "/file" + std::to_string(number)).c_str());
 }
 
 Blob Content(std::string const& text) {
@@ -48,13 +49,13 @@ double Fastest(Round round) {
     return fastest;
 }
 
-/// Ten thousand versions, each of which changes one of a hundred files.
+/// Ten thousand versions, each of which changes one of a hundred files in ten directories.
 double CommitRound() {
     Repository repository(std::make_unique<MemObjectsStorage>());
     const Stopwatch time;
     for (int number = 0; number < commitCount; ++number) {
         Commit commit(&repository, false);
-        commit.AddBlob(&repository, Path(number % 100), Content(std::to_string(number)));
+        commit.AddBlob(&repository, Path(number % 100, 10), Content(std::to_string(number)));
         commit.SetDescription(u"Change a file");
         if (!repository.DoCommit(commit))
             return 0;
@@ -89,7 +90,7 @@ private:
     void Change(int from, int to, std::string const& content) {
         Commit commit(&repository_, false);
         for (int number = from; number < to; ++number)
-            commit.AddBlob(&repository_, Path(number), Content(content + std::to_string(number)));
+            commit.AddBlob(&repository_, Path(number, 100), Content(content + std::to_string(number)));
         repository_.DoCommit(commit);
     }
 
