@@ -31,8 +31,8 @@ TEST_F(HostTrees, ShowWhatTheObjectsOfHostsReturn) {
     };
     const auto add = [&](std::string const& name, HostBlob const& blob) {
         tree.AddBlob(&repo, Wide(name), blob);
-        entries[name] = blob.prefix + " " + blob.header + " " + name + '\0' +
-                        Narrow(blob.id).substr(0, Narrow(blob.id).find('\0'));
+        entries[name] =
+            blob.prefix + " " + blob.header + " " + name + '\0' + Narrow(blob.id).substr(0, Narrow(blob.id).find('\0'));
     };
     HostBlob link = Fetched("nowhere");
     link.prefix = "120000";
@@ -101,7 +101,8 @@ TEST_F(HostTrees, NeitherSliceNorFetchWhatTheyHold) {
     repo.Checkout(u"topic");
     const auto theirs = commitFile(u"a/3", "three");
     repo.Checkout(u"master");
-    EXPECT_TRUE(repo.Merge3Way(theirs, {AlwaysChooseLeft(), [](auto, auto const&) { return TreeConflictChoice::Merge; }}));
+    EXPECT_TRUE(
+        repo.Merge3Way(theirs, {AlwaysChooseLeft(), [](auto, auto const&) { return TreeConflictChoice::Merge; }}));
     const auto merged = repo.GetHead()->GetCommitTree();
     EXPECT_EQ(Joined(ToNames(merged->GetAllBlobPaths())), "a/1 a/2 a/3 a/4");
     EXPECT_EQ(Joined(ToNames(merged->GetBlobDiffs(mine->GetCommitTree()))), "a/3 a/4");

@@ -40,24 +40,26 @@ Commit::~Commit() {
     ReleaseHistory();
 }
 
+bool Commit::IsOfHostClass() const noexcept {
+    return &typeid(*this) != &typeid(Commit);
+}
+
 void Commit::ReleaseHistory() noexcept {
     // Ancestors that nobody else holds die here one after the other: left to their own destructors, they would take stack
-    // for every commit of the history. Each is whole until its destructor has run, which finds its parent held by this
-    // loop, too, and leaves it alone.
+    // for every commit of the history. Those of a host's class stay whole until their destructor has run: it finds the
+    // parent held by this loop, too, and leaves it alone.
     cow_ptr<Commit> oldest = std::move(parent_);
-    if (!oldest) {
+    if (!oldest && deferred_) {
         oldest = GetHeldParent();
         deferred_ = {};
     }
     while (std::unique_ptr<Commit> last = oldest.release_if_last()) {
-        cow_ptr<Commit> parent = last->GetHeldParent();
+        cow_ptr<Commit> parent = last->Commit::IsOfHostClass() ? last->parent_ : std::move(last->parent_);
+        if (!parent && last->deferred_)
+            parent = last->GetHeldParent();
         last.reset();
         oldest = std::move(parent);
     }
-}
-
-bool Commit::IsOfHostClass() const noexcept {
-    return &typeid(*this) != &typeid(Commit);
 }
 
 cow_ptr<Commit> Commit::Copy() const {

@@ -101,19 +101,19 @@ struct DeferredLinks::Links {
     DeferredLink<CommitTree, Tree> root;
 };
 
-DeferredLinks::DeferredLinks() noexcept = default;
+void DeferredLinks::Destroy::operator()(Links* links) const noexcept {
+    std::default_delete<Links>()(links);
+}
+
 DeferredLinks::DeferredLinks(DeferredLinks const& other)
-    : links_(other.links_ == nullptr ? nullptr : std::make_unique<Links>(*other.links_)) {}
-DeferredLinks::DeferredLinks(DeferredLinks&& other) noexcept = default;
+    : links_(other.links_ == nullptr ? nullptr : std::make_unique<Links>(*other.links_).release()) {}
 DeferredLinks& DeferredLinks::operator=(DeferredLinks const& other) {
     return *this = DeferredLinks(other);
 }
-DeferredLinks& DeferredLinks::operator=(DeferredLinks&& other) noexcept = default;
-DeferredLinks::~DeferredLinks() = default;
 
 DeferredLinks::Links& DeferredLinks::Writable() {
     if (links_ == nullptr)
-        links_ = std::make_unique<Links>();
+        links_.reset(std::make_unique<Links>().release());
     return *links_;
 }
 

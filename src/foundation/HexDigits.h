@@ -11,7 +11,7 @@ namespace KivUtils {
 /// The lowercase hexadecimal digit of a number below 16.
 template <class Unit>
 [[nodiscard]] constexpr Unit HexDigit(unsigned number) noexcept {
-    return static_cast<Unit>(number + (number > 9 ? 'a' - 10 : '0'));
+    return static_cast<Unit>("0123456789abcdef"[number]);
 }
 
 /// Writes two digits for each byte, and returns the end of what was written.
@@ -24,7 +24,7 @@ Unit* WriteHexDigits(std::array<std::uint8_t, byteCount> const& bytes, Unit* out
         numbers[2 * index + 1] = static_cast<std::uint8_t>(bytes[index] & 15);
     }
     for (std::size_t index = 0; index < numbers.size(); ++index)
-        out[index] = HexDigit<Unit>(numbers[index]);
+        out[index] = static_cast<Unit>(numbers[index] + (numbers[index] > 9 ? 'a' - 10 : '0'));
     return out + numbers.size();
 }
 

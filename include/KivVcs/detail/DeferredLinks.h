@@ -21,13 +21,16 @@ public:
     using FetchParent = Delegate<cow_ptr<Commit>(Id const&)>;
     using FetchRoot = Delegate<cow_ptr<Tree>(Id const&)>;
 
-    DeferredLinks() noexcept;
+    DeferredLinks() noexcept = default;
     /// What has been fetched is shared, what has not stays deferred for both.
     DeferredLinks(DeferredLinks const& other);
-    DeferredLinks(DeferredLinks&& other) noexcept;
+    DeferredLinks(DeferredLinks&& other) noexcept = default;
     DeferredLinks& operator=(DeferredLinks const& other);
-    DeferredLinks& operator=(DeferredLinks&& other) noexcept;
-    ~DeferredLinks();
+    DeferredLinks& operator=(DeferredLinks&& other) noexcept = default;
+    ~DeferredLinks() = default;
+
+    /// Whether anything may be deferred.
+    explicit operator bool() const noexcept { return links_ != nullptr; }
 
     void SetParent(Id const& id, FetchParent fetch);
     void SetRoot(Id const& id, FetchRoot fetch);
@@ -48,10 +51,14 @@ public:
 
 private:
     struct Links;
+    /// Apart, so that a commit that defers nothing dies without a call.
+    struct Destroy {
+        void operator()(Links* links) const noexcept;
+    };
 
     Links& Writable();
 
-    std::unique_ptr<Links> links_;
+    std::unique_ptr<Links, Destroy> links_;
 };
 
 } // namespace detail
