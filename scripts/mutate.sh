@@ -12,9 +12,9 @@ install_packages build mutation
 build_directory=$build_root/mutation
 rm -rf "$build_directory/source"
 mkdir -p "$build_directory/source"
-cp -r "$source_directory"/{CMakeLists.txt,cmake,include,src,tests} "$build_directory/source"
+cp -r "$source_directory"/{CMakeLists.txt,cmake,include,src,examples,tests} "$build_directory/source"
 export KIVVCS_FAULT_STRIDE=7
 quietly cmake -S "$build_directory/source" -B "$build_directory/build" -G Ninja -DCMAKE_BUILD_TYPE=None \
-    -DCMAKE_CXX_FLAGS='-O1 -D_GLIBCXX_ASSERTIONS' -DKIVVCS_PACKAGE_TESTS=OFF -DKIVVCS_ARCHIVE=OFF
+    -DCMAKE_CXX_FLAGS='-O1 -D_GLIBCXX_ASSERTIONS' -DKIVVCS_PACKAGE_TESTS=OFF -DKIVVCS_ARCHIVE=OFF -DKIVVCS_EXAMPLES=OFF
 quietly cmake --build "$build_directory/build" --parallel "$jobs"
 python3 "$source_directory/scripts/mutate.py" "$build_directory/source" "$build_directory/build" "${1:-100}" "${2:-1}"
