@@ -45,8 +45,8 @@ protected:
 /// The base of blobs, trees and commits: caches the identifier and the packed form of the content.
 ///
 /// What is asked for is computed on first use and kept until `ResetState`; references to packed forms and data are
-/// valid until then, or until the object dies. A copy carries what is kept. What is kept is of one state: a packed form that is asked for after the
-/// identifier is the one that the identifier is computed from, even if the content has changed without `ResetState`.
+/// valid until then, or until the object dies. A copy carries what is kept. It is of one state: a form asked for after
+/// the identifier is the one that the identifier was computed from, even if the content changed without `ResetState`.
 ///
 /// Hosts may derive from the library's classes and override what they like: of such an object everything is asked of
 /// its virtual operations. Objects of exactly `Blob`, `Tree` or `Commit` are known to do as those classes do.

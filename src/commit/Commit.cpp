@@ -37,7 +37,8 @@ Commit& Commit::operator=(Commit const& other) {
 Commit& Commit::operator=(Commit&& other) noexcept = default;
 
 Commit::~Commit() {
-    ReleaseHistory();
+    if (parent_ || deferred_)
+        ReleaseHistory();
 }
 
 bool Commit::IsOfHostClass() const noexcept {
