@@ -221,25 +221,6 @@ TEST_F(Commits, EditsStoreTheirTreesAndLeaveOthersAlone) {
     EXPECT_EQ(Files(parent.GetCommitTree()->GetRoot()), "a/b=1 c=2");
 }
 
-TEST_F(Commits, KeepTheirTextBehindAReplacedRootUntilTheirStateIsReset) {
-    for (const bool identified : {true, false}) {
-        Commit commit(nullptr, false);
-        commit.AddBlob(&repo, u"a", MakeBlob("1"));
-        Commit untouched(commit);
-        if (identified)
-            static_cast<void>(commit.GetId());
-        else
-            static_cast<void>(commit.GetData());
-        commit.ReplaceRoot(&repo, MakeTree(repo, "b=2"));
-        EXPECT_EQ(Files(commit.GetCommitTree()->GetRoot()), "b=2");
-        EXPECT_TRUE(commit.GetCommitTree()->GetRoot() == repo.GetTreeFromStorage(commit.GetCommitTree()->GetRootId()));
-        EXPECT_EQ(Bytes(commit.GetPackedData()), Bytes(untouched.GetPackedData()));
-        EXPECT_EQ(IdText(commit), IdText(untouched));
-        commit.ResetState();
-        EXPECT_NE(IdText(commit), IdText(untouched));
-    }
-}
-
 TEST_F(Commits, AreLinkedOldestFirst) {
     std::vector<cow_ptr<Commit>> line;
     EXPECT_FALSE(Commit::MakeCommitLinksInOrder(line, &repo));

@@ -1,4 +1,4 @@
-#include "support/Builders.h"
+#include "support/HostObjects.h"
 #include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
@@ -102,27 +102,12 @@ TEST_F(Differing, EndsWhereItIsToldTo) {
     EXPECT_EQ(FindCaseCollisions(tree).size(), 40U);
 }
 
-/// A host's file that knows its identifier and counts how often its content is wanted.
-class RemoteBlob : public Blob {
-public:
-    RemoteBlob(Id id, int& fetched) : id_(std::move(id)), fetched_(&fetched) {}
-    Buffer const& GetData() const override {
-        ++*fetched_;
-        return Blob::GetData();
-    }
-    Id GetId() const override { return id_; }
-
-private:
-    Id id_;
-    int* fetched_;
-};
-
 TEST_F(Differing, AsksHostsForIdentifiersAndForNoContent) {
     int fetched = 0;
     std::vector<Id> ids;
     for (auto const* content : {"base", "left", "right", "elsewhere"}) {
         ids.push_back(MakeBlob(content).GetId());
-        repo.AddBlobToStorage(cow_ptr<Blob>(std::make_unique<RemoteBlob>(ids.back(), fetched)));
+        repo.AddBlobToStorage(immu::make<LazyBlob>(content, fetched));
     }
     const auto grow = [this](cow_ptr<Commit> const& parent, std::map<std::string, Id> const& files) {
         Commit commit(parent, false);

@@ -74,62 +74,6 @@ TEST_F(Histories, APurgeRemovesExactlyWhatNobodyHolds) {
     EXPECT_EQ(history.Counts(), "0 0 0");
 }
 
-TEST_F(Histories, APurgeGetsPastWhatIsNotStoredOrHiddenByAName) {
-    // Many of each, since the order in which a table is swept decides whether one is missed.
-    std::string files;
-    history.Grow("0");
-    for (int index = 1; index < 30; ++index) {
-        const auto name = std::to_string(index);
-        history.Grow(name + ":" + std::to_string(index - 1));
-        files += " top/" + name + "/deep/f=" + name + " top/" + name + "=" + name;
-    }
-    for (int index = 1; index < 30; index += 2)
-        Storage().DeleteCommit(history[std::to_string(index)]);
-    auto held = MakeTree(repo, files);
-    history.Forget();
-    EXPECT_EQ(repo.GetCommitCount(), 15U);
-    repo.UpdateStorage();
-    EXPECT_EQ(history.Counts(), "0 59 29");
-    held.reset();
-    repo.UpdateStorage();
-    EXPECT_EQ(history.Counts(), "0 0 0");
-}
-
-TEST_F(Histories, RewritingKeepsWhatBranchesNeedAndLetsGoOfTheRest) {
-    const struct {
-        const char *graph, *branches, *deleted, *after, *counts;
-    } cases[] = {
-        {"a b:a c:b d:c", "master=d", "d", "master=d", "1 1 4"},
-        {"a b:a c:b d:c", "master=d topic=b twin=b", "d", "master=d/b topic=b twin=b", "2 2 4"},
-        {"a b:a c:b d:c", "master=d topic=b", "b", "master=d/c/b/a topic=b", "3 4 4"},
-        {"a b:a c:b d:c", "master=d", "c", "master=d/c/b/a", "1 4 4"},
-        {"a b:a c:b d:c", "master=d", "a", "master=d/c/b/a", "4 4 4"},
-        // Nothing deleted: simplified.
-        {"r a:r b:a c:b", "master=c", nullptr, "master=c", "1 1 4"},
-        {"r a:r b:a c:b d:c", "master=d topic=b", nullptr, "master=d/b topic=b", "2 2 5"},
-        {"r m:r a:m b:a x:m y:x", "master=b topic=y", nullptr, "master=b/m topic=y/m", "3 3 6"},
-        {"r a:r x y:x", "master=a topic=y", nullptr, "master=a topic=y", "2 2 4"},
-        {"r a:r", "master=a topic=a", nullptr, "master=a topic=a", "1 1 2"},
-        {"r a:r b:a c:a d:b e:b", "master=c one=d two=e", nullptr, "master=c/a one=d/b/a two=e/b/a", "5 5 6"},
-        {"r", "", nullptr, "master=", "0 0 0"},
-    };
-    for (auto const& [graph, branches, deleted, after, counts] : cases) {
-        SCOPED_TRACE(std::string(graph) + " | " + branches);
-        Repository each(std::make_unique<MemObjectsStorage>());
-        GrownHistory line(each);
-        line.Grow(graph);
-        line.Point(branches);
-        auto commit = deleted == nullptr ? nullptr : line[deleted];
-        line.Forget();
-        EXPECT_TRUE(deleted == nullptr ? each.SimplifyCommitGraph(true) : each.DeleteCommits(std::move(commit)));
-        EXPECT_EQ(line.Branches(), after);
-        EXPECT_EQ(line.Counts(), counts);
-    }
-    EXPECT_TRUE(repo.DeleteCommits(nullptr));
-    EXPECT_FALSE(Repository(nullptr).DeleteCommits(nullptr));
-    EXPECT_FALSE(Repository(nullptr).SimplifyCommitGraph(true));
-}
-
 TEST_F(Histories, DeletingMovesBranchesNewestFirstAndSurvivesAFailure) {
     history.Grow("a b:a c:b");
     history.Point("master=c topic=b");

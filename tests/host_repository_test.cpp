@@ -247,29 +247,6 @@ TEST(HostObjects, MeetAreStoredAndAreRewrittenByTheirOwnIdentifiers) {
     EXPECT_NE(dynamic_cast<NamedCommit const*>(stored.get()), nullptr);
 }
 
-TEST(HostObjects, AreMergedAndPurgedWithoutTheirContentsAndStayWhatTheyAre) {
-    Repository repo(std::make_unique<MemObjectsStorage>());
-    int fetched = 0;
-    const auto committed = [&](cow_ptr<Commit> parent, std::string const& files) {
-        Commit commit(std::move(parent), false);
-        std::istringstream words(files);
-        for (std::string word; words >> word;)
-            commit.AddBlob(&repo, Wide(word.substr(0, word.find('='))), LazyBlob(word, fetched));
-        return repo.DoCommit(commit);
-    };
-    const auto base = committed(nullptr, "a=0 d/b=0 d/c=0");
-    const auto right = committed(base, "a=2 d/b=2 e/n=2");
-    repo.MoveBranchTo(u"master", base);
-    committed(base, "a=1 d/c=1 d/n=1");
-    EXPECT_TRUE(
-        repo.Merge(right, {AlwaysChooseRight(), always_return_t<TreeConflictChoice>{TreeConflictChoice::Merge}}));
-    repo.UpdateStorage();
-    for (auto const& path : repo.GetHead()->GetCommitTree()->GetAllBlobPaths())
-        EXPECT_NE(dynamic_cast<LazyBlob const*>(repo.GetHead()->GetBlob(path).get()), nullptr) << Narrow(path);
-    EXPECT_EQ(fetched, 0);
-    EXPECT_EQ(Files(repo.GetHead()->GetCommitTree()->GetRoot()), "a=a=2 d/b=d/b=2 d/c=d/c=1 d/n=d/n=1 e/n=e/n=2");
-}
-
 /// A line of commits and a nest of directories, stored but for every second one.
 struct Line {
     Line(Repository& repo, int stored) {

@@ -116,21 +116,6 @@ TEST_F(HostTrees, NeitherSliceNorFetchWhatTheyHold) {
     EXPECT_EQ(Bytes(blob->GetData()), "content of three");
 }
 
-TEST_F(HostTrees, CompareWhatHostsSayTheyAre) {
-    Tree left;
-    Tree right;
-    Repository none(nullptr);
-    const std::string one = Identifier("blob", "1");
-    left.AddBlob(&none, u"changed", Fetched("1"));
-    right.AddBlob(&none, u"changed", Fetched("2"));
-    left.AddBlob(&none, u"equal", Fetched("3"));
-    right.AddBlob(&none, u"equal", Fetched("3"));
-    left.AddBlob(&none, u"own", MakeBlob("1"));
-    right.AddBlob(&none, u"own", Fetched(one));
-    EXPECT_EQ(Joined(ToNames(left.GetDeepBlobDiffs(immu::make<Tree>(right)))), "changed");
-    EXPECT_TRUE(left.GetIdByPath(u"changed") == Id(Wide("1")));
-}
-
 TEST_F(HostTrees, AreWholeUntilTheirDestructorsHaveRun) {
     constexpr int depth = 100'000;
     int whole = 0;

@@ -167,27 +167,6 @@ TEST_F(Merging, BringsACommitInTheCheapestWay) {
     EXPECT_EQ(history.Branches(), "master=//ours/base");
 }
 
-TEST_F(Merging, AnExceptionLeavesTheBranchAndTheRepositoryUsable) {
-    history.Grow("base ours:base theirs:base");
-    history.Point("master=ours");
-    Commit conflicting(history["theirs"], false);
-    conflicting.AddBlob(&repo, u"ours", MakeBlob("theirs"));
-    const auto theirs = repo.SyncWithStorage(immu::make<Commit>(conflicting));
-    const auto before = history.Counts();
-    const auto throwing = [](Path, MergeTrees) -> ConflictChoice { throw std::runtime_error("host"); };
-    EXPECT_THROW(repo.Merge(theirs, {throwing, mergeAlways}), std::runtime_error);
-    for (const char* operation : {"GetHead", "GetCommonBase", "DoCommit", "Sync"}) {
-        repo.Break(operation);
-        EXPECT_THROW(repo.Merge(theirs, {AlwaysChooseRight(), mergeAlways}), std::runtime_error);
-    }
-    repo.Break("");
-    EXPECT_EQ(history.Branches(), "master=ours/base");
-    repo.UpdateStorage();
-    EXPECT_EQ(history.Counts(), before);
-    EXPECT_TRUE(repo.Merge(theirs, {AlwaysChooseRight(), mergeAlways}));
-    EXPECT_EQ(FilesOfHead(), "base=base ours=theirs theirs=theirs");
-}
-
 TEST(Resolving, ChainsAskTheNextOnlyWhileUndecided) {
     int asked = 0;
     const auto answering = [&asked]<class Choice>(Choice choice) {

@@ -22,8 +22,6 @@ Commit Described(cow_ptr<Commit> parent, const char16_t* description) {
 
 class Repositories : public testing::Test {
 protected:
-    IObjectsStorage& Storage() { return *repo.GetStorage(); }
-
     RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
     const cow_ptr<Commit> one = immu::make<Commit>(Described(nullptr, u"one"));
     const cow_ptr<Commit> two = immu::make<Commit>(Described(one, u"two"));
@@ -71,20 +69,6 @@ TEST_F(Repositories, BranchesOfAStorageAreMadeMovedAndRemovedByExactName) {
     EXPECT_EQ(storage.GetRefs().size(), 4U);
 }
 
-TEST_F(Repositories, ACloneSharesObjectsAndGoesItsOwnWay) {
-    MemObjectsStorage storage;
-    storage.AddCommit(one);
-    storage.UpdateBranch(u"master", one);
-    const auto clone = storage.Clone();
-    EXPECT_TRUE(clone->GetCommit(one->GetId()) == one && clone->GetHead(u"master") == one);
-    clone->DeleteCommit(one);
-    clone->AddBlob(immu::make<Blob>());
-    storage.UpdateBranch(u"master", two);
-    EXPECT_EQ(storage.GetCommitCount() * 10 + storage.GetBlobCount(), 10U);
-    EXPECT_EQ(clone->GetCommitCount() * 10 + clone->GetBlobCount(), 1U);
-    EXPECT_TRUE(clone->GetHead(u"master") == one);
-}
-
 TEST_F(Repositories, WithoutAStorageThereIsNothingAndNothingCanBeDone) {
     Repository none(nullptr);
     Commit commit(nullptr, false);
@@ -101,17 +85,6 @@ TEST_F(Repositories, WithoutAStorageThereIsNothingAndNothingCanBeDone) {
     none.UpdateStorage();
     EXPECT_EQ(none.GetStorage(), nullptr);
     EXPECT_EQ(Narrow(none.GetCurentBranch()), "master");
-}
-
-TEST_F(Repositories, InterningGivesTheStoredObject) {
-    EXPECT_FALSE(repo.SyncWithStorage(cow_ptr<Commit>()) || repo.SyncWithStorage(cow_ptr<Tree>()) ||
-                 repo.SyncWithStorage(cow_ptr<Blob>()));
-    EXPECT_TRUE(repo.SyncWithStorage(one) == one);
-    EXPECT_TRUE(repo.SyncWithStorage(immu::make<Commit>(*one)) == one);
-    const auto tree = MakeTree(repo, "a=1");
-    EXPECT_TRUE(repo.SyncWithStorage(tree) == tree && repo.SyncWithStorage(MakeTree(repo, "a=1")) == tree);
-    EXPECT_TRUE(repo.GetBlobFromStorage(MakeBlob("1").GetId()) == tree->GetLocalBlob(u"a"));
-    EXPECT_EQ(repo.GetCommitCount() * 100 + repo.GetTreeCount() * 10 + repo.GetBlobCount(), 111U);
 }
 
 TEST_F(Repositories, ACommitIsStampedStoredAndMadeTheHead) {
@@ -138,29 +111,6 @@ TEST_F(Repositories, ACommitIsStampedStoredAndMadeTheHead) {
     EXPECT_EQ(NameOf(repo.DoCommit(amend)), "amended");
     EXPECT_EQ(repo.TakeCalls(), "DoCommit GetHead() GetHead(master) Sync(amended)");
     EXPECT_EQ(NameOf(repo.GetHead()), "amended");
-}
-
-TEST_F(Repositories, AnAmendNeedsAHeadAndACommitNoBranch) {
-    Commit amend(one, true);
-    EXPECT_FALSE(repo.DoCommit(amend));
-    EXPECT_TRUE(amend.GetCommitTime() == Time() && repo.GetCommitCount() == 0);
-
-    EXPECT_TRUE(repo.RemoveBranch(u"master") && !repo.RemoveBranch(u"master"));
-    Commit commit(nullptr, false);
-    EXPECT_TRUE(repo.DoCommit(commit));
-    EXPECT_TRUE(repo.GetCommitCount() == 1 && !repo.GetHead() && !repo.BranchExist(u"master"));
-    EXPECT_EQ(Narrow(repo.GetCurentBranch()), "master");
-}
-
-TEST_F(Repositories, AnExceptionWhileStoringLeavesTheBranch) {
-    Commit commit = Described(one, u"two");
-    repo.MoveBranchTo(u"master", one);
-    repo.Break("Sync");
-    EXPECT_THROW(repo.DoCommit(commit), std::runtime_error);
-    EXPECT_TRUE(repo.GetHead() == one && commit.GetCommitTime() != Time());
-    repo.Break("");
-    const auto stored = repo.DoCommit(commit);
-    EXPECT_TRUE(stored && stored == repo.GetHead());
 }
 
 TEST_F(Repositories, BranchesStartAtTheHeadAndAreMovedAtWill) {

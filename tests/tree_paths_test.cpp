@@ -99,20 +99,6 @@ TEST_F(TreePaths, EmptyComponentsMakeTreesOnTheWayOnly) {
     }
 }
 
-TEST_F(TreePaths, ABlobAndASubtreeMayShareAName) {
-    auto tree = Of("a=1 a/b=2");
-    EXPECT_EQ(tree->GetLocalObjectCount(), 2U);
-    EXPECT_TRUE(tree->GetLocalObject(u"a") == tree->GetLocalBlob(u"a"));
-    EXPECT_EQ(Bytes(tree->GetData()), Entry("blob", "a", Identifier("blob", "1")));
-    EXPECT_EQ(Files(tree), "a/b=2 a=1");
-    // A hidden subtree differs even from itself.
-    EXPECT_EQ(tree->GetLocalTreeDiffs(tree).size(), 1U);
-    EXPECT_TRUE(tree->GetDeepBlobDiffs(tree).empty());
-    // Pruning a directory takes the file of that name along.
-    EXPECT_TRUE(tree.write()->RemoveObject(&repo, u"a/b"));
-    EXPECT_TRUE(tree->IsEmpty());
-}
-
 TEST_F(TreePaths, ARepositorysAnswerBecomesTheEntryWhateverItIs) {
     auto tree = Of("a/k=1 b=2");
     repo.blobAnswer = immu::make<Blob>(MakeBlob("other"));

@@ -88,75 +88,42 @@ private:
             return SQLITE_IOERR_DELETE;
         return Own().plain->xDelete(Own().plain, name, sync);
     }
-    static int Close(sqlite3_file* file) { return Plain(file)->pMethods->xClose(Plain(file)); }
-    static int Read(sqlite3_file* file, void* to, int size, sqlite3_int64 offset) {
-        if (int const code = Meet(false); code != SQLITE_OK)
-            return SQLITE_IOERR_READ;
-        return Plain(file)->pMethods->xRead(Plain(file), to, size, offset);
+
+    /// Hands a call on to the plain file.
+    template <auto Method, class Result, class... Arguments>
+    static Result HandOn(sqlite3_file* file, Arguments... arguments) {
+        return (Plain(file)->pMethods->*Method)(Plain(file), arguments...);
     }
-    static int Write(sqlite3_file* file, const void* from, int size, sqlite3_int64 offset) {
-        if (int const code = Meet(true); code != SQLITE_OK)
-            return code == SQLITE_FULL ? code : SQLITE_IOERR_WRITE;
-        return Plain(file)->pMethods->xWrite(Plain(file), from, size, offset);
-    }
-    static int Truncate(sqlite3_file* file, sqlite3_int64 size) {
-        if (int const code = Meet(true); code != SQLITE_OK)
-            return SQLITE_IOERR_TRUNCATE;
-        return Plain(file)->pMethods->xTruncate(Plain(file), size);
-    }
-    static int Sync(sqlite3_file* file, int flags) {
-        if (int const code = Meet(true); code != SQLITE_OK)
-            return code == SQLITE_FULL ? code : SQLITE_IOERR_FSYNC;
-        return Plain(file)->pMethods->xSync(Plain(file), flags);
-    }
-    static int FileSize(sqlite3_file* file, sqlite3_int64* size) {
-        if (int const code = Meet(false); code != SQLITE_OK)
-            return SQLITE_IOERR_FSTAT;
-        return Plain(file)->pMethods->xFileSize(Plain(file), size);
-    }
-    static int Lock(sqlite3_file* file, int kind) { return Plain(file)->pMethods->xLock(Plain(file), kind); }
-    static int Unlock(sqlite3_file* file, int kind) { return Plain(file)->pMethods->xUnlock(Plain(file), kind); }
-    static int CheckLock(sqlite3_file* file, int* held) {
-        return Plain(file)->pMethods->xCheckReservedLock(Plain(file), held);
-    }
-    static int Control(sqlite3_file* file, int operation, void* argument) {
-        return Plain(file)->pMethods->xFileControl(Plain(file), operation, argument);
-    }
-    static int SectorSize(sqlite3_file* file) { return Plain(file)->pMethods->xSectorSize(Plain(file)); }
-    static int Traits(sqlite3_file* file) { return Plain(file)->pMethods->xDeviceCharacteristics(Plain(file)); }
-    static int MapShared(sqlite3_file* file, int page, int size, int extend, void volatile** memory) {
-        if (int const code = Meet(true); code != SQLITE_OK)
-            return SQLITE_IOERR_SHMMAP;
-        return Plain(file)->pMethods->xShmMap(Plain(file), page, size, extend, memory);
-    }
-    static int LockShared(sqlite3_file* file, int offset, int count, int flags) {
-        return Plain(file)->pMethods->xShmLock(Plain(file), offset, count, flags);
-    }
-    static void Barrier(sqlite3_file* file) { Plain(file)->pMethods->xShmBarrier(Plain(file)); }
-    static int UnmapShared(sqlite3_file* file, int remove) {
-        return Plain(file)->pMethods->xShmUnmap(Plain(file), remove);
+
+    /// Hands a call on unless it is its turn to fail, with @p failure, or with @p full where the disk is full.
+    template <auto Method, bool isWrite, int failure, int full = failure, class... Arguments>
+    static int Try(sqlite3_file* file, Arguments... arguments) {
+        if (int const code = Meet(isWrite); code != SQLITE_OK)
+            return code == SQLITE_FULL ? full : failure;
+        return HandOn<Method, int>(file, arguments...);
     }
 
     static sqlite3_io_methods const& Methods() {
-        static sqlite3_io_methods const methods = [] {
-            sqlite3_io_methods made{};
+        using IoMethods = sqlite3_io_methods;
+        static IoMethods const methods = [] {
+            IoMethods made{};
             made.iVersion = 2;
-            made.xClose = Close;
-            made.xRead = Read;
-            made.xWrite = Write;
-            made.xTruncate = Truncate;
-            made.xSync = Sync;
-            made.xFileSize = FileSize;
-            made.xLock = Lock;
-            made.xUnlock = Unlock;
-            made.xCheckReservedLock = CheckLock;
-            made.xFileControl = Control;
-            made.xSectorSize = SectorSize;
-            made.xDeviceCharacteristics = Traits;
-            made.xShmMap = MapShared;
-            made.xShmLock = LockShared;
-            made.xShmBarrier = Barrier;
-            made.xShmUnmap = UnmapShared;
+            made.xClose = HandOn<&IoMethods::xClose>;
+            made.xRead = Try<&IoMethods::xRead, false, SQLITE_IOERR_READ>;
+            made.xWrite = Try<&IoMethods::xWrite, true, SQLITE_IOERR_WRITE, SQLITE_FULL>;
+            made.xTruncate = Try<&IoMethods::xTruncate, true, SQLITE_IOERR_TRUNCATE>;
+            made.xSync = Try<&IoMethods::xSync, true, SQLITE_IOERR_FSYNC, SQLITE_FULL>;
+            made.xFileSize = Try<&IoMethods::xFileSize, false, SQLITE_IOERR_FSTAT>;
+            made.xLock = HandOn<&IoMethods::xLock>;
+            made.xUnlock = HandOn<&IoMethods::xUnlock>;
+            made.xCheckReservedLock = HandOn<&IoMethods::xCheckReservedLock>;
+            made.xFileControl = HandOn<&IoMethods::xFileControl>;
+            made.xSectorSize = HandOn<&IoMethods::xSectorSize>;
+            made.xDeviceCharacteristics = HandOn<&IoMethods::xDeviceCharacteristics>;
+            made.xShmMap = Try<&IoMethods::xShmMap, true, SQLITE_IOERR_SHMMAP>;
+            made.xShmLock = HandOn<&IoMethods::xShmLock>;
+            made.xShmBarrier = HandOn<&IoMethods::xShmBarrier>;
+            made.xShmUnmap = HandOn<&IoMethods::xShmUnmap>;
             return made;
         }();
         return methods;

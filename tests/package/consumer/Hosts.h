@@ -5,8 +5,8 @@
 #include <stdexcept>
 #include <utility>
 
-/// Hosts that implement every interface of the library themselves, by handing on to what the library has, and throw exceptions
-/// of their own.
+/// Hosts that implement the library's interfaces themselves, by handing on to what the library has, or derive from its
+/// classes, and throw exceptions of their own.
 namespace hosts {
 
 using namespace KivVcs;
@@ -40,47 +40,15 @@ private:
     Blob blob_;
 };
 
-class Storage final : public IObjectsStorage {
+class Storage final : public MemObjectsStorage {
 public:
     bool refuses = false;
 
-    [[nodiscard]] std::unique_ptr<IObjectsStorage> Clone() const override { return kept_.Clone(); }
-    [[nodiscard]] cow_ptr<Commit> GetCommit(Id const& id) const override { return kept_.GetCommit(id); }
-    [[nodiscard]] cow_ptr<Tree> GetTree(Id const& id) const override { return kept_.GetTree(id); }
-    [[nodiscard]] cow_ptr<Blob> GetBlob(Id const& id) const override { return kept_.GetBlob(id); }
-    void AddCommit(cow_ptr<Commit> commit) override { Willing().AddCommit(std::move(commit)); }
-    void AddTree(cow_ptr<Tree> tree) override { Willing().AddTree(std::move(tree)); }
-    void AddBlob(cow_ptr<Blob> blob) override { Willing().AddBlob(std::move(blob)); }
-    [[nodiscard]] std::uint64_t GetCommitCount() const override { return kept_.GetCommitCount(); }
-    [[nodiscard]] std::uint64_t GetTreeCount() const override { return kept_.GetTreeCount(); }
-    [[nodiscard]] std::uint64_t GetBlobCount() const override { return kept_.GetBlobCount(); }
-    [[nodiscard]] CommitTable const& GetCommits() const override { return kept_.GetCommits(); }
-    [[nodiscard]] TreeTable const& GetTrees() const override { return kept_.GetTrees(); }
-    [[nodiscard]] BlobTable const& GetBlobs() const override { return kept_.GetBlobs(); }
-    [[nodiscard]] ReferenceTable const& GetRefs() const override { return kept_.GetRefs(); }
-    void DeleteCommit(cow_ptr<Commit> commit) override { kept_.DeleteCommit(std::move(commit)); }
-    void PurgeUnusedObjects() override { kept_.PurgeUnusedObjects(); }
-    [[nodiscard]] bool BranchExist(Path name) const override { return kept_.BranchExist(name); }
-    bool CreateBranch(Path name, cow_ptr<Commit> commit) override {
-        return kept_.CreateBranch(name, std::move(commit));
-    }
-    bool RemoveBranch(Path name) override { return kept_.RemoveBranch(name); }
-    bool UpdateBranch(Path name, cow_ptr<Commit> commit) override {
-        return kept_.UpdateBranch(name, std::move(commit));
-    }
-    [[nodiscard]] cow_ptr<Commit> GetHead(Path name) const override { return kept_.GetHead(name); }
-    [[nodiscard]] std::vector<KivStringT<char16_t>> GetCommitBranches(cow_ptr<Commit> commit) const override {
-        return kept_.GetCommitBranches(std::move(commit));
-    }
-
-private:
-    MemObjectsStorage& Willing() {
+    void AddBlob(cow_ptr<Blob> blob) override {
         if (refuses)
             throw Refused("add");
-        return kept_;
+        MemObjectsStorage::AddBlob(std::move(blob));
     }
-
-    MemObjectsStorage kept_;
 };
 
 class Repository final : public IRepository {
