@@ -111,7 +111,7 @@ TEST_F(HostTrees, NeitherSliceNorFetchWhatTheyHold) {
     EXPECT_EQ(repo.GetBlobCount(), 4U);
     EXPECT_EQ(fetches, 0);
     const auto blob = merged->GetBlob(u"a/3");
-    EXPECT_TRUE(typeid(*blob) == typeid(HostBlob));
+    EXPECT_TRUE(dynamic_cast<HostBlob const*>(blob.get()) != nullptr);
     EXPECT_TRUE(blob == repo.GetBlobFromStorage(Id(Wide("three"))));
     EXPECT_EQ(Bytes(blob->GetData()), "content of three");
 }

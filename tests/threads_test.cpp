@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <barrier>
 #include <thread>
 
@@ -71,6 +72,20 @@ std::string ReadAndDrop(Repository const& repository, Versions line) {
     return read;
 }
 
+/// Runs @p read with the number of each thread in all threads at once.
+template <class Read>
+void AtOnce(Read read) {
+    std::vector<std::thread> threads;
+    std::barrier start(threadCount);
+    for (std::size_t index = 0; index < threadCount; ++index)
+        threads.emplace_back([&, index] {
+            start.arrive_and_wait();
+            read(index);
+        });
+    for (auto& thread : threads)
+        thread.join();
+}
+
 TEST(EightThreads, ReadOneHistoryAndDropTheirCopies) {
     Repository repository(std::make_unique<MemObjectsStorage>());
     const Versions stored = GrowLine(repository);
@@ -83,17 +98,29 @@ TEST(EightThreads, ReadOneHistoryAndDropTheirCopies) {
         // Each thread holds its own copies of the pointers; the last one to drop the fresh versions releases them.
         std::vector<Versions> copies(threadCount, FreshCopies(stored));
         std::vector<std::string> read(threadCount);
-        std::vector<std::thread> threads;
-        std::barrier start(threadCount);
-        for (std::size_t index = 0; index < threadCount; ++index)
-            threads.emplace_back([&, index] {
-                start.arrive_and_wait();
-                read[index] = readBoth(stored, copies[index]);
-            });
-        for (auto& thread : threads)
-            thread.join();
+        AtOnce([&](std::size_t index) { read[index] = readBoth(stored, copies[index]); });
         for (auto const& each : read)
             ASSERT_TRUE(each == expected);
+    }
+}
+
+TEST(EightThreads, FetchWhatIsDeferredOnce) {
+    const auto parent = immu::make<Commit>();
+    const auto root = immu::make<Tree>();
+    for (int round = 0; round < 50; ++round) {
+        std::atomic<int> fetches{0};
+        Commit commit;
+        commit.DeferParent(parent->GetId(), [&](Id const&) { return ++fetches, immu::make<Commit>(); });
+        commit.DeferRoot(root->GetId(), [&](Id const&) { return ++fetches, immu::make<Tree>(); });
+        std::vector<cow_ptr<Commit>> parents(threadCount);
+        std::vector<cow_ptr<CommitTree>> files(threadCount);
+        AtOnce([&](std::size_t index) {
+            parents[index] = commit.GetParent();
+            files[index] = Commit(commit).GetHeldParent() ? commit.GetCommitTree() : nullptr;
+        });
+        for (std::size_t index = 0; index < threadCount; ++index)
+            EXPECT_TRUE(parents[index] && parents[index] == parents[0] && files[index] == files[0]);
+        EXPECT_EQ(fetches, 2);
     }
 }
 
