@@ -87,6 +87,17 @@ TEST_F(Repositories, WithoutAStorageThereIsNothingAndNothingCanBeDone) {
     EXPECT_EQ(Narrow(none.GetCurentBranch()), "master");
 }
 
+TEST_F(Repositories, InterningGivesTheStoredObject) {
+    EXPECT_FALSE(repo.SyncWithStorage(cow_ptr<Commit>()) || repo.SyncWithStorage(cow_ptr<Tree>()) ||
+                 repo.SyncWithStorage(cow_ptr<Blob>()));
+    EXPECT_TRUE(repo.SyncWithStorage(one) == one);
+    EXPECT_TRUE(repo.SyncWithStorage(immu::make<Commit>(*one)) == one);
+    const auto tree = MakeTree(repo, "a=1");
+    EXPECT_TRUE(repo.SyncWithStorage(tree) == tree && repo.SyncWithStorage(MakeTree(repo, "a=1")) == tree);
+    EXPECT_TRUE(repo.GetBlobFromStorage(MakeBlob("1").GetId()) == tree->GetLocalBlob(u"a"));
+    EXPECT_EQ(repo.GetCommitCount() * 100 + repo.GetTreeCount() * 10 + repo.GetBlobCount(), 111U);
+}
+
 TEST_F(Repositories, ACommitIsStampedStoredAndMadeTheHead) {
     Commit commit = Described(nullptr, u"first");
     commit.SetCommitTimezoneBias(TimeDelta(1));
