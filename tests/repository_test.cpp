@@ -95,6 +95,7 @@ TEST_F(Repositories, InterningGivesTheStoredObject) {
     const auto tree = MakeTree(repo, "a=1");
     EXPECT_TRUE(repo.SyncWithStorage(tree) == tree && repo.SyncWithStorage(MakeTree(repo, "a=1")) == tree);
     EXPECT_TRUE(repo.GetBlobFromStorage(MakeBlob("1").GetId()) == tree->GetLocalBlob(u"a"));
+    EXPECT_TRUE(repo.SyncWithStorage(immu::make<Blob>(MakeBlob("1"))) == tree->GetLocalBlob(u"a"));
     EXPECT_EQ(repo.GetCommitCount() * 100 + repo.GetTreeCount() * 10 + repo.GetBlobCount(), 111U);
 }
 
