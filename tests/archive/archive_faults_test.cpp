@@ -42,6 +42,9 @@ void* ReallocateForSqlite(void* memory, int size) {
         throw std::bad_alloc();
     return memory;
 }
+[[gnu::noinline]] void* operator new(std::size_t size, std::nothrow_t const& /*tag*/) noexcept {
+    return Fails() ? nullptr : std::malloc(size == 0 ? 1 : size);
+}
 [[gnu::noinline]] void operator delete(void* memory) noexcept {
     std::free(memory);
 }
