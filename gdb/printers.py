@@ -61,10 +61,10 @@ def find_type(name):
 
 def characters_of(string):
     """Pointer and length of a KivStringT or KivStringViewT."""
-    text = string["text_"]
     unit = string.type.strip_typedefs().template_argument(0)
     if has_member(string, "length_"):
-        return text, int(string["length_"])
+        return string["text_"], int(string["length_"])
+    text = string["text_"]["object_"]
     if int(text) == 0:
         return text.cast(unit.pointer()), 0
     return (text + 1).cast(unit.pointer()), int(text["length"])
@@ -82,7 +82,7 @@ def id_of(identifier):
     """The text of an Id; None for the null identifier."""
     if identifier["tellsDigest_"]:
         return array_bytes(identifier["digest_"]).hex()
-    text = atomic_value(identifier["text_"])
+    text = atomic_value(identifier["text_"]["value_"]["word_"])
     if int(text) == 0:
         return None
     if find_type("KivVcs::Id::Text") is None:
@@ -93,7 +93,7 @@ def id_of(identifier):
 def known_id_of(thing):
     """The identifier that an object has computed already; None otherwise."""
     cached = thing["id_"]
-    if int(atomic_value(cached["state_"])) < ID_STATE_SET:
+    if int(atomic_value(cached["state_"]["word_"])) < ID_STATE_SET:
         return None
     return array_bytes(cached["digest_"]).hex()
 
@@ -107,7 +107,7 @@ class Buffers:
     """Size and bytes of a buffer."""
 
     def __init__(self, buffer):
-        self.content = buffer["content_"]
+        self.content = buffer["content_"]["object_"]
         self.known = find_type("KivUtils::Memory::Buffer::Block") is not None
 
     def size(self):
@@ -155,7 +155,7 @@ def elements_of(vector):
 
 def pointee_of(pointer):
     """What a cow_ptr points to; None for null."""
-    counted = pointer["counted_"]
+    counted = pointer["counted_"]["object_"]
     if int(counted) == 0:
         return None
     held = pointer.type.strip_typedefs().template_argument(0).strip_typedefs()
@@ -214,7 +214,7 @@ class PointerPrinter:
         self.value = value
 
     def to_string(self):
-        counted = self.value["counted_"]
+        counted = self.value["counted_"]["object_"]
         if int(counted) == 0:
             return "null"
         owners = int(atomic_value(counted["references_"]))
@@ -293,7 +293,7 @@ class CommitTreePrinter:
         self.value = value
 
     def to_string(self):
-        return "the files of a commit" if int(self.value["root_"]["counted_"]) else "no files"
+        return "the files of a commit" if int(self.value["root_"]["counted_"]["object_"]) else "no files"
 
     def children(self):
         root = pointee_of(self.value["root_"])
@@ -319,7 +319,7 @@ class TreePrinter(ObjectPrinter):
 
 def entries_below(handle):
     """The entries below a node, in order."""
-    node = handle["counted_"].cast(gdb.lookup_type("KivVcs::detail::Node").pointer())
+    node = handle["counted_"]["object_"].cast(gdb.lookup_type("KivVcs::detail::Node").pointer())
     if int(node) == 0:
         return
     kind = "Entry" if int(node["height_"]) == 0 else "Child"

@@ -33,8 +33,8 @@ STANDS_ON = {
 # The public headers of the core, whose directory does not say which room they are in.
 HEADERS = {
     "foundation": ("Foundation",),
-    "identifiers": ("SHADigest256", "Id"),
-    "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/KeptForm", "detail/Published"),
+    "identifiers": ("SHADigest256", "Id", "detail/Published", "detail/PublishedWord"),
+    "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/KeptForm"),
     "interface": ("IRepository",),
     "tree": ("Tree", "CommitTree", "Differences", "PortablePaths", "detail/EntryTable"),
     "merge": ("Merge", "Conflicts"),

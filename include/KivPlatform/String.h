@@ -5,9 +5,9 @@
 
 #include "KivPlatform/Export.h"
 #include "KivPlatform/StringView.h"
+#include "KivPlatform/counted_ptr.h"
 
 #include <array>
-#include <atomic>
 #include <cstdint>
 #include <iosfwd>
 #include <utility>
@@ -69,21 +69,6 @@ public:
         requires std::same_as<C, char16_t>
     KivStringT(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
 
-    KivStringT(KivStringT const& other) noexcept : text_(other.text_) {
-        if (text_ != nullptr)
-            text_->references.fetch_add(1, std::memory_order_relaxed);
-    }
-    KivStringT(KivStringT&& other) noexcept : text_(std::exchange(other.text_, nullptr)) {}
-    KivStringT& operator=(KivStringT const& other) noexcept {
-        KivStringT(other).Swap(*this);
-        return *this;
-    }
-    KivStringT& operator=(KivStringT&& other) noexcept {
-        KivStringT(std::move(other)).Swap(*this);
-        return *this;
-    }
-    ~KivStringT() { Release(); }
-
     /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does. Behind a
     /// percent sign, "s" takes NUL-terminated text (null counts as empty), ".*s" a length and text, "d", "u" and "lu" any
     /// integer; a width ("5d", "02d") pads with blanks or zeros; two percent signs write one. A directive without an
@@ -94,11 +79,11 @@ public:
         FormatList(format, list.data(), list.size());
     }
 
-    [[nodiscard]] int GetLength() const noexcept { return text_ == nullptr ? 0 : text_->length; }
+    [[nodiscard]] int GetLength() const noexcept { return text_ ? text_->length : 0; }
     [[nodiscard]] bool IsEmpty() const noexcept { return GetLength() == 0; }
 
     /// The NUL-terminated text, never null; valid until the string is changed or destroyed.
-    [[nodiscard]] const C* GetString() const noexcept { return text_ == nullptr ? &terminator : Characters(); }
+    [[nodiscard]] const C* GetString() const noexcept { return text_ ? Characters() : &terminator; }
     operator const C*() const noexcept { return GetString(); }
 
     /// Whether both are copies of one text, so that they are equal without a look at the characters.
@@ -143,7 +128,7 @@ public:
         return *this;
     }
 
-    void Swap(KivStringT& other) noexcept { std::swap(text_, other.text_); }
+    void Swap(KivStringT& other) noexcept { text_.swap(other.text_); }
 
     /// Makes a text of @p length code units and lets @p fill write them through the pointer that it is given.
     template <class Fill>
@@ -157,30 +142,28 @@ public:
     }
 
 private:
-    struct Text {
-        std::atomic<std::uint32_t> references{1};
+    struct Text : reference_counted {
         std::int32_t length = 0;
         std::int32_t capacity = 0;
     };
+    struct DestroyText {
+        void operator()(Text* text) const noexcept { Destroy(text); }
+    };
+    using Handle = counted_ptr<Text, DestroyText>;
 
     static constexpr C terminator{};
 
     /// Room for @p capacity code units and the terminator; the length is set to the capacity and terminated there.
-    static Text* Allocate(int capacity);
+    static Handle Allocate(int capacity);
     static void Destroy(Text* text) noexcept;
 
-    [[nodiscard]] C* Characters() const noexcept { return reinterpret_cast<C*>(text_ + 1); }
+    [[nodiscard]] C* Characters() const noexcept { return reinterpret_cast<C*>(text_.get() + 1); }
     [[nodiscard]] KivStringT Slice(View part) const {
         return part.GetLength() == GetLength() ? *this : KivStringT(part);
     }
     void FormatList(View format, const FormatArgument<C>* arguments, std::size_t count);
 
-    void Release() noexcept {
-        if (text_ != nullptr && text_->references.fetch_sub(1, std::memory_order_acq_rel) == 1)
-            Destroy(text_);
-    }
-
-    Text* text_ = nullptr;
+    Handle text_;
 };
 
 template <class C>

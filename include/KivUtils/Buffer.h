@@ -4,11 +4,11 @@
 /// A growable byte buffer made of shared chunks.
 
 #include "KivPlatform/Export.h"
+#include "KivPlatform/counted_ptr.h"
 
 #include <cstddef>
 #include <cstdint>
 #include <span>
-#include <utility>
 
 namespace KivUtils::Memory {
 
@@ -45,17 +45,6 @@ public:
     Buffer() noexcept = default;
     /// @p size zero bytes.
     explicit Buffer(std::uint64_t size);
-    Buffer(Buffer const& other) noexcept;
-    Buffer(Buffer&& other) noexcept : content_(std::exchange(other.content_, nullptr)) {}
-    Buffer& operator=(Buffer const& other) noexcept {
-        Buffer(other).Swap(*this);
-        return *this;
-    }
-    Buffer& operator=(Buffer&& other) noexcept {
-        Buffer(std::move(other)).Swap(*this);
-        return *this;
-    }
-    ~Buffer();
 
     /// Appends the @p size bytes at @p data, @p count times over. Memory is taken in exact size for the first bytes and
     /// grows by a bounded share of the content afterwards. The bytes may be the buffer's own.
@@ -87,20 +76,31 @@ public:
     /// Logarithmic in the number of chunks, plus the bytes copied.
     [[nodiscard]] bool Read(std::uint64_t offset, void* destination, std::uint64_t size) const noexcept;
 
-    void Swap(Buffer& other) noexcept { std::swap(content_, other.content_); }
+    void Swap(Buffer& other) noexcept { content_.swap(other.content_); }
 
 private:
-    struct Content;
+    /// What a buffer points to: one block of bytes, or a chain of pieces of blocks.
+    struct Content : KivPlatform::reference_counted {
+        Content(bool chain, std::uint64_t bytes) noexcept : isChain(chain), size(bytes) {}
+
+        bool isChain;
+        std::uint64_t size;
+    };
     struct Block;
     struct Chain;
+    struct DestroyContent {
+        void operator()(Content* content) const noexcept { Destroy(content); }
+    };
+    template <class T>
+    using Handle = KivPlatform::counted_ptr<T, DestroyContent>;
 
     std::byte* Allocate(std::uint64_t size);
     void AppendOnce(const std::byte* data, std::size_t size);
     void AppendPiece(Block* owner, BufferChunks::Chunk piece);
     Chain& WritableChain();
-    static void Drop(Content* content) noexcept;
+    static void Destroy(Content* content) noexcept;
 
-    Content* content_ = nullptr;
+    Handle<Content> content_;
 };
 
 } // namespace KivUtils::Memory

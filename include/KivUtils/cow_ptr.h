@@ -3,9 +3,8 @@
 /// @file
 /// `cow_ptr`: a shared, reference-counted pointer with copy-on-write access.
 
-#include "KivPlatform/Export.h"
+#include "KivPlatform/counted_ptr.h"
 
-#include <atomic>
 #include <concepts>
 #include <cstddef>
 #include <cstdint>
@@ -24,30 +23,8 @@ struct emplace_t {
 inline constexpr emplace_t emplace{};
 
 /// The count of the `cow_ptr`s that hold an object. A class that derives from it carries its own count and is held
-/// without a control block; any other type gets one. Copying or assigning an object never copies the count.
-class reference_counted {
-public:
-    reference_counted() noexcept = default;
-    reference_counted(reference_counted const&) noexcept {}
-    reference_counted& operator=(reference_counted const&) noexcept { return *this; }
-
-    void add_reference() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
-
-    /// True if that was the last reference; everything done through the other references happened before.
-    [[nodiscard]] bool drop_reference() const noexcept {
-        // A sole owner needs no atomic exchange: nobody else is left who could add a reference.
-        return references_.load(std::memory_order_acquire) == 1 ||
-               references_.fetch_sub(1, std::memory_order_acq_rel) == 1;
-    }
-
-    [[nodiscard]] std::uint32_t reference_count() const noexcept { return references_.load(std::memory_order_acquire); }
-
-protected:
-    ~reference_counted() = default;
-
-private:
-    mutable std::atomic<std::uint32_t> references_{0};
-};
+/// without a control block; any other type gets one.
+using KivPlatform::reference_counted;
 
 /// The control block of an object that does not count itself.
 class object_holder : public reference_counted {
@@ -105,9 +82,9 @@ public:
     template <class... Arguments>
     explicit cow_ptr(emplace_t, Arguments&&... arguments) {
         if constexpr (is_self_counted())
-            adopt(new T(std::forward<Arguments>(arguments)...));
+            counted_ = handle(new T(std::forward<Arguments>(arguments)...));
         else
-            adopt(new in_place_holder<T>(std::forward<Arguments>(arguments)...));
+            counted_ = handle(new in_place_holder<T>(std::forward<Arguments>(arguments)...));
     }
 
     /// Takes over an object made elsewhere; null gives null.
@@ -115,36 +92,25 @@ public:
         if (object == nullptr)
             return;
         if constexpr (is_self_counted())
-            adopt(object.release());
+            counted_ = handle(object.release());
         else
-            adopt(new adopting_holder<T>(std::move(object)));
+            counted_ = handle(new adopting_holder<T>(std::move(object)));
     }
 
     /// Another pointer to an object that a `cow_ptr` holds already; null gives null. Self-counted types only.
     [[nodiscard]] static cow_ptr share(T const* object) noexcept {
         cow_ptr pointer;
-        if (object != nullptr)
-            pointer.adopt(object);
+        pointer.counted_ = handle(object);
         return pointer;
     }
 
     /// Gives up the object without dropping the reference, which `attach` takes over again. Self-counted types only.
-    [[nodiscard]] T const* detach() noexcept {
-        T const* const held = get();
-        counted_ = nullptr;
-        return held;
-    }
+    [[nodiscard]] T const* detach() noexcept { return static_cast<T const*>(counted_.detach()); }
     [[nodiscard]] static cow_ptr attach(T const* object) noexcept {
         cow_ptr pointer;
-        pointer.counted_ = object;
+        pointer.counted_ = handle::attach(object);
         return pointer;
     }
-
-    cow_ptr(cow_ptr const& other) noexcept : counted_(other.counted_) {
-        if (counted_ != nullptr)
-            counted_->add_reference();
-    }
-    cow_ptr(cow_ptr&& other) noexcept : counted_(std::exchange(other.counted_, nullptr)) {}
 
     /// Shares the object as one of its base class. A write through the result copies, if it has to, as the base class
     /// does.
@@ -159,38 +125,26 @@ public:
             if (static_cast<void const*>(base) != static_cast<void const*>(other.get()))
                 throw std::invalid_argument("this base class is not at the beginning of the object");
         }
-        counted_ = std::exchange(other.counted_, nullptr);
+        counted_ = handle::attach(other.counted_.detach());
     }
-
-    cow_ptr& operator=(cow_ptr const& other) noexcept {
-        cow_ptr(other).swap(*this);
-        return *this;
-    }
-    cow_ptr& operator=(cow_ptr&& other) noexcept {
-        cow_ptr(std::move(other)).swap(*this);
-        return *this;
-    }
-    ~cow_ptr() { drop(); }
 
     [[nodiscard]] T const* get() const noexcept { return object(); }
     T const* operator->() const noexcept { return object(); }
     T const& operator*() const noexcept { return *object(); }
-    explicit operator bool() const noexcept { return counted_ != nullptr; }
+    explicit operator bool() const noexcept { return static_cast<bool>(counted_); }
 
     /// The number of pointers that hold the object; 0 for null.
-    [[nodiscard]] std::uint32_t use_count() const noexcept {
-        return counted_ == nullptr ? 0 : counted_->reference_count();
-    }
+    [[nodiscard]] std::uint32_t use_count() const noexcept { return counted_.use_count(); }
 
     void reset() noexcept { cow_ptr().swap(*this); }
-    void swap(cow_ptr& other) noexcept { std::swap(counted_, other.counted_); }
+    void swap(cow_ptr& other) noexcept { counted_.swap(other.counted_); }
 
     /// The object for writing: null for null; the object itself for a sole owner; otherwise a copy, which this pointer
     /// then owns alone, the other owners keeping the unchanged object. It is made by `CopyOf(T const&)` if there is such
     /// a function beside `T`, otherwise by the copy constructor of `T`.
     /// @throws what copying throws; the pointer is unchanged then.
     T* write_if_there() {
-        if (counted_ == nullptr)
+        if (!counted_)
             return nullptr;
         if (counted_->reference_count() != 1)
             copy(*object()).swap(*this);
@@ -199,7 +153,7 @@ public:
 
     /// As `write_if_there`, but a null pointer first receives a new default-constructed `T`; never null.
     T* write() {
-        if (counted_ == nullptr)
+        if (!counted_)
             cow_ptr(emplace).swap(*this);
         return write_if_there();
     }
@@ -208,21 +162,29 @@ public:
     /// take an object apart before it dies. Self-counted types only.
     [[nodiscard]] std::unique_ptr<T> release_if_last() noexcept {
         static_assert(std::is_base_of_v<reference_counted, T>);
-        const auto* const counted = std::exchange(counted_, nullptr);
-        if (counted == nullptr || !counted->drop_reference())
-            return nullptr;
-        return std::unique_ptr<T>(static_cast<T*>(const_cast<reference_counted*>(counted)));
+        const auto* const last = counted_.release_if_last().release();
+        return std::unique_ptr<T>(static_cast<T*>(const_cast<reference_counted*>(last)));
     }
 
     /// Identity of the object, not equality of content.
     friend bool operator==(cow_ptr const& left, cow_ptr const& right) noexcept {
         return left.counted_ == right.counted_;
     }
-    friend bool operator==(cow_ptr const& pointer, std::nullptr_t) noexcept { return pointer.counted_ == nullptr; }
+    friend bool operator==(cow_ptr const& pointer, std::nullptr_t) noexcept { return !pointer.counted_; }
 
 private:
     template <class>
     friend class cow_ptr;
+
+    struct deleter {
+        void operator()(reference_counted const* counted) const noexcept {
+            if constexpr (is_self_counted())
+                delete static_cast<T const*>(counted);
+            else
+                delete static_cast<object_holder const*>(counted);
+        }
+    };
+    using handle = KivPlatform::counted_ptr<reference_counted const, deleter>;
 
     // Not a constant: T may be incomplete where the class is named.
     [[nodiscard]] static constexpr bool is_self_counted() noexcept { return std::is_base_of_v<reference_counted, T>; }
@@ -236,30 +198,15 @@ private:
             return cow_ptr(emplace, object);
     }
 
-    template <class Counted>
-    void adopt(Counted* counted) noexcept {
-        counted_ = counted;
-        counted_->add_reference();
-    }
-
     [[nodiscard]] T* object() const noexcept {
-        auto* const counted = const_cast<reference_counted*>(counted_);
+        auto* const counted = const_cast<reference_counted*>(counted_.get());
         if constexpr (is_self_counted())
             return static_cast<T*>(counted);
         else
             return counted == nullptr ? nullptr : static_cast<T*>(static_cast<object_holder*>(counted)->object());
     }
 
-    void drop() noexcept {
-        if (counted_ == nullptr || !counted_->drop_reference())
-            return;
-        if constexpr (is_self_counted())
-            delete static_cast<T const*>(counted_);
-        else
-            delete static_cast<object_holder const*>(counted_);
-    }
-
-    reference_counted const* counted_ = nullptr;
+    handle counted_;
 };
 
 /// Makers of objects that are only read from then on.

@@ -4,9 +4,9 @@
 /// What every object is known by.
 
 #include "KivVcs/Foundation.h"
+#include "KivVcs/detail/Published.h"
 
 #include <array>
-#include <atomic>
 #include <compare>
 #include <cstddef>
 #include <cstdint>
@@ -42,32 +42,24 @@ public:
     /// The identifier that 64 hexadecimal digits, of either case, spell; nothing for any other text.
     [[nodiscard]] static optional<Id> Parse(std::string_view digits) noexcept;
 
-    Id(Id const& other) noexcept
-        : digest_(other.digest_), hash_(other.hash_), text_(Share(other)), tellsDigest_(other.tellsDigest_) {}
+    Id(Id const& other) noexcept = default;
     Id(Id&& other) noexcept
-        : digest_(other.digest_), hash_(std::exchange(other.hash_, hashOfNull)), text_(TakeText(other)),
+        : digest_(other.digest_), hash_(std::exchange(other.hash_, hashOfNull)), text_(std::move(other.text_)),
           tellsDigest_(std::exchange(other.tellsDigest_, false)) {}
     Id& operator=(Id other) noexcept {
         digest_ = other.digest_;
         std::swap(hash_, other.hash_);
         std::swap(tellsDigest_, other.tellsDigest_);
-        Text const* const mine = text_.load(std::memory_order_relaxed);
-        text_.store(other.text_.load(std::memory_order_relaxed), std::memory_order_relaxed);
-        other.text_.store(mine, std::memory_order_relaxed);
+        text_.Swap(other.text_);
         return *this;
     }
-    ~Id() {
-        if (Text const* const text = text_.load(std::memory_order_acquire))
-            Drop(text);
-    }
+    ~Id() = default;
 
     /// The text, made on first use; valid as long as this identifier, or a copy made of it afterwards, lives.
     /// @throws std::bad_alloc
     [[nodiscard]] KivStringT<char16_t> const& GetText() const;
 
-    [[nodiscard]] bool IsEmpty() const noexcept {
-        return !tellsDigest_ && text_.load(std::memory_order_relaxed) == nullptr;
-    }
+    [[nodiscard]] bool IsEmpty() const noexcept { return !tellsDigest_ && text_.Get() == nullptr; }
 
     /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
     [[nodiscard]] std::size_t Hash() const noexcept { return hash_; }
@@ -91,30 +83,21 @@ private:
     Id(Digest const& digest, std::size_t hash) noexcept : digest_(digest), hash_(hash), tellsDigest_(true) {}
 
     /// Spelled out only when somebody asks for it, since a repository holds an identifier for every object.
-    struct Text;
+    struct Text final : KivUtils::reference_counted {
+        explicit Text(KivStringT<char16_t> value) noexcept : text(std::move(value)) {}
+
+        KivStringT<char16_t> text;
+    };
 
     static constexpr auto hashOfNull = static_cast<std::size_t>(0x42c52834b230ef45U);
 
     static std::size_t HashOf(Digest const& digest) noexcept;
-    static Text const* Share(Id const& other) noexcept {
-        Text const* const text = other.text_.load(std::memory_order_acquire);
-        if (text != nullptr)
-            AddReference(text);
-        return text;
-    }
-    static Text const* TakeText(Id& other) noexcept {
-        Text const* const text = other.text_.load(std::memory_order_relaxed);
-        other.text_.store(nullptr, std::memory_order_relaxed);
-        return text;
-    }
-    static void AddReference(Text const* text) noexcept;
-    static void Drop(Text const* text) noexcept;
     static bool HaveSameText(Id const& left, Id const& right) noexcept;
     static std::strong_ordering Compare(Id const& left, Id const& right) noexcept;
 
     Digest digest_{};
     std::size_t hash_ = hashOfNull;
-    mutable std::atomic<Text const*> text_{nullptr};
+    detail::Published<Text> text_;
     bool tellsDigest_ = false;
 };
 

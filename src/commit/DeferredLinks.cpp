@@ -1,6 +1,7 @@
 #include "KivVcs/detail/DeferredLinks.h"
 
 #include "KivVcs/Commit.h"
+#include "KivVcs/detail/PublishedWord.h"
 
 #include <stdexcept>
 
@@ -28,14 +29,14 @@ public:
     DeferredLink(DeferredLink const& other) : id_(other.id_), fetch_(other.fetch_) {
         if (cow_ptr<Holder> const* const held = other.GetHeld()) {
             held_ = *held;
-            state_.store(State::Held, std::memory_order_relaxed);
+            state_.Set(State::Held);
         }
     }
     DeferredLink& operator=(DeferredLink other) noexcept {
         id_ = std::move(other.id_);
         fetch_ = std::move(other.fetch_);
         held_.swap(other.held_);
-        state_.store(other.state_.load(std::memory_order_relaxed), std::memory_order_relaxed);
+        state_.Set(other.state_.Get());
         return *this;
     }
     ~DeferredLink() = default;
@@ -43,7 +44,7 @@ public:
     [[nodiscard]] bool IsSet() const noexcept { return !id_.IsEmpty(); }
     [[nodiscard]] Id const& GetId() const noexcept { return id_; }
     [[nodiscard]] cow_ptr<Holder> const* GetHeld() const noexcept {
-        return state_.load(std::memory_order_acquire) == State::Held ? &held_ : nullptr;
+        return state_.Get() == State::Held ? &held_ : nullptr;
     }
 
     [[nodiscard]] cow_ptr<Holder> const& Get() const {
@@ -67,10 +68,7 @@ private:
         explicit Fetching(DeferredLink const& link) noexcept : link_(link) {}
         Fetching(Fetching const&) = delete;
         Fetching& operator=(Fetching const&) = delete;
-        ~Fetching() {
-            link_.state_.store(link_.held_ ? State::Held : State::NotFetched, std::memory_order_release);
-            link_.state_.notify_all();
-        }
+        ~Fetching() { link_.state_.PublishToWaiting(link_.held_ ? State::Held : State::NotFetched); }
 
     private:
         DeferredLink const& link_;
@@ -80,18 +78,18 @@ private:
     [[nodiscard]] bool BeginToFetch() const noexcept {
         for (;;) {
             State state = State::NotFetched;
-            if (state_.compare_exchange_strong(state, State::Fetching, std::memory_order_acquire))
+            if (state_.Replace(state, State::Fetching))
                 return true;
             if (state == State::Held)
                 return false;
-            state_.wait(State::Fetching, std::memory_order_acquire);
+            state_.WaitWhile(State::Fetching);
         }
     }
 
     Id id_;
     Fetch fetch_;
     mutable cow_ptr<Holder> held_;
-    mutable std::atomic<State> state_{State::NotFetched};
+    PublishedWord<State> state_;
 };
 
 } // namespace

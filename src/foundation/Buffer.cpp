@@ -1,7 +1,5 @@
 #include "KivUtils/Buffer.h"
 
-#include "KivUtils/cow_ptr.h"
-
 #include <algorithm>
 #include <cstring>
 #include <limits>
@@ -25,24 +23,14 @@ std::size_t RoomForGrowth(std::uint64_t content) noexcept {
 
 } // namespace
 
-/// What a buffer points to: one block of bytes, or a chain of pieces of blocks.
-struct Buffer::Content : reference_counted {
-    Content(bool chain, std::uint64_t bytes) noexcept : isChain(chain), size(bytes) {}
-
-    bool isChain;
-    std::uint64_t size;
-};
-
 /// Bytes in the same allocation as their header. They are written once; what a piece shows never changes.
 struct Buffer::Block final : Content {
     explicit Block(std::size_t room) noexcept : Content(false, 0), capacity(room) {}
 
-    static Block* Make(std::size_t capacity) {
+    static Handle<Block> Make(std::size_t capacity) {
         if (capacity > std::numeric_limits<std::size_t>::max() / 2)
             throw std::length_error("buffer larger than the address space");
-        auto* block = ::new (::operator new(sizeof(Block) + capacity)) Block(capacity);
-        block->add_reference();
-        return block;
+        return Handle<Block>(::new (::operator new(sizeof(Block) + capacity)) Block(capacity));
     }
 
     [[nodiscard]] std::byte* Bytes() noexcept { return reinterpret_cast<std::byte*>(this + 1); }
@@ -59,16 +47,6 @@ struct Buffer::Block final : Content {
 
 struct Buffer::Chain final : Content {
     Chain() noexcept : Content(true, 0) {}
-    Chain(Chain const& other)
-        : Content(true, other.size), chunks(other.chunks), ends(other.ends), owners(other.owners) {
-        for (Block* owner : owners)
-            owner->add_reference();
-    }
-    Chain& operator=(Chain const&) = delete;
-    ~Chain() {
-        for (Block* owner : owners)
-            Drop(owner);
-    }
 
     /// Makes room for one more piece, so that adding it cannot fail half-way.
     void Reserve() {
@@ -81,23 +59,22 @@ struct Buffer::Chain final : Content {
         owners.reserve(room);
     }
 
-    /// Adds a piece and takes one reference to its block over.
-    void Add(Block* owner, BufferChunks::Chunk piece) noexcept {
+    /// Adds a piece of a block. @pre there is room
+    void Add(Handle<Block> owner, BufferChunks::Chunk piece) noexcept {
         size += piece.size();
         chunks.push_back(piece);
         ends.push_back(size);
-        owners.push_back(owner);
+        owners.push_back(std::move(owner));
     }
 
     void Share(Block* owner, BufferChunks::Chunk piece) {
         Reserve();
-        owner->add_reference();
-        Add(owner, piece);
+        Add(Handle<Block>(owner), piece);
     }
 
     /// The bytes that can be written behind the last piece without anybody else seeing them.
     [[nodiscard]] std::size_t RoomAtEnd() const noexcept {
-        if (owners.empty() || owners.back()->reference_count() != 1)
+        if (owners.empty() || owners.back().use_count() != 1)
             return 0;
         const auto* pieceEnd = chunks.back().data() + chunks.back().size();
         return pieceEnd == owners.back()->Bytes() + owners.back()->size ? owners.back()->Room() : 0;
@@ -112,12 +89,10 @@ struct Buffer::Chain final : Content {
 
     std::vector<BufferChunks::Chunk> chunks;
     std::vector<std::uint64_t> ends;
-    std::vector<Block*> owners;
+    std::vector<Handle<Block>> owners;
 };
 
-void Buffer::Drop(Content* content) noexcept {
-    if (content == nullptr || !content->drop_reference())
-        return;
+void Buffer::Destroy(Content* content) noexcept {
     if (content->isChain) {
         delete static_cast<Chain*>(content);
     } else {
@@ -132,24 +107,15 @@ Buffer::Buffer(std::uint64_t size) {
         std::memset(Allocate(size), 0, static_cast<std::size_t>(size));
 }
 
-Buffer::Buffer(Buffer const& other) noexcept : content_(other.content_) {
-    if (content_ != nullptr)
-        content_->add_reference();
-}
-
-Buffer::~Buffer() {
-    Drop(content_);
-}
-
 std::uint64_t Buffer::GetSize() const noexcept {
-    return content_ == nullptr ? 0 : content_->size;
+    return content_ ? content_->size : 0;
 }
 
 BufferChunks Buffer::LockForRead() const noexcept {
-    if (content_ == nullptr)
+    if (!content_)
         return {};
     if (!content_->isChain)
-        return BufferChunks(static_cast<Block*>(content_)->Chunk());
+        return BufferChunks(static_cast<Block*>(content_.get())->Chunk());
     auto const& chain = static_cast<Chain const&>(*content_);
     return {chain.chunks.data(), chain.chunks.size()};
 }
@@ -161,7 +127,7 @@ bool Buffer::Read(std::uint64_t offset, void* destination, std::uint64_t size) c
         return true;
     auto* out = static_cast<std::byte*>(destination);
     if (!content_->isChain) {
-        std::memcpy(out, static_cast<Block*>(content_)->Bytes() + offset, static_cast<std::size_t>(size));
+        std::memcpy(out, static_cast<Block*>(content_.get())->Bytes() + offset, static_cast<std::size_t>(size));
         return true;
     }
     auto const& chain = static_cast<Chain const&>(*content_);
@@ -182,10 +148,11 @@ bool Buffer::Read(std::uint64_t offset, void* destination, std::uint64_t size) c
 std::byte* Buffer::Allocate(std::uint64_t size) {
     if (size > std::numeric_limits<std::size_t>::max() / 2)
         throw std::length_error("buffer larger than the address space");
-    auto* block = Block::Make(static_cast<std::size_t>(size));
+    auto block = Block::Make(static_cast<std::size_t>(size));
     block->size = size;
-    Drop(std::exchange(content_, block));
-    return block->Bytes();
+    std::byte* const bytes = block->Bytes();
+    content_ = std::move(block);
+    return bytes;
 }
 
 void Buffer::Append(const void* data, std::uint64_t size, std::uint64_t count) {
@@ -206,37 +173,39 @@ void Buffer::Append(const void* data, std::uint64_t size, std::uint64_t count) {
 }
 
 void Buffer::AppendOnce(const std::byte* data, std::size_t size) {
-    const bool unique = content_ != nullptr && content_->reference_count() == 1;
-    if (unique && !content_->isChain && static_cast<Block*>(content_)->Room() >= size) {
-        static_cast<Block*>(content_)->Write(data, size);
+    const bool unique = content_.use_count() == 1;
+    if (unique && !content_->isChain && static_cast<Block*>(content_.get())->Room() >= size) {
+        static_cast<Block*>(content_.get())->Write(data, size);
         return;
     }
     const auto held = static_cast<std::size_t>(GetSize());
-    if ((content_ == nullptr || !content_->isChain) && held + size <= largestCopiedBlock) {
+    if ((!content_ || !content_->isChain) && held + size <= largestCopiedBlock) {
         // The first bytes are taken as the only ones; from the second append on the room doubles.
-        auto* grown = Block::Make(held == 0 ? size : std::max(held + size, std::min(2 * held, largestCopiedBlock)));
+        auto grown = Block::Make(held == 0 ? size : std::max(held + size, std::min(2 * held, largestCopiedBlock)));
         if (held > 0)
-            grown->Write(static_cast<Block*>(content_)->Bytes(), held);
+            grown->Write(static_cast<Block*>(content_.get())->Bytes(), held);
         grown->Write(data, size);
-        Drop(std::exchange(content_, grown));
+        content_ = std::move(grown);
         return;
     }
-    if (content_ == nullptr) {
+    if (!content_) {
         std::memcpy(Allocate(size), data, size);
         return;
     }
     Chain& chain = WritableChain();
     chain.Reserve();
     const std::size_t fitting = std::min(size, chain.RoomAtEnd());
-    Block* further = nullptr;
+    Handle<Block> further;
     if (size > fitting) {
         further = Block::Make(std::max(size - fitting, RoomForGrowth(held)));
         further->Write(data + fitting, size - fitting);
     }
     if (fitting > 0)
         chain.WriteAtEnd(data, fitting);
-    if (further != nullptr)
-        chain.Add(further, further->Chunk());
+    if (further) {
+        const auto piece = further->Chunk();
+        chain.Add(std::move(further), piece);
+    }
 }
 
 void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t size) {
@@ -244,12 +213,12 @@ void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t siz
     if (size == 0)
         return;
     const Buffer source(other);
-    if (content_ == nullptr && size == source.GetSize()) {
+    if (!content_ && size == source.GetSize()) {
         *this = source;
         return;
     }
     if (!source.content_->isChain) {
-        auto* block = static_cast<Block*>(source.content_);
+        auto* block = static_cast<Block*>(source.content_.get());
         AppendPiece(block, block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));
         return;
     }
@@ -262,7 +231,7 @@ void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t siz
          ++index) {
         auto piece = chain.chunks[index].subspan(std::exchange(skip, 0));
         piece = piece.first(static_cast<std::size_t>(std::min<std::uint64_t>(piece.size(), size)));
-        result.AppendPiece(chain.owners[index], piece);
+        result.AppendPiece(chain.owners[index].get(), piece);
         size -= piece.size();
     }
     Swap(result);
@@ -276,18 +245,17 @@ void Buffer::AppendPiece(Block* owner, BufferChunks::Chunk piece) {
 }
 
 Buffer::Chain& Buffer::WritableChain() {
-    if (content_ != nullptr && content_->isChain && content_->reference_count() == 1)
+    if (content_ && content_->isChain && content_.use_count() == 1)
         return static_cast<Chain&>(*content_);
     auto chain = std::make_unique<Chain>();
-    if (content_ != nullptr && content_->isChain) {
+    if (content_ && content_->isChain) {
         chain = std::make_unique<Chain>(static_cast<Chain const&>(*content_));
-    } else if (content_ != nullptr) {
-        auto* block = static_cast<Block*>(content_);
+    } else if (content_) {
+        auto* block = static_cast<Block*>(content_.get());
         chain->Share(block, block->Chunk());
     }
-    chain->add_reference();
-    Drop(std::exchange(content_, chain.get()));
-    return *chain.release();
+    content_ = Handle<Content>(chain.release());
+    return static_cast<Chain&>(*content_);
 }
 
 } // namespace KivUtils::Memory

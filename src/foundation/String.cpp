@@ -22,17 +22,14 @@ KivStringT<C>& KivStringT<C>::operator+=(View text) {
     if (text.GetLength() > std::numeric_limits<int>::max() - length)
         throw std::length_error("text longer than a signed 32-bit length can hold");
     const int joined = length + text.GetLength();
-    const bool fits =
-        text_ != nullptr && text_->references.load(std::memory_order_acquire) == 1 && text_->capacity >= joined;
-    if (fits) {
+    if (text_.use_count() == 1 && text_->capacity >= joined) {
         std::copy(text.begin(), text.end(), Characters() + length);
         text_->length = joined;
         Characters()[joined] = C{};
         return *this;
     }
     // A first append is taken as the only one; from the second on the room grows by half, so that loops stay linear.
-    const int room =
-        text_ == nullptr || length > std::numeric_limits<int>::max() / 2 ? joined : std::max(joined, length / 2 * 3);
+    const int room = !text_ || length > std::numeric_limits<int>::max() / 2 ? joined : std::max(joined, length / 2 * 3);
     KivStringT grown;
     grown.text_ = Allocate(room);
     std::copy_n(GetString(), length, grown.Characters());
@@ -44,13 +41,13 @@ KivStringT<C>& KivStringT<C>::operator+=(View text) {
 }
 
 template <class C>
-typename KivStringT<C>::Text* KivStringT<C>::Allocate(int capacity) {
+typename KivStringT<C>::Handle KivStringT<C>::Allocate(int capacity) {
     const auto units = static_cast<std::size_t>(capacity) + 1;
     auto* text = ::new (::operator new(sizeof(Text) + units * sizeof(C))) Text;
     text->length = capacity;
     text->capacity = capacity;
     reinterpret_cast<C*>(text + 1)[capacity] = C{};
-    return text;
+    return Handle(text);
 }
 
 template <class C>

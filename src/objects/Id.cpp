@@ -51,12 +51,6 @@ std::strong_ordering CompareUnits(Left const& left, Right const& right) noexcept
 
 } // namespace
 
-struct Id::Text final : KivUtils::reference_counted {
-    explicit Text(KivStringT<char16_t> value) noexcept : text(std::move(value)) {}
-
-    KivStringT<char16_t> text;
-};
-
 Id::Id(Buffer const& packed) {
     SHADigest256 digest;
     for (auto const& chunk : packed.LockForRead())
@@ -73,10 +67,8 @@ Id::Id(KivStringT<char16_t> const& text) {
         *this = FromDigest(digest);
         return;
     }
-    auto kept = std::make_unique<Text>(text);
-    kept->add_reference();
+    static_cast<void>(text_.GetOrMake([&text] { return Text(text); }));
     hash_ = SampledHash(KivStringViewT<char16_t>(text));
-    text_.store(kept.release(), std::memory_order_relaxed);
 }
 
 std::size_t Id::HashOf(Digest const& digest) noexcept {
@@ -87,23 +79,7 @@ KivStringT<char16_t> const& Id::GetText() const {
     static constinit const KivStringT<char16_t> empty;
     if (IsEmpty())
         return empty;
-    Text const* known = text_.load(std::memory_order_acquire);
-    if (known == nullptr) {
-        auto made = std::make_unique<Text>(DataEncoding::HexEncode(digest_.data(), digest_.size()));
-        made->add_reference();
-        if (text_.compare_exchange_strong(known, made.get(), std::memory_order_acq_rel, std::memory_order_acquire))
-            known = made.release();
-    }
-    return known->text;
-}
-
-void Id::AddReference(Text const* text) noexcept {
-    text->add_reference();
-}
-
-void Id::Drop(Text const* text) noexcept {
-    if (text->drop_reference())
-        delete text;
+    return text_.GetOrMake([this] { return Text(DataEncoding::HexEncode(digest_.data(), digest_.size())); }).text;
 }
 
 optional<Id> Id::Parse(std::string_view digits) noexcept {
@@ -127,7 +103,7 @@ std::strong_ordering Id::Compare(Id const& left, Id const& right) noexcept {
     const auto withUnits = [](Id const& id, auto const& use) {
         if (id.tellsDigest_)
             return use(DigestDigits{id.digest_});
-        Text const* const text = id.text_.load(std::memory_order_relaxed);
+        Text const* const text = id.text_.Get();
         return use(text == nullptr ? KivStringViewT<char16_t>() : KivStringViewT<char16_t>(text->text));
     };
     return withUnits(left, [&](auto const& mine) {
@@ -140,8 +116,8 @@ std::ostream& operator<<(std::ostream& stream, Id const& id) {
 }
 
 bool Id::HaveSameText(Id const& left, Id const& right) noexcept {
-    Text const* const mine = left.text_.load(std::memory_order_relaxed);
-    Text const* const theirs = right.text_.load(std::memory_order_relaxed);
+    Text const* const mine = left.text_.Get();
+    Text const* const theirs = right.text_.Get();
     return mine == theirs || (mine != nullptr && theirs != nullptr && mine->text == theirs->text);
 }
 

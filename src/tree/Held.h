@@ -19,10 +19,8 @@ public:
     Held(cow_ptr<Blob> blob, cow_ptr<Tree> tree)
         : word_(WordOf(immu::make<Both>(std::move(blob), std::move(tree))) | blobBit | treeBit) {}
     Held(Held const& other) noexcept : word_(other.word_) {
-        if (HasBoth())
-            As<Both>()->add_reference();
-        else if (Object const* const object = As<Object>())
-            object->add_reference();
+        static_cast<void>(HasBoth() ? WordOf(cow_ptr<Both>::share(As<Both>()))
+                                    : WordOf(cow_ptr<Object>::share(As<Object>())));
     }
     Held(Held&& other) noexcept : word_(std::exchange(other.word_, 0)) {}
     Held& operator=(Held other) noexcept {

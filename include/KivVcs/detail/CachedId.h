@@ -1,8 +1,8 @@
 #pragma once
 
 #include "KivVcs/Id.h"
+#include "KivVcs/detail/PublishedWord.h"
 
-#include <atomic>
 #include <cstddef>
 #include <cstdint>
 
@@ -21,11 +21,11 @@ public:
     ~CachedId() = default;
 
     /// Whether there is an identifier that is known to be that of a library's object.
-    [[nodiscard]] bool IsOwn() const noexcept { return Current() == State::Own; }
+    [[nodiscard]] bool IsOwn() const noexcept { return state_.Get() == State::Own; }
     /// Whether there is one that will be, should the object be a library's.
-    [[nodiscard]] bool IsCopied() const noexcept { return Current() == State::Copied; }
+    [[nodiscard]] bool IsCopied() const noexcept { return state_.Get() == State::Copied; }
     /// Whether there is one that counts, should the object be of a host's class.
-    [[nodiscard]] bool IsHosts() const noexcept { return Current() == State::Hosts; }
+    [[nodiscard]] bool IsHosts() const noexcept { return state_.Get() == State::Hosts; }
 
     /// The identifier, and its digest. @pre there is one
     [[nodiscard]] Id Get() const noexcept { return {digest_, hash_}; }
@@ -33,19 +33,19 @@ public:
 
     /// Says that the object with a copied identifier is a library's.
     void Confirm() const noexcept {
-        State expected = State::Copied;
-        state_.compare_exchange_strong(expected, State::Own, std::memory_order_acq_rel);
+        State known = State::Copied;
+        static_cast<void>(state_.Replace(known, State::Own));
     }
 
     /// Keeps @p id, which must be a digest, for an object of the given kind, unless another thread is doing so.
     void Keep(Id const& id, bool isHosts) const noexcept {
-        State expected = Current();
-        if (expected == State::Writing || expected == (isHosts ? State::Hosts : State::Own) ||
-            !state_.compare_exchange_strong(expected, State::Writing, std::memory_order_relaxed))
+        State known = state_.Get();
+        if (known == State::Writing || known == (isHosts ? State::Hosts : State::Own) ||
+            !state_.Replace(known, State::Writing))
             return;
         digest_ = *id.GetDigest();
         hash_ = id.Hash();
-        state_.store(isHosts ? State::Hosts : State::Own, std::memory_order_release);
+        state_.Publish(isHosts ? State::Hosts : State::Own);
     }
 
     /// Takes along what @p other, that of an object of the given kind, has. @pre there is none here
@@ -54,17 +54,15 @@ public:
             return;
         digest_ = other.digest_;
         hash_ = other.hash_;
-        state_.store(isHosts ? State::Hosts : State::Copied, std::memory_order_relaxed);
+        state_.Set(isHosts ? State::Hosts : State::Copied);
     }
 
-    void Reset() noexcept { state_.store(State::Empty, std::memory_order_relaxed); }
+    void Reset() noexcept { state_.Set(State::Empty); }
 
 private:
     enum class State : std::uint8_t { Empty, Writing, Own, Copied, Hosts };
 
-    [[nodiscard]] State Current() const noexcept { return state_.load(std::memory_order_acquire); }
-
-    mutable std::atomic<State> state_{State::Empty};
+    PublishedWord<State> state_;
     mutable Id::Digest digest_{};
     mutable std::size_t hash_ = 0;
 };

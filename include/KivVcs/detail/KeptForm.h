@@ -1,11 +1,10 @@
 #pragma once
 
 #include "KivVcs/Foundation.h"
+#include "KivVcs/detail/PublishedWord.h"
 
-#include <atomic>
 #include <cstdint>
 #include <memory>
-#include <utility>
 
 namespace KivVcs::detail {
 
@@ -25,11 +24,11 @@ public:
     /// The form of an object of that kind, made by @p make if none is kept; valid until `Reset`.
     template <class Make>
     Buffer const& GetOrMake(bool isHosts, Make make) const {
-        std::uintptr_t kept = form_.load(std::memory_order_acquire);
+        std::uintptr_t kept = form_.Get();
         while (!Counts(kept, isHosts)) {
             auto made = std::make_unique<Buffer>(make());
             const std::uintptr_t form = AddressOf(made.get()) | (isHosts ? hostsBit : 0);
-            if (form_.compare_exchange_strong(kept, form, std::memory_order_acq_rel, std::memory_order_acquire)) {
+            if (form_.Replace(kept, form)) {
                 Delete(kept);
                 return *made.release();
             }
@@ -39,20 +38,13 @@ public:
 
     /// Takes along what @p other, that of an object of the given kind, keeps. @pre nothing is kept here
     void Copy(KeptForm const& other, bool isHosts) {
-        const std::uintptr_t kept = other.form_.load(std::memory_order_acquire);
+        const std::uintptr_t kept = other.form_.Get();
         if (Counts(kept, isHosts))
-            form_.store(AddressOf(new Buffer(*FormAt(kept))) | (kept & hostsBit), std::memory_order_relaxed);
+            form_.Set(AddressOf(new Buffer(*FormAt(kept))) | (kept & hostsBit));
     }
 
-    void Swap(KeptForm& other) noexcept {
-        const std::uintptr_t mine = form_.load(std::memory_order_relaxed);
-        form_.store(other.form_.exchange(mine, std::memory_order_relaxed), std::memory_order_relaxed);
-    }
-
-    void Reset() noexcept {
-        Delete(form_.load(std::memory_order_acquire));
-        form_.store(0, std::memory_order_relaxed);
-    }
+    void Swap(KeptForm& other) noexcept { form_.Set(other.form_.Take(form_.Get())); }
+    void Reset() noexcept { Delete(form_.Take()); }
 
 private:
     /// Kept in the lowest bit of the address.
@@ -67,7 +59,7 @@ private:
     }
     static void Delete(std::uintptr_t kept) noexcept { delete FormAt(kept); }
 
-    mutable std::atomic<std::uintptr_t> form_{0};
+    PublishedWord<std::uintptr_t> form_;
 };
 
 } // namespace KivVcs::detail

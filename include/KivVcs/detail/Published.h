@@ -1,37 +1,36 @@
 #pragma once
 
-#include <atomic>
+#include "KivUtils/cow_ptr.h"
+#include "KivVcs/detail/PublishedWord.h"
+
 #include <memory>
+#include <type_traits>
 #include <utility>
 
 namespace KivVcs::detail {
 
 /// Holds nothing, or a complete value: it is built aside and published in one step, so that an exception while building
-/// leaves nothing behind, and racing first readers agree on one value.
+/// leaves nothing behind, and racing first readers agree on one value. A copy has a value of its own, or shares one that
+/// counts its references.
 ///
-/// Threads: `Get` and `GetOrMake` may run concurrently. `Reset` and assignment need exclusive use.
+/// Threads: `Get` and `GetOrMake` may run concurrently, and copies be made. Everything else needs exclusive use.
 template <class T>
 class Published {
 public:
     Published() noexcept = default;
-    Published(Published const& other) : Published() {
-        if (const T* value = other.Get())
-            value_.store(new T(*value), std::memory_order_relaxed);
+    Published(Published const& other) noexcept(isShared()) {
+        if (const T* const value = other.Get())
+            value_.Set(Copy(*value));
     }
-    Published(Published&& other) noexcept : value_(other.value_.exchange(nullptr, std::memory_order_relaxed)) {}
-    Published& operator=(Published const& other) {
-        *this = Published(other);
+    Published(Published&& other) noexcept { Swap(other); }
+    Published& operator=(Published other) noexcept {
+        Swap(other);
         return *this;
     }
-    Published& operator=(Published&& other) noexcept {
-        T* const taken = other.value_.exchange(nullptr, std::memory_order_relaxed);
-        delete value_.exchange(taken, std::memory_order_relaxed);
-        return *this;
-    }
-    ~Published() { delete value_.load(std::memory_order_acquire); }
+    ~Published() { Drop(value_.Get()); }
 
     /// The value, or null if there is none yet.
-    [[nodiscard]] const T* Get() const noexcept { return value_.load(std::memory_order_acquire); }
+    [[nodiscard]] const T* Get() const noexcept { return value_.Get(); }
 
     /// The value, made by @p make if there is none yet; the reference is valid until `Reset`, assignment or
     /// destruction.
@@ -39,20 +38,41 @@ public:
     T const& GetOrMake(Make make) const {
         if (const T* value = Get())
             return *value;
-        auto made = std::make_unique<T>(make());
-        T* expected = nullptr;
-        if (value_.compare_exchange_strong(expected, made.get(), std::memory_order_acq_rel, std::memory_order_acquire))
-            return *made.release();
-        return *expected;
+        const T* known = nullptr;
+        const T* const made = New(make());
+        if (value_.Replace(known, made))
+            return *made;
+        Drop(made);
+        return *known;
     }
 
-    void Reset() noexcept {
-        delete value_.load(std::memory_order_relaxed);
-        value_.store(nullptr, std::memory_order_relaxed);
-    }
+    void Swap(Published& other) noexcept { value_.Set(other.value_.Take(value_.Get())); }
+    void Reset() noexcept { Drop(value_.Take()); }
 
 private:
-    mutable std::atomic<T*> value_{nullptr};
+    [[nodiscard]] static constexpr bool isShared() noexcept {
+        return std::is_base_of_v<KivUtils::reference_counted, T>;
+    }
+    [[nodiscard]] static const T* New(T value) {
+        if constexpr (isShared())
+            return KivUtils::immu::make<T>(std::move(value)).detach();
+        else
+            return std::make_unique<T>(std::move(value)).release();
+    }
+    [[nodiscard]] static const T* Copy(T const& value) noexcept(isShared()) {
+        if constexpr (isShared())
+            return KivUtils::cow_ptr<T>::share(&value).detach();
+        else
+            return New(value);
+    }
+    static void Drop(const T* value) noexcept {
+        if constexpr (isShared())
+            static_cast<void>(KivUtils::cow_ptr<T>::attach(value));
+        else
+            std::default_delete<const T>()(value);
+    }
+
+    PublishedWord<const T*> value_;
 };
 
 } // namespace KivVcs::detail
