@@ -47,9 +47,9 @@ fastest() {
 
 # The runs take turns, so that other work on the machine disturbs both sides.
 report_speed() {
-    local here='' there='' run name value reference wasm_directory=$build_directory
+    local here='' there='' name value reference wasm_directory=$build_directory
     build_preset bench
-    for run in 1 2 3; do
+    for _ in 1 2 3; do
         there+=$(node --no-experimental-fetch "$wasm_directory/bench/kivvcs_speed.js")$'\n'
         here+=$("$build_directory/bench/kivvcs_speed")$'\n'
     done
