@@ -1,4 +1,4 @@
-#include "../src/objects/Sha256Compression.h"
+#include "../src/objects/Sha256Lanes.h"
 #include "support/Builders.h"
 #include "support/HostStream.h"
 #include "support/PackedForms.h"
@@ -99,6 +99,32 @@ TEST(Digest, IsTheSameWithAndWithoutTheProcessorsInstructions) {
         hardware(byInstructions, bytes.data() + misaligned, count);
         Sha256::CompressPortably(portable, bytes.data() + misaligned, count);
         ASSERT_EQ(byInstructions, portable);
+    }
+}
+
+TEST(Digest, IsTheSameBesideOthers) {
+    const Sha256::LaneCompression compressions[] = {Sha256::FindPairCompression(), Sha256::FindEightLanes(),
+                                                    Sha256::FindSixteenLanes()};
+    std::mt19937 random(512);
+    std::vector<std::uint8_t> bytes(64 * 20 + 64);
+    for (auto& byte : bytes)
+        byte = static_cast<std::uint8_t>(random());
+    for (auto const& [lanes, compress] : compressions) {
+        for (std::size_t count = 0; compress != nullptr && count < 10 * 64; ++count) {
+            std::vector<Sha256::State> alone(lanes, Sha256::initialState);
+            for (auto& state : alone)
+                state[random() % 8] = static_cast<std::uint32_t>(random());
+            std::vector<Sha256::State> beside(alone);
+            std::vector<Sha256::State*> states;
+            std::vector<const std::uint8_t*> blocks;
+            for (std::size_t lane = 0; lane < lanes; ++lane) {
+                states.push_back(&beside[lane]);
+                blocks.push_back(&bytes[random() % 640 / 64 * 64 + (count + lane) % 64]);
+                Sha256::CompressPortably(alone[lane], blocks[lane], count / 64);
+            }
+            compress(states.data(), blocks.data(), count / 64);
+            ASSERT_EQ(beside, alone) << lanes << ' ' << count;
+        }
     }
 }
 

@@ -124,5 +124,25 @@ TEST(EightThreads, FetchWhatIsDeferredOnce) {
     }
 }
 
+TEST(EightThreads, IdentifyWhatOthersIdentifyToo) {
+    Repository repository(std::make_unique<MemObjectsStorage>());
+    const Versions stored = GrowLine(repository);
+    for (int round = 0; round < 10; ++round) {
+        const Versions fresh = FreshCopies(stored);
+        std::vector<Blob> blobs;
+        for (std::size_t number = 0; number < 100; ++number)
+            blobs.push_back(MakeBlob(std::string(number * 50, 'x')));
+        AtOnce([&](std::size_t index) {
+            std::vector<Object const*> objects{fresh[index].get(), fresh.back().get()};
+            for (std::size_t number = index * 5; number < blobs.size(); ++number)
+                objects.push_back(&blobs[number]);
+            Identify(objects);
+            for (Object const* object : objects)
+                EXPECT_TRUE(object->GetKnownDigest() != nullptr || !object->GetId().IsEmpty());
+        });
+        EXPECT_EQ(blobs[99].GetId(), MakeBlob(std::string(4950, 'x')).GetId());
+    }
+}
+
 } // namespace
 } // namespace KivVcs

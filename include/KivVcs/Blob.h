@@ -62,6 +62,8 @@ private:
     friend KIVVCS_EXPORT cow_ptr<Blob> CopyOf(Blob const& blob);
 
     [[nodiscard]] Id ComputeId() const final;
+    [[nodiscard]] optional<std::uint64_t> GetSizeToHash() const noexcept final;
+    void GetDataToHash(detail::DataToHash& data) const final;
 
     Buffer data_;
 };

@@ -156,6 +156,7 @@ private:
     friend KIVVCS_EXPORT cow_ptr<Commit> CopyOf(Commit const& commit);
 
     [[nodiscard]] Id ComputeId() const final;
+    void ListParts(detail::OpenObjects& parts) const final;
     template <class Add>
     auto EditTree(IRepository* repo, Add add);
     /// The one way to the parent for walks: as `GetParent`, without a share of it, which this commit has.

@@ -14,6 +14,12 @@
 
 namespace KivVcs {
 
+namespace detail {
+struct DataToHash;
+class Identification;
+class OpenObjects;
+} // namespace detail
+
 /// The interface of all stored objects. The order of its operations is part of the binary interface.
 class KIVVCS_EXPORT IObject : public KivUtils::reference_counted {
 public:
@@ -125,8 +131,16 @@ protected:
     [[nodiscard]] Id ComputePackedId() const;
 
 private:
+    friend class detail::Identification;
+
     /// What the identifier of an object of one of the library's classes is computed by. Never asked of others.
     [[nodiscard]] virtual Id ComputeId() const;
+    /// Adds the objects whose identifiers the packed form shows, as far as this object holds them.
+    virtual void ListParts(detail::OpenObjects& parts) const;
+    /// How much data the identifier of an object of one of the library's classes is computed from if that may be done
+    /// beside others, and these data; nothing if it is `ComputeId` that has to do it.
+    [[nodiscard]] virtual optional<std::uint64_t> GetSizeToHash() const noexcept;
+    virtual void GetDataToHash(detail::DataToHash& data) const;
 
     [[nodiscard]] Id::Digest const* ConfirmCopiedDigest() const noexcept;
     void TakeKept(Object const& other) {
@@ -152,6 +166,18 @@ private:
     detail::CachedId id_;
     detail::KeptForm packedData_;
 };
+
+/// Computes the identifiers of many objects, those that their packed forms show included, in less time than one after the
+/// other: several are hashed at once. What a packed form shows is identified first; otherwise the largest objects come
+/// first.
+///
+/// Null pointers and repeated ones are allowed. Objects of hosts' classes are asked for theirs by `GetId`, in the given
+/// order as far as one does not show the other. What is deferred is not fetched. Takes no stack for nested directories or
+/// long histories.
+///
+/// Threads: as `GetId` of each of the objects; several threads may identify the same ones.
+/// @throws std::bad_alloc and what hosts' objects throw; every object has its identifier then, or none yet
+KIVVCS_EXPORT void Identify(array_view<Object const* const> objects);
 
 /// Takes over an object made by `new` on either side of the library's boundary; null gives null.
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Object> dll_wrapped_shared(std::unique_ptr<Object> object);

@@ -164,6 +164,9 @@ private:
     /// Stores the copies and enters them, from the bottom up; removes them instead where they are empty, if @p prunes.
     void PutWayBack(IRepository* repo, PathComponentsView names, std::vector<cow_ptr<Tree>> way, bool prunes);
     [[nodiscard]] Id ComputeId() const final;
+    void ListParts(detail::OpenObjects& parts) const final;
+    [[nodiscard]] optional<std::uint64_t> GetSizeToHash() const noexcept final;
+    void GetDataToHash(detail::DataToHash& data) const final;
 
     detail::EntryTable entries_;
     detail::Published<Buffer> data_;

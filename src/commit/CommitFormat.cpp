@@ -1,6 +1,7 @@
 #include "KivVcs/Commit.h"
 #include "KivVcs/Helpers.h"
 #include "KivVcs/IRepository.h"
+#include "objects/DataToHash.h"
 #include "objects/PackedForm.h"
 
 #include <cstdlib>
@@ -96,6 +97,12 @@ void Commit::IdentifyAncestors() const {
         unidentified.push_back(ancestor);
     for (; !unidentified.empty(); unidentified.pop_back())
         static_cast<void>(unidentified.back()->GetId());
+}
+
+void Commit::ListParts(detail::OpenObjects& parts) const {
+    parts.Add(parent_.get());
+    if (tree_)
+        parts.Add(tree_->GetRoot().get());
 }
 
 Buffer const& Commit::GetData() const {

@@ -1,6 +1,7 @@
 #include "KivVcs/Blob.h"
 
 #include "KivVcs/Helpers.h"
+#include "objects/DataToHash.h"
 #include "objects/PackedForm.h"
 
 #include <array>
@@ -29,6 +30,15 @@ Id Blob::ComputeId() const {
     IdDigest digest("blob", data_.GetSize());
     digest.Feed(data_);
     return digest.Finish();
+}
+
+optional<std::uint64_t> Blob::GetSizeToHash() const noexcept {
+    return data_.GetSize();
+}
+
+void Blob::GetDataToHash(detail::DataToHash& data) const {
+    data.word = "blob";
+    data.kept = &data_;
 }
 
 Blob Blob::CopyText(std::string_view text) {

@@ -40,6 +40,14 @@ Id Object::ComputeId() const {
     return ComputePackedId();
 }
 
+void Object::ListParts(detail::OpenObjects&) const {}
+
+optional<std::uint64_t> Object::GetSizeToHash() const noexcept {
+    return {};
+}
+
+void Object::GetDataToHash(detail::DataToHash&) const {}
+
 Id Object::ComputePackedId() const {
     const KivStringT<char> header = GetHeader();
     Buffer const& data = GetData();

@@ -2,6 +2,7 @@
 
 #include "foundation/HexDigits.h"
 
+#include <algorithm>
 #include <array>
 #include <charconv>
 
@@ -43,6 +44,12 @@ void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t
     const SizeField field(size);
     packed.Append(word.GetString(), static_cast<std::uint64_t>(word.GetLength()));
     packed.Append(field.Data(), field.Size());
+}
+
+char* WritePackedHeader(KivStringViewT<char> word, std::uint64_t size, char* out) noexcept {
+    const SizeField field(size);
+    out = std::copy(word.begin(), word.end(), out);
+    return std::copy_n(field.Data(), field.Size(), out);
 }
 
 IdDigest::IdDigest(KivStringViewT<char> word, std::uint64_t size) noexcept {

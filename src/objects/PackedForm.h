@@ -8,6 +8,9 @@ namespace KivVcs {
 /// What precedes the data in a packed form: the type word, a blank, the data's size in decimal, a zero byte.
 void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t size);
 
+/// Writes the same to @p out, at most 22 bytes and the word, and returns the end of what was written.
+char* WritePackedHeader(KivStringViewT<char> word, std::uint64_t size, char* out) noexcept;
+
 /// Writes the 64 digits of @p digest as packed forms show them, and returns the end of what was written. Unlike
 /// `Id::GetText` it leaves nothing behind.
 char* WriteDigits(Id::Digest const& digest, char* out) noexcept;

@@ -5,17 +5,13 @@
 
 namespace KivVcs {
 
-namespace {
-
-Sha256::Compression FastestCompression() noexcept {
-    static Sha256::Compression const fastest = [] {
-        Sha256::Compression const hardware = Sha256::FindHardwareCompression();
-        return hardware != nullptr ? hardware : Sha256::CompressPortably;
+Sha256::Compression Sha256::FastestCompression() noexcept {
+    static Compression const fastest = [] {
+        Compression const hardware = FindHardwareCompression();
+        return hardware != nullptr ? hardware : CompressPortably;
     }();
     return fastest;
 }
-
-} // namespace
 
 SHADigest256::SHADigest256() noexcept : state_(Sha256::initialState) {}
 
@@ -38,13 +34,13 @@ bool SHADigest256::InitData(const void* data, std::size_t size) noexcept {
     }
     std::size_t const blocks = size / Sha256::blockSize;
     if (blocks != 0)
-        FastestCompression()(state_, bytes, blocks);
+        Sha256::FastestCompression()(state_, bytes, blocks);
     std::copy_n(bytes + blocks * Sha256::blockSize, size % Sha256::blockSize, block_.begin());
     return true;
 }
 
 void SHADigest256::Transform() noexcept {
-    FastestCompression()(state_, block_.data(), 1);
+    Sha256::FastestCompression()(state_, block_.data(), 1);
 }
 
 bool SHADigest256::FinalDigest(void* out) noexcept {

@@ -17,6 +17,8 @@ using Compression = void (*)(State& state, const std::uint8_t* blocks, std::size
 
 /// The compression by the processor's own instructions; null if this processor has none that we know.
 [[nodiscard]] Compression FindHardwareCompression() noexcept;
+/// The same, or the portable one.
+[[nodiscard]] Compression FastestCompression() noexcept;
 
 inline constexpr State initialState{0x6a09e667, 0xbb67ae85, 0x3c6ef372, 0xa54ff53a,
                                     0x510e527f, 0x9b05688c, 0x1f83d9ab, 0x5be0cd19};

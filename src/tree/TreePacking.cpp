@@ -1,4 +1,5 @@
 #include "KivVcs/Helpers.h"
+#include "objects/DataToHash.h"
 #include "objects/PackedForm.h"
 #include "tree/Cursor.h"
 
@@ -28,6 +29,8 @@ bool KeepsRuns(Node const& top) noexcept {
 constexpr std::string_view blobWords = "100644 blob ";
 constexpr std::string_view treeWords = "40000 tree ";
 constexpr std::size_t pieceSize = 4096;
+/// Smaller packed forms are put together to be hashed beside others.
+constexpr std::uint64_t largestPackedAside = 65536;
 constexpr std::size_t idLength = 2 * std::tuple_size_v<Id::Digest>;
 
 /// Hands the code units of a name to @p take as a packed form shows them, up to the first U+0000.
@@ -153,6 +156,18 @@ struct AppendTo {
     void operator()(auto const&... piece) const { data.Append(piece...); }
 };
 
+struct WriteTo {
+    std::byte*& out;
+
+    void operator()(const void* piece, std::size_t size) const {
+        out = std::copy_n(static_cast<const std::byte*>(piece), size, out);
+    }
+    void operator()(Buffer const& piece) const {
+        for (auto const& chunk : piece.LockForRead())
+            operator()(chunk.data(), chunk.size());
+    }
+};
+
 /// @p data without the room that is left from appending to it.
 Buffer WithoutRoom(Buffer const& data) {
     if (data.GetSize() <= pieceSize)
@@ -206,6 +221,24 @@ Id Tree::ComputeId() const {
     if (top != nullptr)
         PackEntries(*top, [&digest](auto const&... piece) { digest.Feed(piece...); });
     return digest.Finish();
+}
+
+void Tree::ListParts(detail::OpenObjects& parts) const {
+    detail::ForEachEntry(entries_.Top().get(), [&parts](Entry const& entry) { parts.Add(entry.held.Packed()); });
+}
+
+optional<std::uint64_t> Tree::GetSizeToHash() const noexcept {
+    Node const* const top = entries_.Top().get();
+    const detail::Tally total = top == nullptr ? detail::Tally() : top->Total();
+    // Of a large one most is packed already, and it keeps the others waiting if it is not.
+    return total.hosts == 0 && total.packedSize < largestPackedAside ? optional<std::uint64_t>(total.packedSize)
+                                                                     : std::nullopt;
+}
+
+void Tree::GetDataToHash(detail::DataToHash& data) const {
+    data.word = "tree";
+    if (Node const* const top = entries_.Top().get())
+        data.own = Buffer::Build(top->Total().packedSize, [top](std::byte* out) { PackEntries(*top, WriteTo{out}); });
 }
 
 Buffer const& Tree::GetData() const {
