@@ -4,6 +4,8 @@
 /// The whole archive.
 
 #include "KivArchive/ArchiveError.h"
+#include "KivArchive/ArchivedBlob.h"
+#include "KivArchive/ArchivedRepository.h"
 #include "KivArchive/IArchive.h"
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/Progress.h"

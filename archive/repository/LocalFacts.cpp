@@ -1,0 +1,55 @@
+#include "repository/LocalFacts.h"
+
+#include "Changes.h"
+
+namespace KivArchive {
+
+LocalFacts::Entry& LocalFacts::EntryOf(KivVcs::Commit const& commit) {
+    Id const id = commit.GetId();
+    auto const found = entries_.find(id);
+    return found != entries_.end()
+               ? found->second
+               : entries_.emplace(id, Entry{{id, commit.GetParentId(), commit.GetRootId(), {}}, {}}).first->second;
+}
+
+void LocalFacts::Add(KivVcs::Commit const& commit, ContainedCommit const& contained, CommitHandle merged) {
+    Entry& entry = EntryOf(commit);
+    AddContained(entry.facts.contains, {contained});
+    if (merged)
+        entry.merged.push_back(std::move(merged));
+}
+
+void LocalFacts::AddLine(CommitHandle commit, IsUnpublished const& isUnpublished) {
+    bool isKnown = false;
+    for (; commit && !isKnown; commit = commit->GetHeldParent()) {
+        Id const id = commit->GetId();
+        if (!isUnpublished(id))
+            return;
+        isKnown = entries_.contains(id);
+        static_cast<void>(EntryOf(*commit));
+    }
+}
+
+Ancestry const* LocalFacts::Find(Id const& id) const {
+    auto const found = entries_.find(id);
+    return found == entries_.end() ? nullptr : &found->second.facts;
+}
+
+std::span<const LocalFacts::CommitHandle> LocalFacts::MergedBy(Id const& id) const {
+    auto const found = entries_.find(id);
+    return found == entries_.end() ? std::span<const CommitHandle>() : found->second.merged;
+}
+
+std::vector<Ancestry> LocalFacts::All() const {
+    std::vector<Ancestry> all;
+    all.reserve(entries_.size());
+    for (auto const& [id, entry] : entries_)
+        all.push_back(entry.facts);
+    return all;
+}
+
+void LocalFacts::ForgetPublished(IsUnpublished const& isUnpublished) {
+    std::erase_if(entries_, [&](auto const& entry) { return !isUnpublished(entry.first); });
+}
+
+} // namespace KivArchive

@@ -1,0 +1,45 @@
+#pragma once
+
+/// @file
+/// Facts about commits that the archive does not know yet.
+
+#include "KivArchive/IArchive.h"
+
+#include <KivVcs/Commit.h>
+
+#include <functional>
+#include <unordered_map>
+
+namespace KivArchive {
+
+/// What commits contain, and the facts of unpublished commits that others were rewritten from. Kept until the archive has
+/// them.
+class LocalFacts {
+public:
+    using CommitHandle = KivVcs::cow_ptr<KivVcs::Commit>;
+    using IsUnpublished = std::function<bool(Id const&)>;
+
+    /// @param merged what must not be purged before @p commit is published; may be null
+    void Add(KivVcs::Commit const& commit, ContainedCommit const& contained, CommitHandle merged);
+    /// Adds the facts of @p commit and of its ancestors, as far as they are unpublished.
+    void AddLine(CommitHandle commit, IsUnpublished const& isUnpublished);
+
+    /// Null if nothing but its parent and its tree is to be said of the commit.
+    [[nodiscard]] Ancestry const* Find(Id const& id) const;
+    [[nodiscard]] std::span<const CommitHandle> MergedBy(Id const& id) const;
+    [[nodiscard]] std::vector<Ancestry> All() const;
+    /// Drops what the archive has been told, except about commits that are still unpublished.
+    void ForgetPublished(IsUnpublished const& isUnpublished);
+
+private:
+    struct Entry {
+        Ancestry facts;
+        std::vector<CommitHandle> merged;
+    };
+
+    Entry& EntryOf(KivVcs::Commit const& commit);
+
+    std::unordered_map<Id, Entry> entries_;
+};
+
+} // namespace KivArchive

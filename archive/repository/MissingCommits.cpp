@@ -1,0 +1,106 @@
+#include "repository/MissingCommits.h"
+
+#include "repository/Unreadable.h"
+
+namespace KivArchive {
+
+namespace {
+
+/// How many commits of one line are asked about at once.
+constexpr std::size_t mostAskedOfLine = 1000;
+/// A few that a host has just made are taken for missing unasked: to store what is there costs less than to ask.
+constexpr std::size_t mostUnasked = 8;
+
+} // namespace
+
+std::vector<cow_ptr<Commit>> MissingCommits::Find(std::vector<cow_ptr<Commit>> const& heads) {
+    Discover(heads);
+    return InOrder(heads);
+}
+
+/// The commit and its ancestors up to the first that the archive is known to have had.
+std::vector<cow_ptr<Commit>> MissingCommits::LineToAskFor(cow_ptr<Commit> commit) const {
+    std::vector<cow_ptr<Commit>> line;
+    for (; commit && line.size() < mostAskedOfLine; commit = commit->GetHeldParent()) {
+        Id const id = commit->GetId();
+        if (asked_.contains(id) || !MustAskFor(id))
+            break;
+        line.push_back(commit);
+    }
+    return line;
+}
+
+void MissingCommits::Discover(std::vector<cow_ptr<Commit>> open) {
+    while (!open.empty()) {
+        std::vector<std::vector<cow_ptr<Commit>>> lines;
+        std::vector<Id> ids;
+        for (auto const& commit : open) {
+            lines.push_back(LineToAskFor(commit));
+            for (auto const& asked : lines.back())
+                if (asked_.insert(asked->GetId()).second)
+                    ids.push_back(asked->GetId());
+        }
+        open.clear();
+        std::vector<Id> const found = ids.size() <= mostUnasked && !asksForAll_ ? ids : archive_.FindMissing(ids);
+        std::unordered_set<Id> const missing(found.begin(), found.end());
+        std::vector<Id> unheld;
+        for (auto const& line : lines) {
+            bool isWhollyMissing = !line.empty();
+            for (auto const& commit : line) {
+                Id const id = commit->GetId();
+                // What is there has all that it names.
+                isWhollyMissing = missing.contains(id);
+                if (!isWhollyMissing)
+                    break;
+                missing_.emplace(id, commit);
+                for (auto const& merged : facts_.MergedBy(id))
+                    open.push_back(merged);
+            }
+            if (!isWhollyMissing)
+                continue;
+            if (cow_ptr<Commit> parent = line.back()->GetHeldParent())
+                open.push_back(std::move(parent));
+            else if (Id parentId = line.back()->GetParentId(); !parentId.IsEmpty())
+                unheld.push_back(std::move(parentId));
+        }
+        CheckUnheld(unheld);
+    }
+}
+
+void MissingCommits::CheckUnheld(std::vector<Id> const& parents) const {
+    if (!asksForAll_ || parents.empty())
+        return;
+    auto const gone = archive_.FindMissing(parents);
+    if (!gone.empty())
+        ThrowUnreadable(Failure::Collected, "version", gone.front());
+}
+
+std::vector<cow_ptr<Commit>> MissingCommits::InOrder(std::vector<cow_ptr<Commit>> const& heads) const {
+    std::vector<cow_ptr<Commit>> ordered;
+    std::unordered_set<Id> entered;
+    std::unordered_set<Id> done;
+    std::vector<std::pair<Id, bool>> open;
+    for (auto const& head : heads)
+        open.emplace_back(head->GetId(), false);
+    while (!open.empty()) {
+        auto const [id, isDone] = open.back();
+        open.pop_back();
+        auto const found = missing_.find(id);
+        if (found == missing_.end())
+            continue;
+        if (isDone) {
+            if (done.insert(id).second)
+                ordered.push_back(found->second);
+            continue;
+        }
+        if (!entered.insert(id).second)
+            continue;
+        open.emplace_back(id, true);
+        for (auto const& merged : facts_.MergedBy(id))
+            open.emplace_back(merged->GetId(), false);
+        open.emplace_back(found->second->GetParentId(), false);
+    }
+    return ordered;
+}
+
+} // namespace KivArchive

@@ -1,0 +1,145 @@
+#include "repository/MissingTrees.h"
+
+#include <algorithm>
+
+namespace KivArchive {
+
+namespace {
+
+/// The null identifier for null.
+template <class T>
+Id IdOf(cow_ptr<T> const& object) {
+    return object ? object->GetId() : Id();
+}
+
+} // namespace
+
+void MissingTrees::Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier) {
+    NewDirectory directory;
+    directory.id = root->GetId();
+    directory.tree = std::move(root);
+    directory.earlier = std::move(earlier);
+    CheckEntry(NewDirectory::none, {}, *directory.tree, "tree", "40000");
+    // What differs from an earlier version is few, and most of it new.
+    bool const isListed = static_cast<bool>(directory.earlier);
+    std::size_t const number = AddDirectory(std::move(directory));
+    if (isListed)
+        List(number);
+}
+
+void MissingTrees::Find() {
+    std::size_t listed = 0;
+    while (!toAskFor_.empty()) {
+        for (Id& id : archive_.FindMissing(std::exchange(toAskFor_, {})))
+            missing_.insert(std::move(id));
+        // Those that are added meanwhile wait for the next batch, unless an earlier version says what is new in them.
+        std::size_t const end = directories_.size();
+        for (; listed < end; ++listed)
+            if (IsMissing(directories_[listed].id) && !directories_[listed].isListed)
+                List(listed);
+    }
+}
+
+std::size_t MissingTrees::AddDirectory(NewDirectory directory) {
+    auto const [known, isNew] = numbers_.try_emplace(directory.id, directories_.size());
+    if (!isNew)
+        return known->second;
+    if (directory.depth > KivVcs::deepestLoadedNesting)
+        Refuse(directory.holder, directory.name, "lies too deep");
+    toAskFor_.push_back(directory.id);
+    directories_.push_back(std::move(directory));
+    return directories_.size() - 1;
+}
+
+void MissingTrees::List(std::size_t number) {
+    // On a list of its own: nesting has no bound that a thread's stack would hold.
+    for (std::vector<std::size_t> open{number}; !open.empty();) {
+        std::size_t const next = open.back();
+        open.pop_back();
+        if (directories_[next].isListed)
+            continue;
+        directories_[next].isListed = true;
+        ListFiles(next);
+        ListSubdirectories(next);
+        for (std::size_t const subdirectory : directories_[next].subdirectories)
+            if (directories_[subdirectory].earlier)
+                open.push_back(subdirectory);
+    }
+}
+
+void MissingTrees::ListFiles(std::size_t number) {
+    NewDirectory& directory = directories_[number];
+    auto const names =
+        directory.earlier ? directory.tree->GetLocalBlobDiffs(directory.earlier) : directory.tree->GetLocalBlobPaths();
+    for (auto const& name : names) {
+        cow_ptr<Blob> blob = directory.tree->GetLocalBlob(name);
+        if (!blob)
+            continue;
+        CheckEntry(number, name, *blob, "blob", "100644");
+        NewDirectory::File file{blob, blob->GetId(), {}, name};
+        if (directory.earlier)
+            file.earlier = IdOf(directory.earlier->GetLocalBlob(name));
+        if (asked_.insert(file.id).second)
+            toAskFor_.push_back(file.id);
+        directory.files.push_back(std::move(file));
+    }
+}
+
+void MissingTrees::ListSubdirectories(std::size_t number) {
+    NewDirectory const& directory = directories_[number];
+    auto const names = directory.earlier ? directory.tree->GetLocalTreeDiffs(directory.earlier)
+                                         : directory.tree->GetLocalSubtreePaths();
+    std::vector<std::size_t> subdirectories;
+    for (auto const& name : names) {
+        // Adding moves the directories.
+        NewDirectory const& holder = directories_[number];
+        NewDirectory subdirectory;
+        subdirectory.tree = holder.tree->GetLocalTree(name);
+        if (!subdirectory.tree)
+            continue;
+        CheckEntry(number, name, *subdirectory.tree, "tree", "40000");
+        subdirectory.id = subdirectory.tree->GetId();
+        subdirectory.earlier = holder.earlier ? holder.earlier->GetLocalTree(name) : nullptr;
+        subdirectory.holder = number;
+        subdirectory.name = name;
+        subdirectory.depth = holder.depth + 1;
+        subdirectories.push_back(AddDirectory(std::move(subdirectory)));
+    }
+    directories_[number].subdirectories = std::move(subdirectories);
+}
+
+void MissingTrees::CheckEntry(std::size_t number, KivStringT<char16_t> const& name, KivVcs::Object const& object,
+                              std::string_view word, std::string_view mode) const {
+    KivStringViewT<char16_t> const text = name;
+    if (text.Find(u"/") >= 0)
+        Refuse(number, name, "has a \"/\" in its name");
+    if (std::find(text.begin(), text.end(), u'\0') != text.end())
+        Refuse(number, name, "has a U+0000 in its name");
+    if (number != NewDirectory::none && directories_[number].tree->GetLocalBlob(name) &&
+        directories_[number].tree->GetLocalTree(name))
+        Refuse(number, name, "is a directory that a file of the same name hides");
+    if (!object.IsOfHostClass())
+        return;
+    if (std::string_view(object.GetHeader().GetString()) != word ||
+        std::string_view(object.GetStoragePrefix().GetString()) != mode)
+        Refuse(number, name, "is of another type than a file or a directory");
+    if (object.GetId().GetDigest() == nullptr)
+        Refuse(number, name, "has an identifier that is no digest");
+}
+
+void MissingTrees::Refuse(std::size_t directory, KivStringViewT<char16_t> name, const char* why) const {
+    throw ArchiveError(Failure::Unrepresentable, {}, "\"" + PathOf(directory, name) + "\" " + why + ".");
+}
+
+std::string MissingTrees::PathOf(std::size_t directory, KivStringViewT<char16_t> name) const {
+    std::vector<std::string> names{KivVcs::ToUtf8(name)};
+    for (; directory != NewDirectory::none && directories_[directory].holder != NewDirectory::none;
+         directory = directories_[directory].holder)
+        names.push_back(KivVcs::ToUtf8(directories_[directory].name));
+    std::string path;
+    for (; !names.empty(); names.pop_back())
+        path += (path.empty() ? "" : "/") + names.back();
+    return path;
+}
+
+} // namespace KivArchive

@@ -1,0 +1,238 @@
+#include "repository/MissingCommits.h"
+#include "repository/Publishing.h"
+#include "repository/RepositoryState.h"
+
+#include <algorithm>
+#include <random>
+#include <set>
+#include <thread>
+
+namespace KivArchive {
+
+namespace {
+
+/// How often a publish is tried whose ground others have collected.
+constexpr int collectedAttempts = 3;
+
+/// How many facts are looked at for a head that was rewritten.
+constexpr std::size_t mostFactsOfRewriting = 10'000;
+
+constexpr std::chrono::milliseconds longestBackOff{1000};
+
+} // namespace
+
+/// The branches that stand elsewhere than in the archive.
+struct ArchivedRepository::Moves {
+    std::vector<BranchMove> moves;
+    /// Of those that are not removed.
+    std::vector<cow_ptr<Commit>> heads;
+};
+
+ArchivedRepository::Moves ArchivedRepository::PendingMoves(std::span<const KivStringT<char16_t>> branches) const {
+    Moves pending;
+    std::set<KivStringT<char16_t>> const names(branches.begin(), branches.end());
+    for (auto const& name : names) {
+        auto const known = state_->branches.find(name);
+        KnownBranch const branch = known == state_->branches.end() ? KnownBranch() : known->second;
+        cow_ptr<Commit> own = state_->storage->GetHead(name);
+        Id const ownId = own ? own->GetId() : Id();
+        bool const isUnreadable = !own && branch.unreadable && state_->storage->BranchExist(name);
+        if (isUnreadable || ownId == branch.published)
+            continue;
+        // What others have published counts as taken in if the host has merged it.
+        bool const hasMerged = own && !(branch.published == branch.taken) && IsContained(branch.published, own);
+        Id const expected = hasMerged ? branch.published : branch.taken;
+        if (ownId == expected)
+            continue;
+        pending.moves.push_back({name, expected, ownId});
+        if (own)
+            pending.heads.push_back(std::move(own));
+    }
+    return pending;
+}
+
+/// Whether the unpublished commits of a line, or what they were put on or have merged, are or contain a commit.
+bool ArchivedRepository::IsContained(Id const& commit, cow_ptr<Commit> const& in) const {
+    std::vector<cow_ptr<Commit>> open{in};
+    std::set<Id> met;
+    while (!open.empty()) {
+        cow_ptr<Commit> const next = std::move(open.back());
+        open.pop_back();
+        Id const id = next->GetId();
+        if (id == commit || next->GetParentId() == commit)
+            return true;
+        if (!met.insert(id).second || !state_->storage->MayBeUnpublished(id))
+            continue;
+        Ancestry const* const facts = state_->facts.Find(id);
+        if (facts != nullptr && std::any_of(facts->contains.begin(), facts->contains.end(),
+                                            [&](ContainedCommit const& contained) { return contained.id == commit; }))
+            return true;
+        for (auto const& merged : state_->facts.MergedBy(id))
+            open.push_back(merged);
+        if (cow_ptr<Commit> parent = next->GetHeldParent())
+            open.push_back(std::move(parent));
+    }
+    return false;
+}
+
+PublishOutcome ArchivedRepository::Publish(IProgress* progress) {
+    std::vector<KivStringT<char16_t>> names;
+    for (auto const& [name, head] : state_->storage->GetRefs())
+        names.push_back(name);
+    for (auto const& [name, known] : state_->branches)
+        names.push_back(name);
+    return Publish(names, {}, progress);
+}
+
+PublishOutcome ArchivedRepository::Publish(std::span<const KivStringT<char16_t>> branches,
+                                           std::vector<RecordChange> const& records, IProgress* progress) {
+    for (int attempt = 1;; ++attempt) {
+        try {
+            return PublishOnce(branches, records, attempt > 1, progress);
+        } catch (ArchiveError const& error) {
+            if (error.GetKind() != Failure::Collected || attempt == collectedAttempts)
+                throw;
+        }
+        Refresh();
+    }
+}
+
+PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16_t>> branches,
+                                               std::vector<RecordChange> const& records, bool asksForAll,
+                                               IProgress* progress) {
+    Moves pending = PendingMoves(branches);
+    if (pending.moves.empty() && records.empty())
+        return {true, {}, {}};
+    State& state = *state_;
+    auto const commits = MissingCommits(*state.storage, state.facts, state.Archive(), asksForAll).Find(pending.heads);
+    Publishing publishing(state.Archive(), *state.storage, state.facts, progress);
+    publishing.Store(commits);
+    // Everything that could fail comes before the branches move.
+    std::vector<Id> published;
+    for (auto const& commit : commits)
+        published.push_back(commit->GetId());
+    for (BranchMove const& move : pending.moves)
+        state.branches.try_emplace(move.name);
+    ChangeOutcome outcome = publishing.Finish(pending.moves, records);
+    if (!outcome.applied)
+        return {false, std::move(outcome.movedBranches), std::move(outcome.changedRecords)};
+    state.storage->SetPublished(published);
+    for (BranchMove const& move : pending.moves) {
+        if (move.head.IsEmpty())
+            state.branches.erase(move.name);
+        else
+            state.branches.find(move.name)->second = {move.head, move.head, {}};
+    }
+    state.facts.ForgetPublished([&state](Id const& id) { return state.storage->MayBeUnpublished(id); });
+    return {true, {}, {}};
+}
+
+PublishMergingOutcome ArchivedRepository::PublishMerging(Resolvers const& resolvers, IProgress* progress) {
+    PublishMergingOutcome outcome;
+    std::minstd_rand random(
+        static_cast<std::uint_fast32_t>(std::chrono::steady_clock::now().time_since_epoch().count()));
+    std::chrono::milliseconds wait = state_->options.backOff;
+    while (outcome.attempts < state_->options.attempts) {
+        ++outcome.attempts;
+        for (auto const& branch : Refresh().diverged) {
+            if (!MergeDiverged(branch, resolvers)) {
+                outcome.result = PublishMergingResult::GaveUp;
+                outcome.branch = branch;
+                return outcome;
+            }
+        }
+        if (Publish(progress).published) {
+            outcome.result = PublishMergingResult::Published;
+            return outcome;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(
+            std::uniform_int_distribution<std::chrono::milliseconds::rep>(0, wait.count())(random)));
+        wait = std::min(2 * wait, longestBackOff);
+    }
+    return outcome;
+}
+
+bool ArchivedRepository::MergeDiverged(KivStringT<char16_t> const& branch, Resolvers const& resolvers) {
+    RebaseOntoRewritten(branch);
+    KnownBranch& known = state_->branches.at(branch);
+    if (!IsContained(known.published, state_->storage->GetHead(branch)) &&
+        !MergePublished(branch, state_->source->FetchCommit(known.published), resolvers))
+        return false;
+    known.taken = known.published;
+    return true;
+}
+
+/// If what the unpublished commits of the branch are on was rewritten, puts them on what stands for it.
+void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch) {
+    cow_ptr<Commit> const own = state_->storage->GetHead(branch);
+    cow_ptr<Commit> fork = own;
+    while (fork && state_->storage->MayBeUnpublished(fork->GetId()))
+        fork = fork->GetParent();
+    if (!fork || fork == own)
+        return;
+    Id const published = state_->branches.at(branch).published;
+    std::unordered_map<Id, Ancestry> facts;
+    for (Ancestry& known : state_->Archive().ReadAncestry({&published, 1}, Follow::Everything, mostFactsOfRewriting))
+        facts.try_emplace(known.commit, std::move(known));
+    auto const standsForFork = [&](Id const& commit) {
+        std::vector<Id> open{commit};
+        std::set<Id> met;
+        while (!open.empty()) {
+            Id const id = open.back();
+            open.pop_back();
+            if (id == fork->GetId())
+                return true;
+            if (auto const found = facts.find(id); found != facts.end() && met.insert(id).second)
+                for (ContainedCommit const& contained : found->second.contains)
+                    if (contained.how == Containment::RewrittenFrom)
+                        open.push_back(contained.id);
+        }
+        return false;
+    };
+    std::set<Id> met;
+    for (Id id = published; facts.contains(id) && met.insert(id).second; id = facts.at(id).parent) {
+        if (id == fork->GetId())
+            return;
+        if (standsForFork(id)) {
+            MoveBranchTo(branch, MergelessRebase(own, fork, state_->source->FetchCommit(id)));
+            return;
+        }
+    }
+}
+
+bool ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
+                                        Resolvers const& resolvers) {
+    /// Makes a branch current as long as it lives, also one in whose place there is none any more.
+    class Current {
+    public:
+        Current(ArchivedRepository& repository, KivStringViewT<char16_t> name)
+            : repository_(repository), before_(repository.Repository::GetCurentBranch()) {
+            repository.Repository::Checkout(name);
+        }
+        Current(Current const&) = delete;
+        Current& operator=(Current const&) = delete;
+        ~Current() {
+            try {
+                auto* const storage = repository_.state_->storage;
+                bool const isMissing = !storage->BranchExist(before_) && storage->CreateBranch(before_, nullptr);
+                repository_.Repository::Checkout(before_);
+                if (isMissing)
+                    storage->RemoveBranch(before_);
+            } catch (std::bad_alloc const&) {
+                // Then the merged one stays current.
+            }
+        }
+
+    private:
+        ArchivedRepository& repository_;
+        KivStringT<char16_t> before_;
+    };
+    Current const current(*this, branch);
+    if (!Merge(theirs, resolvers))
+        return false;
+    if (cow_ptr<Commit> const head = GetHead(branch); head && !(head->GetId() == theirs->GetId()))
+        RecordContained(head, Containment::Merged, theirs);
+    return true;
+}
+
+} // namespace KivArchive

@@ -1,0 +1,166 @@
+#include "repository/Publishing.h"
+
+#include "Changes.h"
+#include "KivArchive/ArchivedBlob.h"
+#include "repository/CommitForm.h"
+
+#include <algorithm>
+
+namespace KivArchive {
+
+namespace {
+
+/// How much one change stores, and how many commits are looked at together.
+constexpr std::uint64_t changeSize = 8 * largestWholeContent;
+constexpr std::size_t commitsTogether = 256;
+
+[[noreturn]] void RefuseContent(std::string const& path) {
+    throw ArchiveError(Failure::Unrepresentable, {}, "\"" + path + "\" is not what its identifier says.");
+}
+
+} // namespace
+
+void Publishing::Store(std::vector<cow_ptr<Commit>> const& commits) {
+    for (std::size_t begin = 0; begin < commits.size(); begin += commitsTogether)
+        StoreTogether({commits.data() + begin, std::min(commitsTogether, commits.size() - begin)});
+}
+
+/// The root of a commit, unless that would have to be fetched.
+cow_ptr<Tree> Publishing::HeldRootOf(Commit const& commit) const {
+    auto const holder = commit.GetHeldCommitTree();
+    return holder ? holder->GetRoot() : storage_.GetTree(commit.GetRootId());
+}
+
+void Publishing::StoreTogether(std::span<cow_ptr<Commit> const> commits) {
+    MissingTrees trees(archive_);
+    for (auto const& commit : commits) {
+        cow_ptr<Commit> const parent = commit->GetHeldParent();
+        if (cow_ptr<Tree> root = HeldRootOf(*commit))
+            trees.Add(std::move(root), parent ? HeldRootOf(*parent) : nullptr);
+    }
+    trees.Find();
+    for (auto const& commit : commits) {
+        if (cow_ptr<Tree> const root = HeldRootOf(*commit); root && trees.IsMissing(root->GetId()))
+            StoreTree(trees, trees.NumberOf(root->GetId()));
+        StoreCommit(*commit);
+    }
+}
+
+void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
+    // On a list of its own: nesting has no bound that a thread's stack would hold.
+    std::vector<std::pair<std::size_t, bool>> open{{root, false}};
+    while (!open.empty()) {
+        auto const [number, isDone] = open.back();
+        open.pop_back();
+        NewDirectory const& directory = trees.At(number);
+        if (!trees.IsMissing(directory.id) || stored_.contains(directory.id))
+            continue;
+        if (isDone) {
+            StoreDirectory(directory, trees.PathOf(directory.holder, directory.name));
+            continue;
+        }
+        StoreFiles(trees, number);
+        open.emplace_back(number, true);
+        for (auto subdirectory = directory.subdirectories.rbegin(); subdirectory != directory.subdirectories.rend();
+             ++subdirectory)
+            open.emplace_back(*subdirectory, false);
+    }
+}
+
+void Publishing::StoreFiles(MissingTrees const& trees, std::size_t directory) {
+    for (NewDirectory::File const& file : trees.At(directory).files)
+        if (trees.IsMissing(file.id) && !stored_.contains(file.id))
+            StoreFile(file, trees.PathOf(directory, file.name));
+}
+
+void Publishing::StoreFile(NewDirectory::File const& file, std::string const& path) {
+    auto const* const archived =
+        file.blob->IsOfHostClass() ? dynamic_cast<ArchivedBlob const*>(file.blob.get()) : nullptr;
+    // Another archive's, then: this one does not have it.
+    if (archived != nullptr && archived->GetSize() > largestWholeContent)
+        return StoreLarge(file, archived->OpenContent(), path);
+    Buffer const data = archived != nullptr ? archived->ReadContent() : file.blob->GetData();
+    if (data.GetSize() > largestWholeContent)
+        return StoreLarge(file, StreamIO(KivVcs::MemStream::CreateOnCopy(data)), path);
+    if (archived == nullptr && file.blob->IsOfHostClass() && !(Identify(ObjectType::Blob, data) == file.id))
+        RefuseContent(path);
+    Add({file.id, ObjectType::Blob, data, file.earlier});
+}
+
+void Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content, std::string const& path) {
+    if (!archive_.StoreContent(file.id, content, file.earlier, progress_))
+        RefuseContent(path);
+    stored_.insert(file.id);
+    ++storedCount_;
+}
+
+void Publishing::StoreDirectory(NewDirectory const& directory, std::string const& path) {
+    Buffer const& data = directory.tree->GetData();
+    if (directory.tree->IsOfHostClass() && !(Identify(ObjectType::Tree, data) == directory.id))
+        RefuseContent(path);
+    for (NewDirectory::File const& file : directory.files)
+        RelyOn(file.id);
+    for (auto const& name : directory.earlier ? directory.tree->GetLocalTreeDiffs(directory.earlier)
+                                              : directory.tree->GetLocalSubtreePaths())
+        if (cow_ptr<Tree> const subtree = directory.tree->GetLocalTree(name))
+            RelyOn(subtree->GetId());
+    if (directory.earlier)
+        RelyOn(directory.earlier->GetId());
+    Add({directory.id, ObjectType::Tree, data, directory.earlier ? directory.earlier->GetId() : Id()});
+}
+
+void Publishing::StoreCommit(Commit const& commit) {
+    Id const id = commit.GetId();
+    Buffer const data = Joined(commit.GetData());
+    if (id.GetDigest() == nullptr || !(Identify(ObjectType::Commit, data) == id) ||
+        !ReadCommit(id, BytesOf(data), {}, {}))
+        throw ArchiveError(Failure::Unrepresentable, {},
+                           "The version \"" + KivVcs::ToUtf8(commit.GetDescription()) + "\" cannot be read back.");
+    Ancestry const* const known = facts_.Find(id);
+    Ancestry facts{id, commit.GetParentId(), commit.GetRootId(), {}};
+    if (known != nullptr)
+        facts.contains = known->contains;
+    if (!facts.parent.IsEmpty())
+        RelyOn(facts.parent);
+    if (!facts.tree.IsEmpty())
+        RelyOn(facts.tree);
+    for (auto const& merged : facts_.MergedBy(id))
+        RelyOn(merged->GetId());
+    change_.ancestry.push_back(std::move(facts));
+    Add({id, ObjectType::Commit, data, {}});
+}
+
+void Publishing::RelyOn(Id const& id) {
+    if (!inChange_.contains(id) && relied_.insert(id).second)
+        change_.relied.push_back(id);
+}
+
+void Publishing::Add(NewObject object) {
+    size_ += object.data.GetSize();
+    ++storedCount_;
+    inChange_.insert(object.id);
+    stored_.insert(object.id);
+    change_.objects.push_back(std::move(object));
+    if (size_ >= changeSize)
+        Flush();
+}
+
+void Publishing::Flush() {
+    ReportProgress(progress_, {"publishing", storedCount_, 0}, {});
+    archive_.Apply(change_);
+    change_ = {};
+    size_ = 0;
+    inChange_.clear();
+    relied_.clear();
+}
+
+ChangeOutcome Publishing::Finish(std::vector<BranchMove> moves, std::vector<RecordChange> const& records) {
+    ReportProgress(progress_, {"publishing", storedCount_, storedCount_}, {});
+    for (Ancestry& facts : facts_.All())
+        change_.ancestry.push_back(std::move(facts));
+    change_.branches = std::move(moves);
+    change_.records = records;
+    return archive_.Apply(change_);
+}
+
+} // namespace KivArchive

@@ -1,0 +1,53 @@
+#pragma once
+
+/// @file
+/// Bringing commits to an archive.
+
+#include "KivArchive/IArchive.h"
+#include "repository/LocalFacts.h"
+#include "repository/MissingTrees.h"
+
+#include <KivVcs/Storage.h>
+
+namespace KivArchive {
+
+using KivVcs::Commit;
+
+/// Stores what the archive lacks, children first, in changes of a bounded size of which the last one moves the branches.
+class Publishing {
+public:
+    Publishing(IArchive& archive, KivVcs::IObjectsStorage const& storage, LocalFacts const& facts, IProgress* progress)
+        : archive_(archive), storage_(storage), facts_(facts), progress_(progress) {}
+
+    /// Stores commits with all that they bring. @param commits those that are missing, each behind what it names
+    void Store(std::vector<cow_ptr<Commit>> const& commits);
+    /// Moves the branches, and stores what is left.
+    [[nodiscard]] ChangeOutcome Finish(std::vector<BranchMove> moves, std::vector<RecordChange> const& records);
+
+private:
+    [[nodiscard]] cow_ptr<Tree> HeldRootOf(Commit const& commit) const;
+    void StoreTogether(std::span<cow_ptr<Commit> const> commits);
+    void StoreTree(MissingTrees const& trees, std::size_t root);
+    void StoreFiles(MissingTrees const& trees, std::size_t directory);
+    void StoreFile(NewDirectory::File const& file, std::string const& path);
+    void StoreLarge(NewDirectory::File const& file, StreamIO content, std::string const& path);
+    void StoreDirectory(NewDirectory const& directory, std::string const& path);
+    void StoreCommit(Commit const& commit);
+    void RelyOn(Id const& id);
+    void Add(NewObject object);
+    void Flush();
+
+    IArchive& archive_;
+    KivVcs::IObjectsStorage const& storage_;
+    LocalFacts const& facts_;
+    IProgress* progress_;
+    Change change_;
+    std::uint64_t size_ = 0;
+    std::uint64_t storedCount_ = 0;
+    /// What the change stores, and what this publish has stored.
+    std::unordered_set<Id> inChange_;
+    std::unordered_set<Id> stored_;
+    std::unordered_set<Id> relied_;
+};
+
+} // namespace KivArchive

@@ -1,0 +1,90 @@
+#include "repository/RepositoryState.h"
+
+#include <algorithm>
+
+namespace KivArchive {
+
+RefreshOutcome ArchivedRepository::Refresh() {
+    auto const theirs = state_->Archive().ReadBranches();
+    std::vector<Id> heads;
+    for (Branch const& branch : theirs) {
+        auto const known = state_->branches.find(branch.name);
+        if (known == state_->branches.end() || known->second.unreadable || !(known->second.published == branch.head))
+            heads.push_back(branch.head);
+    }
+    state_->source->LoadCommits(heads);
+    RefreshOutcome outcome;
+    for (Branch const& branch : theirs)
+        RefreshBranch(branch, outcome);
+    ForgetRemoved(theirs, outcome);
+    return outcome;
+}
+
+void ArchivedRepository::RefreshBranch(Branch const& theirs, RefreshOutcome& outcome) {
+    KnownBranch& known = state_->branches.try_emplace(theirs.name).first->second;
+    bool const isThere = state_->storage->BranchExist(theirs.name);
+    Id const own = state_->OwnHead(theirs.name);
+    bool const hasMoved = !(known.published == theirs.head);
+    bool const isToBeRead = known.unreadable && isThere && own.IsEmpty();
+    known.published = theirs.head;
+    if (own == theirs.head) {
+        known.taken = theirs.head;
+        known.unreadable.reset();
+        return;
+    }
+    bool const hasUnpublished = !isToBeRead && !(own == known.taken);
+    if (hasUnpublished && (isThere || !hasMoved)) {
+        if (isThere && !(known.taken == theirs.head))
+            outcome.diverged.push_back(theirs.name);
+        return;
+    }
+    if (hasMoved || isToBeRead) {
+        TakePublished(theirs.name);
+        outcome.moved.push_back(theirs.name);
+    }
+}
+
+void ArchivedRepository::ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome) {
+    for (auto known = state_->branches.begin(); known != state_->branches.end();) {
+        auto const& [name, state] = *known;
+        bool const isThere = std::any_of(theirs.begin(), theirs.end(),
+                                         [&name = name](Branch const& branch) { return branch.name == name; });
+        if (isThere) {
+            ++known;
+            continue;
+        }
+        if (BranchExist(name) && !HasUnpublished(name)) {
+            RemoveBranch(name);
+            outcome.moved.push_back(name);
+        }
+        // What is left here is a new branch from now on.
+        known = state_->branches.erase(known);
+    }
+}
+
+/// Moves the branch to its published head, or leaves it without one if that cannot be had.
+void ArchivedRepository::TakePublished(KivStringT<char16_t> const& branch) {
+    KnownBranch& known = state_->branches.at(branch);
+    cow_ptr<Commit> head;
+    try {
+        head = state_->source->FetchCommit(known.published);
+    } catch (ArchiveError const& error) {
+        bool const isLocal = error.GetKind() == Failure::Damaged || error.GetKind() == Failure::Unrepresentable ||
+                             error.GetKind() == Failure::Collected;
+        if (!isLocal)
+            throw;
+        known.unreadable = error.GetKind();
+        state_->storage->RemoveBranch(branch);
+        state_->storage->CreateBranch(branch, nullptr);
+        known.taken = known.published;
+        return;
+    }
+    if (BranchExist(branch))
+        MoveBranchTo(branch, std::move(head));
+    else
+        CreateBranch(branch, std::move(head));
+    known.taken = known.published;
+    known.unreadable.reset();
+}
+
+} // namespace KivArchive

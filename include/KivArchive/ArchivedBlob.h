@@ -1,0 +1,61 @@
+#pragma once
+
+/// @file
+/// Files whose content stays in an archive until somebody asks for it.
+
+#include "KivArchive/IArchive.h"
+
+#include <KivVcs/Blob.h>
+
+#include <atomic>
+#include <memory>
+
+namespace KivArchive {
+
+class ContentGroup;
+
+/// A blob that knows its identifier, and fetches its content when it is asked for.
+///
+/// There are three ways to the content: `GetData` keeps it until the blob dies, `ReadContent` gives a value, and
+/// `OpenContent` a stream that holds a few MiB at most. The latter two share the byte budget of the repository that the blob
+/// comes from. The blob keeps the archive alive, not the repository.
+///
+/// Threads: all `const` operations may run concurrently.
+/// @throws ArchiveError from everything that fetches, `Collected` if the content is not there any more and `Damaged` if it
+/// is not what the identifier says; std::bad_alloc. The next call tries again
+class KIVARCHIVE_EXPORT ArchivedBlob final : public KivVcs::Blob {
+public:
+    /// Blobs are made by the repository that reads a directory, a group for each.
+    ArchivedBlob(Id const& id, std::shared_ptr<ContentGroup> group) noexcept;
+    ArchivedBlob(ArchivedBlob const& other);
+    ArchivedBlob& operator=(ArchivedBlob const&) = delete;
+    ~ArchivedBlob() override;
+
+    [[nodiscard]] Id GetId() const override { return contentId_; }
+    /// The content, fetched by the first call and kept until the blob dies.
+    [[nodiscard]] Buffer const& GetData() const override;
+
+    /// The size of the content, without fetching it. The first call asks the archive for the sizes of all files that were
+    /// read along with this one.
+    [[nodiscard]] std::uint64_t GetSize() const;
+
+    /// The content as a value; what is kept of it counts against the budget.
+    [[nodiscard]] Buffer ReadContent() const;
+
+    /// The content as a stream, whose last bytes are given only if the whole is what the identifier says.
+    [[nodiscard]] StreamIO OpenContent() const;
+
+    /// Whether `GetData` has fetched the content.
+    [[nodiscard]] bool IsContentHeld() const noexcept;
+
+protected:
+    [[nodiscard]] KivVcs::cow_ptr<KivVcs::Blob> Copy() const override;
+
+private:
+    Id contentId_;
+    std::shared_ptr<ContentGroup> group_;
+    /// Null until the content has been asked for.
+    mutable std::atomic<Buffer const*> content_{nullptr};
+};
+
+} // namespace KivArchive

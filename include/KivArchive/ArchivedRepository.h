@@ -1,0 +1,170 @@
+#pragma once
+
+/// @file
+/// A repository whose versions are in an archive, and come from there when they are asked for.
+
+#include "KivArchive/ArchivedBlob.h"
+#include "KivArchive/IArchive.h"
+
+#include <KivVcs/Repository.h>
+
+#include <memory>
+
+namespace KivArchive {
+
+using KivVcs::Commit;
+using KivVcs::cow_ptr;
+using KivVcs::Resolvers;
+
+struct RepositoryOptions {
+    /// The most bytes of contents that are kept for those who read them again, and that streams hold; what was not used
+    /// for the longest time goes first. Contents that a blob keeps, since its `GetData` was called, are not counted.
+    std::uint64_t contentBytes = std::uint64_t{64} * 1024 * 1024;
+    /// How many times `PublishMerging` tries.
+    unsigned attempts = 20;
+    /// How long it waits after it has lost a race for the first time, at most; twice as long each further time, up to a
+    /// second.
+    std::chrono::milliseconds backOff{10};
+};
+
+/// What became of the branches that were to be published.
+struct PublishOutcome {
+    /// Whether the archive has them now. If not it has none of them.
+    bool published = false;
+    /// The branches that others have moved meanwhile, with their heads in the archive; null for none.
+    std::vector<Branch> moved;
+    /// The records that had another value than expected, with their values now.
+    std::vector<Record> changedRecords;
+};
+
+struct RefreshOutcome {
+    /// The branches that were moved, made or removed here, since others had done so.
+    std::vector<KivStringT<char16_t>> moved;
+    /// The branches that others have moved and that have something unpublished here, which stay as they are.
+    std::vector<KivStringT<char16_t>> diverged;
+};
+
+enum class PublishMergingResult : std::uint8_t {
+    Published, ///< The archive has all of it.
+    GaveUp,    ///< A merge was refused: a resolver gave up.
+    Lost,      ///< Others were faster each time.
+};
+
+struct PublishMergingOutcome {
+    PublishMergingResult result = PublishMergingResult::Lost;
+    /// How many times publishing was tried.
+    unsigned attempts = 0;
+    /// The branch that could not be merged; empty if none was refused.
+    KivStringT<char16_t> branch;
+};
+
+/// A repository over an archive, which it may share with others.
+///
+/// Its branches are read when it is made. Commits are fetched when something reaches them, a walk's in growing batches
+/// ahead of it; root trees when they are asked for, whole, with one batch for each level; contents when they are asked for,
+/// as `ArchivedBlob` says, and never by anything in here but publishing, of what hosts have added. What has been fetched is
+/// in the storage, also of its clones, and keeps the archive alive, not the repository. Lookups by identifier answer from
+/// the storage and fetch nothing; `Load` brings in others. Counts and tables tell of what is loaded.
+///
+/// The archive sees nothing of what is committed here until it is published.
+///
+/// Threads: as every repository; several repositories may share one archive on several threads. Fetching may happen on any
+/// thread that reads a commit.
+/// @throws ArchiveError from everything that asks the archive, and from everything that walks to what has not been fetched:
+/// `Damaged`, `Unrepresentable` or `Collected` if it cannot be had, which never looks like an end of the history
+class KIVARCHIVE_EXPORT ArchivedRepository : public KivVcs::Repository {
+public:
+    /// Opens the archive, which must not be null: reads its branches and their heads, with two batches. An archive without
+    /// branches gives the branch "master" without a head. A head that cannot be read locks out its own branch only.
+    explicit ArchivedRepository(std::shared_ptr<IArchive> archive, RepositoryOptions const& options = {});
+    ArchivedRepository(ArchivedRepository const&) = delete;
+    ArchivedRepository& operator=(ArchivedRepository const&) = delete;
+    ~ArchivedRepository() override;
+
+    [[nodiscard]] std::shared_ptr<IArchive> const& GetArchive() const noexcept;
+
+    using KivVcs::Repository::GetHead;
+    /// @throws ArchiveError if the archive has a head that cannot be read
+    [[nodiscard]] cow_ptr<Commit> GetHead(KivStringViewT<char16_t> branch) const override;
+
+    /// Brings commits, trees with all below them, and blobs into the storage; commits and blobs by one batch each.
+    /// @return those that the archive does not have
+    std::vector<Id> Load(std::span<const Id> ids);
+
+    /// The content of a blob that is in the archive, as a value or as a stream, within the byte budget. Nobody needs to
+    /// have loaded the blob.
+    [[nodiscard]] Buffer ReadContent(Id const& id);
+    [[nodiscard]] StreamIO OpenContent(Id const& id);
+
+    /// The head that a branch had in the archive when that was last looked at; null if it had none.
+    [[nodiscard]] Id GetPublishedHead(KivStringViewT<char16_t> branch) const;
+    /// Whether a branch stands elsewhere than in the archive, as far as that is known, because it was moved here.
+    [[nodiscard]] bool HasUnpublished(KivStringViewT<char16_t> branch) const;
+
+    /// Writes what the heads of these branches reach and the archive lacks, and moves the branches there: all of them, and
+    /// the records, or none. Branches that were removed here are removed there. What has been merged, too, is published with
+    /// the commit that merged it.
+    ///
+    /// Asks for what is missing from the top, directories against those of the parent; stores children first, in
+    /// changes of 8 MiB and a little more, the last of which moves the branches. Whatever is stored before that is not
+    /// visible, and stays for the next try. Tries again if something that it relied on has been collected meanwhile.
+    /// @param branches those that have nothing unpublished, or do not exist, are left out
+    /// @param progress may be null
+    /// @throws ArchiveError, `Unrepresentable` with its path for what a packed form cannot show, and `Collected` if
+    /// something is gone that is only known here by its identifier; what a host's objects throw
+    PublishOutcome Publish(std::span<const KivStringT<char16_t>> branches,
+                           std::vector<RecordChange> const& records = {}, IProgress* progress = nullptr);
+    /// The same for all branches.
+    PublishOutcome Publish(IProgress* progress = nullptr);
+
+    /// Looks at the archive's branches, and moves those that have nothing unpublished here to where they are there. A branch
+    /// that was removed here comes back if others have moved it.
+    RefreshOutcome Refresh();
+
+    /// Publishes all branches, merging what others have published until it wins: refreshes, merges every branch that has
+    /// moved on both sides, publishes, and begins again if others were faster. Where the head that is known here was
+    /// rewritten there, the commits on top of it are put on the rebuilt one without a merge. The current branch stays
+    /// current.
+    ///
+    /// What has been merged stays so if a later step fails.
+    /// @param resolvers as `Merge` takes them; may be asked again about what was merged for a race that was lost
+    /// @param progress may be null
+    /// @throws as `Publish` and `Refresh`; what resolvers throw
+    PublishMergingOutcome PublishMerging(Resolvers const& resolvers, IProgress* progress = nullptr);
+
+protected:
+    /// Notes that @p rebuilt stands for @p old on a rewritten history, for the archive to know once it is published.
+    void CommitRewritten(cow_ptr<Commit> old, cow_ptr<Commit> rebuilt) override;
+
+    /// Merges what others have published on @p branch into it, for `PublishMerging`. @return false if that is refused
+    [[nodiscard]] virtual bool MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
+                                              Resolvers const& resolvers);
+
+    /// Notes that @p commit contains @p contained, for the archive to know once @p commit is published. What was merged is
+    /// kept until then, and published along.
+    void RecordContained(cow_ptr<Commit> const& commit, Containment how, cow_ptr<Commit> const& contained);
+
+    /// As `IArchive::ReadAncestry`, with what is known of commits that have not been published.
+    [[nodiscard]] std::vector<Ancestry> ReadAncestry(std::span<const Id> commits, Follow follow,
+                                                     std::size_t more) const;
+
+private:
+    struct State;
+    struct Moves;
+
+    explicit ArchivedRepository(std::unique_ptr<State> state);
+
+    [[nodiscard]] Moves PendingMoves(std::span<const KivStringT<char16_t>> branches) const;
+    [[nodiscard]] bool IsContained(Id const& commit, cow_ptr<Commit> const& in) const;
+    PublishOutcome PublishOnce(std::span<const KivStringT<char16_t>> branches, std::vector<RecordChange> const& records,
+                               bool asksForAll, IProgress* progress);
+    void RefreshBranch(Branch const& theirs, RefreshOutcome& outcome);
+    void ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome);
+    void TakePublished(KivStringT<char16_t> const& branch);
+    [[nodiscard]] bool MergeDiverged(KivStringT<char16_t> const& branch, Resolvers const& resolvers);
+    void RebaseOntoRewritten(KivStringT<char16_t> const& branch);
+
+    std::unique_ptr<State> state_;
+};
+
+} // namespace KivArchive
