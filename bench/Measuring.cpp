@@ -20,6 +20,7 @@ void MemoryTaken::WriteTo(Measurement& measurement) const {
 }
 
 std::unique_ptr<Repository> MakeRepository() {
+    SettleFreedMemory();
     return std::make_unique<Repository>(std::make_unique<MemObjectsStorage>());
 }
 

@@ -65,6 +65,12 @@ void KeepFreedMemory() {
     mallopt(M_TRIM_THRESHOLD, std::numeric_limits<int>::max());
 }
 
+void SettleFreedMemory() {
+    // A block that is no small one makes it join those that are free.
+    constexpr std::size_t large = 1 << 20;
+    ::operator delete(::operator new(large));
+}
+
 std::int64_t PeakResidentBytes() {
     std::ifstream status("/proc/self/status");
     for (std::string line; std::getline(status, line);) {

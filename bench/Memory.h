@@ -21,6 +21,9 @@ void ForgetPeak() noexcept;
 /// Keeps what is given back within the process, for the next one to take, as in a host that has run for a while.
 void KeepFreedMemory();
 
+/// Lets the allocator do now what it has put off when much was given back.
+void SettleFreedMemory();
+
 /// The most memory that the process has occupied since `ForgetResidentPeak`, in bytes; 0 where the system does not
 /// know.
 [[nodiscard]] std::int64_t PeakResidentBytes();

@@ -153,11 +153,10 @@ private:
 
     using PathComponentsView = array_view<KivStringViewT<char16_t> const>;
 
-    /// Makes the storage's instance of @p object the entry @p name, which a new entry shares as @p text, and returns it;
-    /// null, doing nothing, for an empty name. @p own gives what is stored if the storage has none.
+    /// Makes the storage's instance of @p object the entry @p name and returns it; null, doing nothing, for an empty
+    /// name. @p own gives what is stored if the storage has none.
     template <class T, class Own>
-    cow_ptr<T> SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own,
-                        KivStringT<char16_t> const* text = nullptr);
+    cow_ptr<T> SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own);
     void EraseLocal(KivStringViewT<char16_t> name);
     /// Private copies of the trees along @p names, new ones where there is none.
     [[nodiscard]] std::vector<cow_ptr<Tree>> CopyWay(PathComponentsView names) const;

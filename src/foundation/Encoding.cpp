@@ -39,10 +39,11 @@ void ForEachCodePoint(KivStringViewT<char16_t> text, Take take) {
 
 /// Whether every code unit is ASCII, as those of most names are. Looks at all of them, since that is faster than to stop
 /// at the first that is not.
-bool IsAscii(KivStringViewT<char16_t> text) noexcept {
+template <class C>
+bool IsAscii(KivStringViewT<C> text) noexcept {
     unsigned bits = 0;
-    for (const char16_t unit : text)
-        bits |= unit;
+    for (const C unit : text)
+        bits |= static_cast<unsigned>(unit);
     return bits < 0x80;
 }
 
@@ -177,6 +178,9 @@ KivStringT<char16_t> DataEncoding::HexEncode(const void* data, std::size_t size)
 }
 
 KivStringT<char16_t> String::ToStringW(KivStringViewT<char> text) {
+    if (IsAscii(text))
+        return KivStringT<char16_t>::Build(
+            text.GetLength(), [text](char16_t* units) { std::copy(text.begin(), text.end(), units); });
     int length = 0;
     ForEachCodeUnit(text, [&length](char16_t) { ++length; });
     return KivStringT<char16_t>::Build(

@@ -87,6 +87,17 @@ void Node::Take(std::span<Element> elements) noexcept {
     count_ = static_cast<std::uint8_t>(count_ + elements.size());
 }
 
+template <class Element>
+cow_ptr<Node> Node::MakeOf(int height, std::span<Element> elements) {
+    cow_ptr<Node> made = Make(height, static_cast<int>(elements.size()));
+    Of(made).Take(elements);
+    Of(made).CountTotal();
+    return made;
+}
+
+template cow_ptr<Node> Node::MakeOf(int, std::span<Entry>);
+template cow_ptr<Node> Node::MakeOf(int, std::span<Child>);
+
 Node& Node::Of(cow_ptr<Node>& handle) noexcept {
     // Only handles give access to nodes, so that the only one may change its node.
     return const_cast<Node&>(*handle);

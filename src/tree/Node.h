@@ -61,6 +61,9 @@ public:
     [[nodiscard]] static cow_ptr<Node> Make(int height, int capacity);
     /// A node with copies of the elements [@p from, @p to) and room for @p room more. @throws std::bad_alloc
     [[nodiscard]] cow_ptr<Node> CopyOf(int from, int to, int room) const;
+    /// A node of exactly the given elements, which are moved there. @throws std::bad_alloc; nothing has moved then
+    template <class Element>
+    [[nodiscard]] static cow_ptr<Node> MakeOf(int height, std::span<Element> elements);
     /// The node of @p handle as one that only this handle owns and that has room for @p room more elements: the node
     /// itself, or a copy that takes its place. @throws std::bad_alloc
     [[nodiscard]] static Node& Writable(cow_ptr<Node>& handle, int room);
@@ -135,6 +138,7 @@ private:
 };
 
 inline EntryTable::EntryTable() noexcept = default;
+inline EntryTable::EntryTable(cow_ptr<Node> top) noexcept : top_(std::move(top)) {}
 inline EntryTable::EntryTable(EntryTable const& other) noexcept = default;
 inline EntryTable::EntryTable(EntryTable&& other) noexcept = default;
 inline EntryTable& EntryTable::operator=(EntryTable const& other) noexcept = default;
@@ -148,9 +152,12 @@ struct TreeAccess {
         return tree.entries_.Find(name);
     }
 
-    /// As `AddBlob` and `AddTree` of @p tree, for an object that the caller may be the only one to hold.
+    [[nodiscard]] static EntryTable& Entries(Tree& tree) noexcept { return tree.entries_; }
+
+    /// What an entry becomes that adds @p object: the storage's instance. An object that only the caller holds is stored
+    /// itself, any other as a copy, unless there is one.
     template <class T>
-    static void AddRead(Tree& tree, IRepository& repo, KivStringT<char16_t> const& name, cow_ptr<T> object);
+    [[nodiscard]] static cow_ptr<T> Stored(IRepository& repo, cow_ptr<T> object);
 };
 
 } // namespace KivVcs::detail

@@ -97,29 +97,24 @@ std::uint64_t Tree::GetLocalBlobCount() const noexcept {
 }
 
 template <class T, class Own>
-cow_ptr<T> Tree::SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own,
-                          KivStringT<char16_t> const* text) {
+cow_ptr<T> Tree::SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own) {
     if (name.IsEmpty())
         return nullptr;
     cow_ptr<T> stored = StoredInstance(repo, object, own);
-    entries_.Set(name, stored, text);
+    entries_.Set(name, stored);
     ResetState();
     return stored;
 }
 
 template <class T>
-void detail::TreeAccess::AddRead(Tree& tree, IRepository& repo, KivStringT<char16_t> const& name, cow_ptr<T> object) {
-    if (name.Find(u"/") >= 0) {
-        tree.AddObjectToTree<T>(&repo, PathComponents(name), *object);
-        return;
-    }
+cow_ptr<T> detail::TreeAccess::Stored(IRepository& repo, cow_ptr<T> object) {
     // Only the caller knows of an object that nobody else holds, so that it needs no copy.
-    const auto own = [&object] { return object.use_count() == 1 ? std::move(object) : CopyOf(*object); };
-    tree.SetLocal(repo, name, *object, own, &name);
+    return StoredInstance(repo, *object,
+                          [&object] { return object.use_count() == 1 ? std::move(object) : CopyOf(*object); });
 }
 
-template void detail::TreeAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Blob>);
-template void detail::TreeAccess::AddRead(Tree&, IRepository&, KivStringT<char16_t> const&, cow_ptr<Tree>);
+template cow_ptr<Blob> detail::TreeAccess::Stored(IRepository&, cow_ptr<Blob>);
+template cow_ptr<Tree> detail::TreeAccess::Stored(IRepository&, cow_ptr<Tree>);
 
 std::vector<cow_ptr<Tree>> Tree::CopyWay(Components names) const {
     std::vector<cow_ptr<Tree>> way(names.size());

@@ -1,9 +1,12 @@
 #include "KivVcs/Helpers.h"
 #include "KivVcs/IRepository.h"
 #include "objects/PackedForm.h"
-#include "tree/Node.h"
+#include "objects/PathComponents.h"
+#include "tree/SortedEntries.h"
 
+#include <limits>
 #include <map>
+#include <string_view>
 
 namespace KivVcs {
 
@@ -12,12 +15,69 @@ namespace {
 using Loader = PortableVersion::Delegate<StreamIO(Id const&)>;
 
 /// Takes the text up to the next @p end off @p rest, and the end with it; all of it if there is none.
-KivStringViewT<char> TakeUntil(KivStringViewT<char>& rest, KivStringViewT<char> end) noexcept {
-    const int found = rest.Find(end);
-    const KivStringViewT<char> taken = found < 0 ? rest : rest.Left(found);
-    rest = found < 0 ? KivStringViewT<char>() : rest.Mid(found + 1);
+std::string_view TakeUntil(std::string_view& rest, char end) noexcept {
+    const std::string_view taken = rest.substr(0, rest.find(end));
+    rest.remove_prefix(std::min(taken.size() + 1, rest.size()));
     return taken;
 }
+
+/// The texts that identifiers are, and how much of a packed form is taken at most.
+constexpr std::size_t idLength = 64;
+constexpr std::size_t longestText = std::numeric_limits<int>::max();
+
+KivStringViewT<char> ViewOf(std::string_view text) noexcept {
+    return {text.data(), static_cast<int>(text.size())};
+}
+
+/// The rest of @p stream in one piece, shared with the loader's memory where that has it so; empty if it cannot be read.
+Buffer ReadInOnePiece(StreamIO& stream) {
+    Buffer data;
+    if (!stream.ReadRest(data))
+        return {};
+    if (data.LockForRead().size() <= 1)
+        return data;
+    return Buffer::Build(data.GetSize(), [&data](std::byte* bytes) { (void)data.Read(0, bytes, data.GetSize()); });
+}
+
+/// The directory that is being read, and its entries so far: in a table that grows at its end while they come in their
+/// order, as they do in every form that a tree was packed to.
+class GrowingDirectory {
+public:
+    template <class T>
+    void Add(IRepository& repo, std::string_view packedName, cow_ptr<T> object) {
+        KivStringT<char16_t> name = String::ToStringW(ViewOf(packedName));
+        if (name.IsEmpty())
+            return;
+        if (KivStringViewT<char16_t>(name).Find(u"/") >= 0) {
+            Gather();
+            tree_.AddObjectToTree<T>(&repo, PathComponents(name), *object);
+            return;
+        }
+        cow_ptr<T> stored = detail::TreeAccess::Stored(repo, std::move(object));
+        if (isSorted_ && inOrder_.IsNext(name)) {
+            inOrder_.Add(std::move(name), detail::Held(std::move(stored)));
+        } else {
+            Gather();
+            detail::TreeAccess::Entries(tree_).Set(name, std::move(stored), &name);
+        }
+    }
+
+    [[nodiscard]] Tree Take() {
+        Gather();
+        return std::move(tree_);
+    }
+
+private:
+    void Gather() {
+        if (std::exchange(isSorted_, false))
+            detail::TreeAccess::Entries(tree_) = inOrder_.Take();
+    }
+
+    detail::SortedEntries inOrder_;
+    bool isSorted_ = true;
+    /// All entries, once one has come out of order.
+    Tree tree_;
+};
 
 /// Some order of identifiers. Those that packed forms name are the host's, and their hashes may all be equal.
 struct InOrder {
@@ -45,14 +105,32 @@ public:
 
 private:
     struct Frame {
+        Frame(Id const& treeId, Buffer form) : id(treeId), data(std::move(form)), rest(TextOf(data)) {}
+
         Id id;
-        KivStringT<char> data;
+        Buffer data;
         /// What has not been read yet.
-        KivStringViewT<char> rest = data;
-        Tree tree{};
+        std::string_view rest;
+        GrowingDirectory directory{};
         /// The name of the entry whose subtree is being read.
-        KivStringT<char16_t> name{};
+        std::string_view name{};
     };
+
+    /// A blob of the innermost frame that has been found or read, but not entered.
+    struct WaitingBlob {
+        std::string_view name;
+        Id id;
+        cow_ptr<Blob> blob;
+        bool isRead;
+    };
+
+    static constexpr std::size_t mostWaiting = 32;
+    static constexpr std::uint64_t mostWaitingBytes = 1 << 19;
+
+    static std::string_view TextOf(Buffer const& data) noexcept {
+        const auto chunk = *data.LockForRead().begin();
+        return {reinterpret_cast<const char*>(chunk.data()), std::min(chunk.size(), longestText)};
+    }
 
     /// Finds the tree @p id or opens a frame for it.
     void BeginTree(Id const& id) {
@@ -67,28 +145,30 @@ private:
         StreamIO stream = loader_(id);
         if (!Helpers::ShiftObjectIdentifier(stream, "tree"))
             return FinishChild(nullptr);
-        if (KivStringT<char> data = Helpers::StreamToStringA(stream); data.IsEmpty())
+        if (Buffer data = ReadInOnePiece(stream); data.GetSize() == 0)
             FinishChild(nullptr);
         else
-            frames_.push_back({id, std::move(data)});
+            frames_.emplace_back(id, std::move(data));
     }
 
     /// Reads the next entry of the innermost frame, or finishes it.
     void NextEntry() {
         Frame& frame = frames_.back();
-        if (frame.rest.IsEmpty())
-            return FinishFrame(repo_.SyncWithStorage(immu::make<Tree>(std::move(frame.tree))));
-        TakeUntil(frame.rest, " ");
-        const KivStringViewT<char> type = TakeUntil(frame.rest, " ");
-        const KivStringViewT<char> name = TakeUntil(frame.rest, KivStringViewT<char>("", 1));
-        const KivStringViewT<char> id = frame.rest.Left(64);
-        frame.rest = frame.rest.Mid(64);
+        if (frame.rest.empty()) {
+            EnterWaiting();
+            return FinishFrame(repo_.SyncWithStorage(immu::make<Tree>(frame.directory.Take())));
+        }
+        TakeUntil(frame.rest, ' ');
+        const std::string_view type = TakeUntil(frame.rest, ' ');
+        const std::string_view name = TakeUntil(frame.rest, '\0');
+        const Id id = ReadId(ViewOf(frame.rest.substr(0, idLength)));
+        frame.rest.remove_prefix(std::min(idLength, frame.rest.size()));
+        if (type == "blob")
+            return FindOrReadBlob(name, id);
+        EnterWaiting();
         if (type == "tree") {
-            frame.name = String::ToStringW(name);
-            BeginTree(ReadId(id));
-        } else if (type == "blob") {
-            if (cow_ptr<Blob> blob = FindOrReadBlob(ReadId(id)))
-                detail::TreeAccess::AddRead(frame.tree, repo_, String::ToStringW(name), std::move(blob));
+            frame.name = name;
+            BeginTree(id);
         } else {
             FinishFrame(nullptr);
         }
@@ -105,24 +185,62 @@ private:
         if (frames_.empty())
             outermost_ = tree;
         else if (tree)
-            detail::TreeAccess::AddRead(frames_.back().tree, repo_, frames_.back().name, tree);
+            frames_.back().directory.Add(repo_, frames_.back().name, tree);
     }
 
-    cow_ptr<Blob> FindOrReadBlob(Id const& id) {
+    void FindOrReadBlob(std::string_view name, Id const& id) {
+        // One that is named again is asked for when it has been stored.
+        if (waiting_.size() == mostWaiting || waitingBytes_ > mostWaitingBytes || IsWaiting(id))
+            EnterWaiting();
         if (cow_ptr<Blob> stored = repo_.GetBlobFromStorage(id))
-            return stored;
-        if (const auto read = misnamedBlobs_.find(id); read != misnamedBlobs_.end())
-            return read->second;
+            return Wait({name, id, std::move(stored), false});
+        if (const auto read = misnamedBlobs_.find(id); read != misnamedBlobs_.end()) {
+            if (read->second)
+                Wait({name, id, read->second, false});
+            return;
+        }
         StreamIO stream = loader_(id);
         cow_ptr<Blob> blob = Blob::Deserialize(stream);
-        if (!blob || blob->GetId() != id)
-            misnamedBlobs_.emplace(id, blob);
-        return blob;
+        if (blob)
+            Wait({name, id, std::move(blob), true});
+        else
+            misnamedBlobs_.emplace(id, nullptr);
+    }
+
+    void Wait(WaitingBlob blob) {
+        if (blob.isRead) {
+            waitingBytes_ += blob.blob->GetData().GetSize();
+            waitingHashes_ |= HashBit(blob.id);
+        }
+        waiting_.push_back(std::move(blob));
+    }
+
+    [[nodiscard]] static std::uint64_t HashBit(Id const& id) noexcept { return std::uint64_t{1} << (id.Hash() % 64); }
+
+    [[nodiscard]] bool IsWaiting(Id const& id) const {
+        return (waitingHashes_ & HashBit(id)) != 0 && std::any_of(waiting_.begin(), waiting_.end(), [&](auto const& blob) {
+                   return blob.isRead && blob.id == id;
+               });
+    }
+
+    /// Identifies the blobs that wait, all at once, and enters them in their order.
+    void EnterWaiting() {
+        for (WaitingBlob& waiting : waiting_) {
+            if (waiting.isRead && waiting.blob->GetId() != waiting.id)
+                misnamedBlobs_.emplace(waiting.id, waiting.blob);
+            frames_.back().directory.Add(repo_, waiting.name, std::move(waiting.blob));
+        }
+        waiting_.clear();
+        waitingBytes_ = waitingHashes_ = 0;
     }
 
     IRepository& repo_;
     Loader const& loader_;
     std::vector<Frame> frames_;
+    std::vector<WaitingBlob> waiting_;
+    std::uint64_t waitingBytes_ = 0;
+    /// A bit for each hash, so that most identifiers are known not to wait without a look at those that do.
+    std::uint64_t waitingHashes_ = 0;
     cow_ptr<Tree> outermost_;
     /// What was read, since a repository need not store it nor under the identifier that was asked for: every form is read
     /// once however often it is named. Trees that are being read count as not loadable, which ends cycles.

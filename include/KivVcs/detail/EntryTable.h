@@ -17,6 +17,7 @@ class Node;
 class EntryTable {
 public:
     EntryTable() noexcept;
+    explicit EntryTable(cow_ptr<Node> top) noexcept;
     EntryTable(EntryTable const& other) noexcept;
     EntryTable(EntryTable&& other) noexcept;
     EntryTable& operator=(EntryTable const& other) noexcept;
