@@ -165,7 +165,7 @@ void AddReadingWorkloads(std::vector<Workload>& workloads, Divisors const& divis
     add("B8 differences, 1 file", {3}, [](auto files) { return Differences(files, 1); });
     add("B9 merge without conflicts", {8, 8192}, [](auto files) { return Merge(files, 0); });
     add("B9 merge, conflicts in one change of ten", {8, 8192}, [](auto files) { return Merge(files, files / 1000); });
-    add("B11 files read back", {3.5}, ReadBack);
+    add("B11 files read back", {3}, ReadBack);
 }
 
 } // namespace KivVcs::Bench

@@ -197,6 +197,38 @@ TEST_F(ReadingTrees, LeavesOutWhatCannotBeLoaded) {
     EXPECT_EQ(Files(packed.Read("long", &repo)), "x=1");
 }
 
+TEST_F(ReadingTrees, ManyEntriesFromOneBufferThatIsUsedAgain) {
+    for (const int count : {1, 32, 33, 1025}) {
+        Tree tree;
+        for (int number = 0; number < count; ++number) {
+            const std::string digits = std::to_string(10'000 + number);
+            tree.AddBlob(&repo, Wide("d/" + digits), MakeBlob(std::to_string(number / 2)));
+            tree.AddBlob(&repo, Wide("e/" + digits), MakeBlob(digits));
+        }
+        Buffer only;
+        int loads = 0;
+        const auto load = [&](Id const& id) {
+            ++loads;
+            const auto subtree = repo.GetTreeFromStorage(id);
+            const auto blob = repo.GetBlobFromStorage(id);
+            only = subtree ? subtree->GetPackedData() : blob ? blob->GetPackedData() : tree.GetPackedData();
+            return StreamIO(MemStream::CreateOnRef(only));
+        };
+        Repository other(std::make_unique<MemObjectsStorage>());
+        auto read = Tree::Deserialize(tree.GetId(), &other, load);
+        ASSERT_TRUE(read && *read == tree) << count;
+        EXPECT_EQ(loads, 3 + (count + 1) / 2 + count) << "the trees, and each content once";
+        const auto edit = [](Repository& holder, Tree& edited) {
+            for (auto const* path : {u"d/10000a", u"d/10500a", u"d/9"})
+                edited.AddBlob(&holder, path, MakeBlob("new"));
+            edited.RemoveObject(&holder, u"d/10031");
+        };
+        edit(repo, tree);
+        edit(other, *read.write());
+        EXPECT_TRUE(*read == tree && read->GetDeepBlobCount() == tree.GetDeepBlobCount()) << count;
+    }
+}
+
 TEST_F(ReadingTrees, EveryTruncationGivesTheEntriesBeforeItOrNothing) {
     const std::string first = Entry("blob", "x", one);
     const std::string whole = first + Entry("blob", "y", one);

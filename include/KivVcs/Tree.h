@@ -133,7 +133,9 @@ public:
     /// everything below it. Blobs and subtrees that cannot be loaded are left out. A tree that names itself, directly
     /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable. An entry whose name holds "/" is
     /// added by that path, as `AddBlob` and `AddTree` do, each time storing the directories on its way. A packed form is
-    /// read once however often it is named.
+    /// read once however often it is named. Blobs are looked up and loaded in the order of the entries, up to 32 or
+    /// 512 KiB of one directory before those are identified together and stored. Large forms of streams on buffers are
+    /// shared; a loader may use its own buffer again.
     /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not
     /// begin with "tree", no entries, or an entry that is neither tree nor blob.
     /// @throws what @p loader and @p repo throw

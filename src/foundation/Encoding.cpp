@@ -179,8 +179,8 @@ KivStringT<char16_t> DataEncoding::HexEncode(const void* data, std::size_t size)
 
 KivStringT<char16_t> String::ToStringW(KivStringViewT<char> text) {
     if (IsAscii(text))
-        return KivStringT<char16_t>::Build(
-            text.GetLength(), [text](char16_t* units) { std::copy(text.begin(), text.end(), units); });
+        return KivStringT<char16_t>::Build(text.GetLength(),
+                                           [text](char16_t* units) { std::copy(text.begin(), text.end(), units); });
     int length = 0;
     ForEachCodeUnit(text, [&length](char16_t) { ++length; });
     return KivStringT<char16_t>::Build(

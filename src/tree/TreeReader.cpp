@@ -218,13 +218,19 @@ private:
     [[nodiscard]] static std::uint64_t HashBit(Id const& id) noexcept { return std::uint64_t{1} << (id.Hash() % 64); }
 
     [[nodiscard]] bool IsWaiting(Id const& id) const {
-        return (waitingHashes_ & HashBit(id)) != 0 && std::any_of(waiting_.begin(), waiting_.end(), [&](auto const& blob) {
-                   return blob.isRead && blob.id == id;
-               });
+        return (waitingHashes_ & HashBit(id)) != 0 &&
+               std::any_of(waiting_.begin(), waiting_.end(),
+                           [&](auto const& blob) { return blob.isRead && blob.id == id; });
     }
 
     /// Identifies the blobs that wait, all at once, and enters them in their order.
     void EnterWaiting() {
+        for (WaitingBlob const& waiting : waiting_) {
+            if (waiting.isRead)
+                unidentified_.push_back(waiting.blob.get());
+        }
+        Identify(unidentified_);
+        unidentified_.clear();
         for (WaitingBlob& waiting : waiting_) {
             if (waiting.isRead && waiting.blob->GetId() != waiting.id)
                 misnamedBlobs_.emplace(waiting.id, waiting.blob);
@@ -238,6 +244,7 @@ private:
     Loader const& loader_;
     std::vector<Frame> frames_;
     std::vector<WaitingBlob> waiting_;
+    std::vector<Object const*> unidentified_;
     std::uint64_t waitingBytes_ = 0;
     /// A bit for each hash, so that most identifiers are known not to wait without a look at those that do.
     std::uint64_t waitingHashes_ = 0;
