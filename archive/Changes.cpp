@@ -1,6 +1,7 @@
 #include "Changes.h"
 
 #include <algorithm>
+#include <string_view>
 
 namespace KivArchive {
 
@@ -83,6 +84,39 @@ void AddContained(std::vector<ContainedCommit>& known, std::vector<ContainedComm
     for (ContainedCommit const& contained : further)
         if (std::find(known.begin(), known.end(), contained) == known.end())
             known.push_back(contained);
+}
+
+KivVcs::SHADigest256 BeginPackedForm(ObjectType type, std::uint64_t size) {
+    static constexpr std::string_view words[] = {"blob ", "tree ", "commit "};
+    std::string header(words[static_cast<std::size_t>(type)]);
+    header += std::to_string(size);
+    KivVcs::SHADigest256 digest;
+    digest.InitData(header.c_str(), header.size() + 1);
+    return digest;
+}
+
+bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& right) {
+    if (!left || !right)
+        return left.has_value() == right.has_value();
+    Buffer const one = Joined(*left);
+    Buffer const other = Joined(*right);
+    ByteView const bytes = BytesOf(one);
+    ByteView const otherBytes = BytesOf(other);
+    return std::equal(bytes.begin(), bytes.end(), otherBytes.begin(), otherBytes.end());
+}
+
+Bytes BytesOfName(KivStringT<char16_t> const& name) {
+    // As a view, so that the zeros of a name are kept.
+    KivStringT<char> const text = KivVcs::DataEncoding::Utf8Encode(KivStringViewT<char16_t>(name));
+    Bytes bytes(static_cast<std::size_t>(text.GetLength()));
+    std::transform(text.GetString(), text.GetString() + text.GetLength(), bytes.begin(),
+                   [](char byte) { return static_cast<std::byte>(byte); });
+    return bytes;
+}
+
+KivStringT<char16_t> NameOfBytes(ByteView bytes) {
+    return KivVcs::String::ToStringW(
+        KivStringViewT<char>(reinterpret_cast<const char*>(bytes.data()), static_cast<int>(bytes.size())));
 }
 
 } // namespace KivArchive

@@ -3,6 +3,7 @@
 /// @file
 /// What all archives do with identifiers and changes before they store anything.
 
+#include "Bytes.h"
 #include "KivArchive/IArchive.h"
 
 #include <KivVcs/SHADigest256.h>
@@ -37,5 +38,12 @@ void ReportProgress(IProgress* progress, Progress const& state, std::string cons
 
 /// Adds to @p known those of @p further that it does not have.
 void AddContained(std::vector<ContainedCommit>& known, std::vector<ContainedCommit> const& further);
+
+/// Whether both are the same bytes, or both none.
+[[nodiscard]] bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& right);
+
+/// The bytes that names are stored as, and the name that they stand for.
+[[nodiscard]] Bytes BytesOfName(KivStringT<char16_t> const& name);
+[[nodiscard]] KivStringT<char16_t> NameOfBytes(ByteView bytes);
 
 } // namespace KivArchive

@@ -1,8 +1,6 @@
 #include "Changes.h"
 
 #include <algorithm>
-#include <cstring>
-#include <string_view>
 
 namespace KivArchive {
 
@@ -73,15 +71,6 @@ private:
 } // namespace
 
 IArchive::~IArchive() = default;
-
-KivVcs::SHADigest256 BeginPackedForm(ObjectType type, std::uint64_t size) {
-    static constexpr std::string_view words[] = {"blob ", "tree ", "commit "};
-    std::string header(words[static_cast<std::size_t>(type)]);
-    header += std::to_string(size);
-    KivVcs::SHADigest256 digest;
-    digest.InitData(header.c_str(), header.size() + 1);
-    return digest;
-}
 
 Id Identify(ObjectType type, std::span<const std::byte> data) {
     KivVcs::SHADigest256 digest = BeginPackedForm(type, data.size());

@@ -17,16 +17,6 @@ struct StoredObject {
 
 using Digest = Id::Digest;
 
-bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& right) {
-    if (!left || !right)
-        return left.has_value() == right.has_value();
-    Buffer const one = Joined(*left);
-    Buffer const other = Joined(*right);
-    auto const oneBytes = BytesOf(one);
-    auto const otherBytes = BytesOf(other);
-    return std::equal(oneBytes.begin(), oneBytes.end(), otherBytes.begin(), otherBytes.end());
-}
-
 /// The values of up to @p limit entries behind @p after, each as @p make gives it.
 template <class Table, class Make>
 auto List(Table const& table, Id const& after, std::size_t limit, Make make) {

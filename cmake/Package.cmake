@@ -52,7 +52,16 @@ set(CPACK_DEBIAN_ARCHIVE-DEVELOPMENT_PACKAGE_SECTION libdevel)
 set(CPACK_COMPONENT_ARCHIVE-DEVELOPMENT_DEPENDS archive-runtime development)
 set(CPACK_DEBIAN_ARCHIVE-DEVELOPMENT_DESCRIPTION "Headers of KivArchive, which makes versions of KivVcs last")
 
+set(CPACK_DEBIAN_ARCHIVE-POSTGRES-RUNTIME_PACKAGE_NAME libkivvcs-archive-postgres${kivvcs_soname_version})
+set(CPACK_COMPONENT_ARCHIVE-POSTGRES-RUNTIME_DEPENDS archive-runtime)
+set(CPACK_DEBIAN_ARCHIVE-POSTGRES-RUNTIME_DESCRIPTION "Archives of KivVcs in databases with the PostgreSQL protocol")
+
+set(CPACK_DEBIAN_ARCHIVE-POSTGRES-DEVELOPMENT_PACKAGE_NAME libkivvcs-archive-postgres-dev)
+set(CPACK_DEBIAN_ARCHIVE-POSTGRES-DEVELOPMENT_PACKAGE_SECTION libdevel)
+set(CPACK_COMPONENT_ARCHIVE-POSTGRES-DEVELOPMENT_DEPENDS archive-postgres-runtime archive-development)
+set(CPACK_DEBIAN_ARCHIVE-POSTGRES-DEVELOPMENT_DESCRIPTION "What programs are linked with that keep KivVcs archives in databases")
+
 # Only what this build installs; nothing that other projects in the build may install.
 get_cmake_property(CPACK_COMPONENTS_ALL COMPONENTS)
-list(FILTER CPACK_COMPONENTS_ALL INCLUDE REGEX "^(archive-)?(runtime|development)$|^vault$")
+list(FILTER CPACK_COMPONENTS_ALL INCLUDE REGEX "^(archive-|archive-postgres-)?(runtime|development)$|^vault$")
 include(CPack)

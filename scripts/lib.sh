@@ -41,7 +41,8 @@ quietly() {
 packages_of() {
     case $1 in
     build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata gdb dpkg-dev python3 ;;
-    archive) echo libsqlite3-dev libzstd-dev ;;
+    archive) echo libsqlite3-dev libzstd-dev libpq-dev ;;
+    postgres) echo postgresql ;;
     vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;

@@ -1,4 +1,4 @@
-#include "Changes.h"
+#include "Pieces.h"
 #include "sqlite/SqliteStore.h"
 
 #include <algorithm>
@@ -125,15 +125,7 @@ std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
 }
 
 std::vector<Id> SqliteStore::PiecesOf(FormReader& reader, ObjectRow const& row) {
-    Form const form = reader.FormAt(row.place);
-    std::vector<Id> pieces;
-    for (ByteReader digests(form.bytes); !digests.Rest().empty();) {
-        Id::Digest digest{};
-        ByteView const bytes = digests.Take(digest.size());
-        std::copy(bytes.begin(), bytes.end(), std::as_writable_bytes(std::span(digest)).begin());
-        pieces.push_back(Id::FromDigest(digest));
-    }
-    return pieces;
+    return ReadDigests(reader.FormAt(row.place).bytes);
 }
 
 } // namespace KivArchive

@@ -1,53 +1,7 @@
-#include "Changes.h"
+#include "Pieces.h"
 #include "sqlite/SqliteStore.h"
 
-#include <KivVcs/SHADigest256.h>
-
 namespace KivArchive {
-
-namespace {
-
-/// How much is stored in one transaction.
-constexpr std::size_t piecesAtOnce = 8;
-
-/// Reads a content piece by piece, and says in the end whether it is the one expected.
-class PieceReader {
-public:
-    PieceReader(StreamIO& content, std::uint64_t size)
-        : content_(content), rest_(size), digest_(BeginPackedForm(ObjectType::Blob, size)) {}
-
-    /// The next piece; empty at the end, and none if it cannot be read.
-    [[nodiscard]] std::optional<Buffer> Next() {
-        std::uint64_t const size = std::min(rest_, largestWholeContent);
-        bool isRead = true;
-        Buffer piece = Buffer::Build(size, [&](std::byte* bytes) { isRead = content_.Read(bytes, size); });
-        if (!isRead)
-            return std::nullopt;
-        rest_ -= size;
-        ByteView const bytes = BytesOf(piece);
-        digest_.InitData(bytes.data(), bytes.size());
-        return piece;
-    }
-
-    [[nodiscard]] bool IsAtEnd() const noexcept { return rest_ == 0; }
-
-    [[nodiscard]] Id Finish() {
-        Id::Digest bytes{};
-        digest_.FinalDigest(bytes.data());
-        return Id::FromDigest(bytes);
-    }
-
-private:
-    StreamIO& content_;
-    std::uint64_t rest_;
-    KivVcs::SHADigest256 digest_;
-};
-
-void AppendDigest(Buffer& list, Id const& id) {
-    list.Append(DigestOf(id).data(), DigestOf(id).size());
-}
-
-} // namespace
 
 bool SqliteArchive::StoreContent(Id const& id, StreamIO& content, Id const& earlier, IProgress* progress) {
     static_cast<void>(DigestOf(id));

@@ -1,7 +1,6 @@
 #include "AncestryWalk.h"
 #include "Changes.h"
 #include "sqlite/SqliteStore.h"
-#include "sqlite/Writer.h"
 
 #include <map>
 

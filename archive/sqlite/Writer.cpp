@@ -23,31 +23,7 @@ std::optional<Buffer> ValueOf(Database& database, Bytes const& name) {
     return value;
 }
 
-bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& right) {
-    if (!left || !right)
-        return left.has_value() == right.has_value();
-    Buffer const one = Joined(*left);
-    Buffer const other = Joined(*right);
-    ByteView const bytes = BytesOf(one);
-    ByteView const otherBytes = BytesOf(other);
-    return std::equal(bytes.begin(), bytes.end(), otherBytes.begin(), otherBytes.end());
-}
-
 } // namespace
-
-Bytes BytesOfName(KivStringT<char16_t> const& name) {
-    // As a view, so that the zeros of a name are kept.
-    KivStringT<char> const text = KivVcs::DataEncoding::Utf8Encode(KivStringViewT<char16_t>(name));
-    Bytes bytes(static_cast<std::size_t>(text.GetLength()));
-    std::transform(text.GetString(), text.GetString() + text.GetLength(), bytes.begin(),
-                   [](char byte) { return static_cast<std::byte>(byte); });
-    return bytes;
-}
-
-KivStringT<char16_t> NameOfBytes(ByteView bytes) {
-    return KivVcs::String::ToStringW(
-        KivStringViewT<char>(reinterpret_cast<const char*>(bytes.data()), static_cast<int>(bytes.size())));
-}
 
 Writer::Writer(Database& database)
     : database_(database), hasMarks_(database.Ask("SELECT EXISTS(SELECT 1 FROM marks)") != 0) {}

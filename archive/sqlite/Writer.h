@@ -35,8 +35,4 @@ private:
     bool hasMarks_;
 };
 
-/// The bytes that names are stored as, and the name that they stand for.
-[[nodiscard]] Bytes BytesOfName(KivStringT<char16_t> const& name);
-[[nodiscard]] KivStringT<char16_t> NameOfBytes(ByteView bytes);
-
 } // namespace KivArchive

@@ -1,0 +1,76 @@
+#pragma once
+
+/// @file
+/// Stored forms as the server gives them, with what they are differences to.
+
+#include "Segment.h"
+#include "postgres/Connection.h"
+
+#include <unordered_map>
+
+namespace KivArchive::Postgres {
+
+/// A stored form, and what keeps its bytes.
+struct Form {
+    std::shared_ptr<const void> owner;
+    ByteView bytes;
+};
+
+/// A row of the table of objects.
+struct Row {
+    StoredType type = StoredType::Blob;
+    /// Whether it is no object any more, and stays for those that are differences to it.
+    bool isRemoved = false;
+    std::uint64_t size = 0;
+    /// Null if it is no difference.
+    Id base;
+    /// The size of what is stored, and that itself; nothing if it was too much.
+    std::uint64_t storedSize = 0;
+    ByteView stored;
+};
+
+/// Rows that were read together. Used by one thread at a time.
+class Forms {
+public:
+    /// Reads the rows of @p ids and of all that they are differences to, in one round trip; the stored forms only if they
+    /// take at most @p most bytes together.
+    void Read(Connection& connection, std::span<const Id> ids, std::uint64_t most);
+    /// The same, as a part of a round trip whose answer is taken then.
+    static void AddTo(RoundTrip& trip, std::span<const Id> ids, std::uint64_t most);
+    void Take(Rows const& rows);
+
+    /// Null if there is no such row.
+    [[nodiscard]] Row const* Find(Id const& id) const;
+    /// Whether the stored forms are there, too.
+    [[nodiscard]] bool AreWhole() const noexcept { return areWhole_; }
+    /// How much is stored for @p id and what it is a difference to.
+    [[nodiscard]] std::uint64_t StoredSizeOf(Id const& id) const;
+
+    /// How the form of @p id is stored. @throws Malformed
+    [[nodiscard]] Member const& MemberOf(Id const& id);
+    /// The form itself. @throws Malformed
+    [[nodiscard]] Form FormOf(Id const& id, Compressor& compressor);
+
+private:
+    [[nodiscard]] std::shared_ptr<const Segment> StoredAt(Id const& id);
+    void Keep(Id const& id, std::shared_ptr<const Bytes> const& form);
+
+    std::vector<Rows> answers_;
+    std::unordered_map<Id, Row> rows_;
+    std::unordered_map<Id, std::shared_ptr<const Segment>> stored_;
+    std::unordered_map<Id, std::shared_ptr<const Bytes>> made_;
+    std::uint64_t madeSize_ = 0;
+    bool areWhole_ = true;
+};
+
+/// The type of a stored thing. @throws Malformed
+[[nodiscard]] Row RowOf(std::int64_t type);
+
+[[nodiscard]] ObjectType ObjectTypeOf(StoredType type) noexcept;
+
+/// Whether the row is an object of the archive, rather than a part of one.
+[[nodiscard]] inline bool IsObject(Row const& row) noexcept {
+    return !row.isRemoved && row.type != StoredType::Piece;
+}
+
+} // namespace KivArchive::Postgres

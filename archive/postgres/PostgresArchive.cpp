@@ -1,0 +1,20 @@
+#include "KivArchive/PostgresArchive.h"
+
+#include "postgres/Store.h"
+
+namespace KivArchive {
+
+PostgresArchive::PostgresArchive(std::string const& address, PostgresOptions const& options)
+    : store_(std::make_unique<Postgres::Store>(address, options)) {}
+
+PostgresArchive::~PostgresArchive() = default;
+
+bool PostgresArchive::IsAddress(std::string_view address) noexcept {
+    return address.starts_with("postgresql://") || address.starts_with("postgres://");
+}
+
+std::uint64_t PostgresArchive::GetRoundTrips() const noexcept {
+    return store_->RoundTrips();
+}
+
+} // namespace KivArchive

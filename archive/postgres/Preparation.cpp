@@ -1,0 +1,218 @@
+#include "postgres/Preparation.h"
+
+#include "Changes.h"
+#include "CompactForms.h"
+#include "Parallel.h"
+
+#include <algorithm>
+#include <unordered_set>
+
+namespace KivArchive::Postgres {
+
+namespace {
+
+/// Beyond this, differences take more memory than is good.
+constexpr std::uint64_t largestDifferenced = 16 * largestWholeContent;
+/// A difference must be this many times smaller than the form.
+constexpr std::size_t worthwhile = 3;
+/// How much of earlier versions is fetched at once.
+constexpr std::uint64_t windowSize = 8 * largestWholeContent;
+/// What is smaller hardly becomes smaller still.
+constexpr std::size_t worthCompressing = 64;
+
+void MakeForm(Prepared& prepared) {
+    Item const& item = *prepared.item;
+    ByteView const data = BytesOf(item.data);
+    prepared.form = data;
+    if (item.type == StoredType::Tree || item.type == StoredType::Commit) {
+        auto compact = item.type == StoredType::Tree ? CompactTree(data) : CompactCommit(data);
+        prepared.member.isCompact = compact.has_value();
+        if (compact) {
+            prepared.compact = std::move(*compact);
+            prepared.form = prepared.compact;
+        }
+    }
+    prepared.member.type = item.type;
+    prepared.member.size = item.size;
+    prepared.member.formSize = prepared.form.size();
+    // A log reads commits as they are.
+    bool const isPlain = item.type == StoredType::Commit || prepared.form.size() < worthCompressing;
+    prepared.member.encoding = isPlain ? Encoding::Plain : Encoding::Shared;
+}
+
+void MakeDifference(Prepared& prepared, Compressor& compressor) {
+    bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
+                         prepared.item->type != StoredType::Commit;
+    if (isTried && AppendDifference(compressor, prepared.baseForm.bytes, prepared.form,
+                                    prepared.form.size() / worthwhile, prepared.difference)) {
+        prepared.member.encoding = Encoding::Difference;
+        prepared.member.generation = prepared.generation;
+    } else {
+        prepared.base = Id();
+    }
+    prepared.baseForm = {};
+}
+
+void MakeStored(Prepared& prepared, Compressor& compressor) {
+    SegmentBuilder builder;
+    builder.Add(prepared.member,
+                prepared.member.encoding == Encoding::Difference ? ByteView(prepared.difference) : prepared.form);
+    prepared.stored = builder.Make(compressor);
+}
+
+} // namespace
+
+Preparation::Preparation(std::vector<Item> const& items, Connection& connection, unsigned workers,
+                         bool looksForPresent) {
+    Select(items);
+    bool const hasEarlier = std::any_of(prepared_.begin(), prepared_.end(), [this](Prepared const& one) {
+        return !one.item->earlier.IsEmpty() && EarlierPrepared(one) == nullptr;
+    });
+    if (looksForPresent || hasEarlier)
+        Ask(connection);
+    ForEachInParallel(prepared_.size(), workers, connection.compressor,
+                      [this](std::size_t index, Compressor&) { MakeForm(prepared_[index]); });
+    if (hasEarlier)
+        MakeDifferencesToRows(connection, workers);
+    for (Prepared& one : prepared_)
+        if (EarlierPrepared(one) != nullptr) {
+            FindBase(one, connection.compressor);
+            MakeDifference(one, connection.compressor);
+        }
+    ForEachInParallel(prepared_.size(), workers, connection.compressor,
+                      [this](std::size_t index, Compressor& own) { MakeStored(prepared_[index], own); });
+    numbers_.clear();
+    std::sort(prepared_.begin(), prepared_.end(), [](Prepared const& left, Prepared const& right) {
+        return DigestOf(left.item->id) < DigestOf(right.item->id);
+    });
+}
+
+void Preparation::Select(std::vector<Item> const& items) {
+    prepared_.reserve(items.size());
+    for (Item const& item : items)
+        if (numbers_.emplace(item.id, prepared_.size()).second)
+            prepared_.emplace_back().item = &item;
+}
+
+void Preparation::Ask(Connection& connection) {
+    std::vector<Id> ids;
+    std::vector<Id> earlier;
+    for (Prepared const& one : prepared_) {
+        ids.push_back(one.item->id);
+        if (!one.item->earlier.IsEmpty())
+            earlier.push_back(one.item->earlier);
+    }
+    RoundTrip trip(connection);
+    trip.Add(Statement::FindRows, Parameters().With(ids));
+    Forms::AddTo(trip, earlier, windowSize);
+    auto const answers = trip.Run();
+    forms_.Take(answers[1]);
+    Rows const& rows = answers[0];
+    std::unordered_set<Id> present;
+    for (int i = 0; i < rows.Count(); ++i) {
+        Id id = rows.Identifier(i, 0);
+        if (RowOf(rows.Number(i, 1)).isRemoved)
+            removed_.push_back(id);
+        present_.push_back(id);
+        present.insert(std::move(id));
+    }
+    std::erase_if(prepared_, [&present](Prepared const& one) { return present.count(one.item->id) != 0; });
+    numbers_.clear();
+    for (std::size_t i = 0; i < prepared_.size(); ++i)
+        numbers_.emplace(prepared_[i].item->id, i);
+    areNew_ = true;
+}
+
+Prepared const* Preparation::EarlierPrepared(Prepared const& one) const {
+    auto const found = numbers_.find(one.item->earlier);
+    if (found == numbers_.end() || &prepared_[found->second] >= &one)
+        return nullptr;
+    return &prepared_[found->second];
+}
+
+std::uint64_t Preparation::GenerationOf(Id const& id) {
+    auto const found = numbers_.find(id);
+    return found != numbers_.end() ? prepared_[found->second].member.generation : forms_.MemberOf(id).generation;
+}
+
+void Preparation::FindBase(Prepared& one, Compressor& compressor) {
+    // What is damaged, or was too much to be fetched, is no base.
+    try {
+        Id at = one.item->earlier;
+        std::uint64_t const generation = 1 + GenerationOf(at);
+        // Version v is a difference to version v & (v - 1), so that no version is more than log2(v) steps from one that
+        // is whole.
+        std::uint64_t const wanted = generation & (generation - 1);
+        for (std::uint64_t before = generation; GenerationOf(at) > wanted;) {
+            if (GenerationOf(at) >= before)
+                throw Malformed();
+            before = GenerationOf(at);
+            auto const prepared = numbers_.find(at);
+            at = prepared != numbers_.end() ? prepared_[prepared->second].base : forms_.Find(at)->base;
+        }
+        auto const prepared = numbers_.find(at);
+        Member const& member = prepared != numbers_.end() ? prepared_[prepared->second].member : forms_.MemberOf(at);
+        if (member.type != one.item->type || member.formSize > largestDifferenced)
+            return;
+        one.baseForm = prepared != numbers_.end() ? Form{std::make_shared<int>(), prepared_[prepared->second].form}
+                                                  : forms_.FormOf(at, compressor);
+        one.base = at;
+        one.generation = generation;
+    } catch (Malformed const&) {
+        one.baseForm = {};
+    }
+}
+
+void Preparation::MakeDifferences(std::span<const std::size_t> window, unsigned workers, Compressor& compressor) {
+    for (std::size_t const number : window)
+        FindBase(prepared_[number], compressor);
+    ForEachInParallel(window.size(), workers, compressor,
+                      [&](std::size_t index, Compressor& own) { MakeDifference(prepared_[window[index]], own); });
+}
+
+void Preparation::MakeDifferencesToRows(Connection& connection, unsigned workers) {
+    std::vector<std::size_t> window;
+    if (forms_.AreWhole()) {
+        for (std::size_t i = 0; i < prepared_.size(); ++i)
+            if (!prepared_[i].item->earlier.IsEmpty() && EarlierPrepared(prepared_[i]) == nullptr)
+                window.push_back(i);
+        MakeDifferences(window, workers, connection.compressor);
+        return;
+    }
+    Forms const sizes = std::move(forms_);
+    std::vector<Id> ids;
+    std::uint64_t size = 0;
+    auto const close = [&] {
+        forms_ = Forms();
+        forms_.Read(connection, ids, UINT64_MAX / 2);
+        MakeDifferences(window, workers, connection.compressor);
+        window.clear();
+        ids.clear();
+        size = 0;
+    };
+    for (std::size_t i = 0; i < prepared_.size(); ++i) {
+        Id const& earlier = prepared_[i].item->earlier;
+        if (earlier.IsEmpty() || EarlierPrepared(prepared_[i]) != nullptr || sizes.Find(earlier) == nullptr)
+            continue;
+        window.push_back(i);
+        ids.push_back(earlier);
+        size += sizes.StoredSizeOf(earlier);
+        if (size >= windowSize)
+            close();
+    }
+    if (!window.empty())
+        close();
+}
+
+std::vector<Id> Preparation::Bases() const {
+    std::unordered_set<Id> own;
+    for (Prepared const& one : prepared_)
+        own.insert(one.item->id);
+    std::unordered_set<Id> bases;
+    for (Prepared const& one : prepared_)
+        if (!one.base.IsEmpty() && own.count(one.base) == 0)
+            bases.insert(one.base);
+    return {bases.begin(), bases.end()};
+}
+
+} // namespace KivArchive::Postgres

@@ -1,0 +1,66 @@
+#pragma once
+
+/// @file
+/// Everything that is made of what is to be stored before the transaction that stores it.
+
+#include "postgres/Forms.h"
+#include "postgres/Store.h"
+
+namespace KivArchive::Postgres {
+
+/// An item on its way into a row.
+struct Prepared {
+    Item const* item = nullptr;
+    Member member;
+    /// The form: compact where that can be, otherwise the data itself, which the item keeps.
+    Bytes compact;
+    ByteView form;
+    /// What it is a difference to, while and if it is one.
+    Id base;
+    Form baseForm;
+    Bytes difference;
+    std::uint64_t generation = 0;
+    /// What the row holds.
+    Bytes stored;
+};
+
+class Preparation {
+public:
+    /// @param looksForPresent whether to ask the server which items it has; it is asked as well if there are earlier
+    /// versions
+    Preparation(std::vector<Item> const& items, Connection& connection, unsigned workers, bool looksForPresent);
+    Preparation(Preparation const&) = delete;
+    Preparation& operator=(Preparation const&) = delete;
+    ~Preparation() = default;
+
+    /// What is to be stored, in ascending order of the identifiers.
+    [[nodiscard]] std::vector<Prepared> const& Items() const noexcept { return prepared_; }
+    /// Whether the server was asked, so that it has none of `Items`.
+    [[nodiscard]] bool AreNew() const noexcept { return areNew_; }
+    /// The items that the server has, and those of them that are no objects there.
+    [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
+    [[nodiscard]] std::vector<Id> const& Removed() const noexcept { return removed_; }
+    /// The rows that items are differences to and that are not among them, each once.
+    [[nodiscard]] std::vector<Id> Bases() const;
+
+private:
+    void Select(std::vector<Item> const& items);
+    /// Asks which items the server has, and for the earlier versions.
+    void Ask(Connection& connection);
+    void MakeDifferencesToRows(Connection& connection, unsigned workers);
+    void MakeDifferences(std::span<const std::size_t> window, unsigned workers, Compressor& compressor);
+    /// The version before, if it is among those prepared and comes before @p one.
+    [[nodiscard]] Prepared const* EarlierPrepared(Prepared const& one) const;
+    void FindBase(Prepared& one, Compressor& compressor);
+    [[nodiscard]] std::uint64_t GenerationOf(Id const& id);
+
+    std::vector<Prepared> prepared_;
+    std::unordered_map<Id, std::size_t> numbers_;
+    std::vector<Id> present_;
+    std::vector<Id> removed_;
+    bool areNew_ = false;
+    /// The earlier versions looked at.
+    Forms forms_;
+};
+
+} // namespace KivArchive::Postgres
