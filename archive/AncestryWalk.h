@@ -14,25 +14,30 @@ template <class LookUp>
 [[nodiscard]] std::vector<Ancestry> WalkAncestry(std::span<const Id> commits, Follow follow, std::size_t more,
                                                  LookUp lookUp) {
     std::vector<Ancestry> found;
+    constexpr std::size_t mostReserved = 4096;
+    found.reserve(std::min(commits.size() + std::min(more, mostReserved), mostReserved));
     std::unordered_set<Id> met;
     auto const meet = [&](Id const& id) {
         if (id.IsEmpty() || !met.insert(id).second)
             return false;
-        auto const facts = lookUp(id);
+        auto facts = lookUp(id);
         if (facts)
-            found.push_back(*facts);
+            found.push_back(*std::move(facts));
         return static_cast<bool>(facts);
     };
     for (Id const& commit : commits)
         if (met.count(commit) == 0)
             meet(commit);
+    auto const follows = [follow](ContainedCommit const& contained) {
+        return follow == Follow::Everything || (follow == Follow::Reachable && contained.how == Containment::Merged);
+    };
     // What has been found is its own queue.
+    std::vector<Id> links;
     for (std::size_t next = 0; next < found.size() && more > 0; ++next) {
-        std::vector<Id> links{found[next].parent};
-        if (follow != Follow::Parents)
-            for (ContainedCommit const& contained : found[next].contains)
-                if (follow == Follow::Everything || contained.how == Containment::Merged)
-                    links.push_back(contained.id);
+        links.assign(1, found[next].parent);
+        for (ContainedCommit const& contained : found[next].contains)
+            if (follows(contained))
+                links.push_back(contained.id);
         for (auto link = links.begin(); link != links.end() && more > 0; ++link)
             if (meet(*link))
                 --more;

@@ -17,10 +17,10 @@ public:
     ObjectIndex(IArchive& archive, IProgress* progress) {
         for (Id after;;) {
             ReportProgress(progress, {"listing objects", digests_.size(), 0}, {});
-            auto const page = archive.ListObjects(after, pageSize);
+            auto const page = archive.ListObjects(after, listedAtOnce);
             for (ObjectInfo const& info : page)
                 digests_.push_back(DigestOf(info.id));
-            if (page.size() < pageSize)
+            if (page.size() < listedAtOnce)
                 return;
             after = page.back().id;
         }
@@ -37,6 +37,9 @@ public:
     }
 
 private:
+    /// Whatever is kept together is looked at once for each of these.
+    static constexpr std::size_t listedAtOnce = std::size_t{1} << 16U;
+
     std::vector<Id::Digest> digests_;
 };
 

@@ -143,7 +143,7 @@ std::optional<PackedCommit> ReadPackedCommit(std::span<const std::byte> data) {
     return commit;
 }
 
-bool PackedEntries::Next() noexcept {
+bool PackedEntries::Next() {
     std::string_view rest = rest_;
     if (rest.empty())
         return false;
@@ -157,7 +157,7 @@ bool PackedEntries::Next() noexcept {
     }
     std::string_view const name = rest.substr(0, end);
     bool const isFirst = entry_.digits.empty();
-    areSound_ = areSound_ && !name.empty() && name.find('/') == std::string_view::npos &&
+    areSound_ = areSound_ && !name.empty() && name.find('/') == std::string_view::npos && IsExactText(name) &&
                 (isFirst || CompareNames(entry_.name, name) < 0);
     entry_ = {isTree, name, rest.substr(end + 1, digitCount)};
     rest_ = rest.substr(end + 1 + digitCount);

@@ -61,10 +61,10 @@ public:
         : rest_(reinterpret_cast<const char*>(data.data()), data.size()) {}
 
     /// Goes to the next entry. @return false behind the last one, and at the first byte that is not as trees have it
-    bool Next() noexcept;
+    bool Next();
     [[nodiscard]] PackedEntry const& Get() const noexcept { return entry_; }
-    /// After `Next` has returned false: whether that was the end of the data, and the names were in the order of trees,
-    /// none twice, none empty and none with "/".
+    /// After `Next` has returned false: whether that was the end of the data, and the names were UTF-8, in the order
+    /// of trees, none twice, none empty and none with "/".
     [[nodiscard]] bool AreSound() const noexcept { return areSound_ && rest_.empty(); }
 
 private:

@@ -5,7 +5,6 @@
 #include <KivVcs/SHADigest256.h>
 
 #include <algorithm>
-#include <array>
 #include <cstring>
 
 namespace KivArchive {
@@ -96,12 +95,9 @@ Id DigestOfBytes(ByteView bytes) {
 
 Segment::Segment(std::uint64_t number, Bytes form) : number_(number), form_(std::move(form)) {
     ByteReader reader(form_);
-    ByteView const check = reader.Take(checkSize);
-    Id::Digest const digest = Sha256(reader.Rest());
-    if (!std::equal(check.begin(), check.end(), std::as_bytes(std::span(digest)).begin()) ||
-        reader.TakeByte() != static_cast<std::uint8_t>(formatOfSegments))
+    std::memcpy(&check_, reader.Take(checkSize).data(), checkSize);
+    if (reader.TakeByte() != static_cast<std::uint8_t>(formatOfSegments))
         throw Malformed();
-    std::memcpy(&check_, check.data(), checkSize);
     std::uint64_t const count = reader.TakeNumber();
     // Each takes a byte at least.
     if (count > reader.Rest().size())
@@ -123,6 +119,15 @@ Segment::Segment(std::uint64_t number, Bytes form) : number_(number), form_(std:
     bool const fits = isSharedCompressed_ ? CanDecompressTo(shared_, sharedSize_) : shared_.size() == sharedSize_;
     if (!fits)
         throw Malformed();
+}
+
+void Segment::Verify() const {
+    if (isVerified_)
+        return;
+    Id::Digest const digest = Sha256(ByteView(form_).subspan(checkSize));
+    if (std::memcmp(digest.data(), &check_, checkSize) != 0)
+        throw Malformed();
+    isVerified_ = true;
 }
 
 Member const& Segment::At(std::uint64_t member) const {
@@ -177,10 +182,8 @@ Bytes SegmentBuilder::Make(Compressor& compressor) const {
     return form;
 }
 
-Bytes ExpandForm(Member const& member, ByteView form) {
-    if (!member.isCompact)
-        return {form.begin(), form.end()};
-    return member.type == StoredType::Tree ? ExpandTree(form, member.size) : ExpandCommit(form, member.size);
+Bytes ExpandForm(StoredType type, ByteView form, std::uint64_t size) {
+    return type == StoredType::Tree ? ExpandTree(form, size) : ExpandCommit(form, size);
 }
 
 } // namespace KivArchive

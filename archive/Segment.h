@@ -6,6 +6,7 @@
 #include "Compression.h"
 #include "KivArchive/IArchive.h"
 
+#include <atomic>
 #include <memory>
 #include <optional>
 
@@ -57,11 +58,14 @@ struct Member {
 /// The form of one segment, parsed. Any number of threads may read it.
 class Segment {
 public:
-    /// @throws Malformed unless @p form is one that `SegmentBuilder` made
+    /// @throws Malformed unless @p form can be one that `SegmentBuilder` made
     Segment(std::uint64_t number, Bytes form);
     Segment(Segment const&) = delete;
     Segment& operator=(Segment const&) = delete;
     ~Segment() = default;
+
+    /// Hashes it, once. @throws Malformed unless it is what was stored
+    void Verify() const;
 
     [[nodiscard]] std::uint64_t Number() const noexcept { return number_; }
     /// A number that is another one for every form.
@@ -79,6 +83,7 @@ private:
     std::uint64_t number_;
     Bytes form_;
     std::uint64_t check_ = 0;
+    mutable std::atomic<bool> isVerified_{false};
     std::vector<Member> members_;
     std::uint64_t sharedSize_ = 0;
     bool isSharedCompressed_ = false;
@@ -105,7 +110,7 @@ private:
 /// The digest of stored bytes that are no object, such as a piece of a content.
 [[nodiscard]] Id DigestOfBytes(ByteView bytes);
 
-/// The data that a stored form stands for.
-[[nodiscard]] Bytes ExpandForm(Member const& member, ByteView form);
+/// The @p size bytes of data that the compact form of a tree or commit stands for.
+[[nodiscard]] Bytes ExpandForm(StoredType type, ByteView form, std::uint64_t size);
 
 } // namespace KivArchive

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <unordered_set>
+#include <utility>
 
 namespace KivArchive {
 
@@ -15,12 +16,12 @@ public:
         : archive_(archive), progress_(progress), all_(archive, progress) {}
 
     VerifyReport Run() {
-        for (std::size_t begin = 0; begin < all_.Size(); begin += pageSize) {
-            ReportProgress(progress_, {"verifying objects", begin, all_.Size()}, {});
-            std::vector<Id> page;
-            for (std::size_t i = begin; i < std::min(begin + pageSize, all_.Size()); ++i)
-                page.push_back(all_.At(i));
-            VerifyPage(page);
+        for (std::size_t begin = 0; begin < all_.Size(); begin += readAtOnce) {
+            std::vector<Id> batch;
+            batch.reserve(std::min(readAtOnce, all_.Size() - begin));
+            for (std::size_t i = begin; i < std::min(begin + readAtOnce, all_.Size()); ++i)
+                batch.push_back(all_.At(i));
+            VerifyBatch(batch);
         }
         VerifyBranches();
         ForgetWhatCameLater();
@@ -28,15 +29,21 @@ public:
     }
 
 private:
-    void VerifyPage(std::vector<Id> const& page) {
+    /// An archive gives objects in the order that is cheapest, which is all the cheaper the more it is asked for.
+    static constexpr std::size_t readAtOnce = std::size_t{1} << 18U;
+
+    void VerifyBatch(std::vector<Id> const& batch) {
         std::vector<Id> large;
         std::vector<Ancestry> told;
-        ReadOutcome const outcome = archive_.Read(page, [&](ArchivedObject const& object) {
-            ++report_.objects;
+        ReadOutcome const outcome = archive_.Read(batch, [&](ArchivedObject const& object) {
+            if (report_.objects++ % pageSize == 0)
+                ReportProgress(progress_, {"verifying objects", report_.objects, all_.Size()}, {});
             if (object.data.empty() && object.size > 0)
                 large.push_back(object.id);
             else
                 VerifyLinks(object, told);
+            if (told.size() == pageSize)
+                VerifyAncestry(std::exchange(told, {}));
         });
         report_.damaged.insert(report_.damaged.end(), outcome.damaged.begin(), outcome.damaged.end());
         for (Id const& id : large)

@@ -16,12 +16,6 @@ void MakeSparse(Database& database, std::uint64_t segment) {
     Query(database, "INSERT INTO sparse(segment) VALUES(?) ON CONFLICT DO NOTHING").With(segment).Run();
 }
 
-ObjectType TypeOf(StoredType type) noexcept {
-    return type == StoredType::Tree     ? ObjectType::Tree
-           : type == StoredType::Commit ? ObjectType::Commit
-                                        : ObjectType::Blob;
-}
-
 /// The identifiers of the members of a segment, which are what their forms hash to. Null for those that are removed, and
 /// for what cannot be read, which is kept; large contents are told apart by the table.
 std::vector<Id> IdentifyMembers(FormReader& reader, Segment const& segment) {
@@ -33,8 +27,9 @@ std::vector<Id> IdentifyMembers(FormReader& reader, Segment const& segment) {
         try {
             Form const form = reader.FormAt({segment.Number(), i});
             ids[i] = member.type == StoredType::Piece ? DigestOfBytes(form.bytes)
-                     : member.isCompact ? Identify(TypeOf(member.type), ByteView(ExpandForm(member, form.bytes)))
-                                        : Identify(TypeOf(member.type), form.bytes);
+                     : member.isCompact
+                         ? Identify(TypeOf(member.type), ByteView(ExpandForm(member.type, form.bytes, member.size)))
+                         : Identify(TypeOf(member.type), form.bytes);
         } catch (Malformed const&) {
             ids[i] = Id();
         }

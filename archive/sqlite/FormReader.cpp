@@ -44,7 +44,7 @@ void FormCache::Keep(Place const& place, std::shared_ptr<const Bytes> const& for
     }
 }
 
-std::shared_ptr<const Segment> FormReader::SegmentAt(std::uint64_t number) {
+std::shared_ptr<const Segment> FormReader::UnverifiedSegmentAt(std::uint64_t number) {
     auto const found = segments_.find(number);
     if (found != segments_.end())
         return found->second;
@@ -59,6 +59,12 @@ std::shared_ptr<const Segment> FormReader::SegmentAt(std::uint64_t number) {
     }
     segments_.emplace(number, segment);
     held_ += form.size();
+    return segment;
+}
+
+std::shared_ptr<const Segment> FormReader::SegmentAt(std::uint64_t number) {
+    auto segment = UnverifiedSegmentAt(number);
+    segment->Verify();
     return segment;
 }
 
@@ -78,6 +84,21 @@ Form FormReader::SharedForm(Segment const& segment, Member const& member) {
 }
 
 Form FormReader::FormAt(Place place) {
+    static_cast<void>(SegmentAt(place.segment));
+    return UnverifiedFormAt(place);
+}
+
+Form FormReader::UnverifiedFormAt(Place place) {
+    auto segment = UnverifiedSegmentAt(place.segment);
+    Member const& member = segment->At(place.member);
+    if (member.encoding == Encoding::Plain)
+        return {segment, member.own, segment->FormSize()};
+    // What others are made of must be what was stored.
+    segment->Verify();
+    return member.encoding == Encoding::Shared ? SharedForm(*segment, member) : DifferentForm(place);
+}
+
+Form FormReader::DifferentForm(Place place) {
     struct Step {
         std::shared_ptr<const Segment> segment;
         Member const& member;
@@ -113,15 +134,20 @@ Form FormReader::FormAt(Place place) {
     return form;
 }
 
+ObjectRow RowOf(Database const& database, Query const& query, int firstColumn) {
+    std::int64_t const type = query.Number(firstColumn);
+    if (type < 0 || type > static_cast<std::int64_t>(StoredType::LargeBlob))
+        database.Fail(SQLITE_CORRUPT);
+    return {static_cast<StoredType>(type),
+            {static_cast<std::uint64_t>(query.Number(firstColumn + 1)),
+             static_cast<std::uint64_t>(query.Number(firstColumn + 2))}};
+}
+
 std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
     Query query(database, "SELECT type, segment, member FROM objects WHERE id=?");
     if (!query.With(DigestOf(id)).Next())
         return std::nullopt;
-    std::int64_t const type = query.Number(0);
-    if (type < 0 || type > static_cast<std::int64_t>(StoredType::LargeBlob))
-        database.Fail(SQLITE_CORRUPT);
-    return ObjectRow{static_cast<StoredType>(type),
-                     {static_cast<std::uint64_t>(query.Number(1)), static_cast<std::uint64_t>(query.Number(2))}};
+    return RowOf(database, query, 0);
 }
 
 std::vector<Id> SqliteStore::PiecesOf(FormReader& reader, ObjectRow const& row) {

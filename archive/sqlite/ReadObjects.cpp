@@ -8,67 +8,52 @@ namespace KivArchive {
 namespace {
 
 /// How much is read in one transaction before it is handed over.
-constexpr std::uint64_t windowSize = 4 * largestWholeContent;
-
-struct Wanted {
-    Id id;
-    ObjectRow row;
-};
+constexpr std::uint64_t windowSize = largestWholeContent / 4;
 
 /// What was found for an identifier; no form if it cannot be read.
 struct Found {
-    Wanted const* wanted = nullptr;
-    Member member;
+    Id const* id = nullptr;
+    StoredType type = StoredType::Blob;
+    bool isCompact = false;
+    std::uint64_t size = 0;
     Form form;
 };
 
-ObjectType TypeOf(StoredType type) noexcept {
-    return type == StoredType::Tree     ? ObjectType::Tree
-           : type == StoredType::Commit ? ObjectType::Commit
-                                        : ObjectType::Blob;
+bool ByPlace(FoundRow const& left, FoundRow const& right) noexcept {
+    return left.row.place < right.row.place;
 }
 
 /// Those of @p ids that are objects here, in the order in which they are stored.
-std::vector<Wanted> Locate(Database& database, std::span<const Id> ids, std::vector<Id>* missing) {
-    std::vector<Wanted> wanted;
-    for (Id const& id : ids) {
-        auto const row = FindRow(database, id);
+std::vector<FoundRow> Locate(Database& database, std::span<const Id> ids, std::vector<Id>* missing) {
+    std::vector<FoundRow> found;
+    found.reserve(ids.size());
+    for (std::size_t i = 0; i < ids.size(); ++i) {
+        auto const row = FindRow(database, ids[i]);
         if (row && row->type != StoredType::Piece)
-            wanted.push_back({id, *row});
+            found.push_back({i, *row});
         else if (missing != nullptr)
-            missing->push_back(id);
+            missing->push_back(ids[i]);
     }
-    std::stable_sort(wanted.begin(), wanted.end(),
-                     [](Wanted const& left, Wanted const& right) { return left.row.place < right.row.place; });
-    return wanted;
+    std::stable_sort(found.begin(), found.end(), ByPlace);
+    return found;
 }
 
-/// Runs @p read. @return whether what it reads is sound
-template <class Read>
-bool IsSound(Read read) {
-    try {
-        read();
-        return true;
-    } catch (Malformed const&) {
-        return false;
-    } catch (ArchiveError const& error) {
-        // One damaged page hides what is on it, not the rest.
-        if (error.GetKind() != Failure::Damaged)
-            throw;
-        return false;
-    }
-}
-
-Found ReadOne(FormReader& reader, Wanted const& wanted) {
-    Found found{&wanted, {}, {}};
+Found ReadOne(FormReader& reader, Id const& id, ObjectRow const& row) {
+    Found found{&id, row.type, false, 0, {}};
     Form form;
+    bool isOfType = false;
     bool const isSound = IsSound([&] {
-        found.member = reader.SegmentAt(wanted.row.place.segment)->At(wanted.row.place.member);
-        form = wanted.row.type == StoredType::LargeBlob ? Form{std::make_shared<int>(), {}, 0}
-                                                        : reader.FormAt(wanted.row.place);
+        bool const isLarge = row.type == StoredType::LargeBlob;
+        auto const segment =
+            isLarge ? reader.SegmentAt(row.place.segment) : reader.UnverifiedSegmentAt(row.place.segment);
+        Member const& member = segment->At(row.place.member);
+        isOfType = member.type == row.type;
+        found.isCompact = member.isCompact;
+        found.size = member.size;
+        form = isLarge ? Form{std::make_shared<int>(), {}, 0} : reader.UnverifiedFormAt(row.place);
     });
-    if (isSound && found.member.type == wanted.row.type)
-        found.form = form;
+    if (isSound && isOfType)
+        found.form = std::move(form);
     return found;
 }
 
@@ -76,26 +61,31 @@ Found ReadOne(FormReader& reader, Wanted const& wanted) {
 bool HandOver(Found const& found, ObjectReceiver const& receiver) {
     if (found.form.owner == nullptr)
         return false;
-    Id const& id = found.wanted->id;
-    ObjectType const type = TypeOf(found.member.type);
-    if (found.member.type == StoredType::LargeBlob) {
-        receiver({id, type, found.member.size, {}});
+    ObjectType const type = TypeOf(found.type);
+    if (found.type == StoredType::LargeBlob) {
+        receiver({*found.id, type, found.size, {}});
         return true;
     }
     Bytes expanded;
     ByteView data = found.form.bytes;
-    if (found.member.isCompact) {
-        if (!IsSound([&] { expanded = ExpandForm(found.member, found.form.bytes); }))
+    if (found.isCompact) {
+        if (!IsSound([&] { expanded = ExpandForm(found.type, found.form.bytes, found.size); }))
             return false;
         data = expanded;
     }
-    if (!(Identify(type, data) == id))
+    if (!(Identify(type, data) == *found.id))
         return false;
-    receiver({id, type, data.size(), data});
+    receiver({*found.id, type, data.size(), data});
     return true;
 }
 
 } // namespace
+
+ObjectType TypeOf(StoredType type) noexcept {
+    return type == StoredType::Tree     ? ObjectType::Tree
+           : type == StoredType::Commit ? ObjectType::Commit
+                                        : ObjectType::Blob;
+}
 
 std::vector<Id> SqliteArchive::FindMissing(std::span<const Id> ids) {
     SqliteStore::Lease const connection(*store_);
@@ -106,43 +96,48 @@ std::vector<Id> SqliteArchive::FindMissing(std::span<const Id> ids) {
     return missing;
 }
 
-std::vector<ObjectInfo> DescribeRows(Connection& connection, FormCache& cache, std::span<const Id> ids, bool all) {
+std::vector<std::optional<std::uint64_t>> SizesOf(Connection& connection, FormCache& cache,
+                                                  std::vector<FoundRow> rows) {
+    std::vector<std::optional<std::uint64_t>> sizes(rows.size());
+    for (std::size_t i = 0; i < rows.size(); ++i)
+        rows[i].wanted = i;
+    std::sort(rows.begin(), rows.end(), ByPlace);
     FormReader reader(connection, cache);
-    std::vector<ObjectInfo> described;
-    described.reserve(ids.size());
-    for (Id const& id : ids) {
-        auto const row = FindRow(connection.database, id);
-        if (!row || row->type == StoredType::Piece)
-            continue;
-        std::uint64_t size = 0;
-        bool const isSound = IsSound([&] { size = reader.SegmentAt(row->place.segment)->At(row->place.member).size; });
-        if (isSound || all)
-            described.push_back({id, TypeOf(row->type), size});
-    }
-    return described;
+    for (auto const& [number, row] : rows)
+        static_cast<void>(IsSound([&, index = number, place = row.place] {
+            sizes[index] = reader.SegmentAt(place.segment)->At(place.member).size;
+        }));
+    return sizes;
 }
 
 std::vector<ObjectInfo> SqliteArchive::Describe(std::span<const Id> ids) {
     SqliteStore::Lease const connection(*store_);
     Transaction const transaction(connection->database, Transaction::Kind::Read);
-    return DescribeRows(*connection, store_->cache, ids, false);
+    auto const rows = Locate(connection->database, ids, nullptr);
+    auto const sizes = SizesOf(*connection, store_->cache, rows);
+    std::vector<ObjectInfo> described;
+    described.reserve(rows.size());
+    for (std::size_t i = 0; i < rows.size(); ++i)
+        if (sizes[i])
+            described.push_back({ids[rows[i].wanted], TypeOf(rows[i].row.type), *sizes[i]});
+    return described;
 }
 
 ReadOutcome SqliteArchive::Read(std::span<const Id> ids, ObjectReceiver const& receiver) {
     ReadOutcome outcome;
     SqliteStore::Lease const connection(*store_);
-    std::vector<Wanted> wanted;
+    std::vector<FoundRow> rows;
     bool isLocated = false;
-    for (std::size_t next = 0; !isLocated || next < wanted.size();) {
-        std::vector<Found> window;
+    std::vector<Found> window;
+    for (std::size_t next = 0; !isLocated || next < rows.size(); window.clear()) {
         {
             Transaction transaction(connection->database, Transaction::Kind::Read);
             if (!isLocated)
-                wanted = Locate(connection->database, ids, &outcome.missing);
+                rows = Locate(connection->database, ids, &outcome.missing);
             isLocated = true;
             FormReader reader(*connection, store_->cache);
-            for (std::uint64_t size = 0; next < wanted.size() && size < windowSize; ++next) {
-                window.push_back(ReadOne(reader, wanted[next]));
+            for (std::uint64_t size = 0; next < rows.size() && size < windowSize; ++next) {
+                window.push_back(ReadOne(reader, ids[rows[next].wanted], rows[next].row));
                 Form const& form = window.back().form;
                 bool const isHeldAlready = window.size() > 1 && window[window.size() - 2].form.owner == form.owner;
                 size += isHeldAlready ? 0 : form.held;
@@ -152,8 +147,8 @@ ReadOutcome SqliteArchive::Read(std::span<const Id> ids, ObjectReceiver const& r
         for (Found& found : window) {
             if (!HandOver(found, receiver)) {
                 // What has been collected since it was located is not damaged.
-                bool const isThere = FindRow(connection->database, found.wanted->id).has_value();
-                (isThere ? outcome.damaged : outcome.missing).push_back(found.wanted->id);
+                bool const isThere = FindRow(connection->database, *found.id).has_value();
+                (isThere ? outcome.damaged : outcome.missing).push_back(*found.id);
             }
             found.form = {};
         }

@@ -121,12 +121,20 @@ std::vector<Ancestry> SqliteArchive::ListAncestry(Id const& after, std::size_t l
 std::vector<ObjectInfo> SqliteArchive::ListObjects(Id const& after, std::size_t limit) {
     SqliteStore::Lease const connection(*store_);
     Transaction transaction(connection->database, Transaction::Kind::Read);
-    std::vector<Id> ids;
-    Query query(connection->database, "SELECT id FROM objects WHERE id>? AND type<>3 ORDER BY id LIMIT ?");
+    std::vector<ObjectInfo> listed;
+    std::vector<FoundRow> rows;
+    Query query(connection->database,
+                "SELECT id, type, segment, member FROM objects WHERE id>? AND type<>3 ORDER BY id LIMIT ?");
     query.With(after).With(LimitOf(limit));
-    while (query.Next())
-        ids.push_back(query.Identifier(0));
-    return DescribeRows(*connection, store_->cache, ids, true);
+    while (query.Next()) {
+        ObjectRow const row = RowOf(connection->database, query, 1);
+        rows.push_back({listed.size(), row});
+        listed.push_back({query.Identifier(0), TypeOf(row.type), 0});
+    }
+    auto const sizes = SizesOf(*connection, store_->cache, std::move(rows));
+    for (std::size_t i = 0; i < listed.size(); ++i)
+        listed[i].size = sizes[i].value_or(0);
+    return listed;
 }
 
 ArchiveStatistics SqliteArchive::GetStatistics() {

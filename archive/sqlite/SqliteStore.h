@@ -59,11 +59,16 @@ public:
 
     /// @throws Malformed if there is no such segment
     [[nodiscard]] std::shared_ptr<const Segment> SegmentAt(std::uint64_t number);
+    /// The same for those who compare what they get with its identifier: not verified.
+    [[nodiscard]] std::shared_ptr<const Segment> UnverifiedSegmentAt(std::uint64_t number);
     /// The stored form of a member, whatever it is a difference to. @throws Malformed
     [[nodiscard]] Form FormAt(Place place);
+    /// The same for those who compare what they get with its identifier.
+    [[nodiscard]] Form UnverifiedFormAt(Place place);
 
 private:
     [[nodiscard]] Form SharedForm(Segment const& segment, Member const& member);
+    [[nodiscard]] Form DifferentForm(Place place);
 
     Connection& connection_;
     FormCache& cache_;
@@ -76,6 +81,9 @@ struct ObjectRow {
     StoredType type = StoredType::Blob;
     Place place;
 };
+
+/// What three columns of a row say: type, segment and member.
+[[nodiscard]] ObjectRow RowOf(Database const& database, Query const& query, int firstColumn);
 
 /// The row of @p id; none if it is not there.
 [[nodiscard]] std::optional<ObjectRow> FindRow(Database& database, Id const& id);
@@ -131,10 +139,33 @@ public:
     std::vector<std::unique_ptr<Connection>> connections;
 };
 
-/// Types and sizes of those of @p ids that are objects and readable, in this order; of all that are objects, those that
-/// are not with size 0, if @p all is set.
-[[nodiscard]] std::vector<ObjectInfo> DescribeRows(Connection& connection, FormCache& cache, std::span<const Id> ids,
-                                                   bool all);
+/// A row that was found for an identifier, which is that of number @p wanted among those asked for.
+struct FoundRow {
+    std::size_t wanted = 0;
+    ObjectRow row;
+};
+
+/// The sizes of what is at @p rows; none for those that cannot be read. Segments are read once, in their order.
+[[nodiscard]] std::vector<std::optional<std::uint64_t>> SizesOf(Connection& connection, FormCache& cache,
+                                                                std::vector<FoundRow> rows);
+
+/// Runs @p read, which reads what is stored. @return false if that is not sound
+template <class Read>
+[[nodiscard]] bool IsSound(Read read) {
+    try {
+        read();
+        return true;
+    } catch (Malformed const&) {
+        return false;
+    } catch (ArchiveError const& error) {
+        // One damaged page hides what is on it, not the rest.
+        if (error.GetKind() != Failure::Damaged)
+            throw;
+        return false;
+    }
+}
+
+[[nodiscard]] ObjectType TypeOf(StoredType type) noexcept;
 
 /// The time of marks: seconds since 1970.
 [[nodiscard]] std::int64_t SecondsNow();

@@ -32,10 +32,11 @@ Buffer BufferOf(std::string_view bytes) {
 
 std::string DigitsOf(Id const& id) {
     static constexpr std::string_view digits = "0123456789abcdef";
-    std::string text;
+    std::string text(2 * std::tuple_size_v<Id::Digest>, ' ');
+    char* to = text.data();
     for (std::uint8_t const byte : *id.GetDigest()) {
-        text += digits[byte >> 4U];
-        text += digits[byte & 15U];
+        *to++ = digits[byte >> 4U];
+        *to++ = digits[byte & 15U];
     }
     return text;
 }

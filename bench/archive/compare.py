@@ -227,7 +227,7 @@ def history(directory):
     runs = compare_times(f"log of {count} versions", lambda: git(repository, "log", "--format=%H %s", "master"),
                          lambda: archive("log", store, count), 1.0)
     compare_times("diff of two of them", lambda: git(repository, "diff", "--name-status", f"master~{count - 1}", "master"),
-                  lambda: archive("diff", store), 1.0)
+                  lambda: archive("diff", store, count - 1), 1.0)
     bound = 20 + 600 * count / 1048576
     row("    memory of the log", f"< {bound:.1f} MiB", f"{runs[0].memory:.1f} MiB", runs[0].memory / bound, 1.0)
 

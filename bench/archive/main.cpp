@@ -3,7 +3,7 @@
 //   versions ARCHIVE              publishes versions given on standard input: "F PATH SIZE\nBYTES\n", then "C\n" for each
 //   restore ARCHIVE DIRECTORY     writes the newest version to a new directory
 //   log ARCHIVE COUNT             prints the newest commits
-//   diff ARCHIVE                  prints what differs between the newest version and the oldest one
+//   diff ARCHIVE COUNT            prints what differs between the newest version and the one so many before it
 //   commits ARCHIVE COUNT         makes commits of one empty tree
 //   directory ARCHIVE COUNT EDITS edits one entry of a directory again and again, and prints times and growth
 //   edits ARCHIVE COUNT           publishes one change again and again, and prints the times
@@ -144,60 +144,33 @@ void Restore(IArchive& archive, std::string const& target) {
     other.join();
 }
 
-void Log(IArchive& archive, std::size_t count) {
+void Log(IArchive& archive, std::uint64_t count) {
     Id const head = HeadOf(archive);
-    auto const history = archive.ReadAncestry({&head, 1}, Follow::Parents, count - 1);
-    std::vector<Id> ids;
-    for (Ancestry const& facts : history)
-        ids.push_back(facts.commit);
-    auto const texts = ReadAll(archive, ids);
+    CommitListOptions options;
+    options.atMost = count;
     std::string out;
-    for (Id const& id : ids) {
-        std::string const& text = texts.at(id);
-        std::size_t const description = text.find("\n\n") + 2;
-        out += DigitsOf(id) + " " + text.substr(description, text.find('\n', description) - description) + "\n";
-    }
+    ListCommits(
+        archive, {&head, 1}, options,
+        [&](CommitRecord const& commit) {
+            std::string const description = KivVcs::ToUtf8(commit.description);
+            out.append(DigitsOf(commit.id)).append(" ").append(description, 0, description.find('\n')).append("\n");
+            return true;
+        },
+        nullptr);
     std::fwrite(out.data(), 1, out.size(), stdout);
 }
 
-void Diff(IArchive& archive) {
+void Diff(IArchive& archive, std::size_t back) {
     Id const head = HeadOf(archive);
-    auto const history = archive.ReadAncestry({&head, 1}, Follow::Parents, 1U << 20U);
-    struct Pair {
-        std::string path;
-        Id left;
-        Id right;
-    };
-    std::vector<Pair> level{{"", history.back().tree, history.front().tree}};
-    while (!level.empty()) {
-        std::vector<Id> ids;
-        for (Pair const& pair : level)
-            for (Id const& id : {pair.left, pair.right})
-                if (!id.IsEmpty())
-                    ids.push_back(id);
-        auto const trees = ReadAll(archive, ids);
-        std::vector<Pair> next;
-        for (Pair const& pair : level) {
-            std::map<std::string, std::pair<TreeEntry, TreeEntry>> entries;
-            if (!pair.left.IsEmpty())
-                for (TreeEntry& entry : EntriesOf(trees.at(pair.left)))
-                    entries[entry.name].first = entry;
-            if (!pair.right.IsEmpty())
-                for (TreeEntry& entry : EntriesOf(trees.at(pair.right)))
-                    entries[entry.name].second = entry;
-            for (auto const& [name, both] : entries) {
-                if (both.first.id == both.second.id)
-                    continue;
-                std::string const path = pair.path.empty() ? name : pair.path + "/" + name;
-                if (both.first.isTree || both.second.isTree)
-                    next.push_back(
-                        {path, both.first.isTree ? both.first.id : Id(), both.second.isTree ? both.second.id : Id()});
-                else
-                    std::printf("M\t%s\n", path.c_str());
-            }
-        }
-        level = std::move(next);
+    auto const history = archive.ReadAncestry({&head, 1}, Follow::Parents, back);
+    static constexpr std::string_view letters = "UADMTTR";
+    std::string out;
+    for (auto const& difference :
+         ListDifferences(archive, history.back().tree, history.front().tree, {}, nullptr).differences) {
+        out += letters[static_cast<std::size_t>(difference.kind)];
+        out.append("\t").append(KivVcs::ToUtf8(difference.path)).append("\n");
     }
+    std::fwrite(out.data(), 1, out.size(), stdout);
 }
 
 void Commits(IArchive& archive, int count) {
@@ -402,9 +375,9 @@ int Run(std::vector<std::string> const& arguments) {
     } else if (command == "restore") {
         Restore(archive, argument(0));
     } else if (command == "log") {
-        Log(archive, static_cast<std::size_t>(number(0)));
+        Log(archive, static_cast<std::uint64_t>(number(0)));
     } else if (command == "diff") {
-        Diff(archive);
+        Diff(archive, static_cast<std::size_t>(number(0)));
     } else if (command == "commits") {
         Commits(archive, number(0));
     } else if (command == "directory") {

@@ -7,6 +7,7 @@
 #include "KivArchive/ArchivedBlob.h"
 #include "KivArchive/ArchivedRepository.h"
 #include "KivArchive/IArchive.h"
+#include "KivArchive/Listings.h"
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/Progress.h"
 #include "KivArchive/SqliteArchive.h"

@@ -51,8 +51,8 @@ struct VerifyReport {
 /// Reads every object, compares it with its identifier, and looks for all that it names. Goes on whatever it finds. What
 /// others store meanwhile is seen or not.
 ///
-/// Takes 32 bytes an object, beside a window of data. Reads every object once, 4,096 at a time in the order of the
-/// identifiers; what an archive keeps together it decompresses once for each of these batches.
+/// Takes 32 bytes an object, and 120 bytes each for up to 262,144 of them, which are asked for at once: what an archive
+/// keeps together it decompresses once for each of these batches.
 /// @param progress may be null
 /// @throws ArchiveError for what concerns the archive as a whole
 [[nodiscard]] KIVARCHIVE_EXPORT VerifyReport Verify(IArchive& archive, IProgress* progress);

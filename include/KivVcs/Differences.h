@@ -43,6 +43,12 @@ struct DifferenceOptions {
     std::size_t atMost = std::numeric_limits<std::size_t>::max();
 };
 
+/// Makes every file that was removed and one of equal content that was added one renamed file, as
+/// `DifferenceOptions::findRenames` asks for; for lists that were made elsewhere.
+/// @param differences ordered by path
+/// @throws std::bad_alloc, leaving them in some order of their own
+KIVVCS_EXPORT void PairRenames(std::vector<Difference>& differences);
+
 /// The files that differ between two trees, ordered by path, each path once:
 ///
 ///     for (auto const& difference : Differences(before->GetCommitTree(), after->GetCommitTree()))

@@ -100,7 +100,7 @@ KivStringViewT<char16_t> NameOf(KivStringT<char16_t> const& path) noexcept {
 /// Makes every file that went and one of equal content that came one renamed file, where @p keyOf, which begins with the
 /// identifier, has both the same; of several such the first ones.
 template <class KeyOf>
-void PairRenames(std::vector<Difference>& differences, KeyOf keyOf) {
+void PairByKey(std::vector<Difference>& differences, KeyOf keyOf) {
     std::vector<Difference*> gone;
     std::vector<Difference*> come;
     for (auto& difference : differences) {
@@ -130,21 +130,21 @@ void PairRenames(std::vector<Difference>& differences, KeyOf keyOf) {
     std::erase_if(differences, [](Difference const& each) { return each.kind == ChangeKind::Unchanged; });
 }
 
-void FindRenames(std::vector<Difference>& differences) {
-    const auto contentOf = [](Difference const& each) -> Id const& {
-        return each.kind == ChangeKind::Removed ? each.oldId : each.newId;
-    };
-    PairRenames(differences, [&](Difference const& each) {
-        return std::tuple<Id const&, KivStringViewT<char16_t>>(contentOf(each), NameOf(each.path));
-    });
-    PairRenames(differences, [&](Difference const& each) { return std::tuple<Id const&>(contentOf(each)); });
-}
-
 cow_ptr<Tree> RootOf(cow_ptr<CommitTree> const& tree) {
     return tree ? tree->GetRoot() : nullptr;
 }
 
 } // namespace
+
+void PairRenames(std::vector<Difference>& differences) {
+    const auto contentOf = [](Difference const& each) -> Id const& {
+        return each.kind == ChangeKind::Removed ? each.oldId : each.newId;
+    };
+    PairByKey(differences, [&](Difference const& each) {
+        return std::tuple<Id const&, KivStringViewT<char16_t>>(contentOf(each), NameOf(each.path));
+    });
+    PairByKey(differences, [&](Difference const& each) { return std::tuple<Id const&>(contentOf(each)); });
+}
 
 Differences::Differences(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after, DifferenceOptions const& options) {
     DifferenceWalk walk(options.atMost);
@@ -154,7 +154,7 @@ Differences::Differences(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after
     std::sort(differences_.begin(), differences_.end(),
               [](Difference const& left, Difference const& right) { return left.path < right.path; });
     if (options.findRenames)
-        FindRenames(differences_);
+        PairRenames(differences_);
 }
 
 Differences::Differences(cow_ptr<CommitTree> const& before, cow_ptr<CommitTree> const& after,

@@ -1,0 +1,35 @@
+#pragma once
+
+/// @file
+/// The data of trees, read in batches for the listings.
+
+#include "KivArchive/Listings.h"
+#include "PackedForms.h"
+
+#include <string>
+#include <unordered_map>
+
+namespace KivArchive {
+
+/// How many objects the listings ask for at once.
+inline constexpr std::size_t listedAtOnce = 500;
+
+/// The data of trees by identifier; the null one has none.
+class TreeData {
+public:
+    /// Reads those of @p ids that are not null, of which there may be several equal ones.
+    /// @throws ArchiveError of kind `Collected` or `Damaged` if one of them is not there, or no sound tree
+    TreeData(IArchive& archive, std::vector<Id> ids);
+
+    [[nodiscard]] std::span<const std::byte> At(Id const& id) const {
+        return id.IsEmpty() ? std::span<const std::byte>() : std::as_bytes(std::span(data_.at(id)));
+    }
+
+private:
+    std::unordered_map<Id, std::string> data_;
+};
+
+/// Throws that a tree is none that is ours to show. @throws ArchiveError of kind `Unrepresentable`
+[[noreturn]] void ThrowUnrepresentableTree(Id const& id);
+
+} // namespace KivArchive
