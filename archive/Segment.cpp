@@ -93,7 +93,7 @@ Id DigestOfBytes(ByteView bytes) {
     return Id::FromDigest(Sha256(bytes));
 }
 
-Segment::Segment(std::uint64_t number, Bytes form) : number_(number), form_(std::move(form)) {
+Segment::Segment(std::uint64_t number, Bytes form, Verified verified) : number_(number), form_(std::move(form)) {
     ByteReader reader(form_);
     std::memcpy(&check_, reader.Take(checkSize).data(), checkSize);
     if (reader.TakeByte() != static_cast<std::uint8_t>(formatOfSegments))
@@ -119,6 +119,8 @@ Segment::Segment(std::uint64_t number, Bytes form) : number_(number), form_(std:
     bool const fits = isSharedCompressed_ ? CanDecompressTo(shared_, sharedSize_) : shared_.size() == sharedSize_;
     if (!fits)
         throw Malformed();
+    if (verified == Verified::Now)
+        Verify();
 }
 
 void Segment::Verify() const {
@@ -180,6 +182,10 @@ Bytes SegmentBuilder::Make(Compressor& compressor) const {
     Id::Digest const digest = Sha256(ByteView(form).subspan(checkSize));
     std::copy_n(std::as_bytes(std::span(digest)).begin(), checkSize, form.begin());
     return form;
+}
+
+Bytes ExpandForm(Member const& member, ByteView form) {
+    return member.isCompact ? ExpandForm(member.type, form, member.size) : Bytes(form.begin(), form.end());
 }
 
 Bytes ExpandForm(StoredType type, ByteView form, std::uint64_t size) {

@@ -58,8 +58,11 @@ struct Member {
 /// The form of one segment, parsed. Any number of threads may read it.
 class Segment {
 public:
-    /// @throws Malformed unless @p form can be one that `SegmentBuilder` made
-    Segment(std::uint64_t number, Bytes form);
+    enum class Verified : std::uint8_t { Now, Later };
+
+    /// @param verified `Later` leaves it to `Verify` to find out that @p form is another one than was stored
+    /// @throws Malformed unless @p form is one that `SegmentBuilder` made
+    Segment(std::uint64_t number, Bytes form, Verified verified = Verified::Now);
     Segment(Segment const&) = delete;
     Segment& operator=(Segment const&) = delete;
     ~Segment() = default;
@@ -110,6 +113,8 @@ private:
 /// The digest of stored bytes that are no object, such as a piece of a content.
 [[nodiscard]] Id DigestOfBytes(ByteView bytes);
 
+/// The data that a stored form stands for.
+[[nodiscard]] Bytes ExpandForm(Member const& member, ByteView form);
 /// The @p size bytes of data that the compact form of a tree or commit stands for.
 [[nodiscard]] Bytes ExpandForm(StoredType type, ByteView form, std::uint64_t size);
 

@@ -44,35 +44,39 @@ void FormCache::Keep(Place const& place, std::shared_ptr<const Bytes> const& for
     }
 }
 
-std::shared_ptr<const Segment> FormReader::UnverifiedSegmentAt(std::uint64_t number) {
-    auto const found = segments_.find(number);
-    if (found != segments_.end())
-        return found->second;
-    Query query(connection_.database, "SELECT form FROM segments WHERE number=?");
+Bytes FormReader::Load(std::uint64_t number) {
+    Query query(database_, "SELECT form FROM segments WHERE number=?");
     if (!query.With(number).Next())
         throw Malformed();
     ByteView const form = query.Blob(0);
-    auto segment = std::make_shared<const Segment>(number, Bytes(form.begin(), form.end()));
-    if (held_ + form.size() > mostHeldSegments) {
+    return {form.begin(), form.end()};
+}
+
+std::shared_ptr<const Segment> SegmentReader::UnverifiedSegmentAt(std::uint64_t number) {
+    auto const found = segments_.find(number);
+    if (found != segments_.end())
+        return found->second;
+    auto segment = std::make_shared<const Segment>(number, Load(number), Segment::Verified::Later);
+    if (held_ + segment->FormSize() > mostHeldSegments) {
         segments_.clear();
         held_ = 0;
     }
     segments_.emplace(number, segment);
-    held_ += form.size();
+    held_ += segment->FormSize();
     return segment;
 }
 
-std::shared_ptr<const Segment> FormReader::SegmentAt(std::uint64_t number) {
+std::shared_ptr<const Segment> SegmentReader::SegmentAt(std::uint64_t number) {
     auto segment = UnverifiedSegmentAt(number);
     segment->Verify();
     return segment;
 }
 
-Form FormReader::SharedForm(Segment const& segment, Member const& member) {
+Form SegmentReader::SharedForm(Segment const& segment, Member const& member) {
     Place const place{segment.Number(), sharedFlag | segment.Check()};
     std::shared_ptr<const Bytes> shared = cache_.Find(place);
     if (shared == nullptr) {
-        shared = std::make_shared<const Bytes>(segment.DecompressShared(connection_.compressor));
+        shared = std::make_shared<const Bytes>(segment.DecompressShared(compressor_));
         cache_.Keep(place, shared);
     }
     if (member.sharedOffset > shared->size() || member.formSize > shared->size() - member.sharedOffset)
@@ -83,12 +87,12 @@ Form FormReader::SharedForm(Segment const& segment, Member const& member) {
             shared->size()};
 }
 
-Form FormReader::FormAt(Place place) {
+Form SegmentReader::FormAt(Place place) {
     static_cast<void>(SegmentAt(place.segment));
     return UnverifiedFormAt(place);
 }
 
-Form FormReader::UnverifiedFormAt(Place place) {
+Form SegmentReader::UnverifiedFormAt(Place place) {
     auto segment = UnverifiedSegmentAt(place.segment);
     Member const& member = segment->At(place.member);
     if (member.encoding == Encoding::Plain)
@@ -98,7 +102,7 @@ Form FormReader::UnverifiedFormAt(Place place) {
     return member.encoding == Encoding::Shared ? SharedForm(*segment, member) : DifferentForm(place);
 }
 
-Form FormReader::DifferentForm(Place place) {
+Form SegmentReader::DifferentForm(Place place) {
     struct Step {
         std::shared_ptr<const Segment> segment;
         Member const& member;
@@ -126,8 +130,8 @@ Form FormReader::DifferentForm(Place place) {
     }
     for (; !steps.empty(); steps.pop_back()) {
         Step const& step = steps.back();
-        auto const made = std::make_shared<const Bytes>(ApplyDifference(
-            connection_.compressor, form.bytes, step.member.own, static_cast<std::size_t>(step.member.formSize)));
+        auto const made = std::make_shared<const Bytes>(
+            ApplyDifference(compressor_, form.bytes, step.member.own, static_cast<std::size_t>(step.member.formSize)));
         cache_.Keep(step.place, made);
         form = {made, *made, made->size()};
     }
@@ -150,7 +154,7 @@ std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
     return RowOf(database, query, 0);
 }
 
-std::vector<Id> SqliteStore::PiecesOf(FormReader& reader, ObjectRow const& row) {
+std::vector<Id> SqliteStore::PiecesOf(SegmentReader& reader, ObjectRow const& row) {
     return ReadDigests(reader.FormAt(row.place).bytes);
 }
 

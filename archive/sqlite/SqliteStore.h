@@ -52,10 +52,12 @@ struct Connection {
     Compressor compressor;
 };
 
-/// Reads stored forms within one transaction.
-class FormReader {
+/// Reads stored forms out of segments, wherever these come from.
+class SegmentReader {
 public:
-    FormReader(Connection& connection, FormCache& cache) : connection_(connection), cache_(cache) {}
+    SegmentReader(SegmentReader const&) = delete;
+    SegmentReader& operator=(SegmentReader const&) = delete;
+    virtual ~SegmentReader() = default;
 
     /// @throws Malformed if there is no such segment
     [[nodiscard]] std::shared_ptr<const Segment> SegmentAt(std::uint64_t number);
@@ -66,14 +68,32 @@ public:
     /// The same for those who compare what they get with its identifier.
     [[nodiscard]] Form UnverifiedFormAt(Place place);
 
+protected:
+    SegmentReader(Compressor& compressor, FormCache& cache) : compressor_(compressor), cache_(cache) {}
+
+    /// The form of a segment. @throws Malformed if there is no such segment
+    [[nodiscard]] virtual Bytes Load(std::uint64_t number) = 0;
+
 private:
     [[nodiscard]] Form SharedForm(Segment const& segment, Member const& member);
     [[nodiscard]] Form DifferentForm(Place place);
 
-    Connection& connection_;
+    Compressor& compressor_;
     FormCache& cache_;
     std::map<std::uint64_t, std::shared_ptr<const Segment>> segments_;
     std::uint64_t held_ = 0;
+};
+
+/// Reads the segments of a database within one transaction.
+class FormReader final : public SegmentReader {
+public:
+    FormReader(Connection& connection, FormCache& cache)
+        : SegmentReader(connection.compressor, cache), database_(connection.database) {}
+
+private:
+    Bytes Load(std::uint64_t number) override;
+
+    Database& database_;
 };
 
 /// What the table of objects stores.
@@ -126,7 +146,7 @@ public:
     [[nodiscard]] ChangeOutcome Store(std::vector<Item> const& items, Change const& change);
 
     /// The digests of the pieces of a large content.
-    [[nodiscard]] static std::vector<Id> PiecesOf(FormReader& reader, ObjectRow const& row);
+    [[nodiscard]] static std::vector<Id> PiecesOf(SegmentReader& reader, ObjectRow const& row);
 
     [[noreturn]] void ThrowDamaged(std::string const& what) const;
 
