@@ -2,7 +2,7 @@
 # usage: scripts/lint.sh [--quick]
 # Checks formatting with clang-format, scripts with shellcheck, that every include points to where it may, that every public
 # header compiles alone, and code with clang-tidy, which takes minutes and --quick leaves out. When all is well it only says
-# how much of the code is tests.
+# how much of the code is tests, at most a third.
 
 . "$(dirname "$0")/lib.sh"
 [[ $# -le 1 && ${1:---quick} == --quick ]] || usage 1

@@ -1,3 +1,4 @@
+#include "KivVcs/History.h"
 #include "KivVcs/Repository.h"
 
 namespace KivVcs {
@@ -13,11 +14,12 @@ struct KeptHeads {
     std::vector<std::vector<KivStringT<char16_t>>> branches;
 };
 
-/// Takes the history out of the storage. Of the old commits other than heads, one at a time is held, so that they die as
-/// soon as nobody else holds them.
+/// Takes the history out of the storage. Of the old commits other than heads, one at a time is held, that of the position,
+/// so that they die as soon as nobody else holds them.
 KeptHeads DeleteChain(IObjectsStorage& storage, cow_ptr<Commit> newest) {
     KeptHeads kept;
-    for (auto commit = std::move(newest); commit; commit = commit->GetParent()) {
+    for (auto position = History(std::move(newest)).begin(); position != History::Iterator(); ++position) {
+        cow_ptr<Commit> const& commit = *position;
         if (auto branches = storage.GetCommitBranches(commit); !branches.empty()) {
             kept.former.push_back(commit);
             kept.commits.push_back(commit);

@@ -6,8 +6,6 @@
 
 #include <typeinfo>
 
-#include <typeinfo>
-
 namespace KivVcs {
 
 using detail::Held;

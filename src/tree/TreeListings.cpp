@@ -119,7 +119,7 @@ std::uint64_t Tree::GetDeepBlobCount() const {
     // Every tree is counted once, when those below it have been, and its number added wherever it is named.
     std::unordered_map<Tree const*, std::uint64_t> counts;
     std::vector<Tree const*> open{this};
-    for (; !open.empty();) {
+    while (!open.empty()) {
         Tree const& tree = *open.back();
         const std::size_t waiting = open.size();
         std::uint64_t count = tree.GetLocalBlobCount();

@@ -79,17 +79,6 @@ private:
     Tree tree_;
 };
 
-/// Some order of identifiers. Those that packed forms name are the host's, and their hashes may all be equal.
-struct InOrder {
-    bool operator()(Id const& left, Id const& right) const {
-        Id::Digest const* const mine = left.GetDigest();
-        Id::Digest const* const theirs = right.GetDigest();
-        if (mine == nullptr || theirs == nullptr)
-            return mine == theirs ? left.GetText() < right.GetText() : theirs == nullptr;
-        return *mine < *theirs;
-    }
-};
-
 /// Reads a tree and everything below it, one entry at a time, with a frame of its own for each tree that is being read:
 /// nesting takes no stack.
 class TreeReader {
@@ -250,10 +239,11 @@ private:
     std::uint64_t waitingHashes_ = 0;
     cow_ptr<Tree> outermost_;
     /// What was read, since a repository need not store it nor under the identifier that was asked for: every form is read
-    /// once however often it is named. Trees that are being read count as not loadable, which ends cycles.
-    std::map<Id, cow_ptr<Tree>, InOrder> trees_;
+    /// once however often it is named. Trees that are being read count as not loadable, which ends cycles. Ordered, since the
+    /// identifiers are the host's, and their hashes may all be equal.
+    std::map<Id, cow_ptr<Tree>> trees_;
     /// The same for blobs, as far as no repository will hold them under that identifier.
-    std::map<Id, cow_ptr<Blob>, InOrder> misnamedBlobs_;
+    std::map<Id, cow_ptr<Blob>> misnamedBlobs_;
 };
 
 } // namespace
