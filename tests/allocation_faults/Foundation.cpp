@@ -57,6 +57,9 @@ const Operation operations[] = {
     {"JoinTexts", JoinTexts},
     {"AppendToAText", [](World& w) { w.text += u"appended once"; }},
     {"CopyBuffers", CopyBuffers},
+    {"CodeTextsAsUtf8", [](World& w) { w.text = FromUtf8(ToUtf8(u"J\u00f8rn, too long for a short string")); }},
+    {"CopyTextOfABlob", [](World& w) { w.blob = Blob::CopyText(w.blob.CopyToString() + ", too long for a short string"); }},
+    {"CopyTheRestOfAStream", [](World& w) { auto rest = w.blob.OpenStream(); w.blob = *Blob::CopyRest(rest); }},
 };
 // clang-format on
 

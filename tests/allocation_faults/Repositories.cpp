@@ -54,6 +54,10 @@ const Operation operations[] = {
     {"RootAtABranch", [](World& w) { w.done = w.repository.EnsureCommonRootFor(u"topic", u"island", u"side"); }},
     {"RootAtANewBranch", [](World& w) { w.done = w.repository.EnsureCommonRootFor(u"topic", u"island", u"root"); }, true},
     {"Purge", Purge},
+    {"MergeWithOutcome", [](World& w) { w.done = MergeWithOutcome(w.repository, w.commits["v"], AskTimesThenRight()).Succeeded(); }},
+    {"ShortenAnId", [](World& w) { w.narrow = ShortIds(*w.repository.GetStorage()).ShortFormOf(w.commits["v"]->GetId(), 20).c_str(); }},
+    {"WalkAHistory", [](World& w) { for (auto const& each : History(w.commits["v"]).Changing(u"d/e/y").First(2)) w.commit = each; }},
+    {"FindWhatACommitChanged", [](World& w) { w.done = DifferencesFromParent(*w.commits["t"]).GetCount() == 3; }},
     {"Clone", [](World& w) { w.done = w.repository.GetStorage()->Clone()->GetRefs().size() == 5; }},
 };
 // clang-format on

@@ -75,6 +75,10 @@ const Operation operations[] = {
     {"AssignATree", AssignATree},
     {"ReadATree", ReadATree},
     {"MergeTrees", MergeTrees},
+    {"FindRenames", [](World& w) { w.done = Differences(RootOf(w, "v"), RootOf(w, "i"), {.findRenames = true}).GetCount() > 5; }},
+    {"FindConflicts", [](World& w) { w.done = FindConflicts({RootOf(w, "v"), RootOf(w, "a"), RootOf(w, "c")}).size() == 2; }},
+    {"FindCaseCollisions", [](World& w) { w.done = FindCaseCollisions(immu::make<Tree>(w.edited)).empty(); }},
+    {"FindPathProblem", [](World& w) { w.text = PortablePathProblem(u"d/what no disk may hold?")->component; }},
 };
 // clang-format on
 
