@@ -9,10 +9,6 @@ namespace {
 
 constexpr std::int64_t ticksPerMinute = 600'000'000;
 
-std::string IdText(Object const& object) {
-    return Narrow(object.GetId().GetText());
-}
-
 class Commits : public testing::Test {
 protected:
     RecordingRepository repo{std::make_unique<MemObjectsStorage>()};

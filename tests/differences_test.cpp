@@ -21,11 +21,6 @@ std::string Told(Differences const& differences) {
     return Joined(words);
 }
 
-/// What a lookup finds at a path, and nothing for what has no identifier.
-optional<Id> IdAt(cow_ptr<Tree> const& tree, KivStringT<char16_t> const& path) {
-    return tree->GetIdByPath(path);
-}
-
 class Differing : public testing::Test {
 protected:
     Differences Between(std::string const& before, std::string const& after, DifferenceOptions const& options = {}) {
@@ -70,8 +65,8 @@ TEST_F(Differing, AgreesWithListingsAndLookupsOverRandomTrees) {
         PathList paths;
         for (auto const& each : differences) {
             paths.push_back(each.path);
-            EXPECT_EQ(each.oldId, IdAt(before, each.path).value_or(Id()));
-            EXPECT_EQ(each.newId, IdAt(after, each.path).value_or(Id()));
+            EXPECT_EQ(each.oldId, before->GetIdByPath(each.path).value_or(Id()));
+            EXPECT_EQ(each.newId, after->GetIdByPath(each.path).value_or(Id()));
             const auto kindOf = [&each](cow_ptr<Tree> const& tree) {
                 return tree->GetDeepBlob(each.path) ? 'f' : tree->GetDeepTree(each.path) ? 'd' : ' ';
             };

@@ -8,13 +8,7 @@
 namespace KivVcs {
 namespace {
 
-class Histories : public testing::Test {
-protected:
-    IObjectsStorage& Storage() { return *repo.GetStorage(); }
-
-    RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
-    GrownHistory history{repo};
-};
+using Histories = WithHistory;
 
 TEST_F(Histories, TheCommonBaseIsWhereTheChainsMeet) {
     history.Grow("r a:r b:a c:b d:c s:a t:s alone");

@@ -27,7 +27,7 @@ TEST_F(HostTrees, ShowWhatTheObjectsOfHostsReturn) {
         for (auto const& [name, entry] : entries)
             data += entry;
         EXPECT_EQ(Bytes(tree.GetData()), data) << entries.size();
-        EXPECT_EQ(Narrow(tree.GetId().GetText()), Identifier("tree", data)) << entries.size();
+        EXPECT_EQ(IdText(tree), Identifier("tree", data)) << entries.size();
     };
     const auto add = [&](std::string const& name, HostBlob const& blob) {
         tree.AddBlob(&repo, Wide(name), blob);
@@ -82,9 +82,9 @@ TEST_F(HostTrees, KeepIdentifierAndDataOfOneState) {
     const Id first = tree.GetId();
     const Tree copy(tree);
     EXPECT_EQ(Narrow(first.GetText()), idOfData(tree));
-    EXPECT_EQ(Narrow(copy.GetId().GetText()), idOfData(copy));
+    EXPECT_EQ(IdText(copy), idOfData(copy));
     tree.ResetState();
-    EXPECT_EQ(idOfData(tree), Narrow(tree.GetId().GetText()));
+    EXPECT_EQ(idOfData(tree), IdText(tree));
     EXPECT_FALSE(tree.GetId() == first || !(copy.GetId() == first));
 }
 

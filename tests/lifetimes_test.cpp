@@ -68,6 +68,7 @@ const struct {
     {"d/e/f d/g h", [](World& w) { auto const& paths = w.tree->GetDeepBlobPaths(); w.End(); return Joined(ToNames(paths)); }},
     {"t/d/e/f t/d/g t/h", [](World& w) { auto const& paths = w.commit->GetCommitTree()->GetBlobDiffs(w.commit->GetParent()->GetCommitTree()); w.End(); return Joined(ToNames(paths)); }},
     {"d h", [](World& w) { auto const& names = w.tree->GetLocalObjectPaths(); w.End(); return Joined(ToNames(names)); }},
+    {"Ada!", [](World& w) { auto const& name = w.commit->GetAuthorName() + KivStringT<char16_t>(u"!"); w.End(); return Narrow(name); }},
     {"blob", [](World& w) { auto const& header = w.tree->GetLocalBlob(u"h")->GetHeader(); w.End(); return std::string(header.GetString()); }},
     {"blob 1\\03", [](World& w) { auto const& text = w.tree->GetLocalBlob(u"h")->ToString(); w.End(); return Narrow(text); }},
     {"100644 b", [](World& w) { const Buffer data = w.tree->GetLocalTree(u"d")->GetLocalTree(u"e")->GetData(); w.End(); return Bytes(data).substr(0, 8); }},

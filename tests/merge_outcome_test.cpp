@@ -21,7 +21,7 @@ std::string Told(std::vector<MergeConflict> const& conflicts) {
     return Joined(words);
 }
 
-class Outcomes : public testing::Test {
+class Outcomes : public WithHistory {
 protected:
     cow_ptr<Commit> Store(cow_ptr<Commit> const& parent, std::string const& files, std::string const& name) {
         Commit commit(parent, false);
@@ -39,9 +39,6 @@ protected:
         return MergeWithOutcome(repo, Store(base, right, "right"), std::move(resolvers));
     }
 
-    [[nodiscard]] std::string FilesOfHead() const { return Files(repo.GetHead()->GetCommitTree()->GetRoot()); }
-
-    RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
     cow_ptr<Commit> head;
 };
 
@@ -126,18 +123,15 @@ TEST_F(Outcomes, AreForeseenInTheOrderOfTheQuestions) {
         std::mt19937 random(seed);
         const auto root = EditAtRandom(random, repo, nullptr);
         const MergeTrees trees{EditAtRandom(random, repo, root), root, EditAtRandom(random, repo, root)};
-        PathList asked;
+        Names asked;
         const auto ask = [&asked](Path path, auto const&) {
-            KivStringT<char16_t> joined;
-            for (auto const& component : path)
-                joined += (joined.IsEmpty() ? KivStringT<char16_t>() : KivStringT<char16_t>(u"/")) + component;
-            asked.push_back(joined);
+            asked.push_back(Joined(path));
             return ConflictChoice::Left;
         };
         (void)ThreeWayMerge(&repo, trees, {ask, always_return_t{TreeConflictChoice::Merge}});
-        PathList foreseen;
+        Names foreseen;
         for (auto const& conflict : FindConflicts(trees)) {
-            foreseen.push_back(conflict.path);
+            foreseen.push_back(Narrow(conflict.path));
             EXPECT_NE(conflict.leftChange, ChangeKind::Unchanged) << seed;
             EXPECT_NE(conflict.rightChange, ChangeKind::Unchanged) << seed;
             EXPECT_NE(conflict.leftId, conflict.rightId) << seed;

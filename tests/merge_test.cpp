@@ -10,13 +10,6 @@ namespace {
 
 using Path = array_view<KivStringViewT<char16_t> const>;
 
-std::string Joined(Path path) {
-    std::string text;
-    for (auto component : path)
-        text += (text.empty() ? "" : "/") + Narrow(component);
-    return text;
-}
-
 /// Resolvers that note what they are asked as "d:directory" and "f:file" and check that they are given the whole trees.
 /// The top is always merged; of the files, one that is not answered for itself gets the general answer.
 struct Host {
@@ -45,16 +38,11 @@ struct Host {
 
 constexpr always_return_t<TreeConflictChoice> mergeAlways{TreeConflictChoice::Merge};
 
-class Merging : public testing::Test {
+class Merging : public WithHistory {
 protected:
     MergeTrees Trees(std::string const& root, std::string const& left, std::string const& right) {
         return {MakeTree(repo, left), MakeTree(repo, root), MakeTree(repo, right)};
     }
-
-    [[nodiscard]] std::string FilesOfHead() const { return Files(repo.GetHead()->GetCommitTree()->GetRoot()); }
-
-    RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
-    GrownHistory history{repo};
 };
 
 TEST_F(Merging, AsksOnlyWhereBothSidesDisagreeAndDoesWhatItIsTold) {
@@ -108,7 +96,7 @@ TEST_F(Merging, AsksOnlyWhereBothSidesDisagreeAndDoesWhatItIsTold) {
         SCOPED_TRACE(inputs);
         Host host{file, directory, Trees(root, left, right)};
         EXPECT_EQ(Files(ThreeWayMerge(&repo, host.trees, host.AsResolvers())), merged);
-        EXPECT_EQ(KivVcs::Joined(host.asked), asked);
+        EXPECT_EQ(Joined(host.asked), asked);
         EXPECT_EQ(Files(host.trees.root) + "|" + Files(host.trees.left) + "|" + Files(host.trees.right), inputs);
     }
 }
@@ -123,21 +111,20 @@ TEST_F(Merging, AsksAboutFilesBeforeDirectoriesInNameOrderWithFullPaths) {
     Host host{.trees = Trees(numbered('0'), numbered('1'), numbered('2'))};
     host.files = {{"k/x", ConflictChoice::Right}, {"a/b/c/d/e/f", ConflictChoice::Right}, {"n", ConflictChoice::Root}};
     const auto merged = ThreeWayMerge(&repo, host.trees, host.AsResolvers());
-    EXPECT_EQ(KivVcs::Joined(host.asked),
-              "d: f:m f:n d:a f:a/z d:a/b d:a/b/c d:a/b/c/d d:a/b/c/d/e f:a/b/c/d/e/f d:k f:k/x");
+    EXPECT_EQ(Joined(host.asked), "d: f:m f:n d:a f:a/z d:a/b d:a/b/c d:a/b/c/d d:a/b/c/d/e f:a/b/c/d/e/f d:k f:k/x");
     EXPECT_EQ(Files(merged), "a/b/c/d/e/f=2 a/z=1 k/x=2 m=1 n=0 same/s=7");
     EXPECT_TRUE(merged->GetLocalTree(u"same") == host.trees.left->GetLocalTree(u"same"));
 
     host.asked.clear();
     host.files["a/z"] = ConflictChoice::Undecided;
     EXPECT_FALSE(ThreeWayMerge(&repo, host.trees, host.AsResolvers()));
-    EXPECT_EQ(KivVcs::Joined(host.asked), "d: f:m f:n d:a f:a/z");
+    EXPECT_EQ(Joined(host.asked), "d: f:m f:n d:a f:a/z");
 
     host.asked.clear();
     EXPECT_FALSE(ThreeWayMerge(&repo, host.trees, {nullptr, host.AsResolvers().treeResolver}));
     EXPECT_FALSE(ThreeWayMerge(&repo, host.trees, {host.AsResolvers().blobResolver, nullptr}));
     EXPECT_FALSE(ThreeWayMerge(nullptr, host.trees, host.AsResolvers()));
-    EXPECT_EQ(KivVcs::Joined(host.asked), "d:");
+    EXPECT_EQ(Joined(host.asked), "d:");
     EXPECT_TRUE(ThreeWayMerge(&repo, {host.trees.left, nullptr, host.trees.left}, {}) == host.trees.left);
 }
 

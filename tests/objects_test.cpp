@@ -22,12 +22,6 @@ std::string Hex(SHADigest256& digest) {
     return Narrow(DataEncoding::HexEncode(bytes.data(), bytes.size()));
 }
 
-Buffer BufferOf(std::string const& content) {
-    Buffer buffer;
-    buffer.Append(content.data(), content.size());
-    return buffer;
-}
-
 std::string const helloId = "8aec4e4876f854f688d0ebfc8f37598f38e5fd6903cccc850ca36591175aeb60";
 std::string const emptyBlobId = "473a0f4c3be8a93681a267e3b1e9a7dcda1185436fe141f7749120a303721813";
 std::string const emptyDigest = "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855";
@@ -162,7 +156,7 @@ TEST(Blob, PacksItsContentBehindTypeAndSize) {
         {std::string(100'000, 'Z'), "59dd672b0f8e28f633da606c83c452689907907f073452e69ac9da474b813ce1"}};
     for (auto const& [content, id] : blobs) {
         const Blob blob = MakeBlob(content);
-        EXPECT_EQ(Narrow(blob.GetId().GetText()), id);
+        EXPECT_EQ(IdText(blob), id);
         const std::string packed = "blob " + std::to_string(content.size()) + '\0' + content;
         EXPECT_EQ(Bytes(blob.GetPackedData()), packed);
         EXPECT_EQ(&blob.GetPackedData(), &blob.GetPackedData());
@@ -223,16 +217,16 @@ TEST(Object, CachesIdentifierAndPackedFormUntilItsStateIsReset) {
     EXPECT_THROW(static_cast<void>(thing.GetId()), std::runtime_error);
     EXPECT_THROW(static_cast<void>(thing.GetPackedData()), std::runtime_error);
     thing.broken = false;
-    EXPECT_EQ(Narrow(thing.GetId().GetText()), id);
+    EXPECT_EQ(IdText(thing), id);
     EXPECT_EQ(thing.GetPackedData().GetSize(), 11U);
     const int asked = thing.asked;
     thing.data.Append("d", 1);
     const Thing copy = thing;
-    EXPECT_EQ(Narrow(thing.GetId().GetText()) + Narrow(copy.GetId().GetText()), id + id);
+    EXPECT_EQ(IdText(thing) + IdText(copy), id + id);
     EXPECT_EQ(Bytes(copy.GetPackedData()), std::string("thing 3\0abc", 11));
     EXPECT_EQ(thing.asked + copy.asked, 2 * asked);
     thing.ResetState();
-    EXPECT_EQ(Narrow(thing.GetId().GetText()), "dd594ce1e440536e093d2643eb07c045cb29cac1a6e4f5852fd7be8ad140dcb3");
+    EXPECT_EQ(IdText(thing), "dd594ce1e440536e093d2643eb07c045cb29cac1a6e4f5852fd7be8ad140dcb3");
     EXPECT_TRUE(thing != copy && thing == thing && !thing.HasSameId(copy) &&
                 Bytes(thing.GetPackedData()).back() == 'd');
 }

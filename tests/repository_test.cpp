@@ -6,12 +6,9 @@
 namespace KivVcs {
 namespace {
 
-std::string SortedNames(std::vector<KivStringT<char16_t>> names) {
+std::string SortedNames(PathList names) {
     std::sort(names.begin(), names.end());
-    std::vector<std::string> words;
-    for (auto const& name : names)
-        words.push_back(Narrow(name));
-    return Joined(words);
+    return Joined(ToNames(names));
 }
 
 Commit Described(cow_ptr<Commit> parent, const char16_t* description) {

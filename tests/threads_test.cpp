@@ -52,13 +52,13 @@ std::string ReadAndDrop(Repository const& repository, Versions line) {
         cow_ptr<Commit> commit = line.back();
         cow_ptr<CommitTree> const& files = commit->GetCommitTree();
         cow_ptr<Commit> const& earlier = line[line.size() / 2 - 1];
-        read += Narrow(commit->GetId().GetText()) + Bytes(commit->GetPackedData()) + NameOf(commit->GetParent());
+        read += IdText(*commit) + Bytes(commit->GetPackedData()) + NameOf(commit->GetParent());
         read += Bytes(files->GetRoot()->GetPackedData()) + Narrow(commit->ToString());
         read += Joined(ToNames(files->GetBlobDiffs(earlier->GetCommitTree())));
         read += Joined(ToNames(files->GetAllBlobPaths())) + std::to_string(files->GetBlobCount());
         for (auto const& path : files->GetBlobDiffs(commit->GetParent()->GetCommitTree())) {
             if (const auto blob = commit->GetBlob(path))
-                read += Bytes(blob->GetPackedData()) + Narrow(blob->GetId().GetText());
+                read += Bytes(blob->GetPackedData()) + IdText(*blob);
         }
         read += NameOf(repository.GetCommonBase(commit, earlier)) + NameOf(repository.GetHead());
         if (const auto stored = repository.GetCommitFromStorage(commit->GetId()))
@@ -66,7 +66,7 @@ std::string ReadAndDrop(Repository const& repository, Versions line) {
         Repository nowhere(nullptr);
         commit.write()->AddBlob(&nowhere, u"wide/7/mine", MakeBlob("mine"));
         commit.write()->RemoveObject(&nowhere, u"a/b");
-        read += Narrow(commit->GetId().GetText());
+        read += IdText(*commit);
         EXPECT_FALSE(line.back()->GetBlob(u"wide/7/mine"));
     }
     return read;

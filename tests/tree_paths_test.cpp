@@ -136,7 +136,7 @@ TEST_F(TreePaths, NamesOfAnyLengthArePackedUpToTheirFirstZero) {
         tree = moved;
     }
     const std::string data = Entry("blob", "a", one) + Entry("blob", longName, one) + Entry("blob", "z\xC2\x80", one);
-    EXPECT_EQ(Narrow(tree.GetId().GetText()), Identifier("tree", data));
+    EXPECT_EQ(IdText(tree), Identifier("tree", data));
     EXPECT_EQ(Bytes(tree.GetData()), data);
     EXPECT_EQ(tree.GetStoragePrefix(), "40000");
 }
@@ -153,14 +153,14 @@ TEST_F(ReadingTrees, GivesTheTreeThatWasPacked) {
     auto const tree = repo.SyncWithStorage(MakeTree(repo, "a/b/c=1 a/d=2 e=3 a.b=4"));
     const std::string late = "\xEF\xBF\xBD";
     const std::string early = "\xF0\x9F\x98\x80";
-    const std::string data = Entry("blob", early, one) + Entry("tree", late, Narrow(tree->GetId().GetText()));
+    const std::string data = Entry("blob", early, one) + Entry("tree", late, IdText(*tree));
     const auto read = packed.Read(packed.Add("tree", data), &repo);
     ASSERT_TRUE(read);
     EXPECT_EQ(Bytes(read->GetData()), data);
     EXPECT_EQ(Bytes(read->GetDeepBlob(u"\xD83D\xDE00")->GetData()), "1");
     EXPECT_EQ(Files(read->GetLocalTree(u"\xFFFD")), "a.b=4 a/b/c=1 a/d=2 e=3");
     EXPECT_EQ(packed.loads, 1);
-    EXPECT_TRUE(packed.Read(Narrow(read->GetId().GetText()), &repo) == read);
+    EXPECT_TRUE(packed.Read(IdText(*read), &repo) == read);
     EXPECT_EQ(packed.loads, 1);
     EXPECT_FALSE(packed.Read(one, nullptr) || packed.Read("", &repo));
     EXPECT_FALSE(Tree::Deserialize(Id(Wide(one)), &repo, nullptr));

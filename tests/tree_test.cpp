@@ -15,7 +15,7 @@ struct Version {
 
     void Check() const {
         ASSERT_EQ(Bytes(tree->GetData()), Data(model));
-        ASSERT_EQ(Narrow(tree->GetId().GetText()), IdOf(model));
+        ASSERT_EQ(IdText(*tree), IdOf(model));
         ASSERT_EQ(tree->IsEmpty(), model.IsEmpty());
         ASSERT_EQ(tree->GetLocalObjectCount(), model.blobs.size() + model.trees.size());
         ASSERT_EQ(tree->GetLocalBlobCount(), model.blobs.size());

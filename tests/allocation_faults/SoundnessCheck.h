@@ -16,7 +16,7 @@ inline Id Recomputed(Tree const& tree) {
     std::string data;
     for (auto const& [name, child] : entries)
         data += std::string(child->GetStoragePrefix()) + " " + child->GetHeader().GetString() + " " + name + '\0' +
-                Narrow(child->GetId().GetText());
+                IdText(*child);
     return MakeBlob("tree " + std::to_string(data.size()) + '\0' + data).GetData();
 }
 

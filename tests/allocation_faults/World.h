@@ -42,11 +42,7 @@ struct World {
         Commit grown(commits[parent], false);
         grown.SetDescription(Wide(name));
         grown.SetAuthorName(u"J\u00f8rn");
-        std::istringstream words(files);
-        for (std::string word; words >> word;) {
-            const auto equals = word.find('=');
-            grown.AddBlob(&repository, Wide(word.substr(0, equals)), MakeBlob(word.substr(equals + 1)));
-        }
+        AddFiles(grown, repository, files);
         commits[name] = repository.SyncWithStorage(immu::make<Commit>(grown));
     }
 

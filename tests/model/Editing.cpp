@@ -85,7 +85,7 @@ const Action actions[] = {
                  tree.AddBlob(&w.repository, edit.first, *w.PickClass(edit.second));
                  w.plain.AddTo(plain, names, edit.second);
              }
-             Expect("the tree", Narrow(tree.GetId().GetText()), IdOf(plain));
+             Expect("the tree", IdText(tree), IdOf(plain));
              return IdOf(plain);
          };
          Expect("in the other order", edited(std::vector(edits.rbegin(), edits.rend())), edited(edits));

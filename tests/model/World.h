@@ -20,8 +20,9 @@ inline void Expect(std::string const& what, auto const& actual, auto const& expe
     throw std::runtime_error(message.str());
 }
 
-inline std::string IdText(auto const& object) {
-    return object ? Narrow(object->GetId().GetText()) : "none";
+template <class T>
+std::string IdText(cow_ptr<T> const& object) {
+    return object ? IdText(*object) : "none";
 }
 inline std::string IdText(PlainCommit::Pointer const& commit) {
     return commit ? commit->id : "none";
@@ -289,7 +290,7 @@ struct World {
             Expect("the content of " + name, Files(RootOf(found)), head->root ? Files(*head->root) : "-");
             Commit fresh(*found);
             fresh.ResetState();
-            Expect("its identifier", IdText(found), Narrow(fresh.GetId().GetText()));
+            Expect("its identifier", IdText(found), IdText(fresh));
         }
         operation(clone);
         clone.UpdateStorage();

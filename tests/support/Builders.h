@@ -11,23 +11,31 @@
 
 namespace KivVcs {
 
-inline Blob MakeBlob(std::string const& content) {
+inline Buffer BufferOf(std::string const& content) {
     Buffer data(0);
     data.Append(content.data(), content.size(), 1);
-    return Blob(std::move(data));
+    return data;
 }
 
-/// A tree written as "name=content directory/name=content"; null for "-".
-inline cow_ptr<Tree> MakeTree(IRepository& repo, std::string const& files) {
-    cow_ptr<Tree> tree;
-    if (files == "-")
-        return tree;
-    Tree* const writable = tree.write();
+inline Blob MakeBlob(std::string const& content) {
+    return Blob(BufferOf(content));
+}
+
+/// Adds files written as "name=content directory/name=content" to a tree or a commit.
+template <class Holder>
+void AddFiles(Holder& holder, IRepository& repo, std::string const& files) {
     std::istringstream words(files);
     for (std::string word; words >> word;) {
         const auto equals = word.find('=');
-        writable->AddBlob(&repo, Wide(word.substr(0, equals)), MakeBlob(word.substr(equals + 1)));
+        holder.AddBlob(&repo, Wide(word.substr(0, equals)), MakeBlob(word.substr(equals + 1)));
     }
+}
+
+/// A tree of such files; null for "-".
+inline cow_ptr<Tree> MakeTree(IRepository& repo, std::string const& files) {
+    cow_ptr<Tree> tree;
+    if (files != "-")
+        AddFiles(*tree.write(), repo, files);
     return tree;
 }
 

@@ -36,12 +36,7 @@ public:
     Id GetId() const override { return Id(id); }
     KivStringT<char> GetHeader() const override { return header.c_str(); }
     KivStringT<char> GetStoragePrefix() const override { return prefix.c_str(); }
-    Buffer const& GetData() const override {
-        const std::string content = fetch_();
-        fetched_ = Buffer();
-        fetched_.Append(content.data(), content.size());
-        return fetched_;
-    }
+    Buffer const& GetData() const override { return fetched_ = BufferOf(fetch_()); }
 
     KivStringT<char16_t> id;
     std::string header = "blob";

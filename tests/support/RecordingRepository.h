@@ -2,6 +2,8 @@
 
 #include "support/Builders.h"
 
+#include <gtest/gtest.h>
+
 #include <stdexcept>
 
 namespace KivVcs {
@@ -62,6 +64,16 @@ private:
 
     mutable std::vector<std::string> calls_;
     std::string broken_;
+};
+
+/// Tests of a repository whose calls are recorded, with a history to grow in it.
+class WithHistory : public testing::Test {
+protected:
+    IObjectsStorage& Storage() { return *repo.GetStorage(); }
+    [[nodiscard]] std::string FilesOfHead() const { return Files(repo.GetHead()->GetCommitTree()->GetRoot()); }
+
+    RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
+    GrownHistory history{repo};
 };
 
 } // namespace KivVcs

@@ -26,16 +26,28 @@ inline Names ToNames(PathList const& paths) {
     return names;
 }
 
+inline std::string Joined(Names const& words, const char* separator = " ") {
+    std::string text;
+    for (auto const& word : words)
+        text += (text.empty() ? "" : separator) + word;
+    return text;
+}
+
+/// The components of a path, with a "/" between them.
+inline std::string Joined(array_view<KivStringViewT<char16_t> const> path) {
+    Names names;
+    for (auto const& component : path)
+        names.push_back(Narrow(component));
+    return Joined(names, "/");
+}
+
+inline std::string IdText(Object const& object) {
+    return Narrow(object.GetId().GetText());
+}
+
 inline std::string Bytes(Buffer const& buffer) {
     const KivStringT<char> text = Helpers::StringAFromBuffer(buffer);
     return {text.GetString(), static_cast<std::size_t>(text.GetLength())};
-}
-
-inline std::string Joined(std::vector<std::string> const& words) {
-    std::string text;
-    for (auto const& word : words)
-        text += (text.empty() ? "" : " ") + word;
-    return text;
 }
 
 } // namespace KivVcs
