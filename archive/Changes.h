@@ -12,7 +12,7 @@
 
 namespace KivArchive {
 
-/// The most bytes that a record may have.
+/// A record has at most so many bytes.
 inline constexpr std::uint64_t largestRecord = 16 * largestWholeContent;
 
 /// The digest of an identifier that must be one. @throws std::invalid_argument

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Trees and commits with their identifiers in 32 bytes instead of 64 digits, and without what they say twice.
+/// Trees and commits with their identifiers in 32 bytes instead of 64 digits, and without what they repeat.
 
 #include "Bytes.h"
 

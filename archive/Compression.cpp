@@ -20,23 +20,23 @@ void CheckMemory(std::size_t code) {
         throw std::bad_alloc();
 }
 
-/// How many bytes both begin with, up to @p most.
-std::size_t CommonBeginning(const std::byte* left, const std::byte* right, std::size_t most) noexcept {
+/// How many bytes both begin with, at most @p limit.
+std::size_t CommonBeginning(const std::byte* left, const std::byte* right, std::size_t limit) noexcept {
     std::size_t same = 0;
-    while (same + sizeof(std::uint64_t) <= most && std::memcmp(left + same, right + same, sizeof(std::uint64_t)) == 0)
+    while (same + sizeof(std::uint64_t) <= limit && std::memcmp(left + same, right + same, sizeof(std::uint64_t)) == 0)
         same += sizeof(std::uint64_t);
-    while (same < most && left[same] == right[same])
+    while (same < limit && left[same] == right[same])
         ++same;
     return same;
 }
 
-std::size_t CommonEnd(ByteView left, ByteView right, std::size_t most) noexcept {
+std::size_t CommonEnd(ByteView left, ByteView right, std::size_t limit) noexcept {
     std::size_t same = 0;
     constexpr std::size_t step = sizeof(std::uint64_t);
-    while (same + step <= most &&
+    while (same + step <= limit &&
            std::memcmp(left.data() + left.size() - same - step, right.data() + right.size() - same - step, step) == 0)
         same += step;
-    while (same < most && left[left.size() - same - 1] == right[right.size() - same - 1])
+    while (same < limit && left[left.size() - same - 1] == right[right.size() - same - 1])
         ++same;
     return same;
 }
@@ -111,14 +111,14 @@ void Compressor::Decompress(ByteView bytes, ByteView prefix, std::byte* to, std:
 
 bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept {
     // A block of 128 KiB takes four bytes at least.
-    constexpr std::uint64_t mostGrowth = 32768;
-    return size / mostGrowth <= bytes.size() && ZSTD_getFrameContentSize(bytes.data(), bytes.size()) == size;
+    constexpr std::uint64_t maximumGrowth = 32768;
+    return size / maximumGrowth <= bytes.size() && ZSTD_getFrameContentSize(bytes.data(), bytes.size()) == size;
 }
 
 bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit, Bytes& to) {
-    std::size_t const most = std::min(base.size(), form.size());
-    std::size_t const begin = CommonBeginning(base.data(), form.data(), most);
-    std::size_t const end = CommonEnd(base, form, most - begin);
+    std::size_t const shorter = std::min(base.size(), form.size());
+    std::size_t const begin = CommonBeginning(base.data(), form.data(), shorter);
+    std::size_t const end = CommonEnd(base, form, shorter - begin);
     ByteView const between = form.subspan(begin, form.size() - begin - end);
     ByteView const replaced = base.subspan(begin, base.size() - begin - end);
     std::size_t const before = to.size();
@@ -145,8 +145,8 @@ Bytes ApplyDifference(Compressor& compressor, ByteView base, ByteView difference
     std::uint64_t const begin = reader.TakeNumber();
     std::uint64_t const end = reader.TakeNumber();
     bool const isCompressed = reader.TakeByte() != 0;
-    std::size_t const most = std::min(base.size(), size);
-    if (begin > most || end > most - begin)
+    std::size_t const shorter = std::min(base.size(), size);
+    if (begin > shorter || end > shorter - begin)
         throw Malformed();
     auto const beginSize = static_cast<std::size_t>(begin);
     auto const endSize = static_cast<std::size_t>(end);

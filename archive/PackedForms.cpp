@@ -34,9 +34,10 @@ bool TakeIdentifierLine(std::string_view& text, KivVcs::Id& id) noexcept {
 std::optional<std::string_view> TakeSignature(std::string_view& text) noexcept {
     constexpr std::string_view committer = "\ncommitter ";
     constexpr std::string_view end = "\n\n";
-    constexpr int mostTried = 16;
+    constexpr int maximumTries = 16;
     std::size_t at = text.find(committer);
-    for (int tried = 0; tried < mostTried && at != std::string_view::npos; ++tried, at = text.find(committer, at + 1)) {
+    for (int tried = 0; tried < maximumTries && at != std::string_view::npos;
+         ++tried, at = text.find(committer, at + 1)) {
         std::string_view const signature = text.substr(0, at);
         std::string_view rest = text.substr(at + committer.size());
         if (Take(rest, signature) && Take(rest, end)) {
@@ -64,7 +65,7 @@ std::optional<Number> NumberOf(std::string_view digits) noexcept {
 std::optional<std::int64_t> MinutesOf(std::string_view offset) noexcept {
     constexpr std::size_t shortest = 5;
     // What differences of time can hold.
-    constexpr std::int64_t mostHours = 256'000'000;
+    constexpr std::int64_t maximumHours = 256'000'000;
     bool const isNegative = offset.substr(0, 1) == "-";
     if (offset.size() < shortest || (!isNegative && offset.front() != '+'))
         return std::nullopt;
@@ -74,7 +75,7 @@ std::optional<std::int64_t> MinutesOf(std::string_view offset) noexcept {
     auto const hours = number(offset.substr(1, offset.size() - 3));
     auto const minutes = number(offset.substr(offset.size() - 2));
     // A negative fraction of an hour is written with "+".
-    if (!hours || !minutes || *hours < 0 || *hours > mostHours || *minutes < 0 || *minutes >= 60 ||
+    if (!hours || !minutes || *hours < 0 || *hours > maximumHours || *minutes < 0 || *minutes >= 60 ||
         (isNegative && *hours == 0))
         return std::nullopt;
     return (isNegative ? -1 : 1) * (*hours * 60 + *minutes);
@@ -165,11 +166,11 @@ bool PackedEntries::Next() {
 }
 
 int CompareNames(std::string_view left, std::string_view right) noexcept {
-    std::size_t const most = std::min(left.size(), right.size());
+    std::size_t const shorter = std::min(left.size(), right.size());
     std::size_t at = 0;
-    while (at < most && left[at] == right[at])
+    while (at < shorter && left[at] == right[at])
         ++at;
-    if (at == most)
+    if (at == shorter)
         return left.size() < right.size() ? -1 : static_cast<int>(left.size() > right.size());
     unsigned const one = ByteAt(left, at);
     unsigned const other = ByteAt(right, at);

@@ -34,34 +34,34 @@ private:
 
     void VerifyBatch(std::vector<Id> const& batch) {
         std::vector<Id> large;
-        std::vector<Ancestry> told;
+        std::vector<Ancestry> stated;
         ReadOutcome const outcome = archive_.Read(batch, [&](ArchivedObject const& object) {
             if (report_.objects++ % pageSize == 0)
                 ReportProgress(progress_, {"verifying objects", report_.objects, all_.Size()}, {});
             if (object.data.empty() && object.size > 0)
                 large.push_back(object.id);
             else
-                VerifyLinks(object, told);
-            if (told.size() == pageSize)
-                VerifyAncestry(std::exchange(told, {}));
+                VerifyLinks(object, stated);
+            if (stated.size() == pageSize)
+                VerifyAncestry(std::exchange(stated, {}));
         });
         report_.damaged.insert(report_.damaged.end(), outcome.damaged.begin(), outcome.damaged.end());
         for (Id const& id : large)
             VerifyContent(id);
-        VerifyAncestry(told);
+        VerifyAncestry(stated);
     }
 
-    void VerifyLinks(ArchivedObject const& object, std::vector<Ancestry>& told) {
+    void VerifyLinks(ArchivedObject const& object, std::vector<Ancestry>& stated) {
         std::vector<Link> links;
         if (!ReadLinks(object.type, object.data, links)) {
             report_.damaged.push_back(object.id);
             return;
         }
         if (object.type == ObjectType::Commit)
-            told.push_back({object.id, {}, {}, {}});
+            stated.push_back({object.id, {}, {}, {}});
         for (Link const& link : links) {
             if (object.type == ObjectType::Commit)
-                (link.type == ObjectType::Tree ? told.back().tree : told.back().parent) = link.id;
+                (link.type == ObjectType::Tree ? stated.back().tree : stated.back().parent) = link.id;
             if (!all_.Find(link.id) && missing_.insert(link.id).second)
                 report_.missing.push_back({link.id, object.id});
         }
@@ -87,16 +87,16 @@ private:
         report_.damaged.push_back(id);
     }
 
-    void VerifyAncestry(std::vector<Ancestry> const& told) {
+    void VerifyAncestry(std::vector<Ancestry> const& stated) {
         std::vector<Id> commits;
-        for (Ancestry const& facts : told)
+        for (Ancestry const& facts : stated)
             commits.push_back(facts.commit);
         auto known = archive_.ReadAncestry(commits, Follow::Parents, 0);
         auto const less = [](Ancestry const& left, Ancestry const& right) {
             return DigestOf(left.commit) < DigestOf(right.commit);
         };
         std::sort(known.begin(), known.end(), less);
-        for (Ancestry const& facts : told) {
+        for (Ancestry const& facts : stated) {
             auto const found = std::lower_bound(known.begin(), known.end(), facts, less);
             if (found == known.end() || !(found->commit == facts.commit) || !(found->parent == facts.parent) ||
                 !(found->tree == facts.tree))

@@ -52,7 +52,7 @@ public:
             Form form{static_cast<Manner>(input.Byte() % 8), {}};
             for (unsigned byte = 0; !input.IsUsedUp() && (byte = input.Byte()) != 0xFF;)
                 form.bytes.append(byte < 0xF0 ? 1 : 64, static_cast<char>(byte < 0xF0 ? byte : '0' + byte % 8));
-            mostLoads_ += 1 + form.bytes.size();
+            maximumLoads_ += 1 + form.bytes.size();
             forms_.push_back(std::move(form));
         }
     }
@@ -75,7 +75,7 @@ public:
 
 private:
     StreamIO Open(Id const& id) {
-        Require(loads_++ < mostLoads_ + 1, "every tree is read once, and every entry asked for once");
+        Require(loads_++ < maximumLoads_ + 1, "every tree is read once, and every entry asked for once");
         const auto index = static_cast<unsigned>(id.GetText()[0] - u'0');
         if (index >= forms_.size() || forms_[index].manner == IsMissing)
             return {};
@@ -109,7 +109,7 @@ private:
 
     unsigned kind_;
     std::vector<Form> forms_;
-    std::size_t mostLoads_ = 0;
+    std::size_t maximumLoads_ = 0;
     std::size_t loads_ = 0;
 };
 

@@ -80,7 +80,7 @@ def text_of(string):
 
 def id_of(identifier):
     """The text of an Id; None for the null identifier."""
-    if identifier["tellsDigest_"]:
+    if identifier["isDigest_"]:
         return array_bytes(identifier["digest_"]).hex()
     text = atomic_value(identifier["text_"]["value_"]["word_"])
     if int(text) == 0:

@@ -12,7 +12,7 @@ std::string WordOf(ChangeKind kind) {
     return {"=+-*fd>"[static_cast<int>(kind)]};
 }
 
-std::string Told(Differences const& differences) {
+std::string Listed(Differences const& differences) {
     std::vector<std::string> words;
     words.reserve(differences.GetCount());
     for (auto const& each : differences)
@@ -31,11 +31,11 @@ protected:
 };
 
 TEST_F(Differing, TellsWhatBecameOfEveryPath) {
-    EXPECT_EQ(Told(Between("a=1 b=1 d/x=1 e/y=1 f=1 same/z=1", "b=2 c=1 d=1 e/y=1 e/z/w=1 f/g=1 same/z=1")),
+    EXPECT_EQ(Listed(Between("a=1 b=1 d/x=1 e/y=1 f=1 same/z=1", "b=2 c=1 d=1 e/y=1 e/z/w=1 f/g=1 same/z=1")),
               "-a *b +c fd -d/x +e/z/w df +f/g");
-    EXPECT_EQ(Told(Between("-", "d/x=1")), "+d/x");
-    EXPECT_EQ(Told(Between("d/x=1", "-")), "-d/x");
-    EXPECT_EQ(Told(Between("-", "-")), "");
+    EXPECT_EQ(Listed(Between("-", "d/x=1")), "+d/x");
+    EXPECT_EQ(Listed(Between("d/x=1", "-")), "-d/x");
+    EXPECT_EQ(Listed(Between("-", "-")), "");
 
     const Differences differences = Between("d/x=1", "d=2");
     ASSERT_EQ(differences.GetCount(), 2U);
@@ -47,12 +47,12 @@ TEST_F(Differing, TellsWhatBecameOfEveryPath) {
 
 TEST_F(Differing, PairsRenamedFilesByContentAndRatherByName) {
     const DifferenceOptions renames{.findRenames = true};
-    EXPECT_EQ(Told(Between("a=1 b=2", "c=1 b=3", renames)), "*b >a>c");
-    EXPECT_EQ(Told(Between("a/n=1 b/m=1 c=1", "x/m=1 y/n=1 z/o=1 z/p=1", renames)), ">b/m>x/m >a/n>y/n >c>z/o +z/p");
-    EXPECT_EQ(Told(Between("a=1 b=1 c=1", "d=1", renames)), "-b -c >a>d");
-    EXPECT_EQ(Told(Between("d/x=1", "d=1", renames)), "fd -d/x");
-    EXPECT_EQ(Told(Between("a=1", "b=2", renames)), "-a +b");
-    EXPECT_EQ(Told(Between("a=2", "b=1", renames)), "-a +b");
+    EXPECT_EQ(Listed(Between("a=1 b=2", "c=1 b=3", renames)), "*b >a>c");
+    EXPECT_EQ(Listed(Between("a/n=1 b/m=1 c=1", "x/m=1 y/n=1 z/o=1 z/p=1", renames)), ">b/m>x/m >a/n>y/n >c>z/o +z/p");
+    EXPECT_EQ(Listed(Between("a=1 b=1 c=1", "d=1", renames)), "-b -c >a>d");
+    EXPECT_EQ(Listed(Between("d/x=1", "d=1", renames)), "fd -d/x");
+    EXPECT_EQ(Listed(Between("a=1", "b=2", renames)), "-a +b");
+    EXPECT_EQ(Listed(Between("a=2", "b=1", renames)), "-a +b");
 }
 
 TEST_F(Differing, AgreesWithListingsAndLookupsOverRandomTrees) {
@@ -81,7 +81,7 @@ TEST_F(Differing, AgreesWithListingsAndLookupsOverRandomTrees) {
 TEST_F(Differing, EndsWhereItIsToldTo) {
     EXPECT_TRUE(Between("a=1 b=1", "-", {.atMost = 2}).IsComplete());
     const Differences cut = Between("a=1 b=1 c=1", "-", {.atMost = 2});
-    EXPECT_EQ(Told(cut), "-a -b");
+    EXPECT_EQ(Listed(cut), "-a -b");
     EXPECT_FALSE(cut.IsComplete());
 
     // Two trees that name the next one twice, forty times over, without a single file that would be listed.
@@ -114,10 +114,10 @@ TEST_F(Differing, AsksHostsForIdentifiersAndForNoContent) {
     const auto left = grow(base, {{"d/f", ids[1]}, {"d/g", ids[3]}});
     const auto right = grow(base, {{"d/f", ids[2]}, {"D", ids[3]}});
     const Differences differences(base->GetCommitTree(), left->GetCommitTree(), {.findRenames = true});
-    ASSERT_EQ(Told(differences), "*d/f +d/g");
+    ASSERT_EQ(Listed(differences), "*d/f +d/g");
     EXPECT_EQ(differences[0].oldId, ids[0]);
     EXPECT_EQ(differences[0].newId, ids[1]);
-    EXPECT_EQ(Told(DifferencesFromParent(*base)), "+d/f");
+    EXPECT_EQ(Listed(DifferencesFromParent(*base)), "+d/f");
     EXPECT_EQ(FindCaseCollisions(right->GetCommitTree()->GetRoot()), (std::vector<PathList>{{u"D", u"d"}}));
     const History changes = History(left).Changing(u"d/f");
     EXPECT_EQ(std::vector<cow_ptr<Commit>>(changes.begin(), changes.end()), (std::vector{left, base}));
@@ -149,21 +149,21 @@ TEST_F(Differing, HistoryShowsTheNewestThatChangedAPath) {
     commit("d", "d/x", "2");
     commit("e", "d", "");
     commit("f", "other", "1");
-    const auto told = [](History const& history) {
+    const auto namesOf = [](History const& history) {
         std::string names;
         for (auto const& each : history)
             names += Narrow(each->GetDescription());
         return names;
     };
-    EXPECT_EQ(told(History(head)), "fedcba");
-    EXPECT_EQ(told(History(head).First(2)), "fe");
-    EXPECT_EQ(told(History(head).Changing(u"d/x")), "eda");
-    EXPECT_EQ(told(History(head).Changing(u"/d/").First(3)), "edc");
-    EXPECT_EQ(told(History(head).First(1).Changing(u"d/x").First(2)), "e");
-    EXPECT_EQ(told(History(head).Changing(u"")), "edcba");
-    EXPECT_EQ(told(History(head).Changing(u"none")), "");
-    EXPECT_EQ(told(History(head).First(0)), "");
-    EXPECT_EQ(told(History(nullptr).Changing(u"d")), "");
+    EXPECT_EQ(namesOf(History(head)), "fedcba");
+    EXPECT_EQ(namesOf(History(head).First(2)), "fe");
+    EXPECT_EQ(namesOf(History(head).Changing(u"d/x")), "eda");
+    EXPECT_EQ(namesOf(History(head).Changing(u"/d/").First(3)), "edc");
+    EXPECT_EQ(namesOf(History(head).First(1).Changing(u"d/x").First(2)), "e");
+    EXPECT_EQ(namesOf(History(head).Changing(u"")), "edcba");
+    EXPECT_EQ(namesOf(History(head).Changing(u"none")), "");
+    EXPECT_EQ(namesOf(History(head).First(0)), "");
+    EXPECT_EQ(namesOf(History(nullptr).Changing(u"d")), "");
 }
 
 TEST(PortablePaths, NameWhatAFileSystemCannotHold) {

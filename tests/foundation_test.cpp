@@ -77,16 +77,16 @@ TEST(Text, ComparesTextsAndNeverPointers) {
 }
 
 TEST(Text, SearchesAndSubstringsClipTheirArguments) {
-    constexpr int most = std::numeric_limits<int>::max();
+    constexpr int largest = std::numeric_limits<int>::max();
     const Text text("a/bb/a/");
     const std::tuple<const char*, int, int> searches[] = {{"/", 0, 1},  {"/", 2, 4},  {"/", -9, 1},
-                                                          {"/", 7, -1}, {"a/", 1, 5}, {"b", most, -1},
+                                                          {"/", 7, -1}, {"a/", 1, 5}, {"b", largest, -1},
                                                           {"", 7, 7},   {"", 8, -1},  {"a/bb/a//", 0, -1}};
     for (auto const& [needle, start, found] : searches)
         EXPECT_EQ(text.Find(needle, start), found) << needle << ' ' << start;
-    const std::tuple<int, int, const char*> parts[] = {{-5, 3, "a/b"},     {5, 99, "a/"}, {7, 1, ""},
-                                                       {most, most, ""},   {1, -1, ""},   {1, 0, ""},
-                                                       {2, most, "bb/a/"}, {0, 1, "a"}};
+    const std::tuple<int, int, const char*> parts[] = {{-5, 3, "a/b"},         {5, 99, "a/"}, {7, 1, ""},
+                                                       {largest, largest, ""}, {1, -1, ""},   {1, 0, ""},
+                                                       {2, largest, "bb/a/"},  {0, 1, "a"}};
     for (auto const& [start, count, part] : parts)
         EXPECT_EQ(text.Mid(start, count), part) << start << ' ' << count;
     EXPECT_EQ(text.Mid(5) + text.Left(-1), "a/");
@@ -348,11 +348,11 @@ TEST(Stream, ReadsAndAppendsAtIndependentPositions) {
 }
 
 TEST(Stream, CopiesWhatAHostHoldsWhateverSizeItClaims) {
-    constexpr std::uint64_t most = std::numeric_limits<std::uint64_t>::max();
+    constexpr std::uint64_t largest = std::numeric_limits<std::uint64_t>::max();
     const std::tuple<std::size_t, std::uint64_t, std::size_t, bool, std::size_t> cases[] = {
         {150'000, 150'000, 150'000, true, 150'000},
         {50'000, 7, 50'000, true, 7},
-        {3, most, 9, false, 0},
+        {3, largest, 9, false, 0},
         {150'000, 150'000, 149'999, false, 131'072}};
     for (auto const& [held, claimed, room, success, expected] : cases) {
         StreamIO reader = ReaderOf(std::string(held, 'x'), claimed);

@@ -206,13 +206,13 @@ TEST(Objects, AreIdentifiedByWhatTheyHoldAfterAMove) {
     commits[0] = std::move(commit);
     EXPECT_EQ(know(blobs[0]) + know(trees[0]) + know(commits[0]), known);
     // NOLINTBEGIN(bugprone-use-after-move): what is left is what this is about
-    const auto holdsWhatItTells = [&know](auto const& object) {
+    const auto holdsWhatItShows = [&know](auto const& object) {
         using Kind = std::decay_t<decltype(object)>;
         Kind fresh(object);
         fresh.ResetState();
         return know(object) == know(fresh);
     };
-    EXPECT_TRUE(holdsWhatItTells(blob) && holdsWhatItTells(tree) && holdsWhatItTells(commit));
+    EXPECT_TRUE(holdsWhatItShows(blob) && holdsWhatItShows(tree) && holdsWhatItShows(commit));
     EXPECT_EQ(IdText(blob), IdText(Blob()));
     EXPECT_EQ(IdText(tree), IdText(Tree()));
     // NOLINTEND(bugprone-use-after-move)

@@ -11,7 +11,7 @@ namespace {
 using Path = array_view<KivStringViewT<char16_t> const>;
 
 /// "path:LR=S": what left and right did, and how it was settled; directories end with "/".
-std::string Told(std::vector<MergeConflict> const& conflicts) {
+std::string Listed(std::vector<MergeConflict> const& conflicts) {
     std::vector<std::string> words;
     words.reserve(conflicts.size());
     for (auto const& each : conflicts)
@@ -82,7 +82,7 @@ TEST_F(Outcomes, TellWhatEachSideDidAndHowItWasSettled) {
              return !path.empty() && path[0] == u"d" ? TreeConflictChoice::Right : TreeConflictChoice::Merge;
          }});
     EXPECT_EQ(outcome.result, MergeResult::Merged);
-    EXPECT_EQ(Told(outcome.conflicts), "a:**L b:*-R e:*dL f:-*B g:++L c/x:**L d/:**R");
+    EXPECT_EQ(Listed(outcome.conflicts), "a:**L b:*-R e:*dL f:-*B g:++L c/x:**L d/:**R");
     EXPECT_EQ(outcome.conflicts[0].rightId, MakeBlob("3").GetId());
     EXPECT_EQ(outcome.conflicts.back().leftId, MakeTree(repo, "x=2")->GetId());
 }
@@ -94,7 +94,7 @@ TEST_F(Outcomes, GiveUpWithAllThatIsLeftAndAskNobodyAgain) {
         {[&asked](Path, auto const&) { return ++asked == 2 ? ConflictChoice::Undecided : ConflictChoice::Right; }, {}});
     EXPECT_EQ(outcome.result, MergeResult::GaveUp);
     EXPECT_EQ(asked, 2);
-    EXPECT_EQ(Told(outcome.conflicts), "a:**R b:**? c:**? d/e/x:**? f/x:**?");
+    EXPECT_EQ(Listed(outcome.conflicts), "a:**R b:**? c:**? d/e/x:**? f/x:**?");
     EXPECT_EQ(repo.GetHead(), head);
 
     const auto stopAt = [](KivStringViewT<char16_t> directory) {
@@ -105,13 +105,13 @@ TEST_F(Outcomes, GiveUpWithAllThatIsLeftAndAskNobodyAgain) {
         };
     };
     const auto conflicts = [&](KivStringViewT<char16_t> directory) {
-        return Told(Merge("d/x=1 d2=1 f/x=1 g/x=1", "d/x=2 d2=2 f/x=2 g/x=2", "d/x=3 d2=3 f/x=3 g/x=3",
-                          {AlwaysChooseLeft(), stopAt(directory)})
-                        .conflicts);
+        return Listed(Merge("d/x=1 d2=1 f/x=1 g/x=1", "d/x=2 d2=2 f/x=2 g/x=2", "d/x=3 d2=3 f/x=3 g/x=3",
+                            {AlwaysChooseLeft(), stopAt(directory)})
+                          .conflicts);
     };
     EXPECT_EQ(conflicts(u"f"), "d2:**L d/:**L f/:**? g/x:**?");
     const auto stopAtOnce = [](Path, auto const&) { return TreeConflictChoice::Undecided; };
-    EXPECT_EQ(Told(Merge("a=1 b=1", "a=2 b=1", "a=3 b=1", {{}, stopAtOnce}).conflicts), "/:**?");
+    EXPECT_EQ(Listed(Merge("a=1 b=1", "a=2 b=1", "a=3 b=1", {{}, stopAtOnce}).conflicts), "/:**?");
     EXPECT_THROW(
         Merge("a=1", "a=2", "a=3", {[](Path, auto const&) -> ConflictChoice { throw std::runtime_error("host"); }, {}}),
         std::runtime_error);

@@ -74,10 +74,10 @@ TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
             now.tree.write()->AddTree(&repo, Wide(name), *MakeTree(repo, "f=" + content));
         }
     };
-    constexpr int most = 4000;
+    constexpr int largest = 4000;
     for (int round = 0; round < 40; ++round) {
-        const int from = round == 0 ? 0 : Below(most);
-        const int count = round == 0 ? most : Below(most - from) + 1;
+        const int from = round == 0 ? 0 : Below(largest);
+        const int count = round == 0 ? largest : Below(largest - from) + 1;
         std::vector<int> numbers;
         for (int index = 0; index < count; ++index)
             numbers.push_back(from + index);

@@ -7,7 +7,7 @@ namespace KivArchive::Postgres {
 namespace {
 
 /// A version is that many steps from one that is no difference at most, one for each bit of its number.
-constexpr std::size_t mostSteps = 64;
+constexpr std::size_t maximumSteps = 64;
 constexpr std::uint64_t mostMade = std::uint64_t{32} * 1024 * 1024;
 
 } // namespace
@@ -61,7 +61,7 @@ Row const* Forms::Find(Id const& id) const {
 std::uint64_t Forms::StoredSizeOf(Id const& id) const {
     std::uint64_t size = 0;
     Row const* row = Find(id);
-    for (std::size_t steps = 0; row != nullptr && steps <= mostSteps; ++steps) {
+    for (std::size_t steps = 0; row != nullptr && steps <= maximumSteps; ++steps) {
         size += row->storedSize;
         row = row->base.IsEmpty() ? nullptr : Find(row->base);
     }
@@ -104,7 +104,7 @@ Form Forms::FormOf(Id const& id, Compressor& compressor) {
         } else {
             steps.push_back(at);
         }
-        if (steps.size() > mostSteps)
+        if (steps.size() > maximumSteps)
             throw Malformed();
     }
     for (; !steps.empty(); steps.pop_back()) {

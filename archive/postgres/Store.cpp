@@ -9,7 +9,7 @@ namespace KivArchive::Postgres {
 namespace {
 
 /// Connections kept for the next call.
-constexpr std::size_t mostIdle = 8;
+constexpr std::size_t maximumIdle = 8;
 
 constexpr std::string_view uniqueViolation = "23505";
 
@@ -85,7 +85,7 @@ bool Attempts::Wait(std::chrono::milliseconds atMost) {
 
 Store::Store(std::string const& address, PostgresOptions const& options)
     : address_(address), options_(options), schema_(Quoted(options.schema)) {
-    idle_.reserve(mostIdle);
+    idle_.reserve(maximumIdle);
     Run([this](Connection& connection) { EnsureSchema(connection, *this); });
     isFirstConnection_ = false;
 }
@@ -106,7 +106,7 @@ void Store::GiveBack(std::unique_ptr<Connection> connection) noexcept {
     if (!connection->IsSound())
         return;
     std::scoped_lock const lock(mutex_);
-    if (idle_.size() < mostIdle)
+    if (idle_.size() < maximumIdle)
         idle_.push_back(std::move(connection));
 }
 

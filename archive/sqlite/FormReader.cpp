@@ -7,12 +7,12 @@ namespace KivArchive {
 
 namespace {
 
-constexpr std::uint64_t mostHeldSegments = std::uint64_t{8} * 1024 * 1024;
+constexpr std::uint64_t maximumHeldSegments = std::uint64_t{8} * 1024 * 1024;
 /// The flag under which the cache keeps what the members of a segment share, beside the check of its form: that changes
 /// when members are removed.
 constexpr std::uint64_t sharedFlag = std::uint64_t{1} << 63U;
 /// A version is that many steps from one that is no difference at most, one for each bit of its number.
-constexpr std::size_t mostSteps = 64;
+constexpr std::size_t maximumSteps = 64;
 
 } // namespace
 
@@ -57,7 +57,7 @@ std::shared_ptr<const Segment> SegmentReader::UnverifiedSegmentAt(std::uint64_t 
     if (found != segments_.end())
         return found->second;
     auto segment = std::make_shared<const Segment>(number, Load(number), Segment::Verified::Later);
-    if (held_ + segment->FormSize() > mostHeldSegments) {
+    if (held_ + segment->FormSize() > maximumHeldSegments) {
         segments_.clear();
         held_ = 0;
     }
@@ -125,7 +125,7 @@ Form SegmentReader::DifferentForm(Place place) {
             steps.push_back({std::move(segment), member, place});
             place = base;
         }
-        if (steps.size() > mostSteps)
+        if (steps.size() > maximumSteps)
             throw Malformed();
     }
     for (; !steps.empty(); steps.pop_back()) {

@@ -8,8 +8,8 @@ namespace KivArchive {
 
 namespace {
 
-/// The most bytes that SQLite can be asked to give rows for at once stays bounded, whatever a host asks for.
-constexpr std::size_t mostRows = 1U << 20U;
+/// How many rows are asked of SQLite at once stays bounded, whatever a host asks for.
+constexpr std::size_t maximumRows = 1U << 20U;
 
 /// Reads facts within one transaction.
 class FactsReader {
@@ -52,7 +52,7 @@ Buffer BufferOf(ByteView bytes) {
 }
 
 std::int64_t LimitOf(std::size_t limit) noexcept {
-    return static_cast<std::int64_t>(std::min(limit, mostRows));
+    return static_cast<std::int64_t>(std::min(limit, maximumRows));
 }
 
 } // namespace

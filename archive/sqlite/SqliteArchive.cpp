@@ -9,7 +9,7 @@ namespace KivArchive {
 namespace {
 
 /// Connections kept for the next call.
-constexpr std::size_t mostIdle = 8;
+constexpr std::size_t maximumIdle = 8;
 
 } // namespace
 
@@ -18,7 +18,7 @@ SqliteStore::SqliteStore(std::string filePath, SqliteOptions const& givenOptions
     auto first = std::make_unique<Connection>(path, options.create ? Database::Access::Make : Database::Access::Use,
                                               options.wait);
     EnsureSchema(first->database, options.create);
-    connections.reserve(mostIdle);
+    connections.reserve(maximumIdle);
     connections.push_back(std::move(first));
 }
 
@@ -38,7 +38,7 @@ std::unique_ptr<Connection> SqliteStore::Take() {
 
 void SqliteStore::GiveBack(std::unique_ptr<Connection> connection) noexcept {
     std::scoped_lock const lock(connectionsMutex);
-    if (connections.size() < mostIdle)
+    if (connections.size() < maximumIdle)
         connections.push_back(std::move(connection));
 }
 

@@ -53,8 +53,8 @@ public:
         : old_(sequences[0]), new_(sequences[1]), places_(places), changed_(changed),
           forward_(old_.size() + new_.size() + 3), backward_(forward_.size()),
           middle_(static_cast<Position>(new_.size()) + 1) {
-        while (mostSteps_ * mostSteps_ < static_cast<Position>(forward_.size()))
-            mostSteps_ *= 2;
+        while (maximumSteps_ * maximumSteps_ < static_cast<Position>(forward_.size()))
+            maximumSteps_ *= 2;
     }
 
     void Run() {
@@ -164,7 +164,7 @@ private:
                 if (!meetForward && ahead.least <= d && d <= ahead.greatest && x <= Forward(d))
                     return {x, x - d};
             }
-            if (steps >= mostSteps_)
+            if (steps >= maximumSteps_)
                 return Farthest(box, ahead, back);
         }
     }
@@ -195,7 +195,7 @@ private:
     std::vector<Position> forward_;
     std::vector<Position> backward_;
     Position middle_;
-    Position mostSteps_ = 256;
+    Position maximumSteps_ = 256;
 };
 
 /// Slides groups of changed lines along equal lines to where they end last, or to where the other side has changes, too: so
@@ -336,12 +336,12 @@ std::vector<LineChange> ToChanges(std::array<Flags, 2> const& changed, std::size
 } // namespace
 
 std::vector<LineChange> CompareLines(Lines const& before, Lines const& after) {
-    const std::size_t fewest = std::min(before.GetCount(), after.GetCount());
+    const std::size_t shorter = std::min(before.GetCount(), after.GetCount());
     std::size_t same = 0;
-    while (same < fewest && before[same] == after[same])
+    while (same < shorter && before[same] == after[same])
         ++same;
     std::size_t sameAtEnd = 0;
-    while (sameAtEnd < fewest - same &&
+    while (sameAtEnd < shorter - same &&
            before[before.GetCount() - 1 - sameAtEnd] == after[after.GetCount() - 1 - sameAtEnd])
         ++sameAtEnd;
     const auto middleOf = [=](Lines const& lines) {

@@ -67,9 +67,9 @@ private:
 
 } // namespace
 
-TextDifferences DiffTextLines(KivVcs::Buffer const& before, KivVcs::Buffer const& after, std::uint64_t mostBytes) {
-    const auto old = Lines::Split(before, mostBytes);
-    const auto fresh = Lines::Split(after, mostBytes);
+TextDifferences DiffTextLines(KivVcs::Buffer const& before, KivVcs::Buffer const& after, std::uint64_t maximumBytes) {
+    const auto old = Lines::Split(before, maximumBytes);
+    const auto fresh = Lines::Split(after, maximumBytes);
     if (!old || !fresh)
         return {};
     return {true, CompareLines(*old, *fresh)};
@@ -77,8 +77,8 @@ TextDifferences DiffTextLines(KivVcs::Buffer const& before, KivVcs::Buffer const
 
 std::optional<KivVcs::Buffer> UnifiedText(KivVcs::Buffer const& before, KivVcs::Buffer const& after,
                                           UnifiedTextOptions const& options) {
-    const auto old = Lines::Split(before, options.mostBytes);
-    const auto fresh = Lines::Split(after, options.mostBytes);
+    const auto old = Lines::Split(before, options.maximumBytes);
+    const auto fresh = Lines::Split(after, options.maximumBytes);
     if (!old || !fresh)
         return std::nullopt;
     const std::vector<LineChange> changes = CompareLines(*old, *fresh);

@@ -4,8 +4,8 @@
 
 namespace KivArchive {
 
-std::optional<Lines> Lines::Split(KivVcs::Buffer const& content, std::uint64_t mostBytes) {
-    if (content.GetSize() > mostBytes)
+std::optional<Lines> Lines::Split(KivVcs::Buffer const& content, std::uint64_t maximumBytes) {
+    if (content.GetSize() > maximumBytes)
         return std::nullopt;
     Lines lines(content);
     const auto chunks = content.LockForRead();

@@ -10,7 +10,7 @@ namespace KivArchive {
 class Lines {
 public:
     /// Nothing if the content is no text.
-    static std::optional<Lines> Split(KivVcs::Buffer const& content, std::uint64_t mostBytes);
+    static std::optional<Lines> Split(KivVcs::Buffer const& content, std::uint64_t maximumBytes);
 
     Lines(Lines const&) = delete;
     Lines(Lines&&) noexcept = default;

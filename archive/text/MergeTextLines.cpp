@@ -127,9 +127,9 @@ private:
 
 TextMerge MergeTextLines(KivVcs::Buffer const& base, KivVcs::Buffer const& left, KivVcs::Buffer const& right,
                          TextMergeOptions const& options) {
-    const auto baseLines = Lines::Split(base, options.mostBytes);
-    const auto leftLines = Lines::Split(left, options.mostBytes);
-    const auto rightLines = Lines::Split(right, options.mostBytes);
+    const auto baseLines = Lines::Split(base, options.maximumBytes);
+    const auto leftLines = Lines::Split(left, options.maximumBytes);
+    const auto rightLines = Lines::Split(right, options.maximumBytes);
     if (!baseLines || !leftLines || !rightLines)
         return {};
     return Merger(*baseLines, *leftLines, *rightLines, options).Run();

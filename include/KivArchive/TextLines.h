@@ -49,7 +49,7 @@ struct TextDifferences {
 };
 
 [[nodiscard]] KIVARCHIVE_EXPORT TextDifferences DiffTextLines(KivVcs::Buffer const& before, KivVcs::Buffer const& after,
-                                                              std::uint64_t mostBytes = largestText);
+                                                              std::uint64_t maximumBytes = largestText);
 
 struct UnifiedTextOptions {
     /// Behind "---" and "+++".
@@ -57,7 +57,7 @@ struct UnifiedTextOptions {
     KivVcs::KivStringT<char> newLabel = "new";
     /// How many equal lines are shown around changes.
     std::size_t context = 3;
-    std::uint64_t mostBytes = largestText;
+    std::uint64_t maximumBytes = largestText;
 };
 
 /// The differences as text for people and for `patch`; empty if nothing differs.
@@ -85,7 +85,7 @@ struct TextMergeOptions {
     KivVcs::KivStringT<char> leftLabel = "left";
     KivVcs::KivStringT<char> baseLabel = "base";
     KivVcs::KivStringT<char> rightLabel = "right";
-    std::uint64_t mostBytes = largestText;
+    std::uint64_t maximumBytes = largestText;
 };
 
 struct TextMerge {

@@ -62,7 +62,7 @@ struct CollectOptions {
     std::chrono::seconds grace{std::chrono::hours{14 * 24}};
     /// Trees and commits that are kept with all that they reach, though no branch reaches them.
     std::vector<Id> kept;
-    /// The most objects removed in one transaction, and about the most bytes given back in one.
+    /// One transaction removes at most so many objects, or gives back about so many bytes at most.
     std::size_t slice = 1000;
     std::uint64_t sliceBytes = std::uint64_t{4} * 1024 * 1024;
 };

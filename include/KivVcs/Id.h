@@ -45,11 +45,11 @@ public:
     Id(Id const& other) noexcept = default;
     Id(Id&& other) noexcept
         : digest_(other.digest_), hash_(std::exchange(other.hash_, hashOfNull)), text_(std::move(other.text_)),
-          tellsDigest_(std::exchange(other.tellsDigest_, false)) {}
+          isDigest_(std::exchange(other.isDigest_, false)) {}
     Id& operator=(Id other) noexcept {
         digest_ = other.digest_;
         std::swap(hash_, other.hash_);
-        std::swap(tellsDigest_, other.tellsDigest_);
+        std::swap(isDigest_, other.isDigest_);
         text_.Swap(other.text_);
         return *this;
     }
@@ -59,19 +59,19 @@ public:
     /// @throws std::bad_alloc
     [[nodiscard]] KivStringT<char16_t> const& GetText() const;
 
-    [[nodiscard]] bool IsEmpty() const noexcept { return !tellsDigest_ && text_.Get() == nullptr; }
+    [[nodiscard]] bool IsEmpty() const noexcept { return !isDigest_ && text_.Get() == nullptr; }
 
     /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
     [[nodiscard]] std::size_t Hash() const noexcept { return hash_; }
 
     /// The digest that the text stands for; null if it is not 64 lowercase hexadecimal digits.
-    [[nodiscard]] Digest const* GetDigest() const noexcept { return tellsDigest_ ? &digest_ : nullptr; }
+    [[nodiscard]] Digest const* GetDigest() const noexcept { return isDigest_ ? &digest_ : nullptr; }
 
     friend bool operator==(Id const& left, Id const& right) noexcept {
-        if (left.hash_ != right.hash_ || left.tellsDigest_ != right.tellsDigest_)
+        if (left.hash_ != right.hash_ || left.isDigest_ != right.isDigest_)
             return false;
         // A text that stands for a digest is always kept as one, so that the two kinds never have the same text.
-        return left.tellsDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
+        return left.isDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
     }
 
     /// The order of the texts.
@@ -80,7 +80,7 @@ public:
 private:
     friend class detail::CachedId;
 
-    Id(Digest const& digest, std::size_t hash) noexcept : digest_(digest), hash_(hash), tellsDigest_(true) {}
+    Id(Digest const& digest, std::size_t hash) noexcept : digest_(digest), hash_(hash), isDigest_(true) {}
 
     /// Spelled out only when somebody asks for it, since a repository holds an identifier for every object.
     struct Text final : KivUtils::reference_counted {
@@ -98,7 +98,7 @@ private:
     Digest digest_{};
     std::size_t hash_ = hashOfNull;
     detail::Published<Text> text_;
-    bool tellsDigest_ = false;
+    bool isDigest_ = false;
 };
 
 /// Writes the text of an identifier. @throws std::bad_alloc, and what the stream throws

@@ -97,11 +97,11 @@ optional<Id> Id::Parse(std::string_view digits) noexcept {
 }
 
 std::strong_ordering Id::Compare(Id const& left, Id const& right) noexcept {
-    if (left.tellsDigest_ && right.tellsDigest_)
+    if (left.isDigest_ && right.isDigest_)
         return std::memcmp(left.digest_.data(), right.digest_.data(), left.digest_.size()) <=> 0;
     // Without making a text of a digest, which may fail.
     const auto withUnits = [](Id const& id, auto const& use) {
-        if (id.tellsDigest_)
+        if (id.isDigest_)
             return use(DigestDigits{id.digest_});
         Text const* const text = id.text_.Get();
         return use(text == nullptr ? KivStringViewT<char16_t>() : KivStringViewT<char16_t>(text->text));

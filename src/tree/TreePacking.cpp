@@ -83,10 +83,10 @@ public:
         Object const* const object = entry.held.Packed();
         if (object == nullptr)
             return;
-        const std::size_t most = blobWords.size() + 3 * static_cast<std::size_t>(entry.name.GetLength()) + 1 + idLength;
-        if (most > bytes_.size())
+        const std::size_t size = blobWords.size() + 3 * static_cast<std::size_t>(entry.name.GetLength()) + 1 + idLength;
+        if (size > bytes_.size())
             return AddAsking(entry.name, *object);
-        if (most > bytes_.size() - used_)
+        if (size > bytes_.size() - used_)
             Flush();
         const std::string_view words = WordsFor(entry.held);
         char* out = bytes_.data() + used_;

@@ -91,7 +91,7 @@ TEST(TextLines, WhatIsNoTextIsGivenUp) {
     const std::string binary("a\0b\n", 4);
     EXPECT_EQ(Merged("a\n", binary, "a\n") + Merged(binary, "a\n", "a\n") + Merged("a\n", "a\n", binary),
               "gave upgave upgave up");
-    EXPECT_EQ(Merge("a\n", "b\n", "a\n", {.mostBytes = 1}).result, TextMergeResult::GaveUp);
+    EXPECT_EQ(Merge("a\n", "b\n", "a\n", {.maximumBytes = 1}).result, TextMergeResult::GaveUp);
     EXPECT_FALSE(DiffTextLines(Content("a"), Content(binary)).areTexts || UnifiedText(Content(binary), Content("")) ||
                  DiffTextLines(Content("abc"), Content("a"), 2).areTexts);
     EXPECT_TRUE(DiffTextLines(Content("a"), Content("a")).areTexts);
