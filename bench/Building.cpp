@@ -32,6 +32,19 @@ Round Blobs(std::int64_t count, std::int64_t size, bool copied) {
     return Storing(static_cast<std::uint64_t>(count), bring, store, content);
 }
 
+/// A blob from a vector that the host hands over.
+Round AdoptedBlob(std::int64_t size) {
+    const auto content = std::make_shared<std::vector<char>>(static_cast<std::size_t>(size), 'c');
+    const auto bring = [content] {
+        auto const* const bytes = reinterpret_cast<std::byte const*>(content->data());
+        return std::vector<std::byte>(bytes, bytes + content->size());
+    };
+    const auto store = [](Repository& repo, std::vector<std::byte>& bytes) {
+        repo.SyncWithStorage(immu::make<Blob>(Blob::AdoptBytes(std::move(bytes))));
+    };
+    return Storing(1, bring, store, content);
+}
+
 Round FilesByPath(std::int64_t count, std::vector<int> const& directories) {
     const auto bring = [count] { return SmallContents(count); };
     const auto add = [paths = FilePaths(count, directories)](Repository& repo, std::vector<Buffer>& contents) {
@@ -126,6 +139,8 @@ void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divi
                 {copied ? "B1 one blob, copied" : "B1 one blob", size, limits, [=] { return Blobs(1, size, copied); }});
         }
     }
+    add("B1 one blob, handed over", std::int64_t{1} << 24, {1.03}, AdoptedBlob);
+    add("B1 16 MiB, copied", std::int64_t{1} << 24, {1.25}, [](auto size) { return Blobs(1, size, true); });
     addBlobs("B2 blobs of 64 KiB", 1000, 65536, {1.25, 65536 + 600});
     addBlobs("B3 blobs of 200 B", 100'000, 200, {2.5, 200 + 260});
     add("B4 files by path, one directory", 16'000, {1.5, 6144}, [](auto count) { return FilesByPath(count, {}); });

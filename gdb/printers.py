@@ -120,9 +120,10 @@ class Buffers:
         """Address and size of each."""
         if not self.known or int(self.content) == 0:
             return
-        if not self.content["isChain"]:
-            block = self.content.cast(gdb.lookup_type("KivUtils::Memory::Buffer::Block").pointer())
-            yield int(block + 1), self.size()
+        kind = str(self.content["kind"]).rpartition("::")[2]
+        if kind != "Chain":
+            block = self.content.cast(gdb.lookup_type("KivUtils::Memory::Buffer::%sBlock" % kind.replace("Block", "")).pointer())
+            yield int(block["bytes"] if kind == "Adopted" else block + 1), self.size()
             return
         chain = self.content.cast(gdb.lookup_type("KivUtils::Memory::Buffer::Chain").pointer())
         for piece in elements_of(chain["chunks"]):

@@ -266,7 +266,7 @@ TEST(Buffer, BehavesLikeATextWhateverIsShared) {
         const std::string source = models[other];
         const std::size_t offset = below(source.size() + 2);
         const std::size_t size = below(source.size() + 2);
-        switch (below(5)) {
+        switch (below(6)) {
         case 0: {
             const std::size_t sizes[] = {1, 40, 511, 512, 5000, 70'000};
             const auto bytes = pool.substr(below(70'000), 1 + below(sizes[below(6)]));
@@ -291,6 +291,10 @@ TEST(Buffer, BehavesLikeATextWhateverIsShared) {
             ASSERT_TRUE(offset + size > source.size() || part == source.substr(offset, size));
             break;
         }
+        case 4:
+            model = pool.substr(below(70'000), below(2) == 0 ? 500 : 20'000);
+            buffer = Buffer::Adopt(std::string(model));
+            break;
         default:
             buffer = buffers[other];
             model = source;
@@ -322,6 +326,43 @@ TEST(Buffer, SharesLargeChunksAndNeverMovesThem) {
     EXPECT_THROW(Buffer{std::numeric_limits<std::uint64_t>::max()}, std::length_error);
     copy.Append(nullptr, 5);
     EXPECT_EQ(ContentOf(copy), zeros + "another");
+}
+
+template <class... Memory>
+concept Adoptable = requires(Memory&&... memory) { Buffer::Adopt(std::forward<Memory>(memory)...); };
+
+TEST(Buffer, AdoptsWhatIsOwnedAndNothingElse) {
+    std::vector<std::byte> bytes(1000, std::byte{'v'});
+    const void* const at = bytes.data();
+    Buffer adopted = Buffer::Adopt(std::move(bytes));
+    const Buffer copy = adopted;
+    adopted.Append("more", 4);
+    EXPECT_TRUE(bytes.empty() && copy.LockForRead().begin()->data() == at); // NOLINT(bugprone-use-after-move)
+    EXPECT_EQ(ContentOf(copy), std::string(1000, 'v'));
+    EXPECT_EQ(ContentOf(adopted), std::string(1000, 'v') + "more");
+
+    for (const std::size_t size : {511, 70'000}) {
+        const std::string text(size, 't');
+        int given = 0;
+        const auto giveBack = [&given](const void* memory) noexcept { given += memory == nullptr ? 100 : 1; };
+        std::unique_ptr<const void, decltype(giveBack)> memory(text.data(), giveBack);
+        {
+            Buffer framed;
+            framed.Append(Buffer::Adopt(std::move(memory), text.size()), 1, size);
+            EXPECT_EQ(ContentOf(framed), text.substr(1));
+            EXPECT_TRUE(memory == nullptr && given == (size < 512 ? 1 : 0)); // NOLINT(bugprone-use-after-move)
+        }
+        EXPECT_EQ(given, 1);
+    }
+    EXPECT_EQ(Buffer::Adopt(std::unique_ptr<char[]>(), 5).GetSize(), 0U);
+
+    static_assert(Adoptable<std::string> && Adoptable<std::vector<char>> && Adoptable<std::unique_ptr<char[]>, int>);
+    static_assert(!Adoptable<std::string&> && !Adoptable<const std::string> && !Adoptable<std::string_view>);
+    static_assert(!Adoptable<std::vector<std::byte>&> && !Adoptable<std::span<std::byte>>);
+    static_assert(!Adoptable<std::byte*, int> && !Adoptable<const char*> && !Adoptable<std::vector<int>>);
+    static_assert(!Adoptable<std::unique_ptr<char[]>&, int> && !Adoptable<std::unique_ptr<int[]>, int>);
+    static_assert(!std::is_convertible_v<std::string, Buffer> &&
+                  !std::is_convertible_v<std::vector<std::byte>, Buffer>);
 }
 
 TEST(Stream, ReadsAndAppendsAtIndependentPositions) {

@@ -6,9 +6,16 @@
 #include "KivPlatform/Export.h"
 #include "KivPlatform/counted_ptr.h"
 
+#include <concepts>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
+#include <optional>
 #include <span>
+#include <string>
+#include <type_traits>
+#include <utility>
+#include <vector>
 
 namespace KivUtils::Memory {
 
@@ -31,6 +38,10 @@ private:
     const Chunk* chunks_ = nullptr;
     std::size_t count_ = 0;
 };
+
+/// What containers of bytes hold.
+template <class T>
+concept OneByte = std::same_as<T, std::byte> || std::same_as<T, char> || std::same_as<T, unsigned char>;
 
 /// A value of bytes, as large as a pointer: copying it shares its chunks and allocates nothing, appending one buffer to
 /// another shares large chunks and copies only small ones, and bytes once appended never move while they are shared.
@@ -66,6 +77,26 @@ public:
         return result;
     }
 
+    /// A buffer of the bytes that @p bytes owns, which are not copied: they move in with all of the container's capacity, and
+    /// stay until no buffer shares them. What is appended later goes elsewhere. Fewer than 512 bytes are copied after all,
+    /// since that takes less memory. Either way @p bytes is empty then.
+    /// @throws std::bad_alloc; @p bytes is as before then
+    template <OneByte Byte, class Allocator>
+    [[nodiscard]] static Buffer Adopt(std::vector<Byte, Allocator>&& bytes) {
+        return AdoptFrom(bytes, bytes.size(), [](auto const& owned) { return owned.data(); });
+    }
+    template <OneByte Byte, class Traits, class Allocator>
+    [[nodiscard]] static Buffer Adopt(std::basic_string<Byte, Traits, Allocator>&& text) {
+        return AdoptFrom(text, text.size(), [](auto const& owned) { return owned.data(); });
+    }
+    /// The same for any other memory: the @p size bytes at `memory.get()`, which nobody changes any more and which the
+    /// deleter gives back. Null memory has no bytes.
+    template <class T, class Deleter>
+        requires(std::is_void_v<T> || OneByte<std::remove_cv_t<std::remove_extent_t<T>>>)
+    [[nodiscard]] static Buffer Adopt(std::unique_ptr<T, Deleter>&& memory, std::uint64_t size) {
+        return AdoptFrom(memory, memory == nullptr ? 0 : size, [](auto const& owned) { return owned.get(); });
+    }
+
     /// The content as chunks, without copying.
     [[nodiscard]] BufferChunks LockForRead() const noexcept;
 
@@ -79,20 +110,60 @@ public:
     void Swap(Buffer& other) noexcept { content_.swap(other.content_); }
 
 private:
-    /// What a buffer points to: one block of bytes, or a chain of pieces of blocks.
-    struct Content : KivPlatform::reference_counted {
-        Content(bool chain, std::uint64_t bytes) noexcept : isChain(chain), size(bytes) {}
+    enum class Kind : std::uint32_t { Block, Adopted, Chain };
 
-        bool isChain;
+    /// What a buffer points to: one block of bytes, which are its own or adopted, or a chain of pieces of blocks.
+    struct Content : KivPlatform::reference_counted {
+        Content(Kind what, std::uint64_t bytes, std::size_t further) noexcept
+            : kind(what), room(further & mostRoom), size(bytes) {}
+
+        static constexpr std::uint32_t mostRoom = (1U << 30U) - 1;
+
+        Kind kind : 2;
+        /// How many bytes a block can take behind those that it has.
+        std::uint32_t room : 30;
         std::uint64_t size;
     };
+    /// What adopted bytes live in.
+    struct Owner {
+        Owner() noexcept = default;
+        Owner(Owner const&) = delete;
+        Owner& operator=(Owner const&) = delete;
+        virtual ~Owner() = default;
+    };
+    template <class Memory>
+    struct OwnerOf final : Owner {
+        std::optional<Memory> memory;
+    };
     struct Block;
+    struct AdoptedBlock;
     struct Chain;
     struct DestroyContent {
         void operator()(Content* content) const noexcept { Destroy(content); }
     };
     template <class T>
     using Handle = KivPlatform::counted_ptr<T, DestroyContent>;
+
+    /// Smaller pieces are copied: sharing one costs about as much memory as it holds.
+    static constexpr std::size_t smallestSharedPiece = 512;
+
+    template <class Memory, class BytesOf>
+    [[nodiscard]] static Buffer AdoptFrom(Memory& memory, std::uint64_t size, BytesOf bytesOf) {
+        static_assert(std::is_nothrow_move_constructible_v<Memory>, "so that what it holds is never lost half-way");
+        Buffer result;
+        if (size < smallestSharedPiece) {
+            result.Append(bytesOf(memory), size);
+            const Memory last(std::move(memory));
+            return result;
+        }
+        auto owner = std::make_unique<OwnerOf<Memory>>();
+        auto& owned = owner->memory;
+        result.Own(std::move(owner), size);
+        result.ShowOwned(bytesOf(owned.emplace(std::move(memory))));
+        return result;
+    }
+    void Own(std::unique_ptr<Owner> owner, std::uint64_t size);
+    void ShowOwned(const void* bytes) noexcept;
 
     std::byte* Allocate(std::uint64_t size);
     void AppendOnce(const std::byte* data, std::size_t size);

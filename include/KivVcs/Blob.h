@@ -32,6 +32,17 @@ public:
     [[nodiscard]] static optional<Blob> CopyRest(StreamIO& stream);
     [[nodiscard]] static optional<Blob> CopyRest(std::istream& stream);
 
+    /// A blob with the bytes that @p text or @p bytes owns, which are not copied, or with the @p size bytes at
+    /// `memory.get()`: see `Buffer::Adopt`. @throws std::bad_alloc; what was to be adopted is as before then
+    [[nodiscard]] static Blob AdoptText(std::string&& text) { return Blob(Buffer::Adopt(std::move(text))); }
+    [[nodiscard]] static Blob AdoptBytes(std::vector<std::byte>&& bytes) {
+        return Blob(Buffer::Adopt(std::move(bytes)));
+    }
+    template <class T, class Deleter>
+    [[nodiscard]] static Blob AdoptBytes(std::unique_ptr<T, Deleter>&& memory, std::uint64_t size) {
+        return Blob(Buffer::Adopt(std::move(memory), size));
+    }
+
     /// "blob"
     [[nodiscard]] KivStringT<char> GetHeader() const override;
     /// "100644"

@@ -11,9 +11,6 @@ namespace KivUtils::Memory {
 
 namespace {
 
-/// Smaller pieces are copied when buffers are joined: sharing one costs about as much memory as it holds.
-constexpr std::size_t smallestSharedPiece = 512;
-
 /// A single block grows by copying up to this size; beyond it new bytes go into further blocks and nothing is copied.
 constexpr std::size_t largestCopiedBlock = 65536;
 
@@ -23,40 +20,55 @@ std::size_t RoomForGrowth(std::uint64_t content) noexcept {
 
 } // namespace
 
-/// Bytes in the same allocation as their header. They are written once; what a piece shows never changes.
-struct Buffer::Block final : Content {
-    explicit Block(std::size_t room) noexcept : Content(false, 0), capacity(room) {}
+/// Bytes in the same allocation as their header, unless they are adopted. They are written once; what a piece shows never
+/// changes.
+struct Buffer::Block : Content {
+    using Content::Content;
 
-    static Handle<Block> Make(std::size_t capacity) {
-        if (capacity > std::numeric_limits<std::size_t>::max() / 2)
+    /// A block of @p size bytes, which are the caller's to write, with room for @p further ones.
+    static Handle<Block> Make(std::size_t size, std::size_t further) {
+        if (size > std::numeric_limits<std::size_t>::max() / 2)
             throw std::length_error("buffer larger than the address space");
-        return Handle<Block>(::new (::operator new(sizeof(Block) + capacity)) Block(capacity));
+        return Handle<Block>(::new (::operator new(sizeof(Block) + size + further)) Block(Kind::Block, size, further));
     }
 
-    [[nodiscard]] std::byte* Bytes() noexcept { return reinterpret_cast<std::byte*>(this + 1); }
-    [[nodiscard]] std::size_t Room() const noexcept { return capacity - static_cast<std::size_t>(size); }
-    [[nodiscard]] BufferChunks::Chunk Chunk() noexcept { return {Bytes(), static_cast<std::size_t>(size)}; }
+    [[nodiscard]] const std::byte* Bytes() const noexcept;
+    [[nodiscard]] BufferChunks::Chunk Chunk() const noexcept { return {Bytes(), static_cast<std::size_t>(size)}; }
 
+    /// Where a block that has not adopted its bytes has them. @pre nobody else sees what is written
+    [[nodiscard]] std::byte* OwnBytes() noexcept { return reinterpret_cast<std::byte*>(this + 1); }
     void Write(const std::byte* data, std::size_t count) noexcept {
-        std::memcpy(Bytes() + size, data, count);
+        std::memcpy(OwnBytes() + size, data, count);
         size += count;
+        room = (room - count) & mostRoom;
     }
-
-    std::size_t capacity;
 };
 
+struct Buffer::AdoptedBlock final : Block {
+    AdoptedBlock(std::unique_ptr<Owner> keeper, std::uint64_t count) noexcept
+        : Block(Kind::Adopted, count, 0), owner(std::move(keeper)) {}
+
+    std::unique_ptr<Owner> owner;
+    const std::byte* bytes = nullptr;
+};
+
+const std::byte* Buffer::Block::Bytes() const noexcept {
+    return kind == Kind::Adopted ? static_cast<AdoptedBlock const*>(this)->bytes
+                                 : reinterpret_cast<const std::byte*>(this + 1);
+}
+
 struct Buffer::Chain final : Content {
-    Chain() noexcept : Content(true, 0) {}
+    Chain() noexcept : Content(Kind::Chain, 0, 0) {}
 
     /// Makes room for one more piece, so that adding it cannot fail half-way.
     void Reserve() {
         const std::size_t count = chunks.size() + 1;
         if (count <= chunks.capacity() && count <= ends.capacity() && count <= owners.capacity())
             return;
-        const std::size_t room = std::max(count, 2 * chunks.size());
-        chunks.reserve(room);
-        ends.reserve(room);
-        owners.reserve(room);
+        const std::size_t more = std::max(count, 2 * chunks.size());
+        chunks.reserve(more);
+        ends.reserve(more);
+        owners.reserve(more);
     }
 
     /// Adds a piece of a block. @pre there is room
@@ -77,7 +89,7 @@ struct Buffer::Chain final : Content {
         if (owners.empty() || owners.back().use_count() != 1)
             return 0;
         const auto* pieceEnd = chunks.back().data() + chunks.back().size();
-        return pieceEnd == owners.back()->Bytes() + owners.back()->size ? owners.back()->Room() : 0;
+        return pieceEnd == owners.back()->Bytes() + owners.back()->size ? owners.back()->room : 0;
     }
 
     void WriteAtEnd(const std::byte* data, std::size_t count) noexcept {
@@ -93,13 +105,27 @@ struct Buffer::Chain final : Content {
 };
 
 void Buffer::Destroy(Content* content) noexcept {
-    if (content->isChain) {
+    switch (content->kind) {
+    case Kind::Chain:
         delete static_cast<Chain*>(content);
-    } else {
-        auto* block = static_cast<Block*>(content);
-        block->~Block();
-        ::operator delete(block);
+        return;
+    case Kind::Adopted:
+        delete static_cast<AdoptedBlock*>(content);
+        return;
+    case Kind::Block:
+        break;
     }
+    auto* block = static_cast<Block*>(content);
+    block->~Block();
+    ::operator delete(block);
+}
+
+void Buffer::Own(std::unique_ptr<Owner> owner, std::uint64_t size) {
+    content_ = Handle<Content>(std::make_unique<AdoptedBlock>(std::move(owner), size).release());
+}
+
+void Buffer::ShowOwned(const void* bytes) noexcept {
+    static_cast<AdoptedBlock*>(content_.get())->bytes = static_cast<const std::byte*>(bytes);
 }
 
 Buffer::Buffer(std::uint64_t size) {
@@ -114,7 +140,7 @@ std::uint64_t Buffer::GetSize() const noexcept {
 BufferChunks Buffer::LockForRead() const noexcept {
     if (!content_)
         return {};
-    if (!content_->isChain)
+    if (content_->kind != Kind::Chain)
         return BufferChunks(static_cast<Block*>(content_.get())->Chunk());
     auto const& chain = static_cast<Chain const&>(*content_);
     return {chain.chunks.data(), chain.chunks.size()};
@@ -126,7 +152,7 @@ bool Buffer::Read(std::uint64_t offset, void* destination, std::uint64_t size) c
     if (size == 0)
         return true;
     auto* out = static_cast<std::byte*>(destination);
-    if (!content_->isChain) {
+    if (content_->kind != Kind::Chain) {
         std::memcpy(out, static_cast<Block*>(content_.get())->Bytes() + offset, static_cast<std::size_t>(size));
         return true;
     }
@@ -148,9 +174,8 @@ bool Buffer::Read(std::uint64_t offset, void* destination, std::uint64_t size) c
 std::byte* Buffer::Allocate(std::uint64_t size) {
     if (size > std::numeric_limits<std::size_t>::max() / 2)
         throw std::length_error("buffer larger than the address space");
-    auto block = Block::Make(static_cast<std::size_t>(size));
-    block->size = size;
-    std::byte* const bytes = block->Bytes();
+    auto block = Block::Make(static_cast<std::size_t>(size), 0);
+    std::byte* const bytes = block->OwnBytes();
     content_ = std::move(block);
     return bytes;
 }
@@ -174,17 +199,19 @@ void Buffer::Append(const void* data, std::uint64_t size, std::uint64_t count) {
 
 void Buffer::AppendOnce(const std::byte* data, std::size_t size) {
     const bool unique = content_.use_count() == 1;
-    if (unique && !content_->isChain && static_cast<Block*>(content_.get())->Room() >= size) {
+    if (unique && content_->kind != Kind::Chain && content_->room >= size) {
         static_cast<Block*>(content_.get())->Write(data, size);
         return;
     }
     const auto held = static_cast<std::size_t>(GetSize());
-    if ((!content_ || !content_->isChain) && held + size <= largestCopiedBlock) {
+    if ((!content_ || content_->kind != Kind::Chain) && held + size <= largestCopiedBlock) {
         // The first bytes are taken as the only ones; from the second append on the room doubles.
-        auto grown = Block::Make(held == 0 ? size : std::max(held + size, std::min(2 * held, largestCopiedBlock)));
+        const std::size_t joined = held + size;
+        auto grown =
+            Block::Make(joined, held == 0 ? 0 : std::max(joined, std::min(2 * held, largestCopiedBlock)) - joined);
         if (held > 0)
-            grown->Write(static_cast<Block*>(content_.get())->Bytes(), held);
-        grown->Write(data, size);
+            std::memcpy(grown->OwnBytes(), static_cast<Block*>(content_.get())->Bytes(), held);
+        std::memcpy(grown->OwnBytes() + held, data, size);
         content_ = std::move(grown);
         return;
     }
@@ -197,8 +224,9 @@ void Buffer::AppendOnce(const std::byte* data, std::size_t size) {
     const std::size_t fitting = std::min(size, chain.RoomAtEnd());
     Handle<Block> further;
     if (size > fitting) {
-        further = Block::Make(std::max(size - fitting, RoomForGrowth(held)));
-        further->Write(data + fitting, size - fitting);
+        const std::size_t rest = size - fitting;
+        further = Block::Make(rest, std::max(rest, RoomForGrowth(held)) - rest);
+        std::memcpy(further->OwnBytes(), data + fitting, rest);
     }
     if (fitting > 0)
         chain.WriteAtEnd(data, fitting);
@@ -217,7 +245,7 @@ void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t siz
         *this = source;
         return;
     }
-    if (!source.content_->isChain) {
+    if (source.content_->kind != Kind::Chain) {
         auto* block = static_cast<Block*>(source.content_.get());
         AppendPiece(block, block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));
         return;
@@ -245,10 +273,10 @@ void Buffer::AppendPiece(Block* owner, BufferChunks::Chunk piece) {
 }
 
 Buffer::Chain& Buffer::WritableChain() {
-    if (content_ && content_->isChain && content_.use_count() == 1)
+    if (content_ && content_->kind == Kind::Chain && content_.use_count() == 1)
         return static_cast<Chain&>(*content_);
     auto chain = std::make_unique<Chain>();
-    if (content_ && content_->isChain) {
+    if (content_ && content_->kind == Kind::Chain) {
         chain = std::make_unique<Chain>(static_cast<Chain const&>(*content_));
     } else if (content_) {
         auto* block = static_cast<Block*>(content_.get());

@@ -1,6 +1,8 @@
 #include "allocation_faults/World.h"
 #include "support/HostStream.h"
 
+#include <gtest/gtest.h>
+
 namespace KivVcs::Faults {
 namespace {
 
@@ -49,6 +51,20 @@ void CopyBuffers(World& w) {
     w.data.Append("appended four times.", 20, 4);
 }
 
+void AdoptText(World& w) {
+    for (const std::size_t size : {100, 10'000}) {
+        std::string text(size, 'a');
+        try {
+            w.blob = Blob::AdoptText(std::move(text));
+        } catch (...) {
+            if (text.size() != size) // NOLINT(bugprone-use-after-move): a fault takes nothing
+                ADD_FAILURE() << "lost in a fault";
+            throw;
+        }
+    }
+    w.done = w.blob.GetData().GetSize() == 10'000;
+}
+
 // clang-format off
 const Operation operations[] = {
     {"AssignABlob", AssignABlob},
@@ -60,6 +76,7 @@ const Operation operations[] = {
     {"CodeTextsAsUtf8", [](World& w) { w.text = FromUtf8(ToUtf8(u"J\u00f8rn, too long for a short string")); }},
     {"CopyTextOfABlob", [](World& w) { w.blob = Blob::CopyText(w.blob.CopyToString() + ", too long for a short string"); }},
     {"CopyTheRestOfAStream", [](World& w) { auto rest = w.blob.OpenStream(); w.blob = *Blob::CopyRest(rest); }},
+    {"AdoptText", AdoptText},
 };
 // clang-format on
 
