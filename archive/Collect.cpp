@@ -197,6 +197,12 @@ CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgres
         roots.push_back(branch.head);
     Walk walk(archive, index, progress);
     walk.From(roots, true);
+    // Which may be gone already, from before they were kept.
+    std::vector<Id> exchanged;
+    for (ExchangedHead const& head : ReadExchangedHeads(archive))
+        if (!head.tree.IsEmpty() && index.Find(head.tree))
+            exchanged.push_back(head.tree);
+    walk.From(exchanged, false);
 
     CollectReport report;
     report.reached = walk.CountReached();

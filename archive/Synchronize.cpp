@@ -1,4 +1,5 @@
 #include "Changes.h"
+#include "ExchangedHeads.h"
 #include "KivArchive/Upkeep.h"
 
 #include <algorithm>
@@ -360,10 +361,24 @@ std::uint64_t CopyAncestry(IArchive& from, IArchive& to, IProgress* progress) {
     }
 }
 
+/// Records the heads that were brought.
+void RecordHeads(IArchive& from, SynchronizeOptions const& options, std::vector<Branch> const& heads, Change& change) {
+    for (Branch const& head : heads)
+        for (SynchronizedBranch const& branch : options.branches) {
+            if (!(branch.from == head.name))
+                continue;
+            auto const facts = from.ReadAncestry({&head.head, 1}, Follow::Parents, 0);
+            Id const tree = facts.empty() ? Id() : facts.front().tree;
+            change.records.push_back(
+                {RecordOf({branch.to.IsEmpty() ? branch.from : branch.to, head.head, tree}), false, {}});
+        }
+}
+
 void MoveBranches(IArchive& from, IArchive& to, SynchronizeOptions const& options, std::vector<Branch> const& heads) {
     Change change;
     for (Record& record : from.ReadRecords(options.records))
         change.records.push_back({std::move(record), false, {}});
+    RecordHeads(from, options, heads, change);
     for (;;) {
         change.branches.clear();
         auto const present = to.ReadBranches();

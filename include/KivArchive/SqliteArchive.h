@@ -72,4 +72,34 @@ private:
     std::unique_ptr<SqliteStore> store_;
 };
 
+/// What `Salvage` has found.
+struct SalvageReport {
+    /// What was handed over.
+    std::uint64_t objects = 0;
+    std::uint64_t ancestries = 0;
+    /// Segments that were made out and are damaged, or a difference to one that is, and objects that could not be read
+    /// though their segments are sound.
+    std::uint64_t damagedSegments = 0;
+    std::uint64_t lostObjects = 0;
+    /// The branches that were made.
+    std::vector<Branch> branches;
+    /// Those whose head is lost, or whose name stands for something else in the other archive.
+    std::vector<Branch> lostBranches;
+    /// Commits that no other one leads to: what branches stood at whose names are lost.
+    std::vector<Id> lastCommits;
+    std::uint64_t records = 0;
+};
+
+/// Stores in @p to whatever is sound in a damaged file, which is only read, page by page and without SQLite: also where
+/// the tables cannot be opened any more, or an index hides what it leads to. Every object is what its identifier says,
+/// and one page that is damaged loses the segments on it and the versions that are differences to these, nothing else.
+///
+/// Branches, records and facts that cannot be read to their ends are taken from what pages show, where older ones may be
+/// left over: of several heads that which was stored last. What is missing then, `Verify` tells; `Repair` takes it from
+/// another archive.
+/// @param path a file that nobody uses meanwhile
+/// @param progress may be null
+/// @throws ArchiveError of kind `Unavailable` if the file cannot be read, and for what concerns @p to
+KIVARCHIVE_EXPORT SalvageReport Salvage(std::string const& path, IArchive& to, IProgress* progress);
+
 } // namespace KivArchive

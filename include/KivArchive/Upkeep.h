@@ -75,7 +75,8 @@ struct CollectReport {
     std::uint64_t removed = 0;
 };
 
-/// Marks what neither branches nor `kept` reach, along parents, trees, contents and what was merged; removes, those that
+/// Marks what neither branches nor `kept` reach, along parents, trees, contents and what was merged, nor the trees of the
+/// heads last exchanged (`ReadExchangedHeads`), which later merges are made against; removes, those that
 /// name others first, what has been marked for the grace time and is still unreached; and gives the space back. Facts of
 /// ancestry stay.
 ///
@@ -112,8 +113,21 @@ struct SynchronizeReport {
     std::uint64_t ancestries = 0;
 };
 
+/// The head of a branch when `Synchronize` last brought it.
+struct ExchangedHead {
+    /// As in `SynchronizedBranch::to`, or `from` if that is empty.
+    KivStringT<char16_t> branch;
+    Id commit;
+    /// Null if the commit names none.
+    Id tree;
+};
+
+/// What was last brought to @p archive of each branch, which its records that begin with "exchanged/" hold.
+/// @throws ArchiveError
+[[nodiscard]] KIVARCHIVE_EXPORT std::vector<ExchangedHead> ReadExchangedHeads(IArchive& archive);
+
 /// Copies what the branches of @p from reach and @p to lacks, along parents, trees, contents and what was merged; then all
-/// facts of ancestry; and in the last transaction it moves the branches, whatever they stood at, and sets the records.
+/// facts of ancestry; and in the last transaction it moves the branches, whatever they stood at, and sets the records, also those of the heads exchanged.
 ///
 /// Objects are stored children first, those of older commits before those of newer ones, so that an interrupted call is
 /// gone on with by the next one. Everything is compared with its identifier, and read as what it is said to be, before it

@@ -281,10 +281,26 @@ TEST_P(ArchiveUpkeep, SynchronizeBringsHistoriesFactsAndRecords) {
     EXPECT_TRUE(to->FindMissing({&side.object.id, 1}).empty()) << "what was merged comes along";
     EXPECT_EQ(to->GetStatistics().ancestries, from.GetStatistics().ancestries);
     EXPECT_EQ(to->ReadAncestry({&merge.object.id, 1}, Follow::Parents, 0)[0].contains.size(), 2U);
-    EXPECT_EQ(to->ListRecords().size(), 1U);
+    EXPECT_EQ(to->ListRecords().size(), 2U) << "the settings, and the head";
     std::uint64_t const most = from.GetStatistics().bytes * 5 / 4;
     EXPECT_TRUE(!GetParam() || to->GetStatistics().bytes < most) << "differences stay differences";
     EXPECT_EQ(Synchronize(from, *to, Everything(), nullptr).objects, 0U) << "what is there is not copied";
+
+    // Later merges are made against what was brought last, also when its commit is gone.
+    Id const before = from.ReadAncestry({&merge.facts.parent, 1}, Follow::Parents, 0)[0].tree;
+    Change back;
+    back.branches = {{u"master", merge.object.id, merge.facts.parent}};
+    ASSERT_TRUE(from.Apply(back).applied);
+    Synchronize(from, *to, Everything(), nullptr);
+    back.branches = {{u"theirs", merge.facts.parent, {}}};
+    ASSERT_TRUE(to->Apply(back).applied);
+    CollectNow(*to);
+    CollectNow(*to);
+    EXPECT_EQ(to->GetStatistics().commits, 0U);
+    ASSERT_EQ(ReadExchangedHeads(*to).size(), 1U);
+    EXPECT_EQ(ReadExchangedHeads(*to)[0].commit, merge.facts.parent);
+    EXPECT_TRUE(to->FindMissing({&before, 1}).empty()) << "with all that it names:";
+    EXPECT_EQ(ProblemsOf(*to), "");
 }
 
 TEST_P(ArchiveUpkeep, SynchronizeTakesNothingThatIsNotWhatItSays) {
