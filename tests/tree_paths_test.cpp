@@ -125,6 +125,129 @@ TEST_F(TreePaths, ARepositorysAnswerBecomesTheEntryWhateverItIs) {
     EXPECT_EQ(Joined(ToNames(tree->GetDeepBlobPaths())), "a/k b");
 }
 
+/// Blobs and the paths that they are added under, written as `MakeTree` reads them.
+class Additions {
+public:
+    explicit Additions(std::string const& files) {
+        std::istringstream words(files);
+        for (std::string word; words >> word;) {
+            const auto equals = word.find('=');
+            paths_.push_back(Wide(word.substr(0, equals)));
+            blobs_.push_back({paths_.back(), immu::make<Blob>(MakeBlob(word.substr(equals + 1)))});
+        }
+    }
+    std::vector<BlobAtPath> const& All() const { return blobs_; }
+    void AddOneByOne(IRepository& repo, Tree& tree) const {
+        for (auto const& [path, blob] : blobs_)
+            tree.AddBlob(&repo, path, *blob);
+    }
+
+private:
+    std::vector<KivStringT<char16_t>> paths_;
+    std::vector<BlobAtPath> blobs_;
+};
+
+TEST_F(TreePaths, ManyBlobsAreStoredFirstAndThenEachDirectoryOnce) {
+    auto tree = Of("a/k=1 m/x=2");
+    const Additions additions("b=3 m//n/y/=4 a/c/d=5 //=6 a/c/b=7 a/c/d=8");
+    EXPECT_TRUE(tree.write()->AddBlobs(&repo, additions.All()));
+    EXPECT_EQ(repo.Take(),
+              "blob? 3 blob? blob? 4 blob? blob? 5 blob? blob? 7 blob? blob? 8 blob? "
+              "tree? [b=7 d=8] tree? tree? [c/b=7 c/d=8 k=1] tree? tree? [y=4] tree? tree? [n/y=4 x=2] tree?");
+    EXPECT_EQ(Files(tree), "a/c/b=7 a/c/d=8 a/k=1 b=3 m/n/y=4 m/x=2");
+    EXPECT_TRUE(tree->GetDeepBlob(u"b") == additions.All()[0].blob);
+
+    const Id before = tree->GetId();
+    const BlobAtPath nothing[] = {{u"/", immu::make<Blob>()}, {u"z", nullptr}};
+    EXPECT_FALSE(tree.write()->AddBlobs(nullptr, additions.All()) || tree.write()->AddBlobs(&repo, nothing));
+    for (auto const& answer : {tree->GetLocalTree(u"m"), cow_ptr<Tree>()}) {
+        repo.treeAnswer = answer;
+        auto changed = tree;
+        auto expected = tree;
+        EXPECT_TRUE(changed.write()->AddBlobs(&repo, Additions("p/q/r=1").All()));
+        expected.write()->AddBlob(&repo, u"p/q/r", MakeBlob("1"));
+        EXPECT_TRUE(*changed == *expected && changed->GetLocalTree(u"p") == answer);
+    }
+    repo.treeAnswer.reset();
+    for (const char* broken : {"blob?", "tree?"}) {
+        struct Failing : Repository {
+            using Repository::Repository;
+            using Repository::SyncWithStorage;
+            cow_ptr<Tree> SyncWithStorage(cow_ptr<Tree> synchronized) override {
+                return ++trees == 3 ? throw std::runtime_error("full") : Repository::SyncWithStorage(synchronized);
+            }
+            cow_ptr<Blob> GetBlobFromStorage(Id const& id) const override {
+                return *what == 'b' ? throw std::runtime_error("lost") : Repository::GetBlobFromStorage(id);
+            }
+            const char* what = "";
+            int trees = 0;
+        } failing(std::make_unique<MemObjectsStorage>());
+        failing.what = broken;
+        EXPECT_THROW(tree.write()->AddBlobs(&failing, additions.All()), std::runtime_error);
+    }
+    EXPECT_TRUE(tree->GetId() == before && Files(tree) == "a/c/b=7 a/c/d=8 a/k=1 b=3 m/n/y=4 m/x=2");
+}
+
+TEST_F(TreePaths, ManyBlobsMakeTheTreeThatTheyMakeOneByOne) {
+    std::mt19937 random(3);
+    const auto below = [&random](std::size_t limit) { return random() % limit; };
+    for (int round = 0; round < 30; ++round) {
+        auto many = immu::make<Tree>();
+        auto single = many;
+        // Few directories and many names in some rounds, many directories and few names in others.
+        const std::size_t names = round % 3 == 0 ? 500 : 3;
+        // Identifiers do not cover a directory beside a blob of its name, and what is stored in between stands for it.
+        const bool hides = round % 2 == 0;
+        for (int step = 0; step < 3; ++step) {
+            Names files;
+            for (std::size_t count = 1 + below(round % 3 == 0 ? 400 : 30); count > 0; --count) {
+                std::string path;
+                for (std::size_t depth = below(names == 3 ? 4 : 2); depth > 0; --depth)
+                    path += std::string(1, "abc"[below(3)]) + (below(9) == 0 ? "//" : "/");
+                files.push_back(path + std::to_string(below(names)) + (hides && below(20) == 0 ? "/f=" : "=") +
+                                std::to_string(below(5)));
+            }
+            if (below(2) == 0)
+                std::sort(files.begin(), files.end());
+            const Additions additions(Joined(files));
+            Repository one(std::make_unique<MemObjectsStorage>());
+            Repository other(std::make_unique<MemObjectsStorage>());
+            ASSERT_TRUE(many.write()->AddBlobs(&one, additions.All()));
+            additions.AddOneByOne(other, *single.write());
+            ASSERT_EQ(Bytes(many->GetData()), Bytes(single->GetData()));
+            ASSERT_TRUE(*many == *single && (hides || many->GetDeepBlobPaths() == single->GetDeepBlobPaths()));
+            ASSERT_TRUE(one.GetBlobCount() == other.GetBlobCount() && one.GetTreeCount() <= other.GetTreeCount());
+            // A storage that has it all gives what it has, and the tree grows and shrinks as any other does.
+            auto again = immu::make<Tree>();
+            again.write()->AddBlobs(&other, Additions(Files(single)).All());
+            ASSERT_TRUE(hides || *again == *single);
+            for (int edits = hides ? 0 : 100; edits > 0; --edits) {
+                const auto path = additions.All()[below(files.size())].path;
+                if (below(3) == 0)
+                    ASSERT_TRUE(many.write()->AddBlob(&one, path, Blob()) &&
+                                single.write()->AddBlob(&one, path, Blob()));
+                else
+                    ASSERT_EQ(many.write()->RemoveObject(&one, path), single.write()->RemoveObject(&one, path));
+            }
+            ASSERT_TRUE(*many == *single);
+        }
+    }
+}
+
+TEST_F(TreePaths, ManyBlobsMayLieAsDeepAsTheyLike) {
+    std::string path = "file";
+    for (int level = 0; level < 20'000; ++level)
+        path = "d/" + path;
+    const Additions additions(path + "=1 " + path.substr(20'000) + "2=2");
+    Repository silent(std::make_unique<MemObjectsStorage>());
+    auto tree = immu::make<Tree>();
+    EXPECT_TRUE(tree.write()->AddBlobs(&silent, additions.All()));
+    EXPECT_EQ(silent.GetTreeCount(), 20'000U);
+    Tree expected;
+    additions.AddOneByOne(silent, expected);
+    EXPECT_TRUE(*tree == expected && tree->GetDeepBlobCount() == 2);
+}
+
 TEST_F(TreePaths, NamesOfAnyLengthArePackedUpToTheirFirstZero) {
     const std::string one = Identifier("blob", "1");
     const std::string longName(5000, 'n');

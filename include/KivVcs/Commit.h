@@ -101,6 +101,7 @@ public:
     /// @return null, or false, if nothing was added or removed: no repository, a path that cannot be, an unknown
     /// identifier.
     cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
+    bool AddBlobs(IRepository* repo, array_view<BlobAtPath const> blobs);
     cow_ptr<Tree> AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree);
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
     bool RemoveObject(IRepository* repo, KivStringViewT<char16_t> path);

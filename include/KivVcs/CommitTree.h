@@ -27,6 +27,7 @@ public:
     /// As the operations of `Tree`, on a root that is made if there is none, even if nothing is added then. A first add
     /// that throws leaves the holder without a root, as it was.
     cow_ptr<Blob> AddBlob(IRepository* repo, KivStringViewT<char16_t> path, Blob const& blob);
+    bool AddBlobs(IRepository* repo, array_view<BlobAtPath const> blobs);
     cow_ptr<Tree> AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree);
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
     bool RemoveObject(IRepository* repo, KivStringViewT<char16_t> path);

@@ -24,6 +24,12 @@ using PathList = std::vector<KivStringT<char16_t>>;
 /// The deepest nesting of directories that `Tree::Deserialize` reads; what lies deeper counts as not loadable.
 inline constexpr std::size_t deepestLoadedNesting = 131'072;
 
+/// A blob and the path that it is added under.
+struct BlobAtPath {
+    KivStringViewT<char16_t> path;
+    cow_ptr<Blob> blob;
+};
+
 /// A directory: names mapped to blobs and to subtrees.
 ///
 /// Names are single path components. One name may be held both as a blob and as a subtree; lookups by name and the
@@ -79,6 +85,18 @@ public:
     /// The same for an object that the storage holds, a blob before a tree of that identifier; null if it holds
     /// neither.
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
+
+    /// Adds many blobs. Afterwards the entries, and those of the directories below, are what `AddBlob` of one pair after the
+    /// other makes them; the last pair of a path stays. The versions of directories in between are neither made nor stored.
+    /// Pairs of a null blob or a path without components are left out.
+    ///
+    /// Asks @p repo as `AddBlob` does: for all blobs, in the given order, then for the directories on their ways, each after
+    /// those in it, in the order of their names. What is stored if the storage has none is the given blob itself. Identifiers
+    /// are computed as by `Identify`.
+    /// @return whether a blob was added; false, changing nothing, if @p repo is null.
+    /// @complexity linear in the blobs, if those of a directory come together in the order of their names and the directory
+    /// is new, with a factor O(log n) otherwise; plus hashing
+    bool AddBlobs(IRepository* repo, array_view<BlobAtPath const> blobs);
 
     /// `AddBlob` and `AddTree` with the path given as components. An empty last component adds nothing and returns
     /// null, although the trees on the way have been made; an empty one before it makes a tree that is attached

@@ -209,6 +209,10 @@ cow_ptr<Blob> Commit::AddBlob(IRepository* repo, KivStringViewT<char16_t> path, 
     return EditTree(repo, [&](CommitTree& tree) { return tree.AddBlob(repo, path, blob); });
 }
 
+bool Commit::AddBlobs(IRepository* repo, array_view<BlobAtPath const> blobs) {
+    return EditTree(repo, [&](CommitTree& tree) { return tree.AddBlobs(repo, blobs); });
+}
+
 cow_ptr<Tree> Commit::AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree) {
     return EditTree(repo, [&](CommitTree& holder) { return holder.AddTree(repo, path, tree); });
 }

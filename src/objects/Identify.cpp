@@ -12,6 +12,7 @@ class Identification final : public DigestCustomer {
 public:
     /// Finds what has to be identified.
     explicit Identification(array_view<Object const* const> objects) {
+        found_.reserve(objects.size());
         for (Object const* const object : objects) {
             if (object != nullptr && object->GetKnownDigest() == nullptr)
                 Visit(*object);

@@ -29,6 +29,10 @@ cow_ptr<Blob> CommitTree::AddBlob(IRepository* repo, KivStringViewT<char16_t> pa
     return AddTo(root_, [&](Tree& root) { return root.AddBlob(repo, path, blob); });
 }
 
+bool CommitTree::AddBlobs(IRepository* repo, array_view<BlobAtPath const> blobs) {
+    return AddTo(root_, [&](Tree& root) { return root.AddBlobs(repo, blobs); });
+}
+
 cow_ptr<Tree> CommitTree::AddTree(IRepository* repo, KivStringViewT<char16_t> path, Tree const& tree) {
     return AddTo(root_, [&](Tree& root) { return root.AddTree(repo, path, tree); });
 }

@@ -153,6 +153,7 @@ struct TreeAccess {
     }
 
     [[nodiscard]] static EntryTable& Entries(Tree& tree) noexcept { return tree.entries_; }
+    [[nodiscard]] static EntryTable const& Entries(Tree const& tree) noexcept { return tree.entries_; }
 
     /// What an entry becomes that adds @p object: the storage's instance. An object that only the caller holds is stored
     /// itself, any other as a copy, unless there is one.

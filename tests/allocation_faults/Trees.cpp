@@ -11,6 +11,23 @@ void GrowAWideTree(World& w) {
     w.tree = immu::make<Tree>(wide);
 }
 
+template <class T>
+void AddManyBlobs(World& w, T& edited) {
+    const auto other = immu::make<Blob>(MakeBlob("other"));
+    w.done = edited.AddBlobs(
+        &w.repository,
+        std::vector<BlobAtPath>{
+            {u"d/e/new/a", other}, {u"many/100", other}, {u"d/x", other}, {u"n/a", other}, {u"n/b", other}});
+}
+
+void IdentifyManyObjects(World& w) {
+    Commit grown(w.draft);
+    grown.SetDescription(u"another");
+    const Commit line(immu::make<Commit>(grown), false);
+    Identify(std::vector<Object const*>{&line, &w.blob, &w.edited});
+    w.done = line.GetKnownDigest() && w.edited.GetKnownDigest();
+}
+
 void EmptyATree(World& w) {
     Tree shrinking(w.edited);
     for (char16_t name[] = u"many/100"; name[6] < u'4'; name[7] == u'9' ? (++name[6], name[7] = u'0') : ++name[7])
@@ -62,6 +79,9 @@ const Operation operations[] = {
     {"AddBlobToTree", [](World& w) { w.done = !!w.edited.AddBlob(&w.repository, u"d/e/new/deep", w.blob); }},
     {"AddBlobToManyEntries", [](World& w) { w.edited.AddBlob(&w.repository, u"many/110a", w.blob); }},
     {"ReplaceBlobOfTree", [](World& w) { w.sole.AddBlob(&w.repository, u"d/x", MakeBlob("other")); }},
+    {"AddManyBlobsToTree", [](World& w) { AddManyBlobs(w, w.edited); }},
+    {"AddManyBlobsToCommit", [](World& w) { AddManyBlobs(w, w.draft); }},
+    {"IdentifyManyObjects", IdentifyManyObjects},
     {"AddTreeToTree", [](World& w) { w.tree = w.edited.AddTree(&w.repository, u"d/copy", w.sole); }},
     {"AddObjectToTree", [](World& w) { w.sole.AddObject(&w.repository, u"q/r", RootOf(w, "t")->GetId()); }},
     {"RemoveObjectFromTree", [](World& w) { w.done = w.edited.RemoveObject(&w.repository, u"s/t/u"); }},
