@@ -4,6 +4,7 @@
 /// The whole archive.
 
 #include "KivArchive/ArchiveError.h"
+#include "KivArchive/CachingArchive.h"
 #include "KivArchive/ArchivedBlob.h"
 #include "KivArchive/ArchivedRepository.h"
 #include "KivArchive/IArchive.h"

@@ -1,0 +1,368 @@
+#include "caching/NearArchive.h"
+
+#include "Bytes.h"
+#include "Changes.h"
+
+#include <algorithm>
+#include <array>
+#include <exception>
+#include <unordered_set>
+
+namespace KivArchive {
+
+namespace {
+
+/// How many objects are listed or removed at once.
+constexpr std::size_t pageSize = 4096;
+/// Uses are stored in so many records, by the first digits of the identifiers.
+constexpr std::size_t usesRecords = 16;
+/// The size is looked at each time that this part of it has been stored.
+constexpr std::uint64_t partWatched = 16;
+
+/// Calls @p work. @return false if the near archive fails
+template <class Work>
+bool Try(Work work) {
+    try {
+        work();
+        return true;
+    } catch (ArchiveError const&) {
+        // What is not here is read from where it came from.
+        return false;
+    }
+}
+
+/// Uses are noted by the hour, so that most sessions have nothing to note.
+std::uint64_t HourNow() {
+    auto const now = std::chrono::system_clock::now().time_since_epoch();
+    return static_cast<std::uint64_t>(std::chrono::duration_cast<std::chrono::hours>(now).count());
+}
+
+KivStringT<char16_t> NameOfUses(std::size_t number) {
+    char16_t const name[] = {u'u', u's', u'e', u's', u'/', static_cast<char16_t>(u'a' + number), u'\0'};
+    return KivStringT<char16_t>(name);
+}
+
+KivStringT<char16_t> NameOfRecord(KivStringT<char16_t> const& name) {
+    Bytes bytes{std::byte{'r'}, std::byte{'/'}};
+    Append(bytes, BytesOfName(name));
+    return NameOfBytes(bytes);
+}
+
+const KivStringT<char16_t> nameOfBranches(u"branches");
+
+Buffer BufferOf(Bytes const& bytes) {
+    Buffer buffer;
+    buffer.Append(bytes.data(), bytes.size());
+    return buffer;
+}
+
+void AppendDigest(Bytes& bytes, Id::Digest const& digest) {
+    Append(bytes, std::as_bytes(std::span(digest)));
+}
+
+Id::Digest TakeDigest(ByteReader& reader) {
+    Id::Digest digest{};
+    ByteView const bytes = reader.Take(digest.size());
+    std::copy(bytes.begin(), bytes.end(), std::as_writable_bytes(std::span(digest)).begin());
+    return digest;
+}
+
+} // namespace
+
+NearArchive::NearArchive(std::shared_ptr<IArchive> archive, std::uint64_t mostBytes)
+    : archive_(std::move(archive)), mostBytes_(mostBytes) {}
+
+NearArchive::~NearArchive() {
+    try {
+        SaveUses();
+    } catch (...) {
+        // Then these are taken for older than they are.
+        return;
+    }
+}
+
+void NearArchive::Use(Id const& id) {
+    std::scoped_lock const lock(mutex_);
+    used_[id] = ++useCount_;
+}
+
+std::vector<Id> NearArchive::Read(std::span<const Id> ids, ObjectReceiver const& receiver) {
+    std::unordered_set<Id> given;
+    ReadOutcome outcome;
+    std::exception_ptr thrown;
+    bool const isRead = Try([&] {
+        outcome = archive_->Read(ids, [&](ArchivedObject const& object) {
+            if (!given.insert(object.id).second)
+                return;
+            Use(object.id);
+            try {
+                receiver(object);
+            } catch (...) {
+                thrown = std::current_exception();
+                throw;
+            }
+        });
+    });
+    // A receiver's own failure of an archive is not the near one's.
+    if (!isRead && thrown)
+        std::rethrow_exception(thrown);
+    if (!outcome.damaged.empty())
+        Drop(outcome.damaged);
+    std::vector<Id> others;
+    std::unordered_set<Id> met;
+    for (Id const& id : ids)
+        if (given.count(id) == 0 && met.insert(id).second)
+            others.push_back(id);
+    return others;
+}
+
+std::vector<ObjectInfo> NearArchive::Describe(std::span<const Id> ids) {
+    std::vector<ObjectInfo> described;
+    Try([&] { described = archive_->Describe(ids); });
+    return described;
+}
+
+std::optional<Buffer> NearArchive::ReadContent(Id const& id, std::uint64_t offset, std::uint64_t size) {
+    std::optional<Buffer> content;
+    if (!Try([&] { content = archive_->ReadContent(id, offset, size); }))
+        Drop({&id, 1});
+    if (content)
+        Use(id);
+    return content;
+}
+
+void NearArchive::Keep(std::vector<NewObject> objects) {
+    std::uint64_t size = 0;
+    for (NewObject& object : objects) {
+        size += object.data.GetSize();
+        Use(object.id);
+    }
+    Change change;
+    change.objects = std::move(objects);
+    if (!change.objects.empty() && Try([&] { archive_->Apply(change); }))
+        NoteStored(size);
+}
+
+bool NearArchive::KeepContent(Id const& id, StreamIO& content) {
+    std::uint64_t const size = content.GetSize();
+    bool isStored = false;
+    Try([&] { isStored = archive_->StoreContent(id, content, {}, nullptr); });
+    if (!isStored)
+        return false;
+    Use(id);
+    NoteStored(size);
+    return true;
+}
+
+void NearArchive::Drop(std::span<const Id> ids) {
+    Try([&] { RemoveAll(ids); });
+}
+
+void NearArchive::RemoveAll(std::span<const Id> ids) {
+    std::vector<Id> present(ids.begin(), ids.end());
+    auto const missing = archive_->FindMissing(ids);
+    std::unordered_set<Id> const absent(missing.begin(), missing.end());
+    std::erase_if(present, [&absent](Id const& id) { return absent.count(id) != 0; });
+    if (present.empty())
+        return;
+    archive_->Mark(present);
+    archive_->Remove(present, std::chrono::seconds(0));
+}
+
+void NearArchive::NoteStored(std::uint64_t bytes) {
+    {
+        std::scoped_lock const lock(mutex_);
+        if (bytes < unwatched_) {
+            unwatched_ -= bytes;
+            return;
+        }
+        unwatched_ = mostBytes_ / partWatched;
+    }
+    if (std::unique_lock const turn(removing_, std::try_to_lock); turn)
+        Try([this] { RemoveOldest(); });
+}
+
+std::vector<NearArchive::Candidate> NearArchive::ListByUse() {
+    Uses const uses = ReadUses();
+    std::uint64_t const now = HourNow();
+    std::vector<Candidate> candidates;
+    for (Id after;;) {
+        auto const page = archive_->ListObjects(after, pageSize);
+        std::scoped_lock const lock(mutex_);
+        for (ObjectInfo const& info : page) {
+            auto const used = used_.find(info.id);
+            auto const noted = uses.find(DigestOf(info.id));
+            bool const isUsed = used != used_.end();
+            std::uint64_t const hour = isUsed ? now : noted == uses.end() ? 0 : noted->second;
+            candidates.push_back({hour, isUsed ? used->second : 0, info});
+        }
+        if (page.size() < pageSize)
+            break;
+        after = page.back().id;
+    }
+    std::sort(candidates.begin(), candidates.end(), [](Candidate const& left, Candidate const& right) {
+        return std::pair(left.use, left.hour) < std::pair(right.use, right.hour);
+    });
+    return candidates;
+}
+
+void NearArchive::RemoveOldest() {
+    ArchiveStatistics const statistics = archive_->GetStatistics();
+    std::uint64_t const taken = statistics.bytes - std::min(statistics.bytes, statistics.unusedBytes);
+    if (taken <= mostBytes_)
+        return;
+    std::vector<Candidate> const candidates = ListByUse();
+    std::uint64_t sum = 0;
+    for (Candidate const& candidate : candidates)
+        sum += candidate.info.size;
+    // A quarter more than has to go; sizes are told before compression.
+    double const share = static_cast<double>(taken - mostBytes_ + mostBytes_ / 4) / static_cast<double>(taken);
+    auto const wanted = static_cast<std::uint64_t>(share * static_cast<double>(sum));
+    std::vector<Id> page;
+    Uses kept;
+    std::uint64_t removed = 0;
+    for (Candidate const& candidate : candidates) {
+        if (removed >= wanted) {
+            kept.emplace(DigestOf(candidate.info.id), candidate.hour);
+            continue;
+        }
+        removed += candidate.info.size;
+        page.push_back(candidate.info.id);
+        if (page.size() == pageSize)
+            RemoveAll(std::exchange(page, {}));
+    }
+    RemoveAll(page);
+    WriteUses(kept);
+    while (archive_->Compact(mostBytes_ / partWatched) > 0) {
+    }
+}
+
+NearArchive::Uses NearArchive::ReadUses() {
+    std::vector<KivStringT<char16_t>> names;
+    for (std::size_t i = 0; i < usesRecords; ++i)
+        names.push_back(NameOfUses(i));
+    Uses uses;
+    for (Record const& record : archive_->ReadRecords(names)) {
+        Buffer const value = Joined(*record.value);
+        try {
+            for (ByteReader reader(BytesOf(value)); !reader.Rest().empty();) {
+                Id::Digest const digest = TakeDigest(reader);
+                uses[digest] = reader.TakeNumber();
+            }
+        } catch (Malformed const&) {
+            continue;
+        }
+    }
+    return uses;
+}
+
+void NearArchive::WriteUses(Uses const& uses) {
+    std::array<Bytes, usesRecords> values;
+    for (auto const& [digest, hour] : uses) {
+        Bytes& value = values[digest[0] % usesRecords];
+        AppendDigest(value, digest);
+        AppendNumber(value, hour);
+    }
+    Change change;
+    for (std::size_t i = 0; i < usesRecords; ++i)
+        if (values[i].size() <= largestRecord)
+            change.records.push_back({{NameOfUses(i), BufferOf(values[i])}, false, {}});
+    archive_->Apply(change);
+}
+
+void NearArchive::SaveUses() {
+    std::scoped_lock const lock(mutex_);
+    if (used_.empty())
+        return;
+    Uses uses = ReadUses();
+    std::uint64_t const now = HourNow();
+    bool isNew = false;
+    for (auto const& [id, use] : used_) {
+        std::uint64_t& hour = uses[DigestOf(id)];
+        isNew = isNew || hour != now;
+        hour = now;
+    }
+    if (isNew)
+        WriteUses(uses);
+}
+
+void NearArchive::KeepRecord(KivStringT<char16_t> const& name, std::optional<Buffer> value) {
+    {
+        std::scoped_lock const lock(mutex_);
+        auto const known = knownRecords_.find(name);
+        if (known != knownRecords_.end() && SameValue(known->second, value))
+            return;
+        knownRecords_[name] = value;
+    }
+    Change change;
+    change.records.push_back({{name, std::move(value)}, false, {}});
+    Try([&] { archive_->Apply(change); });
+}
+
+void NearArchive::KeepBranches(std::vector<Branch> const& branches) {
+    Bytes bytes;
+    for (Branch const& branch : branches) {
+        Bytes const name = BytesOfName(branch.name);
+        AppendNumber(bytes, name.size());
+        Append(bytes, name);
+        AppendDigest(bytes, DigestOf(branch.head));
+    }
+    KeepRecord(nameOfBranches, BufferOf(bytes));
+}
+
+std::vector<Branch> NearArchive::ReadBranches() {
+    std::vector<Branch> branches;
+    for (Record const& record : archive_->ReadRecords({&nameOfBranches, 1})) {
+        Buffer const value = Joined(*record.value);
+        try {
+            for (ByteReader reader(BytesOf(value)); !reader.Rest().empty();) {
+                KivStringT<char16_t> name = NameOfBytes(reader.Take(reader.TakeNumber()));
+                branches.push_back({std::move(name), Id::FromDigest(TakeDigest(reader))});
+            }
+        } catch (Malformed const&) {
+            break;
+        }
+    }
+    return branches;
+}
+
+void NearArchive::KeepRecords(std::span<const KivStringT<char16_t>> names, std::vector<Record> const& records) {
+    for (auto const& name : names) {
+        auto const found =
+            std::find_if(records.begin(), records.end(), [&name](Record const& record) { return record.name == name; });
+        KeepRecord(NameOfRecord(name), found == records.end() ? std::nullopt : found->value);
+    }
+}
+
+std::vector<Record> NearArchive::ReadRecords(std::span<const KivStringT<char16_t>> names) {
+    std::vector<Record> records;
+    for (auto const& name : names) {
+        auto const nearName = NameOfRecord(name);
+        for (Record& record : archive_->ReadRecords({&nearName, 1}))
+            records.push_back({name, std::move(record.value)});
+    }
+    std::sort(records.begin(), records.end(),
+              [](Record const& left, Record const& right) { return left.name < right.name; });
+    return records;
+}
+
+void NearArchive::KeepAncestry(std::vector<Ancestry> const& facts) {
+    Change change;
+    {
+        std::scoped_lock const lock(mutex_);
+        for (Ancestry const& one : facts)
+            if (auto const [known, isNew] = knownFacts_.try_emplace(one.commit, one.contains.size());
+                isNew || known->second < one.contains.size()) {
+                known->second = one.contains.size();
+                change.ancestry.push_back(one);
+            }
+    }
+    if (!change.ancestry.empty())
+        Try([&] { archive_->Apply(change); });
+}
+
+std::vector<Ancestry> NearArchive::ReadAncestry(std::span<const Id> commits, Follow follow, std::size_t more) {
+    return archive_->ReadAncestry(commits, follow, more);
+}
+
+} // namespace KivArchive
