@@ -47,8 +47,7 @@ compare() {
 
 install_packages build abi
 build_preset abi
-for library in "$build_directory"/libKiv*.so "$build_directory"/*/libKiv*.so; do
-    [ -e "$library" ] || continue
+while IFS= read -r library; do
     name=$(basename "$library" .so)
     version=$(basename "$(readlink -f "$library")")
     version=${version#"$name.so."}
@@ -66,4 +65,4 @@ for library in "$build_directory"/libKiv*.so "$build_directory"/*/libKiv*.so; do
     old_version=$(basename "$baseline" .abi.xz)
     xz --decompress --stdout "$baseline" >"$work/old.abi"
     compare "$name" "${old_version#"$name-"}" "$version" "$work/old.abi" "$work/new.abi"
-done
+done < <(find "$build_directory" -name 'libKiv*.so' | sort)

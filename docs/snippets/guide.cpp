@@ -59,6 +59,10 @@ int main() {
     for (auto const& path : repository.GetHead()->GetCommitTree()->GetAllBlobPaths())
         std::cout << path << ": " << repository.GetHead()->GetBlob(path)->CopyToString();
 
+    Commit described(&repository, true);
+    described.SetDescription(u"Bring the holidays in");
+    std::cout << repository.DoCommit(described)->GetDescription() << '\n';
+
     repository.MoveBranchTo(u"master", repository.GetHead()->GetParent());
     std::cout << "back at: " << repository.GetHead()->GetDescription() << '\n';
 }
