@@ -133,6 +133,7 @@ TEST(Identify, AsksObjectsOfHostsClassesInOrder) {
     // The directory asks again for what it shows.
     EXPECT_EQ(asked, "babaca");
     EXPECT_TRUE(tree.GetKnownDigest() != nullptr && own.GetKnownDigest() != nullptr);
+    EXPECT_EQ(tree.GetId(), Id(tree.GetPackedData()));
     EXPECT_NE(Narrow(tree.ToString()).find("host's a"), std::string::npos);
 }
 
