@@ -1,0 +1,96 @@
+#pragma once
+
+/// @file
+/// What is known of the histories of commits, read as far as it is needed.
+
+#include "KivArchive/Merging.h"
+
+#include <cstdint>
+#include <map>
+#include <unordered_map>
+
+namespace KivArchive {
+
+/// Commits by number, with all that they contain: parents, what was merged, rewritten and found equal. Not a tree, and not
+/// free of cycles: a line of commits may have been rebased there and back.
+class AncestryGraph {
+public:
+    using Node = std::uint32_t;
+
+    /// Where two histories meet.
+    struct Meeting {
+        /// The common ancestors that no other one contains, one for each cycle, ordered by identifier.
+        std::vector<Node> bases;
+        bool leftContainsRight = false;
+        bool rightContainsLeft = false;
+    };
+
+    explicit AncestryGraph(AncestryReader read) : read_(std::move(read)) {}
+
+    /// The number of a commit, whether or not anything is known of it.
+    [[nodiscard]] Node Enter(Id const& commit);
+    [[nodiscard]] Id const& CommitOf(Node node) const noexcept { return *entries_[node].commit; }
+    /// Null for a commit without a tree, and for one of which nothing is known.
+    [[nodiscard]] Id const& TreeOf(Node node) const noexcept { return entries_[node].tree; }
+    [[nodiscard]] bool IsKnown(Node node) const noexcept { return entries_[node].isKnown; }
+
+    /// Reads what is needed for it.
+    [[nodiscard]] Meeting Meet(Node left, Node right);
+
+    /// The earliest commits that @p side contains, @p other does not, and that contain all of @p commits, which both
+    /// sides do: where this side brought them together. For those that @p isUsable rejects the next ones above stand in.
+    /// Empty if there are none, or more than 64 commits are asked about.
+    /// @pre the two have met
+    [[nodiscard]] std::vector<Node> FindFirstWithAll(Node side, Node other, std::span<const Node> commits,
+                                                     std::function<bool(Node)> const& isUsable);
+
+private:
+    struct Entry {
+        Id const* commit = nullptr;
+        Id tree;
+        std::size_t firstLink = 0;
+        std::uint32_t links = 0;
+        bool isRead = false;
+        bool isKnown = false;
+    };
+    /// What a walk has found out about a commit; the next walk forgets it.
+    struct Mark {
+        std::uint64_t walk = 0;
+        /// One bit for each of up to 63 commits that it was reached from; the last one stands for all others.
+        std::uint64_t reachedFrom = 0;
+        std::uint8_t sides = 0;
+        bool isOrdered = false;
+    };
+    /// The links of some commits upside down.
+    using Above = std::unordered_map<Node, std::vector<Node>>;
+
+    static constexpr std::uint8_t leftSide = 1;
+    static constexpr std::uint8_t rightSide = 2;
+    static constexpr std::uint8_t bothSides = leftSide | rightSide;
+    static constexpr std::size_t lastBit = 63;
+
+    [[nodiscard]] std::span<const Node> LinksOf(Node node) const noexcept {
+        return std::span(links_).subspan(entries_[node].firstLink, entries_[node].links);
+    }
+    [[nodiscard]] Mark& MarkOf(Node node) noexcept;
+    void BeginWalk();
+    void Read(std::span<const Node> nodes, std::size_t more);
+    void Learn(Ancestry const& facts);
+    [[nodiscard]] std::vector<Node> Reach(Node from, std::uint8_t side);
+    [[nodiscard]] std::vector<Node> OrderCommon(std::vector<Node> const& reached);
+    [[nodiscard]] std::vector<Node> FindBest(std::vector<Node> const& ordered);
+    [[nodiscard]] std::vector<Node> ReachFromBest(Node best, std::size_t number);
+    /// The commits that contain @p node and are contained in it.
+    /// @param reached all that it contains
+    [[nodiscard]] std::vector<Node> CycleOf(Node node, std::vector<Node> const& reached) const;
+    [[nodiscard]] Above TurnLinks(std::vector<Node> const& nodes) const;
+
+    AncestryReader read_;
+    std::unordered_map<Id, Node> numbers_;
+    std::vector<Entry> entries_;
+    std::vector<Node> links_;
+    std::vector<Mark> marks_;
+    std::uint64_t walk_ = 0;
+};
+
+} // namespace KivArchive
