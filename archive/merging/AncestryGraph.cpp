@@ -142,9 +142,8 @@ std::vector<AncestryGraph::Node> AncestryGraph::FindBest(std::vector<Node> const
     for (Node const node : ordered)
         if (MarkOf(node).reachedFrom == 0) {
             auto const cycle = CycleOf(node, ReachFromBest(node, best.size()));
-            best.push_back(*std::min_element(cycle.begin(), cycle.end(), [this](Node one, Node other) {
-                return CommitOf(one) < CommitOf(other);
-            }));
+            best.push_back(*std::min_element(cycle.begin(), cycle.end(),
+                                             [this](Node one, Node other) { return CommitOf(one) < CommitOf(other); }));
         }
     return best;
 }

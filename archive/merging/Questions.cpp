@@ -187,17 +187,17 @@ void Questions::ShowBase(BaseEntry const& base) {
 
 void Questions::Note(HeldEntry const& left, HeldEntry const& right, BaseEntry const& base, bool isDirectory,
                      ConflictSettlement settlement) {
-    conflicts_.push_back({Join(path_), isDirectory, ChangeOf(base, left), ChangeOf(base, right),
-                          base ? base->id : Id(), left.id, right.id, settlement});
+    conflicts_.push_back({Join(path_), isDirectory, ChangeOf(base, left), ChangeOf(base, right), base ? base->id : Id(),
+                          left.id, right.id, settlement});
     gaveUp_ = gaveUp_ || settlement == ConflictSettlement::Undecided;
 }
 
-ContentResolver MergeTexts(std::uint64_t mostBytes) {
-    return [mostBytes](auto const& /*path*/, DisputedContents const& contents) -> std::optional<Buffer> {
+ContentResolver MergeTexts(std::uint64_t maximumBytes) {
+    return [maximumBytes](auto const& /*path*/, DisputedContents const& contents) -> std::optional<Buffer> {
         if (!contents.base)
             return {};
         TextMergeOptions options;
-        options.mostBytes = mostBytes;
+        options.maximumBytes = maximumBytes;
         TextMerge merge = MergeTextLines(*contents.base, contents.left, contents.right, options);
         return merge.result == TextMergeResult::Merged ? std::optional(std::move(merge.text)) : std::nullopt;
     };

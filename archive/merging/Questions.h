@@ -21,7 +21,8 @@ public:
 
     Questions(KivVcs::IRepository& repo, MergeSources const& sources, MergeResolvers const& resolvers,
               KivVcs::MergeTrees trees)
-        : repo_(repo), sources_(sources), resolvers_(resolvers), trees_(std::move(trees)), isRootWhole_(static_cast<bool>(trees_.root)) {}
+        : repo_(repo), sources_(sources), resolvers_(resolvers), trees_(std::move(trees)),
+          isRootWhole_(static_cast<bool>(trees_.root)) {}
 
     /// The directory that questions are about from now on. The view must stay valid until `Leave`.
     void Enter(KivStringViewT<char16_t> name) { path_.push_back(name); }

@@ -2,6 +2,8 @@
 
 #include "Changes.h"
 
+#include <algorithm>
+
 namespace KivArchive {
 
 LocalFacts::Entry& LocalFacts::EntryOf(KivVcs::Commit const& commit) {
@@ -46,6 +48,11 @@ std::vector<Ancestry> LocalFacts::All() const {
     for (auto const& [id, entry] : entries_)
         all.push_back(entry.facts);
     return all;
+}
+
+bool LocalFacts::TellOfPublished(IsUnpublished const& isUnpublished) const {
+    return std::any_of(entries_.begin(), entries_.end(),
+                       [&isUnpublished](auto const& entry) { return !isUnpublished(entry.first); });
 }
 
 void LocalFacts::ForgetPublished(IsUnpublished const& isUnpublished) {

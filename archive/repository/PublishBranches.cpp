@@ -101,9 +101,10 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
                                                std::vector<RecordChange> const& records, bool asksForAll,
                                                IProgress* progress) {
     Moves pending = PendingMoves(branches);
-    if (pending.moves.empty() && records.empty())
-        return {true, {}, {}};
     State& state = *state_;
+    auto const isUnpublished = [&state](Id const& id) { return state.storage->MayBeUnpublished(id); };
+    if (pending.moves.empty() && records.empty() && !state.facts.TellOfPublished(isUnpublished))
+        return {true, {}, {}};
     auto const commits = MissingCommits(*state.storage, state.facts, state.Archive(), asksForAll).Find(pending.heads);
     Publishing publishing(state.Archive(), *state.storage, state.facts, progress);
     publishing.Store(commits);
@@ -123,11 +124,15 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
         else
             state.branches.find(move.name)->second = {move.head, move.head, {}};
     }
-    state.facts.ForgetPublished([&state](Id const& id) { return state.storage->MayBeUnpublished(id); });
+    state.facts.ForgetPublished(isUnpublished);
     return {true, {}, {}};
 }
 
 PublishMergingOutcome ArchivedRepository::PublishMerging(Resolvers const& resolvers, IProgress* progress) {
+    return PublishMerging(MergeResolvers{resolvers, {}, {}}, progress);
+}
+
+PublishMergingOutcome ArchivedRepository::PublishMerging(MergeResolvers const& resolvers, IProgress* progress) {
     PublishMergingOutcome outcome;
     std::minstd_rand random(
         static_cast<std::uint_fast32_t>(std::chrono::steady_clock::now().time_since_epoch().count()));
@@ -135,7 +140,8 @@ PublishMergingOutcome ArchivedRepository::PublishMerging(Resolvers const& resolv
     while (outcome.attempts < state_->options.attempts) {
         ++outcome.attempts;
         for (auto const& branch : Refresh().diverged) {
-            if (!MergeDiverged(branch, resolvers)) {
+            outcome.merges.push_back(MergeDiverged(branch, resolvers));
+            if (!outcome.merges.back().Succeeded()) {
                 outcome.result = PublishMergingResult::GaveUp;
                 outcome.branch = branch;
                 return outcome;
@@ -152,14 +158,16 @@ PublishMergingOutcome ArchivedRepository::PublishMerging(Resolvers const& resolv
     return outcome;
 }
 
-bool ArchivedRepository::MergeDiverged(KivStringT<char16_t> const& branch, Resolvers const& resolvers) {
+MergeReport ArchivedRepository::MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers) {
     RebaseOntoRewritten(branch);
     KnownBranch& known = state_->branches.at(branch);
-    if (!IsContained(known.published, state_->storage->GetHead(branch)) &&
-        !MergePublished(branch, state_->source->FetchCommit(known.published), resolvers))
-        return false;
-    known.taken = known.published;
-    return true;
+    MergeReport report;
+    report.result = KivVcs::MergeResult::UpToDate;
+    if (!IsContained(known.published, state_->storage->GetHead(branch)))
+        report = MergePublished(branch, state_->source->FetchCommit(known.published), resolvers);
+    if (report.Succeeded())
+        known.taken = known.published;
+    return report;
 }
 
 /// If what the unpublished commits of the branch are on was rewritten, puts them on what stands for it.
@@ -200,8 +208,8 @@ void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch)
     }
 }
 
-bool ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
-                                        Resolvers const& resolvers) {
+MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
+                                               MergeResolvers const& resolvers) {
     /// Makes a branch current as long as it lives, also one in whose place there is none any more.
     class Current {
     public:
@@ -228,11 +236,7 @@ bool ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, cow_ptr
         KivStringT<char16_t> before_;
     };
     Current const current(*this, branch);
-    if (!Merge(theirs, resolvers))
-        return false;
-    if (cow_ptr<Commit> const head = GetHead(branch); head && !(head->GetId() == theirs->GetId()))
-        RecordContained(head, Containment::Merged, theirs);
-    return true;
+    return MergeWithReport(theirs, resolvers);
 }
 
 } // namespace KivArchive

@@ -5,6 +5,7 @@
 
 #include "KivArchive/ArchivedBlob.h"
 #include "KivArchive/IArchive.h"
+#include "KivArchive/Merging.h"
 
 #include <KivVcs/Repository.h>
 
@@ -25,6 +26,8 @@ struct RepositoryOptions {
     /// How long it waits after it has lost a race for the first time, at most; twice as long each further time, up to a
     /// second.
     std::chrono::milliseconds backOff{10};
+    /// Gives the commit of a merge its author and description; what it is told is the commit that is merged. May be empty.
+    std::function<void(Commit& merge, Commit const& merged)> describeMerge;
 };
 
 /// What became of the branches that were to be published.
@@ -56,6 +59,8 @@ struct PublishMergingOutcome {
     unsigned attempts = 0;
     /// The branch that could not be merged; empty if none was refused.
     KivStringT<char16_t> branch;
+    /// What the merges did, those of races that were lost included.
+    std::vector<MergeReport> merges;
 };
 
 /// A repository over an archive, which it may share with others.
@@ -131,14 +136,31 @@ public:
     /// @param progress may be null
     /// @throws as `Publish` and `Refresh`; what resolvers throw
     PublishMergingOutcome PublishMerging(Resolvers const& resolvers, IProgress* progress = nullptr);
+    PublishMergingOutcome PublishMerging(MergeResolvers const& resolvers, IProgress* progress = nullptr);
+
+    /// Moves the current branch if that takes no new commit: to @p commit if that contains the head, or if both have one
+    /// tree and @p commit the smaller identifier; nowhere if the head contains @p commit, or both have one tree and the head
+    /// has the smaller identifier. Of two with one tree the one that is taken is noted to contain the other, so that both
+    /// sides of an exchange end with the same head.
+    /// @return whether the branch has @p commit now
+    bool FastForwardMerge(cow_ptr<Commit> commit) override;
+    /// As `Repository::Merge`, with `FastForwardMerge` and `Merge3Way` of this class.
+    bool Merge(cow_ptr<Commit> commit, Resolvers resolvers) override;
+    /// Merges the tree of @p commit into the current branch with `MergeAgain`, by a new commit that contains both, also if its
+    /// tree is that of one side. `GetCommonBase` is not asked: what counts is what a commit contains, not only its parents.
+    bool Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) override;
+
+    /// `Merge` and `Merge3Way` with all resolvers, and with an account of what was done.
+    MergeReport MergeWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers);
+    MergeReport Merge3WayWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers);
 
 protected:
     /// Notes that @p rebuilt stands for @p old on a rewritten history, for the archive to know once it is published.
     void CommitRewritten(cow_ptr<Commit> old, cow_ptr<Commit> rebuilt) override;
 
-    /// Merges what others have published on @p branch into it, for `PublishMerging`. @return false if that is refused
-    [[nodiscard]] virtual bool MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
-                                              Resolvers const& resolvers);
+    /// Merges what others have published on @p branch into it, for `PublishMerging`, with `MergeWithReport`.
+    [[nodiscard]] virtual MergeReport MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
+                                                     MergeResolvers const& resolvers);
 
     /// Notes that @p commit contains @p contained, for the archive to know once @p commit is published. What was merged is
     /// kept until then, and published along.
@@ -161,7 +183,13 @@ private:
     void RefreshBranch(Branch const& theirs, RefreshOutcome& outcome);
     void ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome);
     void TakePublished(KivStringT<char16_t> const& branch);
-    [[nodiscard]] bool MergeDiverged(KivStringT<char16_t> const& branch, Resolvers const& resolvers);
+    [[nodiscard]] MergeReport MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers);
+    [[nodiscard]] std::optional<KivVcs::MergeResult> MergeWithoutCommit(cow_ptr<Commit> const& commit);
+    void EnterLine(cow_ptr<Commit> commit);
+    [[nodiscard]] AncestryReader FactsReader() const;
+    [[nodiscard]] MergeSources SourcesOfMerge();
+    [[nodiscard]] bool CommitMerge(cow_ptr<Commit> const& head, cow_ptr<Commit> const& commit,
+                                   cow_ptr<KivVcs::Tree> tree);
     void RebaseOntoRewritten(KivStringT<char16_t> const& branch);
 
     std::unique_ptr<State> state_;

@@ -10,6 +10,7 @@
 #include "KivArchive/IArchive.h"
 #include "KivArchive/Listings.h"
 #include "KivArchive/MemArchive.h"
+#include "KivArchive/Merging.h"
 #include "KivArchive/Progress.h"
 #include "KivArchive/SqliteArchive.h"
 #include "KivArchive/TextLines.h"

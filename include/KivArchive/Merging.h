@@ -9,8 +9,8 @@
 #include "KivArchive/IArchive.h"
 #include "KivArchive/TextLines.h"
 
-#include <KivVcs/Conflicts.h>
 #include <KivVcs/IRepository.h>
+#include <KivVcs/MergeOutcome.h>
 
 #include <functional>
 #include <optional>
@@ -47,12 +47,12 @@ struct DisputedContents {
 };
 
 /// Merges contents; nothing if it gives up. The path is the file's, as components.
-using ContentResolver =
-    std::function<std::optional<Buffer>(KivVcs::array_view<KivStringViewT<char16_t> const> path, DisputedContents const&)>;
+using ContentResolver = std::function<std::optional<Buffer>(KivVcs::array_view<KivStringViewT<char16_t> const> path,
+                                                            DisputedContents const&)>;
 
 /// A resolver that merges texts line by line with `MergeTextLines`, and gives up if that finds conflicts, or if there is
 /// no base.
-[[nodiscard]] KIVARCHIVE_EXPORT ContentResolver MergeTexts(std::uint64_t mostBytes = largestText);
+[[nodiscard]] KIVARCHIVE_EXPORT ContentResolver MergeTexts(std::uint64_t maximumBytes = largestText);
 
 /// What becomes of a name that is a file on one side and a directory on the other.
 struct KindDecision {
@@ -132,5 +132,16 @@ struct TreeMerge {
 [[nodiscard]] KIVARCHIVE_EXPORT TreeMerge MergeAgain(KivVcs::IRepository& repo, MergeSources const& sources,
                                                      MergeSide const& left, MergeSide const& right,
                                                      MergeResolvers const& resolvers);
+
+/// What a merge of a repository over an archive did.
+struct MergeReport {
+    KivVcs::MergeResult result = KivVcs::MergeResult::NothingToCommit;
+    /// As `TreeMerge` has them.
+    std::vector<KivVcs::MergeConflict> conflicts;
+    std::vector<Id> lostBases;
+
+    /// Whether the branch has the commit's changes now.
+    [[nodiscard]] bool Succeeded() const noexcept { return result <= KivVcs::MergeResult::Merged; }
+};
 
 } // namespace KivArchive

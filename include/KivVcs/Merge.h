@@ -84,6 +84,13 @@ struct Resolvers {
 /// order, the blobs of a directory before its subdirectories. All directories of a merge ask the very same resolvers,
 /// which are not copied for each. Contents are never merged, nor asked for. Unchanged subtrees are shared
 /// with the inputs, which stay as they are. New trees are stored in @p repo as they are made.
+///
+/// A name may be a file on one side and a directory on the other. Nobody is asked about it, or the answer does not hold,
+/// in four cases: where one side adds a file and the other a directory, the file is gone; where one side changed a file
+/// that the other made a directory, the directory is taken, whatever is answered; where a directory became a file while the
+/// other side changed something in it, both may come to be under one name, of which the packed form shows the file; where
+/// one side made a directory a file and the other removed it, both are gone. Hosts that care let the tree resolver answer
+/// `Left` or `Right` there, or merge with the archive's `MergeAgain`, which asks.
 /// @return the merged tree; null if @p repo is null, a resolver that was needed is empty or undecided, or no side has a
 /// tree.
 /// @complexity proportional to the entries that differ and to the size of the directories that hold them.
