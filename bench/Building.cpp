@@ -45,6 +45,68 @@ Round AdoptedBlob(std::int64_t size) {
     return Storing(1, bring, store, content);
 }
 
+/// Blobs that are all identified at once, of buffers that are ready, or of vectors that the host hands over.
+Round IdentifiedBlobs(std::int64_t count, std::int64_t size, bool handedOver) {
+    auto content = std::make_shared<std::vector<char>>(static_cast<std::size_t>(count * size), 'c');
+    HashFloor floor;
+    for (std::int64_t blob = 0; blob < count; ++blob) {
+        const std::string number = std::to_string(blob);
+        std::copy(number.begin(), number.end(), content->begin() + static_cast<std::ptrdiff_t>(blob * size));
+        floor.AddForm(Blob(Buffer(static_cast<std::uint64_t>(size))));
+    }
+    return [=]() mutable {
+        Measurement result{.operations = static_cast<std::uint64_t>(count)};
+        const MemoryTaken taken;
+        std::vector<std::vector<char>> vectors;
+        std::vector<Blob> blobs;
+        blobs.reserve(static_cast<std::size_t>(count));
+        for (auto bytes = content->cbegin(); bytes != content->cend(); bytes += size) {
+            if (handedOver)
+                vectors.emplace_back(bytes, bytes + size);
+            else
+                blobs.push_back(Blob::CopyBytes(&*bytes, static_cast<std::size_t>(size)));
+        }
+        result.seconds = LibrarySecondsOf([&] {
+            for (std::vector<char>& vector : vectors)
+                blobs.emplace_back(Buffer::Adopt(std::move(vector)));
+            std::vector<Object const*> objects;
+            objects.reserve(blobs.size());
+            for (Blob const& blob : blobs)
+                objects.push_back(&blob);
+            Identify(objects);
+        });
+        vectors = {};
+        taken.WriteTo(result);
+        blobs = {};
+        result.floorSeconds = floor.Run(content.get());
+        return result;
+    };
+}
+
+/// Files of @p size bytes, a hundred in each directory, all added at once.
+Round FilesAtOnce(std::int64_t count, std::int64_t size) {
+    const auto bring = [count, size] {
+        std::vector<Buffer> contents = SmallContents(count);
+        const std::string rest(static_cast<std::size_t>(size), 'c');
+        for (Buffer& content : contents)
+            content.Append(rest.data(), static_cast<std::uint64_t>(size) - content.GetSize());
+        return contents;
+    };
+    std::vector<Path> paths = FilePaths(count, {});
+    for (std::size_t file = 0; file < paths.size(); ++file)
+        paths[file] = Numbered("directory-", static_cast<std::int64_t>(file / 100)) + u"/" + paths[file];
+    const auto add = [paths = std::move(paths)](Repository& repo, std::vector<Buffer>& contents) {
+        std::vector<BlobAtPath> blobs;
+        blobs.reserve(paths.size());
+        for (std::size_t file = 0; file < paths.size(); ++file)
+            blobs.push_back({paths[file], immu::make<Blob>(std::move(contents[file]))});
+        Commit commit(&repo, false);
+        commit.AddBlobs(&repo, blobs);
+        repo.DoCommit(commit);
+    };
+    return Storing(static_cast<std::uint64_t>(count), bring, add);
+}
+
 Round FilesByPath(std::int64_t count, std::vector<int> const& directories) {
     const auto bring = [count] { return SmallContents(count); };
     const auto add = [paths = FilePaths(count, directories)](Repository& repo, std::vector<Buffer>& contents) {
@@ -120,14 +182,23 @@ Round OneFileOfMany(std::int64_t count) {
 } // namespace
 
 void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
+    const auto withoutContender = [](std::int64_t) { return Contender(); };
+    const auto addBeside = [&](std::string const& name, std::int64_t whole, Limits limits, auto rounds, auto contender,
+                               int roundsInOne = 1) {
+        for (const std::int64_t divisor : divisors) {
+            const std::int64_t size = whole / divisor;
+            workloads.push_back({name, size, limits, [=] { return rounds(size); }, roundsInOne, contender(size)});
+        }
+    };
     const auto add = [&](std::string const& name, std::int64_t whole, Limits limits, auto rounds, int roundsInOne = 1) {
-        for (const std::int64_t divisor : divisors)
-            workloads.push_back({name, whole / divisor, limits, [=] { return rounds(whole / divisor); }, roundsInOne});
+        addBeside(name, whole, limits, rounds, withoutContender, roundsInOne);
     };
     const auto addBlobs = [&](std::string const& name, std::int64_t count, std::int64_t size, Limits limits) {
         for (const bool copied : {false, true}) {
-            add(name + (copied ? ", copied" : ""), count, copied ? Limits{} : limits,
-                [=](std::int64_t number) { return Blobs(number, size, copied); });
+            addBeside(
+                name + (copied ? ", copied" : ""), count, copied ? Limits{} : limits,
+                [=](std::int64_t number) { return Blobs(number, size, copied); },
+                [=](std::int64_t number) { return copied ? Libgit2Blobs(number, size) : Contender(); });
         }
     };
     constexpr std::int64_t oneBlob = std::int64_t{1} << 28;
@@ -140,13 +211,31 @@ void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divi
         }
     }
     add("B1 one blob, handed over", std::int64_t{1} << 24, {1.03}, AdoptedBlob);
-    add("B1 16 MiB, copied", std::int64_t{1} << 24, {1.25}, [](auto size) { return Blobs(1, size, true); });
+    addBeside(
+        "B1 16 MiB, copied", std::int64_t{1} << 24, {1.25}, [](auto size) { return Blobs(1, size, true); },
+        [](auto size) { return Libgit2Blobs(1, size); });
     addBlobs("B2 blobs of 64 KiB", 1000, 65536, {1.25, 65536 + 600});
     addBlobs("B3 blobs of 200 B", 100'000, 200, {2.5, 200 + 260});
     add("B4 files by path, one directory", 16'000, {1.5, 6144}, [](auto count) { return FilesByPath(count, {}); });
-    add("B5 files by path, three levels", 10'000, {2.5, 3072}, [](auto count) { return FilesByPath(count, {20, 25}); });
-    add("B6 files in local trees", 100'000, {3.5, 450}, LocalTrees);
-    add("B7 commits of one change", 20'000, {3.5, 2.2 * 1024}, SmallCommits);
+    addBeside(
+        "B5 files by path, three levels", 10'000, {2.5, 3072},
+        [](auto count) {
+            return FilesByPath(count, {20, 25});
+        },
+        Libgit2FilesByPath);
+    addBeside("B6 files in local trees", 100'000, {3.5, 450}, LocalTrees,
+              [](auto count) { return Libgit2Directories(count, 0); });
+    addBeside("B7 commits of one change", 20'000, {3.5, 2.2 * 1024}, SmallCommits, Libgit2Commits);
+    const auto addIdentified = [&](std::string const& name, double limit, bool handedOver) {
+        addBeside(
+            name, 4000, {limit}, [=](auto count) { return IdentifiedBlobs(count, 65536, handedOver); },
+            [](auto count) { return Libgit2Blobs(count, 65536); });
+    };
+    addIdentified("B19 blobs of 64 KiB at once", 0.6, false);
+    addIdentified("B19 blobs of 64 KiB at once, handed over", 0.7, true);
+    addBeside(
+        "B20 files of 200 B at once", 100'000, {2}, [](auto count) { return FilesAtOnce(count, 200); },
+        [](auto count) { return Libgit2Directories(count, 200); });
     add("B14 one file of a directory", 100'000, {1.1, 8192}, OneFileOfMany, 20);
 }
 

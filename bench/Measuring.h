@@ -3,6 +3,7 @@
 /// @file
 /// How a workload is measured: contender and floor in turn, in processor time of this thread.
 
+#include "Contenders.h"
 #include "Memory.h"
 
 #include "KivVcs/Repository.h"
@@ -43,6 +44,7 @@ struct Workload {
     Limits limits;
     std::function<Round()> prepare;
     int roundsInOne = 1;
+    Contender contender{};
 };
 
 /// The sizes to run with: the whole size of each workload, divided by each of these.

@@ -4,6 +4,7 @@
 #include "KivVcs/SHADigest256.h"
 
 #include <algorithm>
+#include <memory>
 #include <random>
 #include <stdexcept>
 #include <unordered_map>
@@ -68,6 +69,71 @@ Round Differences(std::int64_t files, std::int64_t changes) {
         result.floorSeconds /= static_cast<double>(times);
         return result;
     };
+}
+
+/// A directory as nothing but names and digests, in order.
+struct PlainDirectory {
+    struct Entry {
+        Path name;
+        Id::Digest digest;
+        /// The directory of that name, if it is one.
+        std::unique_ptr<PlainDirectory> below;
+    };
+    std::vector<Entry> entries;
+};
+
+PlainDirectory ToPlain(Tree const& tree) {
+    PlainDirectory plain;
+    for (Path const& name : tree.GetLocalObjectPaths()) {
+        const auto below = tree.GetLocalTree(name);
+        plain.entries.push_back({name, *tree.GetLocalObject(name)->GetKnownDigest(),
+                                 below ? std::make_unique<PlainDirectory>(ToPlain(*below)) : nullptr});
+    }
+    return plain;
+}
+
+/// Walks along the entries of both directories, in which the same names are directories.
+void FindPlainDifferences(PlainDirectory const& older, PlainDirectory const& newer, Path const* prefix,
+                          PathList& found) {
+    auto left = older.entries.begin();
+    auto right = newer.entries.begin();
+    while (left != older.entries.end() || right != newer.entries.end()) {
+        const int order = left == older.entries.end()    ? 1
+                          : right == newer.entries.end() ? -1
+                                                         : left->name.Compare(right->name);
+        auto const& entry = order <= 0 ? *left : *right;
+        if (order == 0 && left->digest != right->digest && left->below)
+            FindPlainDifferences(*left->below, *right->below, &entry.name, found);
+        else if (order != 0 || left->digest != right->digest)
+            found.push_back(prefix == nullptr ? entry.name : Join(*prefix, entry.name));
+        left += order <= 0 ? 1 : 0;
+        right += order >= 0 ? 1 : 0;
+    }
+}
+
+/// Finds the differences by a walk that is written for these directories alone.
+Contender PlainDifferences(std::int64_t files, std::int64_t changes) {
+    const auto prepare = [=] {
+        const auto repo = MakeRepository();
+        const auto base = MakeTwoLevels(*repo, files, inEachDirectory);
+        const auto changed = ChangeTwoLevels(*repo, *base, inEachDirectory, 0, files / changes, changes, 1);
+        const auto older = std::make_shared<PlainDirectory>(ToPlain(*base));
+        const auto newer = std::make_shared<PlainDirectory>(ToPlain(*changed));
+        const auto find = [=] {
+            PathList found;
+            FindPlainDifferences(*older, *newer, nullptr, found);
+            return found;
+        };
+        Require(find() == base->GetDeepBlobDiffs(changed), "wrong differences");
+        return [=, times = std::max<std::int64_t>(1, 1000 / changes)] {
+            const double seconds = SecondsOf([&] {
+                for (std::int64_t time = 0; time < times; ++time)
+                    Require(!find().empty(), "no differences");
+            });
+            return seconds / static_cast<double>(times);
+        };
+    };
+    return {"plain", prepare, 1.05};
 }
 
 Round Merge(std::int64_t files, std::int64_t conflicts) {
@@ -154,15 +220,24 @@ Round ReadBack(std::int64_t files) {
 } // namespace
 
 void AddReadingWorkloads(std::vector<Workload>& workloads, Divisors const& divisors) {
-    const auto add = [&](std::string const& name, Limits limits, auto rounds, int roundsInOne = 1) {
+    const auto addBeside = [&](std::string const& name, Limits limits, auto rounds, auto contender) {
         for (const std::int64_t divisor : divisors) {
             const std::int64_t files = 100'000 / divisor / inEachDirectory * inEachDirectory;
-            workloads.push_back({name, files, limits, [=] { return rounds(files); }, roundsInOne});
+            workloads.push_back({name, files, limits, [=] { return rounds(files); }, 1, contender(files)});
         }
     };
-    add("B8 differences, one file in ten", {3}, [](auto files) { return Differences(files, files / 10); });
-    add("B8 differences, 100 files", {3}, [](auto files) { return Differences(files, 100); });
-    add("B8 differences, 1 file", {3}, [](auto files) { return Differences(files, 1); });
+    const auto add = [&](std::string const& name, Limits limits, auto rounds) {
+        addBeside(name, limits, rounds, [](auto) { return Contender(); });
+    };
+    const auto addDifferences = [&](std::string const& name, Limits limits, auto changes) {
+        addBeside(
+            "B8 differences, " + name, limits, [=](auto files) { return Differences(files, changes(files)); },
+            [=](auto files) { return PlainDifferences(files, changes(files)); });
+    };
+    addDifferences("one file in ten", {3}, [](auto files) { return files / 10; });
+    addDifferences("100 files", {3}, [](auto) { return 100; });
+    addDifferences("10 files", {}, [](auto) { return 10; });
+    addDifferences("1 file", {3}, [](auto) { return 1; });
     add("B9 merge without conflicts", {8, 8192}, [](auto files) { return Merge(files, 0); });
     add("B9 merge, conflicts in one change of ten", {8, 8192}, [](auto files) { return Merge(files, files / 1000); });
     add("B11 files read back", {3}, ReadBack);

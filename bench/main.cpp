@@ -26,6 +26,7 @@ public:
         if (workload_ == &workload)
             return;
         round_ = nullptr;
+        contender_ = nullptr;
         workload_ = &workload;
         round_ = workload.prepare();
         memory_ = {.operations = 0};
@@ -37,9 +38,14 @@ public:
             memory_.operations += one.operations;
         }
         CountMemory(false);
+        if (workload.contender.prepare) {
+            contender_ = workload.contender.prepare();
+            static_cast<void>(contender_());
+        }
     }
 
     [[nodiscard]] Measurement RunRound() { return round_(); }
+    [[nodiscard]] double RunContender() { return contender_ ? contender_() : 0; }
     [[nodiscard]] double KeptBytes() const { return PerOperation(memory_.keptBytes); }
     [[nodiscard]] double ResidentBytes() const { return PerOperation(memory_.residentBytes); }
 
@@ -50,6 +56,7 @@ private:
 
     Workload const* workload_ = nullptr;
     Round round_;
+    ContenderRound contender_;
     Measurement memory_;
 };
 
@@ -57,16 +64,22 @@ void Run(benchmark::State& state, Workload const& workload, Prepared& prepared) 
     prepared.Prepare(workload);
     double seconds = 0;
     double floorSeconds = 0;
+    double contenderSeconds = 0;
     for ([[maybe_unused]] auto iteration : state) {
         const Measurement one = prepared.RunRound();
         state.SetIterationTime(one.seconds);
         seconds += one.seconds;
         floorSeconds += one.floorSeconds;
+        contenderSeconds += prepared.RunContender();
     }
     const auto rounds = static_cast<double>(state.iterations());
     state.counters["floor"] = floorSeconds / rounds;
     state.counters["ours"] = seconds / rounds;
     state.counters["ratio"] = floorSeconds > 0 ? seconds / floorSeconds : 0;
+    state.counters["contender"] = contenderSeconds / rounds;
+    state.counters["versus"] = contenderSeconds > 0 ? seconds / contenderSeconds : 0;
+    state.counters["versusLimit"] = workload.contender.limit;
+    state.SetLabel(workload.contender.name);
     state.counters["bytes"] = prepared.KeptBytes();
     state.counters["resident"] = prepared.ResidentBytes();
     state.counters["ratioLimit"] = workload.limits.ratio;
@@ -102,7 +115,7 @@ void Measure(Divisors const& divisors, int argc, char** argv) {
                                      [&](benchmark::State& state) { Run(state, workload, prepared); })
             ->UseManualTime()
             ->Iterations(workload.roundsInOne)
-            ->Repetitions(7)
+            ->Repetitions(9)
             ->ReportAggregatesOnly()
             ->Unit(benchmark::kMillisecond);
     }

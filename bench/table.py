@@ -22,12 +22,12 @@ def limited(value, limit, text):
 with open(sys.argv[1], encoding="utf-8") as file:
     runs = [run for run in json.load(file)["benchmarks"] if run.get("aggregate_name") == "median"]
 
-rows = [("workload", "size", "floor", "ours", "ratio", "at most", "growth", "at most", "kept/op", "at most", "resident/op", "")]
+rows = [("workload", "size", "floor", "ours", "ratio", "at most", "contender", "", "ours to it", "at most", "growth", "at most", "kept/op", "at most", "resident/op", "")]
 missed = 0
 smaller = {}
 for run in runs:
     name, size = run["run_name"].split("/")[:2]
-    values = {"ratio": run["ratio"], "bytes": run["bytes"], "growth": 0}
+    values = {"ratio": run["ratio"], "versus": run["versus"], "bytes": run["bytes"], "growth": 0}
     for smaller_size, seconds in smaller.setdefault(name, []):
         if abs(int(size) / smaller_size - 4) < 0.1:
             values["growth"] = run["ours"] / seconds
@@ -37,6 +37,8 @@ for run in runs:
     rows.append((
         name, size, time(run["floor"]) if run["floor"] else "-", time(run["ours"]),
         *limited(values["ratio"], run["ratioLimit"], "{:.2f}".format),
+        run.get("label", "") if run["contender"] else "", time(run["contender"]) if run["contender"] else "-",
+        *limited(values["versus"], run["versusLimit"], "{:.2f}".format),
         *limited(values["growth"], run["growthLimit"], "{:.1f}".format),
         *limited(values["bytes"], run["bytesLimit"], amount),
         amount(run["resident"]) if run["resident"] else "-", "MISSED" if bad else "",

@@ -1,9 +1,9 @@
 #!/bin/bash
 # usage: scripts/bench.sh [--quick | --plot] [FILTER]
 #        scripts/bench.sh --check [--update]
-# Installs what is missing, builds the benchmarks and runs those whose names match FILTER, each workload and its floor in
-# turn, and prints one table with the medians over seven rounds; build/bench/result.json holds the numbers. --quick runs a
-# quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws build/bench/performance.svg.
+# Installs what is missing, builds the benchmarks and runs those whose names match FILTER, each workload, its contender and its
+# floor in turn, and prints one table with the medians over nine rounds; build/bench/result.json holds the numbers. --quick
+# runs a quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws build/bench/performance.svg.
 # With `archive` as FILTER it runs the archive beside git instead, and prints one table with the limits that it keeps to.
 # --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
 # says by over 5 %; --update writes that file. docs/performance.md says what is measured.
@@ -58,6 +58,7 @@ if [ $# -gt 1 ] || [[ $mode == --check && ${1:---update} != --update ]]; then
 fi
 
 install_packages build bench
+(install_packages contenders) || printf 'Without libgit2 as a contender: it cannot be installed here\n'
 build_preset bench
 result=$build_directory/result.json
 case $mode in

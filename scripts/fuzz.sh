@@ -1,7 +1,7 @@
 #!/bin/bash
 # usage: scripts/fuzz.sh [SECONDS] [TARGET...]
 # Installs what is missing, builds the fuzz targets with clang 14's libFuzzer under AddressSanitizer and
-# UndefinedBehaviorSanitizer, and lets each (readers, paths, operations) look for inputs that break something, for SECONDS of
+# UndefinedBehaviorSanitizer, and lets each (readers, paths, operations, lanes) look for inputs that break something, for SECONDS of
 # CPU time (60 unless given) from the inputs in fuzz/corpus on. Fails at the first finding and says where its input is kept.
 # New inputs that reach more code are kept below the build directory, in corpus/TARGET, for the next time.
 
@@ -9,7 +9,7 @@
 seconds=${1:-60}
 [[ $seconds =~ ^[0-9]+$ ]] || usage 1
 targets=("${@:2}")
-[ ${#targets[@]} -gt 0 ] || targets=(readers paths operations)
+[ ${#targets[@]} -gt 0 ] || targets=(readers paths operations lanes)
 
 install_packages build fuzz
 build_preset fuzz

@@ -50,6 +50,7 @@ packages_of() {
     docs) echo doxygen doxygen-awesome-css python3 ;;
     lint) echo clang-14 clang-format-16 clang-tidy-14 shellcheck python3 ;;
     bench) echo libbenchmark-dev libssl-dev valgrind python3 ;;
+    contenders) echo libgit2-dev ;;
     plot) echo python3-matplotlib ;;
     valgrind) echo valgrind ;;
     coverage) echo gcovr ;;
