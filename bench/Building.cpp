@@ -215,7 +215,7 @@ void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divi
         "B1 16 MiB, copied", std::int64_t{1} << 24, {1.25}, [](auto size) { return Blobs(1, size, true); },
         [](auto size) { return Libgit2Blobs(1, size); });
     addBlobs("B2 blobs of 64 KiB", 1000, 65536, {1.25, 65536 + 600});
-    addBlobs("B3 blobs of 200 B", 100'000, 200, {2.5, 200 + 260});
+    addBlobs("B3 blobs of 200 B", 100'000, 200, {2.5, 400});
     add("B4 files by path, one directory", 16'000, {1.5, 6144}, [](auto count) { return FilesByPath(count, {}); });
     addBeside(
         "B5 files by path, three levels", 10'000, {2.5, 3072},
@@ -236,7 +236,13 @@ void AddBuildingWorkloads(std::vector<Workload>& workloads, Divisors const& divi
     addBeside(
         "B20 files of 200 B at once", 100'000, {2}, [](auto count) { return FilesAtOnce(count, 200); },
         [](auto count) { return Libgit2Directories(count, 200); });
-    add("B14 one file of a directory", 100'000, {1.1, 8192}, OneFileOfMany, 20);
+    add("B14 one file of a directory", 100'000, {0.6, 3072}, OneFileOfMany, 20);
+    // Smaller ones have fewer places to go on from.
+    for (const std::int64_t divisor : divisors) {
+        const std::int64_t count = 16'000 / divisor;
+        const Limits limits = divisor == 1 ? Limits{0.6, 2600} : Limits{};
+        workloads.push_back({"B14 one of 16,000 files", count, limits, [=] { return OneFileOfMany(count); }, 20});
+    }
 }
 
 } // namespace KivVcs::Bench

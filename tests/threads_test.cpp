@@ -129,14 +129,26 @@ TEST(EightThreads, IdentifyWhatOthersIdentifyToo) {
     const Versions stored = GrowLine(repository);
     for (int round = 0; round < 10; ++round) {
         const Versions fresh = FreshCopies(stored);
+        // Large enough to go on where the digest of another version has been.
+        const std::string longName(2000, 'n');
+        Tree base;
+        for (int number = 100; number < 200; ++number)
+            base.AddBlob(&repository, Wide(longName + std::to_string(number)), MakeBlob("1"));
+        EXPECT_TRUE(round % 2 == 0 || !base.GetId().IsEmpty());
+        Tree large(base);
+        large.AddBlob(&repository, Wide(longName + "180"), MakeBlob("2"));
         std::vector<Blob> blobs;
         for (std::size_t number = 0; number < 100; ++number)
             blobs.push_back(MakeBlob(std::string(number * 50, 'x')));
         AtOnce([&](std::size_t index) {
+            Repository nowhere(nullptr);
             std::vector<Object const*> objects{fresh[index].get(), fresh.back().get()};
             for (std::size_t number = index * 5; number < blobs.size(); ++number)
                 objects.push_back(&blobs[number]);
             Identify(objects);
+            Tree mine(index % 2 == 0 ? base : large);
+            mine.AddBlob(&nowhere, Wide(longName + "190"), MakeBlob("2"));
+            EXPECT_FALSE(mine.GetId().IsEmpty() || large.GetId() == base.GetId());
             for (Object const* object : objects)
                 EXPECT_TRUE(object->GetKnownDigest() != nullptr || !object->GetId().IsEmpty());
         });

@@ -95,6 +95,16 @@ TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
             }
         }
         ASSERT_NO_FATAL_FAILURE(now.Check()) << round;
+        // The packed form stays as long as it is.
+        for (int few = Below(12); few > 0 && !now.model.blobs.empty(); --few) {
+            auto const& name =
+                std::next(now.model.blobs.begin(), Below(static_cast<int>(now.model.blobs.size())))->first;
+            now.model.blobs[name] = std::to_string(round);
+            now.tree.write()->AddBlob(&repo, Wide(name), MakeBlob(std::to_string(round)));
+            if (few % 3 == 0) {
+                ASSERT_EQ(IdText(*now.tree), IdOf(now.model)) << round;
+            }
+        }
         ASSERT_NO_FATAL_FAILURE(now.CheckAgainst(former[random() % former.size()])) << round;
         if (Below(3) == 0)
             former.push_back(now);

@@ -11,6 +11,8 @@
 
 namespace KivVcs {
 
+class IdDigest;
+
 /// The SHA-256 digest of FIPS 180-4 over bytes fed in any number of pieces. Uses the processor's SHA instructions where
 /// it has them. A value: a copy goes on from the same state. One digest is used by one thread at a time.
 class KIVVCS_EXPORT SHADigest256 {
@@ -28,6 +30,8 @@ public:
     bool FinalDigest(void* out) noexcept;
 
 private:
+    friend class IdDigest;
+
     std::array<std::uint32_t, 8> state_{};
     std::array<std::uint8_t, 64> block_{};
     std::uint64_t fed_ = 0;

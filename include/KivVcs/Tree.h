@@ -4,6 +4,7 @@
 /// Directories.
 
 #include "KivVcs/Blob.h"
+#include "KivVcs/detail/DigestTrail.h"
 #include "KivVcs/detail/EntryTable.h"
 #include "KivVcs/detail/Published.h"
 
@@ -189,6 +190,7 @@ private:
 
     detail::EntryTable entries_;
     detail::Published<Buffer> data_;
+    detail::DigestTrail trail_;
 };
 
 extern template KIVVCS_EXPORT cow_ptr<Blob>

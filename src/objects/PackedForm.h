@@ -24,6 +24,17 @@ public:
     /// Begins the packed form of @p size bytes of data of the type @p word.
     IdDigest(KivStringViewT<char> word, std::uint64_t size) noexcept;
 
+    /// The state after a number of whole blocks, from which another digest of the same beginning can go on.
+    using State = std::array<std::uint32_t, 8>;
+    static constexpr std::uint64_t blockSize = 64;
+    IdDigest(State const& state, std::uint64_t fed) noexcept {
+        digest_.state_ = state;
+        digest_.fed_ = fed;
+    }
+    [[nodiscard]] std::uint64_t GetFed() const noexcept { return digest_.fed_; }
+    /// @pre `GetFed()` is a number of whole blocks
+    [[nodiscard]] State const& GetState() const noexcept { return digest_.state_; }
+
     void Feed(const void* data, std::size_t size) noexcept { digest_.InitData(data, size); }
     void Feed(Buffer const& data) noexcept;
 

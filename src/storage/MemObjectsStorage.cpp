@@ -16,7 +16,7 @@ void AddTo(std::unordered_map<Id, cow_ptr<T>>& table, cow_ptr<T> object) {
     // Where most buckets are free, the bucket alone shows that an object is new, as most that are asked for are; otherwise
     // that takes a visit to a neighbour somewhere in memory. What is there already must not make the table grow, which
     // would change its order.
-    if (table.size() >= table.bucket_count() / 4 && !table.contains(id))
+    if (table.size() >= table.bucket_count() / 2 && !table.contains(id))
         table.rehash(2 * table.bucket_count());
     table.try_emplace(std::move(id), std::move(object));
 }

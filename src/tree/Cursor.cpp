@@ -10,6 +10,20 @@ Cursor::Cursor(Node const* top) noexcept {
     Descend(height_);
 }
 
+Cursor Cursor::AtLeafOf(Node const& top, std::uint64_t& offset) noexcept {
+    Cursor cursor;
+    cursor.height_ = static_cast<std::size_t>(top.Height());
+    cursor.steps_[cursor.height_] = {&top, 0};
+    for (std::size_t height = cursor.height_; height > 0; --height) {
+        Step& step = cursor.steps_[height];
+        while (offset >= step.node->ChildAt(step.child).node->Total().packedSize)
+            offset -= step.node->ChildAt(step.child++).node->Total().packedSize;
+        cursor.steps_[height - 1] = {step.node->ChildAt(step.child).node.get(), 0};
+    }
+    cursor.Descend(0);
+    return cursor;
+}
+
 /// Goes from the current child of the node at @p height down to its first entry.
 void Cursor::Descend(std::size_t height) noexcept {
     for (; height > 0; --height)

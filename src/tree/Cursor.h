@@ -11,6 +11,10 @@ class Cursor {
 public:
     explicit Cursor(Node const* top) noexcept;
 
+    /// At the beginning of the leaf that packs the byte @p offset of what @p top packs, and @p offset is counted from the leaf
+    /// on then. @pre there is such a byte
+    [[nodiscard]] static Cursor AtLeafOf(Node const& top, std::uint64_t& offset) noexcept;
+
     [[nodiscard]] bool AtEnd() const noexcept { return entry_ == nullptr; }
     [[nodiscard]] Entry const& Get() const noexcept { return *entry_; }
     [[nodiscard]] Node const& Leaf() const noexcept { return *steps_[0].node; }
@@ -25,6 +29,8 @@ public:
     static void SkipShared(Cursor& left, Cursor& right) noexcept;
 
 private:
+    Cursor() noexcept = default;
+
     /// A node on the way to the entry and the index of the child that leads on.
     struct Step {
         Node const* node;

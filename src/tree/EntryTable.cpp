@@ -83,6 +83,11 @@ EntryTable::Place EntryTable::FindPlace(KivStringViewT<char16_t> name) const noe
     return {index, count, exists ? &node->EntryAt(index) : nullptr};
 }
 
+KivStringT<char16_t> const* EntryTable::FindName(KivStringViewT<char16_t> name) const noexcept {
+    Entry const* const entry = FindPlace(name).entry;
+    return entry == nullptr ? nullptr : &entry->name;
+}
+
 Held const* EntryTable::Find(KivStringViewT<char16_t> name) const noexcept {
     Entry const* const entry = FindPlace(name).entry;
     return entry == nullptr ? nullptr : &entry->held;
@@ -97,6 +102,8 @@ struct EntryTable::Edit {
     int growth = 0;
     /// What the totals grow by; where they shrink, the numbers wrap around.
     Tally difference{};
+    /// Whether the packed form changes by an identifier at most.
+    bool onlyShowsAnother = false;
 
     /// Makes the nodes from @p handle down to the leaf writable, changes the leaf and mends the totals on the way back. What
     /// can fail happens on the way down and leaves the entries as they are: nodes are copied, split where they are full,
@@ -130,7 +137,10 @@ struct EntryTable::Edit {
             leaf.Erase<Entry>(at, at + 1);
         else
             std::swap(leaf.EntryAt(at).held, entry.held);
-        leaf.DropPackedRun();
+        if (onlyShowsAnother)
+            leaf.MarkStale(at);
+        else
+            leaf.DropPackedRun();
     }
 };
 
@@ -138,7 +148,9 @@ void EntryTable::Put(Place const& place, KivStringViewT<char16_t> name, KivStrin
     Edit edit{name, place, {std::move(text), std::move(held)}};
     Entry const* const old = place.entry;
     edit.growth = (edit.entry.held.IsNothing() ? 0 : 1) - (old == nullptr ? 0 : 1);
-    if (old == nullptr || !CountAlike(old->held, edit.entry.held)) {
+    if (old != nullptr && CountAlike(old->held, edit.entry.held)) {
+        edit.onlyShowsAnother = true;
+    } else {
         edit.difference = TallyOf(name, edit.entry.held);
         if (old != nullptr)
             edit.difference -= TallyOf(name, old->held);

@@ -1,5 +1,7 @@
 #include "tree/Node.h"
 
+#include <bit>
+
 namespace KivVcs::detail {
 
 // NOLINTNEXTLINE(misc-redundant-expression): that both sides are the same number is what is claimed
@@ -55,6 +57,7 @@ cow_ptr<Node> EntriesOfLast(Held& held) noexcept {
 void Node::operator delete(Node* node, std::destroying_delete_t) noexcept {
     // The nodes whose last owner is gone.
     Node* dying = node;
+    node->nextDying_ = nullptr;
     const auto giveUp = [&dying](cow_ptr<Node> share) {
         if (Node* const last = share.release_if_last().release())
             last->nextDying_ = std::exchange(dying, last);
@@ -109,10 +112,13 @@ cow_ptr<Node> Node::CopyOf(int from, int to, int room) const {
     const auto first = static_cast<std::size_t>(from);
     const auto count = static_cast<std::size_t>(to - from);
     IsLeaf() ? node.Take(Entries().subspan(first, count)) : node.Take(Children().subspan(first, count));
-    if (to - from == count_)
+    if (to - from == count_) {
         node.total_ = total_;
-    else
+        node.packedRun_ = packedRun_;
+        node.staleEntries_ = staleEntries_;
+    } else {
         node.CountTotal();
+    }
     return copy;
 }
 
@@ -181,11 +187,20 @@ void Node::Truncate(int from) noexcept {
         Erase<Entry>(from, count_);
     else
         Erase<Child>(from, count_);
-    packedRun_.Reset();
+    DropPackedRun();
     CountTotal();
 }
 
+void Node::MarkStale(int index) noexcept {
+    // With too many of them, another run is worth its memory.
+    constexpr int mostStale = 8;
+    staleEntries_ |= 1U << static_cast<unsigned>(index);
+    if (std::popcount(staleEntries_) > mostStale)
+        DropPackedRun();
+}
+
 void Node::Append(Node const& other) noexcept {
+    DropPackedRun();
     IsLeaf() ? Take(other.Entries()) : Take(other.Children());
     total_ += other.total_;
 }

@@ -108,9 +108,16 @@ public:
 
     void AddToTotal(Tally const& difference) noexcept { total_ += difference; }
 
-    /// The packed form of a leaf's entries, made on first use and kept with the leaf. @pre there are no hosts' objects
+    /// The packed form of a leaf's entries, made on first use and kept with the leaf and its copies, except for the identifiers
+    /// of the entries whose bit is set in `StaleEntries`. @pre there are no hosts' objects
     [[nodiscard]] Buffer const& PackedRun() const;
-    void DropPackedRun() noexcept { packedRun_.Reset(); }
+    [[nodiscard]] std::uint32_t StaleEntries() const noexcept { return staleEntries_; }
+    /// Says that the entry @p index shows another identifier than before, and nothing else.
+    void MarkStale(int index) noexcept;
+    void DropPackedRun() noexcept {
+        packedRun_.Reset();
+        staleEntries_ = 0;
+    }
 
 private:
     Node(int height, int capacity) noexcept
@@ -128,13 +135,22 @@ private:
     void Take(std::span<Element> elements) noexcept;
     void CountTotal() noexcept;
 
+    struct Run : KivUtils::reference_counted {
+        explicit Run(Buffer packed) noexcept : bytes(std::move(packed)) {}
+
+        Buffer bytes;
+    };
+
     std::uint8_t count_ = 0;
     std::uint8_t capacity_;
     std::uint8_t height_;
     Tally total_;
-    Published<Buffer> packedRun_;
-    // Links the nodes that wait for destruction; there is no other use for a node then.
-    Node* nextDying_ = nullptr;
+    Published<Run> packedRun_;
+    union {
+        std::uint32_t staleEntries_ = 0;
+        /// Links the nodes that wait for destruction; there is no other use for a node then.
+        Node* nextDying_;
+    };
 };
 
 inline EntryTable::EntryTable() noexcept = default;

@@ -62,6 +62,7 @@ cow_ptr<Tree> CopyOf(Tree const& tree) {
 void Tree::ResetState() {
     Object::ResetState();
     data_.Reset();
+    trail_.Reset();
 }
 
 bool Tree::IsEmpty() const noexcept {
@@ -81,8 +82,22 @@ cow_ptr<T> Tree::SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T co
     if (name.IsEmpty())
         return nullptr;
     cow_ptr<T> stored = StoredInstance(repo, object, own);
+    KivStringT<char16_t> const* const known = trail_.IsEmpty() ? nullptr : entries_.FindName(name);
+    if (known == nullptr) {
+        entries_.Set(name, stored);
+        ResetState();
+        return stored;
+    }
+    const KivStringT<char16_t> changed = *known;
+    const std::uint64_t sizeBefore = entries_.Top()->Total().packedSize;
     entries_.Set(name, stored);
+    // The way of the digest up to the entry stays as it was, as long as the whole is as long.
+    detail::DigestTrail trail = std::move(trail_);
     ResetState();
+    if (entries_.Top()->Total().packedSize == sizeBefore) {
+        trail.NoteChange(changed);
+        trail_ = std::move(trail);
+    }
     return stored;
 }
 
@@ -103,8 +118,10 @@ std::vector<cow_ptr<Tree>> Tree::CopyWay(Components names) const {
         above = above == nullptr ? nullptr : SubtreeOf(*above, names[level]);
         if (above != nullptr && above->IsOfHostClass())
             way[level] = CopyOf(*above);
-        else if (Tree* const copy = way[level].write(); above != nullptr)
+        else if (Tree* const copy = way[level].write(); above != nullptr) {
             copy->entries_ = above->entries_;
+            copy->trail_ = above->trail_;
+        }
     }
     return way;
 }

@@ -35,6 +35,16 @@ void EmptyATree(World& w) {
     w.tree = immu::make<Tree>(shrinking);
 }
 
+void EditALongTree(World& w) {
+    const KivStringT<char16_t> longName = Wide(std::string(30'000, 'n'));
+    Tree tree;
+    for (char16_t edit = 0; edit < 7; ++edit) {
+        tree.AddBlob(&w.repository, longName + static_cast<char16_t>(u'a' + edit % 5), w.blob);
+        w.done = edit < 4 || !tree.GetId().IsEmpty();
+    }
+    w.tree = immu::make<Tree>(tree);
+}
+
 void EditADeepPath(World& w) {
     KivStringT<char16_t> path;
     for (int level = 0; level < 160; ++level)
@@ -88,6 +98,7 @@ const Operation operations[] = {
     {"RemoveOneOfManyEntries", [](World& w) { w.done = w.edited.RemoveObject(&w.repository, u"many/101"); }},
     {"GrowAWideTree", GrowAWideTree},
     {"EmptyATree", EmptyATree},
+    {"EditALongTree", EditALongTree},
     {"EditADeepPath", EditADeepPath},
     {"ListATree", ListATree},
     {"CompareTrees", CompareTrees},

@@ -3,6 +3,8 @@
 #include "KivVcs/Id.h"
 #include "KivVcs/detail/PublishedWord.h"
 
+#include <array>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 
@@ -28,7 +30,7 @@ public:
     [[nodiscard]] bool IsHosts() const noexcept { return state_.Get() == State::Hosts; }
 
     /// The identifier, and its digest. @pre there is one
-    [[nodiscard]] Id Get() const noexcept { return {digest_, hash_}; }
+    [[nodiscard]] Id Get() const noexcept { return {digest_, std::bit_cast<std::size_t>(hash_)}; }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
     /// Says that the object with a copied identifier is a library's.
@@ -44,7 +46,7 @@ public:
             !state_.Replace(known, State::Writing))
             return;
         digest_ = *id.GetDigest();
-        hash_ = id.Hash();
+        hash_ = std::bit_cast<Hash>(id.Hash());
         state_.Publish(isHosts ? State::Hosts : State::Own);
     }
 
@@ -60,11 +62,13 @@ public:
     void Reset() noexcept { state_.Set(State::Empty); }
 
 private:
-    enum class State : std::uint8_t { Empty, Writing, Own, Copied, Hosts };
+    enum class State : std::uint32_t { Empty, Writing, Own, Copied, Hosts };
+    using Hash = std::array<std::byte, sizeof(std::size_t)>;
 
+    // Nothing here is aligned to more than four bytes, so that an object has all of it right behind its use count.
     PublishedWord<State> state_;
     mutable Id::Digest digest_{};
-    mutable std::size_t hash_ = 0;
+    mutable Hash hash_{};
 };
 
 } // namespace KivVcs::detail

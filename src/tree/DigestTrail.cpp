@@ -1,0 +1,150 @@
+#include "KivVcs/detail/DigestTrail.h"
+
+#include "tree/EntryPacker.h"
+
+namespace KivVcs::detail {
+
+namespace {
+
+constexpr std::uint64_t smallestStep = 65536;
+constexpr std::uint64_t mostSteps = 14;
+
+/// How far apart the states are of a form of @p size bytes.
+std::uint64_t StepOf(std::uint64_t size) noexcept {
+    return std::max(smallestStep, (size / mostSteps + IdDigest::blockSize) / IdDigest::blockSize * IdDigest::blockSize);
+}
+
+/// Where the leaf that holds @p name, or would, begins in what @p top packs.
+std::uint64_t OffsetOfLeaf(Node const& top, KivStringViewT<char16_t> name) noexcept {
+    std::uint64_t offset = 0;
+    for (Node const* node = &top; !node->IsLeaf();) {
+        const int way = node->ChildFor(name);
+        for (int index = 0; index < way; ++index)
+            offset += node->ChildAt(index).node->Total().packedSize;
+        node = node->ChildAt(way).node.get();
+    }
+    return offset;
+}
+
+/// Feeds a digest what comes after the first @p known bytes, and notes its state at every step.
+class NotingDigest {
+public:
+    NotingDigest(IdDigest& digest, std::vector<IdDigest::State>& states, std::uint64_t step,
+                 std::uint64_t known) noexcept
+        : digest_(digest), states_(states), step_(step), known_(known) {}
+
+    void Feed(const void* piece, std::size_t size) {
+        const auto skipped = static_cast<std::size_t>(std::min<std::uint64_t>(known_, size));
+        known_ -= skipped;
+        size -= skipped;
+        const auto* data = static_cast<const std::byte*>(piece) + skipped;
+        for (std::uint64_t left = step_ - digest_.GetFed() % step_; left <= size; left = step_) {
+            digest_.Feed(data, static_cast<std::size_t>(left));
+            data += left;
+            size -= static_cast<std::size_t>(left);
+            states_.push_back(digest_.GetState());
+        }
+        digest_.Feed(data, size);
+    }
+    void Feed(Buffer const& piece) {
+        for (auto const& chunk : piece.LockForRead())
+            Feed(chunk.data(), chunk.size());
+    }
+
+private:
+    IdDigest& digest_;
+    std::vector<IdDigest::State>& states_;
+    std::uint64_t step_;
+    std::uint64_t known_;
+};
+
+} // namespace
+
+/// The states of one form at every step.
+struct DigestTrail::Checkpoints final : KivUtils::reference_counted {
+    std::uint64_t packedSize = 0;
+    std::vector<IdDigest::State> states;
+};
+
+/// What a tree has computed, and what it was handed: that of the tree that it was made from.
+struct DigestTrail::Trail {
+    Trail() noexcept = default;
+    Trail(Trail const& other) noexcept {
+        if (Checkpoints const* const states = other.computed.Get()) {
+            handed = cow_ptr<Checkpoints>::share(states);
+        } else {
+            handed = other.handed;
+            firstChanged = other.firstChanged;
+        }
+    }
+    Trail(Trail&& other) noexcept = default;
+    Trail& operator=(Trail const&) = delete;
+
+    cow_ptr<Checkpoints> handed;
+    /// The first entry that shows something else than it did there; empty if none does.
+    KivStringT<char16_t> firstChanged;
+    Published<Checkpoints> computed;
+};
+
+DigestTrail::DigestTrail() noexcept = default;
+DigestTrail::DigestTrail(DigestTrail const& other) = default;
+DigestTrail::DigestTrail(DigestTrail&& other) noexcept = default;
+DigestTrail& DigestTrail::operator=(DigestTrail other) noexcept {
+    trail_.Swap(other.trail_);
+    return *this;
+}
+DigestTrail::~DigestTrail() = default;
+
+void DigestTrail::Reset() noexcept {
+    trail_.Reset();
+}
+
+void DigestTrail::NoteChange(KivStringT<char16_t> const& name) noexcept {
+    if (IsEmpty())
+        return;
+    // Only the tree that is being changed has this trail.
+    auto& trail = const_cast<Trail&>(*trail_.Get());
+    if (Checkpoints const* const states = trail.computed.Get()) {
+        trail.handed = cow_ptr<Checkpoints>::share(states);
+        trail.computed.Reset();
+        trail.firstChanged = {};
+    }
+    if (trail.firstChanged.IsEmpty() || name.Compare(trail.firstChanged) < 0)
+        trail.firstChanged = name;
+}
+
+Id DigestTrail::ComputeId(Node const& top) const {
+    const std::uint64_t size = top.Total().packedSize;
+    IdDigest digest("tree", size);
+    if (size < 2 * smallestStep) {
+        PackEntries(top, [&digest](auto const&... piece) { digest.Feed(piece...); });
+        return digest.Finish();
+    }
+    const std::uint64_t step = StepOf(size);
+    const std::uint64_t headerSize = digest.GetFed();
+    Checkpoints passed;
+    passed.packedSize = size;
+    passed.states.reserve(static_cast<std::size_t>((headerSize + size) / step));
+
+    std::uint64_t offset = 0;
+    Trail const* const trail = trail_.Get();
+    if (trail != nullptr && trail->handed && trail->handed->packedSize == size) {
+        const std::uint64_t same = trail->firstChanged.IsEmpty() ? size - 1 : OffsetOfLeaf(top, trail->firstChanged);
+        auto const& states = trail->handed->states;
+        const auto valid = std::min<std::uint64_t>((headerSize + same) / step, states.size());
+        if (valid > 0) {
+            passed.states.assign(states.begin(), states.begin() + static_cast<std::ptrdiff_t>(valid));
+            digest = IdDigest(passed.states.back(), valid * step);
+            offset = valid * step - headerSize;
+        }
+    }
+
+    const Cursor from = Cursor::AtLeafOf(top, offset);
+    NotingDigest noting(digest, passed.states, step, offset);
+    PackEntries(top, from, [&noting](auto const&... piece) { noting.Feed(piece...); });
+    const auto take = [&passed] { return std::move(passed); };
+    static_cast<void>(trail_.GetOrMake([] { return Trail(); }).computed.GetOrMake(take));
+    return digest.Finish();
+}
+
+} // namespace KivVcs::detail
