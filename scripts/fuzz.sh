@@ -1,17 +1,18 @@
 #!/bin/bash
 # usage: scripts/fuzz.sh [SECONDS] [TARGET...]
 # Installs what is missing, builds the fuzz targets with clang 14's libFuzzer under AddressSanitizer and
-# UndefinedBehaviorSanitizer, and lets each (readers, paths, operations, lanes) look for inputs that break something, for SECONDS of
-# CPU time (60 unless given) from the inputs in fuzz/corpus on. Fails at the first finding and says where its input is kept.
+# UndefinedBehaviorSanitizer, and lets each (readers, paths, operations, lanes; forms and files of the archive) look for
+# inputs that break something, for SECONDS of CPU time (60 unless given) from the inputs in fuzz/corpus on. Fails at the first
+# finding and says where its input is kept.
 # New inputs that reach more code are kept below the build directory, in corpus/TARGET, for the next time.
 
 . "$(dirname "$0")/lib.sh"
 seconds=${1:-60}
 [[ $seconds =~ ^[0-9]+$ ]] || usage 1
 targets=("${@:2}")
-[ ${#targets[@]} -gt 0 ] || targets=(readers paths operations lanes)
+[ ${#targets[@]} -gt 0 ] || targets=(readers paths operations lanes forms files)
 
-install_packages build fuzz
+install_packages build archive fuzz
 build_preset fuzz
 export ASAN_OPTIONS=malloc_context_size=2:quarantine_size_mb=16
 TIMEFORMAT='%U %S'
@@ -22,7 +23,11 @@ for target in "${targets[@]}"; do
     log=$build_directory/fuzz_$target.log
     mkdir -p "$inputs"
     : >"$log"
-    options=(-max_len=128 -entropic=0 -timeout=60 -malloc_limit_mb=64 -print_final_stats=1
+    case $target in
+    forms) longest=1024 ;;
+    *) longest=128 ;;
+    esac
+    options=(-max_len="$longest" -entropic=0 -timeout=60 -malloc_limit_mb=64 -print_final_stats=1
         -artifact_prefix="$build_directory/finding-$target-")
     [ ! -e "$source_directory/fuzz/$target.dict" ] || options+=(-dict="$source_directory/fuzz/$target.dict")
     spent=0

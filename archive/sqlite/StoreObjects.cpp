@@ -23,8 +23,8 @@ public:
     Preparation(std::vector<Item> const& items, Connection& connection, FormCache& cache, unsigned workers)
         : connection_(connection), workers_(workers) {
         Transaction transaction(connection.database, Transaction::Kind::Read);
-        SelectNew(items);
         FormReader reader(connection, cache);
+        SelectNew(items, reader);
         for (Prepared& one : prepared_)
             if (EarlierPrepared(one) == nullptr && !one.item->earlier.IsEmpty())
                 FindBase(one, nullptr, reader, connection.database);
@@ -44,6 +44,8 @@ public:
 
     [[nodiscard]] std::vector<Prepared> const& Items() const noexcept { return prepared_; }
     [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
+    /// What is there and has to be stored anew.
+    [[nodiscard]] std::vector<std::pair<Id, Place>> const& Damaged() const noexcept { return damaged_; }
 
     /// The forms of all segments, in order.
     [[nodiscard]] std::vector<Bytes> MakeSegments() const {
@@ -59,18 +61,28 @@ public:
     }
 
 private:
-    void SelectNew(std::vector<Item> const& items) {
+    void SelectNew(std::vector<Item> const& items, FormReader& reader) {
         prepared_.reserve(items.size());
         for (Item const& item : items) {
             if (numbers_.count(item.id) != 0)
                 continue;
-            if (FindRow(connection_.database, item.id)) {
-                present_.push_back(item.id);
-                continue;
+            if (auto const row = FindRow(connection_.database, item.id)) {
+                if (IsUsable(item, *row, reader)) {
+                    present_.push_back(item.id);
+                    continue;
+                }
+                damaged_.emplace_back(item.id, row->place);
             }
             numbers_.emplace(item.id, prepared_.size());
             prepared_.emplace_back().item = &item;
         }
+    }
+
+    /// Nobody but a content asks for its pieces, so that one that is damaged would be found out when it is too late.
+    static bool IsUsable(Item const& item, ObjectRow const& row, FormReader& reader) {
+        bool isSame = item.type != StoredType::Piece;
+        return isSame ||
+               (IsSound([&] { isSame = DigestOfBytes(reader.FormAt(row.place).bytes) == item.id; }) && isSame);
     }
 
     /// The version before, if it is among those prepared and comes before @p one.
@@ -133,6 +145,7 @@ private:
     unsigned workers_;
     std::vector<Prepared> prepared_;
     std::vector<Id> present_;
+    std::vector<std::pair<Id, Place>> damaged_;
     std::unordered_map<Id, std::size_t> numbers_;
     std::vector<std::vector<std::size_t>> layout_;
 };
@@ -145,6 +158,11 @@ bool WriteItems(Writer& writer, Preparation const& preparation, std::vector<Byte
     for (Prepared const& one : preparation.Items())
         if (one.relied && !writer.IsAt(one.relied->first, one.relied->second))
             return false;
+    for (auto const& [id, place] : preparation.Damaged()) {
+        if (!writer.IsAt(id, place))
+            return false;
+        writer.RemoveObject(id, place);
+    }
     if (forms.empty())
         return true;
     std::uint64_t const first = writer.NextSegment();

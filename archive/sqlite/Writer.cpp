@@ -1,6 +1,7 @@
 #include "sqlite/Writer.h"
 
 #include "Changes.h"
+#include "sqlite/Compaction.h"
 
 #include <algorithm>
 
@@ -73,6 +74,10 @@ void Writer::AddObject(Id const& id, StoredType type, Place const& place) {
         return;
     Query(database_, "INSERT INTO sparse(segment) VALUES(?) ON CONFLICT DO NOTHING").With(place.segment).Run();
     Use(id);
+}
+
+void Writer::RemoveObject(Id const& id, Place const& place) {
+    KivArchive::RemoveObject(database_, id, place);
 }
 
 void Writer::AddDependency(std::uint64_t base, std::uint64_t segment) {

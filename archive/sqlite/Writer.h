@@ -23,6 +23,8 @@ public:
     void AddSegment(std::uint64_t number, ByteView form);
     /// The first one of an identifier stays, and another one's place is left to be cleared.
     void AddObject(Id const& id, StoredType type, Place const& place);
+    /// Its place is left to be cleared.
+    void RemoveObject(Id const& id, Place const& place);
     void AddDependency(std::uint64_t base, std::uint64_t segment);
 
     /// Facts, branches and records, and what is relied on. @throws ArchiveError of kind `Collected`

@@ -1,10 +1,11 @@
-#include "ArchiveFiles.h"
 #include "FaultyFiles.h"
+#include "Trials.h"
 
 #include <gtest/gtest.h>
 
 #include <cstdlib>
 #include <new>
+#include <utility>
 
 /// Operations during which one allocation, or one access to the disk, after the other fails. The archive must be whole
 /// after each, and the next operation must succeed.
@@ -59,10 +60,33 @@ using namespace Conformance;
 
 constexpr const char* pathOfStart = "start";
 
+/// A host's callback that fails once, by an exception or by asking to stop.
+struct Callbacks final : IProgress {
+    struct Thrown {};
+
+    bool Report(Progress const& /*progress*/) override {
+        if (failing == 0 || ++made != failing)
+            return true;
+        if (made % 2 == 0)
+            throw Thrown();
+        return false;
+    }
+
+    long failing = 0;
+    long made = 0;
+};
+Callbacks callbacks;
+
+/// What synchronizing and repairing take from; made before anything fails.
+std::unique_ptr<MemArchive> elsewhere;
+
 /// What may be interrupted; each begins with the same archive.
 struct Operation {
     const char* name;
     void (*run)(std::string const& path);
+    bool hasCallbacks = false;
+    /// Whether the archive is damaged at the beginning, and repaired from elsewhere in the end.
+    bool isDamaged = false;
 };
 
 SqliteOptions OneWorker() {
@@ -87,34 +111,72 @@ void Publish(std::string const& path) {
         host.Publish();
 }
 
+void PublishBranch(std::string const& path) {
+    auto const archive = std::make_shared<SqliteArchive>(path, OneWorker());
+    for (int i = 0; i < 2; ++i)
+        PublishByRepository(archive, "file" + std::to_string(i), &callbacks);
+}
+
 void CollectAll(std::string const& path) {
     SqliteArchive archive(path, OneWorker());
     CollectOptions options;
     options.grace = std::chrono::seconds(0);
     options.slice = 4;
     for (int i = 0; i < 2; ++i)
-        Collect(archive, options, nullptr);
+        Collect(archive, options, &callbacks);
+}
+
+void Take(std::string const& path) {
+    SqliteArchive archive(path, OneWorker());
+    Synchronize(*elsewhere, archive, FromElsewhere(), &callbacks);
+}
+
+void RepairAll(std::string const& path) {
+    SqliteArchive archive(path, OneWorker());
+    Repair(archive, *elsewhere, &callbacks);
 }
 
 void Copy(std::string const& path) {
     SqliteArchive archive(path, OneWorker());
-    archive.Backup(path + ".copy", nullptr);
+    archive.Backup(path + ".copy", &callbacks);
 }
 
-constexpr Operation operations[] = {
-    {"Open", Open}, {"MakeNew", MakeNew}, {"Publish", Publish}, {"Collect", CollectAll}, {"Copy", Copy}};
+constexpr Operation operations[] = {{"Open", Open},
+                                    {"MakeNew", MakeNew},
+                                    {"Publish", Publish},
+                                    {"PublishBranch", PublishBranch, true},
+                                    {"Collect", CollectAll, true},
+                                    {"Synchronize", Take, true},
+                                    {"Repair", RepairAll, true, true},
+                                    {"Copy", Copy, true}};
 
 /// An archive with versions that nothing reaches any more, beside some that are.
-std::string MakeStart(std::string const& path) {
+std::string MakeStart(std::string const& path, bool isDamaged) {
+    elsewhere = std::make_unique<MemArchive>();
+    std::filesystem::remove(path);
     {
         SqliteArchive archive(path, OneWorker());
         SmallHost host(archive, 1);
         for (int i = 0; i < 9; ++i)
             host.Publish();
+        SynchronizeOptions options;
+        options.branches = {{u"master", u"master"}};
+        Synchronize(archive, *elsewhere, options, nullptr);
+        SmallHost others(*elsewhere, 2);
+        for (int i = 0; i < 4; ++i)
+            EXPECT_TRUE(others.Publish());
         Id const head = host.Head();
         Change change;
         change.branches = {{u"master", head, archive.ReadAncestry({&head, 1}, Follow::Parents, 4).back().commit}};
         archive.Apply(change);
+    }
+    if (isDamaged) {
+        sqlite3* database = nullptr;
+        sqlite3_open(path.c_str(), &database);
+        sqlite3_exec(database,
+                     "UPDATE segments SET form=zeroblob(9) WHERE number%4=1; DELETE FROM objects WHERE segment%4=2",
+                     nullptr, nullptr, nullptr);
+        sqlite3_close(database);
     }
     return ReadFile(path);
 }
@@ -132,7 +194,7 @@ protected:
     template <class Arm, class Disarm>
     void TryAll(const char* kind, Arm arm, Disarm disarm) {
         std::string const path = directory_.Path("archive");
-        std::string const start = MakeStart(directory_.Path(pathOfStart));
+        std::string const start = MakeStart(directory_.Path(pathOfStart), GetParam().isDamaged);
         int const stride = CountFromEnvironment("KIVVCS_ARCHIVE_FAULT_STRIDE", 7);
         Outcomes outcomes;
         bool hasFailed = true;
@@ -149,6 +211,8 @@ protected:
                 isRefused = true;
             } catch (std::bad_alloc const&) {
                 isRefused = true;
+            } catch (Callbacks::Thrown const&) {
+                isRefused = true;
             }
             hasFailed = disarm();
             outcomes.faults += hasFailed ? 1 : 0;
@@ -164,6 +228,8 @@ protected:
     void CheckWhole(std::string const& path, const char* kind, long fault) {
         for (std::string const& file : {path, path + ".new"}) {
             SqliteArchive archive(file, OneWorker());
+            if (GetParam().isDamaged && file == path)
+                Repair(archive, *elsewhere, nullptr);
             ASSERT_EQ(ProblemsOf(archive), "") << kind << ": after fault " << fault;
             ASSERT_TRUE(SmallHost(archive, 5).Publish()) << kind << ": after fault " << fault;
         }
@@ -201,6 +267,18 @@ TEST_P(ArchiveFaults, OfTheDisk) {
             },
             [] { return FaultyFiles::Disarm(); });
     }
+}
+
+TEST_P(ArchiveFaults, OfCallbacks) {
+    if (!GetParam().hasCallbacks)
+        GTEST_SKIP() << "it has none";
+    TryAll(
+        "callbacks",
+        [](long fault) {
+            callbacks.failing = fault;
+            callbacks.made = 0;
+        },
+        [] { return callbacks.made >= std::exchange(callbacks.failing, 0); });
 }
 
 INSTANTIATE_TEST_SUITE_P(During, ArchiveFaults, testing::ValuesIn(operations),

@@ -1,5 +1,4 @@
-#include "ArchiveFiles.h"
-#include "KivArchive/MemArchive.h"
+#include "Trials.h"
 
 #include <gtest/gtest.h>
 
@@ -167,13 +166,30 @@ private:
     std::mt19937 engine_;
 };
 
+/// Rows in each other's places, absurd numbers and sizes, and what would run: done by SQL, which a stranger may use, too.
+const char* const rowDamages[] = {
+    "UPDATE objects SET segment=segment+1 WHERE segment%3=0",
+    "UPDATE objects SET member=9223372036854775807 WHERE segment%2=0",
+    "UPDATE objects SET type=4 WHERE type=0",
+    "UPDATE objects SET type=77, segment=-1",
+    "UPDATE segments SET form=(SELECT form FROM segments AS other WHERE other.number=segments.number+1) WHERE number<9",
+    "UPDATE segments SET form=substr(form, 1, 30)||zeroblob(99999999) WHERE number%2=0",
+    "UPDATE segments SET form=x'0000000000000000018080808080808080808001' WHERE number%3=1",
+    "UPDATE branches SET head=zeroblob(31)",
+    "UPDATE ancestry SET parent=id, tree=zeroblob(1000000)",
+    "UPDATE OR REPLACE dependencies SET base=segment",
+    "INSERT OR IGNORE INTO sparse SELECT number FROM segments; UPDATE segments SET number=number+(1<<62)",
+    "CREATE TRIGGER t AFTER INSERT ON objects BEGIN DELETE FROM branches; END",
+    "CREATE VIEW v AS WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) SELECT x FROM n",
+};
+
 /// One kind of damage after the other; the seed decides where.
 std::string Damage(std::string bytes, std::uint32_t seed) {
     Random random(seed);
     constexpr std::size_t page = 4096;
     std::size_t const pages = bytes.size() / page;
     auto const at = [&](std::size_t number) { return bytes.begin() + static_cast<std::ptrdiff_t>(number * page); };
-    switch (seed % 6) {
+    switch (seed % 7) {
     case 0:
         for (std::size_t i = 0; i <= random.Below(20); ++i)
             bytes[random.Below(bytes.size())] ^= static_cast<char>(1U << random.Below(8));
@@ -214,10 +230,23 @@ TEST(SqliteArchive, TellsDamageAndGivesWhatIsSound) {
     std::uint64_t given = 0;
     for (int trial = 0; trial < trials; ++trial) {
         std::string const path = directory.Path("damaged");
-        WriteFile(path, Damage(sound, static_cast<std::uint32_t>(trial)));
+        bool const isOfRows = trial % 7 == 6;
+        WriteFile(path, isOfRows ? sound : Damage(sound, static_cast<std::uint32_t>(trial)));
+        if (isOfRows)
+            RunSql(path, rowDamages[static_cast<std::size_t>(trial / 7) % std::size(rowDamages)]);
+        if (trial % 5 == 0) {
+            MemArchive salvaged;
+            Salvage(path, salvaged, nullptr);
+            EXPECT_TRUE(Verify(salvaged, nullptr).damaged.empty());
+        }
         try {
             SqliteArchive archive(path);
-            // What is read is compared with its identifier there; nothing else counts as read.
+            std::vector<Id> listed;
+            for (ObjectInfo const& info : archive.ListObjects({}, 1U << 20U))
+                listed.push_back(info.id);
+            archive.Read(listed, [](ArchivedObject const& object) {
+                EXPECT_TRUE(object.size > largestWholeContent || Identify(object.type, object.data) == object.id);
+            });
             VerifyReport const report = Verify(archive, nullptr);
             partial += report.IsSound() ? 0 : 1;
             given += report.objects;
@@ -299,12 +328,20 @@ TEST(SqliteArchive, SalvageLosesWhatIsOnADamagedPageAndNothingElse) {
     EXPECT_LT(whole, tried);
 }
 
-/// Publishes and collects until it is killed, and reports every head that it has published.
+/// Publishes, synchronizes and collects until it is killed, and reports every head that it has published.
 [[noreturn]] void PublishForever(std::string const& path, std::uint32_t seed, int told) {
     try {
-        SqliteArchive archive(path);
+        auto const shared = std::make_shared<SqliteArchive>(path);
+        SqliteArchive& archive = *shared;
         SmallHost host(archive, seed);
+        MemArchive elsewhere;
+        SmallHost other(elsewhere, seed + 1);
         for (int i = 1;; ++i) {
+            if (i % 3 == 0) {
+                other.Publish();
+                Synchronize(elsewhere, archive, FromElsewhere(), nullptr);
+                PublishByRepository(shared, std::to_string(seed) + "." + std::to_string(i));
+            }
             if (host.Publish()) {
                 Id::Digest const digest = *host.Head().GetDigest();
                 if (write(told, digest.data(), digest.size()) != static_cast<ssize_t>(digest.size()))
