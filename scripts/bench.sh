@@ -4,7 +4,7 @@
 # Installs what is missing, builds the benchmarks and runs those whose names match FILTER, each workload, its contender and its
 # floor in turn, and prints one table with the medians over nine rounds; build/bench/result.json holds the numbers. --quick
 # runs a quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws build/bench/performance.svg.
-# With `archive` as FILTER it runs the archive beside git instead, and prints one table with the limits that it keeps to.
+# With `archive` or `vault` as FILTER it runs that beside git instead, and prints one table with the limits that it keeps to.
 # --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
 # says by over 5 %; --update writes that file. docs/performance.md says what is measured.
 
@@ -52,6 +52,12 @@ if [[ ${1:-} == archive ]]; then
     build_preset bench
     exec /usr/bin/python3 "$source_directory/bench/archive/compare.py" "$build_directory/bench/kivvcs_archive_bench" \
         ${mode:+"$mode"}
+fi
+if [[ ${1:-} == vault ]]; then
+    [[ $# -eq 1 && ${mode:---quick} == --quick ]] || usage 1
+    install_packages build archive vault demo
+    build_preset release
+    exec /usr/bin/python3 "$source_directory/bench/vault.py" "$build_directory/examples/vault/vault" ${mode:+"$mode"}
 fi
 if [ $# -gt 1 ] || [[ $mode == --check && ${1:---update} != --update ]]; then
     usage 1

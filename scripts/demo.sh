@@ -2,8 +2,8 @@
 # usage: scripts/demo.sh [PICTURE]
 # Installs what is missing, builds the example host `vault`, and shows what it does with this project: versions its
 # history (or, where there is none, its tree), lists and compares versions and verifies them; then lets two people work
-# apart and brings their work together. Draws the history that comes out of it to PICTURE, an SVG file, by default beside
-# the vaults.
+# apart and bring their work together three times, and a damaged vault be repaired. Draws the history that comes out of it
+# to PICTURE, an SVG file, by default beside the vaults.
 
 . "$(dirname "$0")/lib.sh"
 [[ $# -le 1 && ${1:-} != -* ]] || usage 1
@@ -47,6 +47,13 @@ save_history() {
     tail -n 3 saved
 }
 
+# What git takes for the same versions after it has packed them.
+size_in_git() {
+    git clone --quiet --bare --no-local --depth $versions_shown "file://$source_directory" packed.git
+    git -C packed.git gc --quiet --aggressive --prune=now
+    size_of packed.git/objects
+}
+
 save_tree() {
     mkdir version
     tar -C "$source_directory" --exclude=./build --exclude=./.git -c . | tar -x -C version
@@ -71,40 +78,57 @@ show_project() {
     step "Sizes"
     printf '%s versions of together %s bytes\n' "$("$vault" log | wc -l)" "$content_size"
     printf 'are held by one file of %s bytes\n' "$(stat -c %s vault.db)"
+    if has_history; then
+        printf 'while the same in git, packed, takes %s bytes\n' "$(size_in_git)"
+    fi
     step "Every stored object, checked"
     show verify
     "$vault" restore master restored && diff -r version restored && echo "restored without a difference"
 }
 
-# Ann and Ben each have the project, work on it apart, and do not agree about the README.
-work_apart() {
-    export VAULT_AUTHOR='Ann <ann@example.org>'
+# Ann and Ben each have the project, and work on it apart from each other.
+begin_apart() {
     mv vault.db ann.db && cp ann.db ben.db
     "$vault" -f ann.db restore master ann && "$vault" -f ben.db restore master ben
-    echo 'Ann was here.' >>ann/README.md
-    mkdir ann/plans && echo 'Sail to the north.' >ann/plans/summer
-    rm ann/CHANGELOG.md
-    show -f ann.db save ann -m 'Plan the summer'
-    sleep 1
-    export VAULT_AUTHOR='Ben <ben@example.org>'
-    echo 'Ben was here.' >>ben/README.md
-    echo 'Stay at home.' >ben/plans
-    echo '- Ben' >>ben/CHANGELOG.md
-    echo 'Ben wrote this.' >ben/notes.txt
-    show -f ben.db save ben -m 'Write notes'
 }
 
-come_together() {
-    step "Ann gets Ben's work; nothing of hers is touched"
+as_ann() {
     export VAULT_AUTHOR='Ann <ann@example.org>'
-    show -f ann.db sync ben.db
-    show -f ann.db merge other/master && die "the conflicts were not found"
-    step "Both changed the same: the later one wins"
-    show -f ann.db merge other/master --on-conflict newest
-    step "Ben takes what Ann made of it"
+    show -f ann.db "$@"
+}
+
+as_ben() {
     export VAULT_AUTHOR='Ben <ben@example.org>'
-    show -f ben.db sync ann.db
-    show -f ben.db merge other/master --on-conflict right
+    show -f ben.db "$@"
+}
+
+# Brings both together: Ann merges what Ben did, and Ben takes over what Ann made of it.
+exchange() {
+    as_ann sync ben.db
+    as_ann merge other/master "$@"
+    as_ben sync ann.db
+    as_ben merge other/master
+    "$vault" -f ann.db restore master ann --force --delete && "$vault" -f ben.db restore master ben --force --delete
+}
+
+work_together() {
+    step "Both change the README, in different places, and files of their own"
+    sed -i '1s/$/ (edited by Ann)/' ann/README.md && mkdir ann/plans && echo 'Sail to the north.' >ann/plans/summer
+    as_ann save ann -m 'Plan the summer'
+    echo 'Ben was here.' >>ben/README.md && echo 'Ben wrote this.' >ben/notes.txt
+    as_ben save ben -m 'Write notes'
+    exchange
+    step "Ann removes what Ben wrote, Ben goes on: nothing comes back, nothing is lost"
+    rm ann/notes.txt && as_ann save ann -m 'No notes'
+    echo 'Sail to the south.' >>ben/plans/winter && as_ben save ben -m 'Plan the winter'
+    exchange
+    step "A true conflict: both change one line, and a directory becomes a file"
+    echo 'Stay at home.' >ann/plans/summer && as_ann save ann -m 'Stay'
+    rm -r ben/plans && echo 'No plans.' >ben/plans && as_ben save ben -m 'No plans'
+    as_ann sync ben.db
+    as_ann merge other/master && die "the conflict was not found"
+    step "Ann keeps her side"
+    exchange --on-conflict left
 }
 
 prove_equality() {
@@ -114,9 +138,16 @@ prove_equality() {
     ben=$("$vault" -f ben.db show master | grep '^root')
     printf 'ann.db %s\nben.db %s\n' "$ann" "$ben"
     [ "$ann" = "$ben" ] || die "the vaults differ"
-    "$vault" -f ann.db verify && "$vault" -f ben.db verify
-    step "Only the heads and where they part are kept"
-    show -f ann.db compact
+    show -f ann.db graph --text | sed -n '1,12p'
+}
+
+survive_damage() {
+    step "A disk loses 200 KB of Ann's vault: what is sound is read, the rest comes from Ben"
+    dd if=/dev/zero of=ann.db bs=4096 seek=$(($(stat -c %s ann.db) / 8192)) count=50 conv=notrunc status=none
+    show -f ann.db verify 2>&1 | tail -n 1
+    show -f ann.db log -n 2
+    show -f ann.db repair ben.db
+    show -f ann.db verify
 }
 
 draw() {
@@ -131,9 +162,9 @@ workshop=$(mktemp -d)
 picture=$(realpath -m "${1:-$workshop/history.svg}")
 cd "$workshop" || exit
 show_project
-step "Two people work apart"
-work_apart
-come_together
+begin_apart
+work_together
 prove_equality
+survive_damage
 draw "$picture"
 printf 'The vaults are in %s\n' "$workshop"

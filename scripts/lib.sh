@@ -43,7 +43,7 @@ packages_of() {
     build) echo cmake g++ ninja-build pkg-config libgtest-dev binutils tzdata gdb dpkg-dev python3 ;;
     archive) echo libsqlite3-dev libzstd-dev libpq-dev ;;
     postgres) echo postgresql ;;
-    vault) echo libsqlite3-dev libcli11-dev sqlite3 ;;
+    vault) echo libsqlite3-dev libzstd-dev libcli11-dev sqlite3 ;;
     demo) echo git graphviz ;;
     clang) echo clang-14 ;;
     abi) echo abigail-tools xz-utils ;;

@@ -3,8 +3,9 @@
 
 set -euo pipefail
 vault=$(realpath "$1")
+here=$(realpath "$(dirname "${BASH_SOURCE[0]}")")
 work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
+trap 'chmod -R u+rwx "$work" 2>/dev/null; rm -rf "$work"' EXIT
 cd "$work"
 export VAULT_AUTHOR='Ann Example <ann@example.org>' TZ=Asia/Kathmandu
 
@@ -20,13 +21,17 @@ matches() {
         grep -qE -- "$pattern" <<<"$text" || fail "no '$pattern' in: $text"
     done
 }
-# refused STATUS PATTERN ARGUMENT...: vault ends with STATUS and one line on standard error that has PATTERN.
-refused() {
+# ends STATUS PATTERN ARGUMENT...: vault ends with STATUS and has PATTERN on standard error, whose output is in out.
+ends() {
     local status=0
-    "$vault" "${@:3}" >out 2>err || status=$?
-    equal "$status" "$1"
-    equal "$(wc -l <err)" 1
+    "$vault" "${@:3}" >out 2>err </dev/null || status=$?
+    [ "$status" = "$1" ] || fail "'$*' ended with $status: $(cat err)"
     matches "$(cat err)" "$2"
+}
+# refused PATTERN ARGUMENT...: vault ends with status 2 and one line on standard error that has PATTERN.
+refused() {
+    ends 2 "$@"
+    equal "$(wc -l <err)" 1
 }
 root_of() { "$vault" "${@:2}" show "$1" | sed -n 's/^root *//p'; }
 # write FILE CONTENT...: makes files of one line each, and their directories.
@@ -37,3 +42,8 @@ write() {
         shift 2
     done
 }
+# Everything in a directory that a version keeps.
+state_of() { (cd "$1" && find . -printf '%P %y %#m %l %T@ ' -type f -exec md5sum {} + -o -printf '\n' | LC_ALL=C sort); }
+same() { diff <(state_of "$1") <(state_of "$2") || fail "$1 and $2 differ"; }
+# files DIR: the files below it with their contents, on one line.
+files() { (cd "$1" && find . -type f -printf '%P\n' | LC_ALL=C sort | while read -r f; do echo "$f:$(cat "$f")"; done | xargs); }

@@ -1,8 +1,11 @@
 #pragma once
 
+#include <list>
 #include <string>
+#include <string_view>
 #include <unistd.h>
 #include <utility>
+#include <vector>
 
 namespace vault {
 
@@ -33,5 +36,40 @@ private:
 
 /// @throws Problem with the reason why the last system call failed
 [[noreturn]] void ThrowSystemProblem(std::string const& what, std::string const& path);
+
+/// The path without links and dots; @p path itself if there is nothing.
+[[nodiscard]] std::string RealPath(std::string const& path);
+
+/// Opens the directory @p name of @p parent, if it is no link.
+[[nodiscard]] Descriptor OpenDirectory(int parent, char const* name, int moreFlags = 0) noexcept;
+
+/// The names in a directory, without "." and "..". @return false, with errno set, if it cannot be listed
+[[nodiscard]] bool ReadNames(Descriptor const& directory, std::vector<std::string>& names);
+
+/// Opens directories below a top one by their paths, of any depth and without ever following a link.
+class DirectoryOpener {
+public:
+    /// Links are followed at the top only.
+    /// @throws Problem if it is no directory
+    explicit DirectoryOpener(std::string const& top);
+    explicit DirectoryOpener(Descriptor top) noexcept : top_(std::move(top)) {}
+
+    /// A descriptor for the directory at @p path, which is empty for the top and otherwise ends with "/"; -1, with errno
+    /// set, if there is none. Valid until the next call.
+    [[nodiscard]] int Open(std::string_view path);
+    [[nodiscard]] int Top() const noexcept { return top_.Get(); }
+    /// Forgets what has been opened, which may have been replaced.
+    void Forget() noexcept { opened_.clear(); }
+
+private:
+    struct Opened {
+        std::string path;
+        Descriptor directory;
+    };
+
+    Descriptor top_;
+    /// The last ones used come first.
+    std::list<Opened> opened_;
+};
 
 } // namespace vault

@@ -1,200 +1,348 @@
 #include "Commands.h"
+#include "Names.h"
+#include "Output.h"
 #include "Problem.h"
-#include "Revision.h"
-#include "Vault.h"
+#include "Progress.h"
 
+#include <KivArchive/ArchivedRepository.h>
+#include <KivArchive/Upkeep.h>
 #include <algorithm>
 #include <iostream>
 #include <set>
+#include <sys/stat.h>
 
 namespace vault {
 
-using Access = VaultFile::Access;
-using KivVcs::Id;
+using KivArchive::ArchivedRepository;
+using KivVcs::Commit;
+using KivVcs::cow_ptr;
 
 namespace {
 
 constexpr char16_t const* forgetMark = u":forget";
 constexpr std::string_view otherPrefix = "other/";
+constexpr std::size_t factsAtOnce = 10'000;
 
-CommitHandle RequireBranch(KivVcs::Repository const& repository, std::string const& name) {
-    const auto branch = RequireUtf8(name, "a branch name");
-    if (!repository.GetStorage()->BranchExist(branch))
-        throw Problem("no such branch: " + Printable(name));
-    return repository.GetHead(branch);
+/// Removes what no branch has reached for some time; what is to go at once is marked first.
+KivArchive::CollectReport CollectUnreached(IArchive& archive, std::chrono::seconds grace) {
+    KivArchive::CollectOptions options;
+    options.grace = grace;
+    Progress progress("collecting");
+    auto report = KivArchive::Collect(archive, options, &progress);
+    if (grace == std::chrono::seconds(0) && report.marked > 0)
+        report = KivArchive::Collect(archive, options, &progress);
+    return report;
+}
+
+std::uint64_t SizeOf(std::string const& file) {
+    std::uint64_t size = 0;
+    for (auto const* const suffix : {"", "-wal"}) {
+        struct stat status {};
+        if (stat((file + suffix).c_str(), &status) == 0)
+            size += static_cast<std::uint64_t>(status.st_size);
+    }
+    return size;
+}
+
+void Publish(ArchivedRepository& repository) {
+    Progress progress("writing");
+    if (!repository.Publish(&progress).published)
+        throw Problem("somebody else changed the branches meanwhile; nothing was changed. Try again");
+}
+
+std::size_t CountCommits(ArchivedRepository const& repository) {
+    std::set<Id> reached;
+    for (auto const& [name, head] : repository.GetStorage()->GetRefs()) {
+        for (auto commit = head; commit && reached.insert(commit->GetId()).second; commit = commit->GetParent()) {
+        }
+    }
+    return reached.size();
+}
+
+/// The commits that only lead to a version, which are forgotten when it becomes the first one.
+std::vector<Id> CommitsBelow(Vault const& vault, Id const& commit) {
+    std::vector<Id> heads{commit};
+    std::vector<Id> below;
+    for (auto const& facts : vault.Archive().ReadAncestry(heads, KivArchive::Follow::Parents, SIZE_MAX)) {
+        if (facts.commit != commit)
+            below.push_back(facts.commit);
+    }
+    for (auto const& branch : vault.Archive().ReadBranches())
+        std::erase(below, branch.head);
+    return below;
 }
 
 /// The branches whose history leads from above down to @p commit.
-std::map<std::string, CommitHandle> BranchesAbove(KivVcs::Repository const& repository, CommitHandle const& commit) {
-    std::map<std::string, CommitHandle> above;
+std::vector<std::pair<Text, cow_ptr<Commit>>> BranchesAbove(ArchivedRepository const& repository,
+                                                            cow_ptr<Commit> const& commit) {
+    std::vector<std::pair<Text, cow_ptr<Commit>>> above;
     for (auto const& [name, head] : repository.GetStorage()->GetRefs()) {
         if (head && head != commit && repository.GetCommonBase(head, commit) == commit)
-            above.emplace(ToUtf8(name), head);
+            above.emplace_back(name, head);
     }
     return above;
 }
 
-/// Deleting takes commits out of the storage that branches still need, and stores some anew that equal them. Those would
-/// be purged, since no branch holds them: the storage is to have the very objects that the branches hold.
-void StoreReachableCommits(KivVcs::Repository& repository) {
-    std::unordered_set<Id> visited;
-    std::vector<CommitHandle> reachable;
-    for (auto const& [name, head] : repository.GetStorage()->GetRefs()) {
-        for (auto commit = head; commit && visited.insert(commit->GetId()).second; commit = commit->GetParent())
-            reachable.push_back(commit);
-    }
-    for (auto const& commit : reachable) {
-        repository.GetStorage()->DeleteCommit(commit);
-        repository.AddCommitToStorage(commit);
-    }
-}
-
 /// The library deletes a history with its top; a branch at the top makes it survive, and what lies above is put on top
 /// again.
-void ForgetBelow(KivVcs::Repository& repository, CommitHandle const& commit) {
+void ForgetBelow(ArchivedRepository& repository, cow_ptr<Commit> const& commit) {
     const auto above = BranchesAbove(repository, commit);
     repository.CreateBranch(forgetMark, commit);
     repository.DeleteCommits(commit);
     const auto kept = repository.GetHead(forgetMark);
     for (auto const& [name, head] : above)
-        repository.MoveBranchTo(RequireUtf8(name, "a branch name"), repository.MergelessRebase(head, commit, kept));
+        repository.MoveBranchTo(name, repository.MergelessRebase(head, commit, kept));
     repository.RemoveBranch(forgetMark);
-    StoreReachableCommits(repository);
 }
 
-/// Graphviz takes what looks like an entity of HTML for one, in plain labels too.
-std::string Quoted(std::string const& text) {
-    std::string quoted = "\"";
-    for (const char c : text) {
-        if (c == '"' || c == '\\')
-            quoted += '\\';
-        quoted += c;
-        if (c == '&')
-            quoted += "amp;";
+/// The versions that were forgotten here and that the other vault would bring back.
+std::vector<Id> Forgotten(IArchive& ours, IArchive& theirs, std::vector<Id> const& heads) {
+    std::vector<Id> known;
+    for (auto const& facts : theirs.ReadAncestry(heads, KivArchive::Follow::Reachable, SIZE_MAX))
+        known.push_back(facts.commit);
+    std::vector<Id> forgotten;
+    for (std::size_t at = 0; at < known.size(); at += factsAtOnce) {
+        const auto some = std::span(known).subspan(at, std::min(factsAtOnce, known.size() - at));
+        const auto missing = ours.FindMissing(some);
+        for (auto const& facts : ours.ReadAncestry(missing, KivArchive::Follow::Parents, 0))
+            forgotten.push_back(facts.commit);
     }
-    return quoted + '"';
-}
-
-void DrawHistory(CommitHandle commit, std::set<std::string>& drawn) {
-    for (; commit; commit = commit->GetParent()) {
-        const auto id = ToUtf8(commit->GetId());
-        if (!drawn.insert(id).second)
-            return;
-        std::cout << "  \"" << id
-                  << "\" [label=" << Quoted(Shortened(commit->GetId()) + "  " + Printable(commit->GetDescription()))
-                  << "];\n";
-        if (const auto parent = commit->GetParent())
-            std::cout << "  \"" << id << "\" -> \"" << ToUtf8(parent->GetId()) << "\";\n";
-    }
+    return forgotten;
 }
 
 } // namespace
 
-void DeleteBranch(Path const& file, std::string const& name) {
-    Vault vault(file, Access::Write);
-    const auto head = RequireBranch(vault.Repository(), name);
-    if (ToUtf8(vault.Repository().GetCurentBranch()) == name)
-        throw Problem("the current branch cannot be deleted");
-    vault.Repository().RemoveBranch(RequireUtf8(name, "a branch name"));
-    vault.Write();
+int ListBranches(VaultPlace const& place) {
+    const Vault vault(place);
+    const auto current = vault.CurrentBranch();
+    for (auto const& [name, head] : vault.Archive().ReadBranches())
+        std::cout << (name == current ? "* " : "  ") << Printable(name) << "  " << DigitsOf(head) << '\n';
+    return 0;
 }
 
-void Rebase(Path const& file, std::string const& branch, std::string const& onto) {
-    Vault vault(file, Access::Write);
-    auto& repository = vault.Repository();
-    const auto head = RequireBranch(repository, branch);
-    const auto ontoHead = RequireBranch(repository, onto);
+int MakeBranch(VaultPlace const& place, std::string const& name) {
+    const auto branch = RequireBranchName(name);
+    Vault vault(place);
+    const auto head = vault.Find("").id;
+    if (!MoveHead(vault, {}, branch, {}, head))
+        throw Problem("there is a branch " + Printable(name) + " already");
+    return 0;
+}
+
+int DeleteBranch(VaultPlace const& place, std::string const& name) {
+    Vault vault(place);
+    const auto head = vault.RequireBranch(name);
+    const auto branch = RequireUtf8(name, "a branch name");
+    if (vault.CurrentBranch() == branch)
+        throw Problem("the current branch cannot be deleted");
+    if (!MoveHead(vault, {}, branch, head, {}))
+        throw Problem("somebody else has moved the branch meanwhile");
+    return 0;
+}
+
+int Checkout(VaultPlace const& place, std::string const& name) {
+    Vault vault(place);
+    static_cast<void>(vault.RequireBranch(name));
+    KivArchive::Change change;
+    change.records.push_back(Vault::MakeCurrent(RequireUtf8(name, "a branch name")));
+    vault.Archive().Apply(change);
+    return 0;
+}
+
+int Rebase(VaultPlace const& place, std::string const& branch, std::string const& onto) {
+    Vault vault(place);
+    static_cast<void>(vault.RequireBranch(branch));
+    static_cast<void>(vault.RequireBranch(onto));
+    const auto name = RequireUtf8(branch, "a branch name");
+    ArchivedRepository repository(vault.SharedArchive());
+    const auto head = repository.GetHead(name);
+    const auto ontoHead = repository.GetHead(RequireUtf8(onto, "a branch name"));
     const auto base = repository.GetCommonBase(head, ontoHead);
-    if (!head || !ontoHead || base == head || base == ontoHead) {
+    if (base == head || base == ontoHead) {
         std::cout << "nothing to rebase\n";
-        return;
+        return 0;
     }
     const auto tip = repository.MergelessRebase(head, base, ontoHead);
-    repository.MoveBranchTo(RequireUtf8(branch, "a branch name"), tip);
-    vault.Write();
-    std::cout << Printable(branch) << " is now " << ToUtf8(tip->GetId()) << '\n';
+    repository.MoveBranchTo(name, tip);
+    Publish(repository);
+    std::cout << Printable(branch) << " is now " << DigitsOf(tip->GetId()) << '\n';
+    return 0;
 }
 
-void Join(Path const& file, std::string const& first, std::string const& second, std::string const& root) {
+int Join(VaultPlace const& place, std::string const& first, std::string const& second, std::string const& root) {
     const auto rootBranch = RequireBranchName(root);
-    Vault vault(file, Access::Write);
-    auto& repository = vault.Repository();
-    RequireBranch(repository, first);
-    RequireBranch(repository, second);
+    Vault vault(place);
+    static_cast<void>(vault.RequireBranch(first));
+    static_cast<void>(vault.RequireBranch(second));
+    ArchivedRepository repository(vault.SharedArchive());
     if (!repository.EnsureCommonRootFor(RequireUtf8(first, "a branch name"), RequireUtf8(second, "a branch name"),
                                         rootBranch))
         throw Problem("these branches cannot be joined");
-    vault.Write();
+    Publish(repository);
     std::cout << Printable(first) << " and " << Printable(second) << " have a common root\n";
+    return 0;
 }
 
-void Forget(Path const& file, std::string const& revision) {
-    Vault vault(file, Access::Write);
-    auto commit = FindRevision(vault.Repository(), revision);
-    if (!commit->GetParent()) {
+int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions const& options) {
+    Vault vault(place);
+    const auto version = vault.Find(revision);
+    const auto below = CommitsBelow(vault, version.id);
+    if (version.parent.IsEmpty() || below.empty()) {
         std::cout << "there is nothing below " << Printable(revision) << '\n';
-        return;
+        return 0;
     }
-    ForgetBelow(vault.Repository(), commit);
-    // Whatever is still held stays in the storage, and so in the file.
-    commit.reset();
-    vault.WriteAndPrune();
-}
-
-void Compact(Path const& file) {
-    Vault vault(file, Access::Write);
-    const auto before = std::filesystem::file_size(file);
-    vault.Repository().SimplifyCommitGraph(true);
-    vault.WriteAndPrune();
-    try {
-        vault.File().Shrink();
-    } catch (Problem const& problem) {
-        throw Problem(std::string("the history was compacted, but the file was not made smaller: ") + problem.what(),
-                      problem.ExitStatus());
+    const auto count = std::to_string(below.size()) + (below.size() == 1 ? " version" : " versions");
+    if (options.dryRun) {
+        std::cout << count << " would be forgotten\n";
+        return 0;
     }
-    const auto after = std::filesystem::file_size(file);
-    std::cout << before - std::min(before, after) << " bytes reclaimed, " << after << " left\n";
-}
-
-void Graph(Path const& file) {
-    Vault vault(file, Access::Read);
-    const auto current = ToUtf8(vault.Repository().GetCurentBranch());
-    std::set<std::string> drawn;
-    std::cout << "digraph vault {\n  rankdir=BT;\n  node [shape=box, style=rounded, fontname=\"sans-serif\"];\n";
-    for (auto const& [name, id] : vault.File().ReadBranches()) {
-        const auto node = Quoted("branch " + Printable(name));
-        std::cout << "  " << node << " [label=" << Quoted(Printable(name))
-                  << ", shape=ellipse, style=" << (name == current ? "bold" : "solid") << "];\n";
-        if (id.empty())
-            continue;
-        std::cout << "  " << node << " -> \"" << id << "\" [style=dashed];\n";
-        DrawHistory(vault.Repository().GetHead(RequireUtf8(name, "a branch name")), drawn);
-    }
-    std::cout << "}\n";
-}
-
-void Sync(Path const& file, Path const& other) {
-    if (std::error_code error; std::filesystem::equivalent(file, other, error))
-        throw Problem("a vault cannot be synced with itself");
-    Vault vault(file, Access::Write);
-    std::map<std::string, CommitHandle> heads;
+    Warn("another vault that still has them may bring them back when it is synced, which asks first");
+    if (!Confirm("Forget " + count + " before " + Shortened(version.id) + "?", options.yes))
+        return 0;
     {
-        VaultFile theirs(other, Access::Read);
-        for (auto const& [name, head] : theirs.ReadBranches()) {
-            // What they have from others is not theirs to hand on.
-            if (!name.starts_with(otherPrefix) && !head.empty())
-                heads.emplace(name, vault.Import(theirs, head));
+        ArchivedRepository repository(vault.SharedArchive());
+        repository.Load(std::span(&version.id, 1));
+        ForgetBelow(repository, repository.GetCommitFromStorage(version.id));
+        Publish(repository);
+    }
+    CollectUnreached(vault.Archive(), std::chrono::seconds(0));
+    std::cout << count << " forgotten\n";
+    return 0;
+}
+
+int Compact(VaultPlace const& place, RemovalOptions const& options) {
+    std::string file;
+    std::uint64_t size = 0;
+    {
+        Vault vault(place);
+        file = vault.File();
+        size = SizeOf(file);
+        ArchivedRepository repository(vault.SharedArchive());
+        const auto before = CountCommits(repository);
+        repository.SimplifyCommitGraph(true);
+        const auto gone = before - std::min(before, CountCommits(repository));
+        const auto count = std::to_string(gone) + " of " + std::to_string(before) + " versions";
+        if (options.dryRun) {
+            std::cout << count << " would go\n";
+            return 0;
         }
+        if (gone > 0 && !Confirm("Drop " + count + '?', options.yes))
+            return 0;
+        Publish(repository);
+        CollectUnreached(vault.Archive(), std::chrono::seconds(0));
     }
-    for (auto const& [name, head] : heads) {
-        const auto branch = RequireBranchName(std::string(otherPrefix) + name);
-        if (!vault.Repository().CreateBranch(branch, head))
-            vault.Repository().MoveBranchTo(branch, head);
+    // The database gives back what it can when it is closed.
+    const auto left = SizeOf(file);
+    std::cout << size - std::min(size, left) << " bytes reclaimed, " << left << " left\n";
+    return 0;
+}
+
+int Collect(VaultPlace const& place, unsigned days, RemovalOptions const& options) {
+    Vault vault(place);
+    const auto grace = std::chrono::hours(24) * days;
+    const auto due = vault.Archive().ListMarked(grace, {}, SIZE_MAX).size();
+    if (options.dryRun) {
+        std::cout << due << " objects that nothing has needed for " << days << " days would go\n";
+        return 0;
     }
-    const auto written = vault.Write();
-    for (auto const& [name, head] : heads)
-        std::cout << otherPrefix << Printable(name) << "  " << ToUtf8(head->GetId()) << '\n';
-    std::cout << written << " objects brought in\n";
+    if (!Confirm("Remove what nothing has needed for " + std::to_string(days) + " days?", options.yes))
+        return 0;
+    const auto report = CollectUnreached(vault.Archive(), grace);
+    std::cout << report.removed << " objects removed, " << report.marked << " more wait, " << report.reached
+              << " are needed\n";
+    return 0;
+}
+
+int Sync(VaultPlace const& place, std::string const& other, bool yes) {
+    struct stat one {};
+    struct stat two {};
+    if (stat(place.file.c_str(), &one) == 0 && stat(other.c_str(), &two) == 0 && one.st_dev == two.st_dev &&
+        one.st_ino == two.st_ino)
+        throw Problem("a vault cannot be synced with itself");
+    Vault vault(place, Vault::Access::Create);
+    const Vault theirs({other, place.wait});
+    KivArchive::SynchronizeOptions options;
+    std::vector<Id> heads;
+    for (auto const& [name, head] : theirs.Archive().ReadBranches()) {
+        // What they have from others is not theirs to hand on.
+        const auto shown = ToUtf8(name);
+        if (shown.starts_with(otherPrefix))
+            continue;
+        options.branches.push_back({name, RequireBranchName(std::string(otherPrefix) + shown)});
+        heads.push_back(head);
+    }
+    const auto forgotten = Forgotten(vault.Archive(), theirs.Archive(), heads);
+    if (!forgotten.empty()) {
+        Warn("versions that were forgotten here and that this brings back:");
+        for (auto const& commit : KivArchive::ReadCommits(theirs.Archive(), forgotten))
+            Warn("    " + Shortened(commit.id) + "  " + DescribeMessage(commit));
+        if (!Confirm("Bring them back?", yes))
+            return 0;
+    }
+    options.acceptsName = [](KivVcs::KivStringViewT<char16_t> name) {
+        const auto stored = ToUtf8(name);
+        return IsOwn(stored) || FileName(stored).has_value();
+    };
+    KivArchive::SynchronizeReport report;
+    {
+        Progress progress("syncing");
+        report = KivArchive::Synchronize(theirs.Archive(), vault.Archive(), options, &progress);
+    }
+    for (auto const& [name, head] : report.heads)
+        std::cout << otherPrefix << Printable(name) << "  " << DigitsOf(head) << '\n';
+    std::cout << report.objects << " objects brought in\n";
+    return 0;
+}
+
+int Verify(VaultPlace const& place, bool json) {
+    const Vault vault(place);
+    KivArchive::VerifyReport report;
+    {
+        Progress progress("verifying");
+        report = KivArchive::Verify(vault.Archive(), &progress);
+    }
+    if (json)
+        std::cout << "{\"objects\":" << report.objects << ",\"sound\":" << (report.IsSound() ? "true" : "false")
+                  << ",\"findings\":[";
+    std::size_t count = 0;
+    const auto find = [&](std::string const& finding) {
+        if (json)
+            std::cout << (count == 0 ? "\n" : ",\n") << JsonText(finding);
+        else
+            Warn(finding);
+        ++count;
+    };
+    for (auto const& id : report.damaged)
+        find("damaged object " + DigitsOf(id));
+    for (auto const& [id, namedBy] : report.missing)
+        find("missing object " + DigitsOf(id) + ", needed by " + DigitsOf(namedBy));
+    for (auto const& [name, head] : report.branches)
+        find("branch " + Printable(name) + " has lost its version " + DigitsOf(head));
+    for (auto const& id : report.ancestry)
+        find("facts of version " + DigitsOf(id) + " are missing or wrong");
+    if (json)
+        std::cout << (count == 0 ? "]}\n" : "\n]}\n");
+    else if (report.IsSound())
+        std::cout << "verified " << report.objects << " objects\n";
+    else
+        throw Problem(PrintableName(StoredName(place.file)) + " is damaged: " + std::to_string(count) +
+                          " findings (repair takes them from another vault)",
+                      findingsExitStatus);
+    return report.IsSound() ? 0 : findingsExitStatus;
+}
+
+int Repair(VaultPlace const& place, std::string const& other) {
+    const Vault vault(place);
+    const Vault theirs({other, place.wait});
+    KivArchive::RepairReport report;
+    {
+        Progress progress("repairing");
+        report = KivArchive::Repair(vault.Archive(), theirs.Archive(), &progress);
+    }
+    for (auto const& id : report.lost)
+        Warn("not to be had there: object " + DigitsOf(id));
+    std::cout << report.repaired.size() << " objects repaired, " << report.lost.size() << " lost\n";
+    return report.lost.empty() ? 0 : findingsExitStatus;
 }
 
 } // namespace vault

@@ -16,7 +16,9 @@ private:
     int exitStatus_;
 };
 
-/// The exit status of damaged vaults and of merges that were stopped by conflicts.
+/// The command was carried out as far as that was possible: damage, conflicts, files that were not saved or restored.
 inline constexpr int findingsExitStatus = 1;
+/// A listing was cut off.
+inline constexpr int cutOffExitStatus = 3;
 
 } // namespace vault

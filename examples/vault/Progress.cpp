@@ -16,29 +16,32 @@ Progress::Progress(std::string label)
     : label_(std::move(label)), isTerminal_(isatty(STDERR_FILENO) == 1), nextShow_(Clock::now() + patience) {}
 
 Progress::~Progress() {
-    Erase();
+    if (isShown_)
+        std::cerr << "\r\x1b[K" << std::flush;
 }
 
 void Progress::Step(std::uint64_t bytes) {
     ++steps_;
     bytes_ += bytes;
-    if (!isTerminal_ || Clock::now() < nextShow_)
-        return;
-    Erase();
-    std::cerr << label_ << ": " << steps_ << ", " << bytes_ / mebibyte << " MiB" << std::flush;
+    if (IsDue())
+        Show(label_ + ": " + std::to_string(steps_) + ", " + std::to_string(bytes_ / mebibyte) + " MiB");
+}
+
+bool Progress::Report(KivArchive::Progress const& progress) {
+    if (IsDue())
+        Show(label_ + ": " + progress.step + ' ' + std::to_string(progress.done) +
+             (progress.total == 0 ? "" : " of " + std::to_string(progress.total)));
+    return true;
+}
+
+bool Progress::IsDue() const {
+    return isTerminal_ && Clock::now() >= nextShow_;
+}
+
+void Progress::Show(std::string const& line) {
+    std::cerr << "\r\x1b[K" << line << std::flush;
     isShown_ = true;
     nextShow_ = Clock::now() + patience;
-}
-
-void Progress::Say(std::string_view line) {
-    Erase();
-    isShown_ = false;
-    std::cerr << "vault: " << line << '\n';
-}
-
-void Progress::Erase() const {
-    if (isShown_)
-        std::cerr << "\r\x1b[K" << std::flush;
 }
 
 } // namespace vault

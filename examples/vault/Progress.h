@@ -1,5 +1,6 @@
 #pragma once
 
+#include <KivArchive/Progress.h>
 #include <chrono>
 #include <cstdint>
 #include <string>
@@ -9,23 +10,22 @@ namespace vault {
 
 /// Shows on standard error how far long work has come, on one line that disappears at the end; silent unless that is a
 /// terminal.
-class Progress {
+class Progress final : public KivArchive::IProgress {
 public:
     explicit Progress(std::string label);
     Progress(Progress const&) = delete;
     Progress& operator=(Progress const&) = delete;
-    ~Progress();
+    ~Progress() override;
 
     /// One more thing done, of @p bytes bytes.
     void Step(std::uint64_t bytes = 0);
-
-    /// Writes a lasting line to standard error, terminal or not.
-    void Say(std::string_view line);
+    bool Report(KivArchive::Progress const& progress) override;
 
 private:
     using Clock = std::chrono::steady_clock;
 
-    void Erase() const;
+    [[nodiscard]] bool IsDue() const;
+    void Show(std::string const& line);
 
     std::string label_;
     bool isTerminal_;

@@ -1,125 +1,158 @@
 #include "Vault.h"
 
-#include "HistoryLoader.h"
+#include "Descriptor.h"
+#include "Names.h"
+#include "OldVault.h"
 #include "Problem.h"
-#include "Verify.h"
+
+#include <algorithm>
+#include <sys/stat.h>
 
 namespace vault {
 
-using KivVcs::Id;
+using KivArchive::ObjectInfo;
 
 namespace {
 
 constexpr char16_t const* firstBranch = u"master";
+Text const currentBranchRecord = u"vault/branch";
 
-/// A text that the file holds, which only damage can have made anything but UTF-8.
-Text StoredText(VaultFile const& file, std::string const& bytes) {
-    if (auto text = FromUtf8(bytes))
-        return *std::move(text);
-    throw Problem(Printable(file.Path().native()) + " is damaged: this is no text: " + Printable(bytes),
-                  findingsExitStatus);
-}
-
-[[noreturn]] void ReportDamage(VaultFile& file, std::string const& head) {
-    Progress progress("looking for damage");
-    auto findings = FindDamage(file, progress);
-    if (findings.empty())
-        findings.push_back("the history of " + Printable(head) + " does not read back");
-    std::string report = Printable(file.Path().native()) + ": " + findings.front();
-    for (auto finding = findings.begin() + 1; finding != findings.end(); ++finding)
-        report += "; " + *finding;
-    throw Problem(report, findingsExitStatus);
+/// The greatest identifier before all that begin with @p digits; null if there is none.
+Id Before(std::string digits) {
+    digits.resize(64, '0');
+    const auto first = Id::Parse(digits);
+    if (!first || first->GetDigest() == nullptr)
+        return {};
+    auto digest = *first->GetDigest();
+    for (auto byte = digest.rbegin(); byte != digest.rend(); ++byte) {
+        if ((*byte)-- != 0)
+            return Id::FromDigest(digest);
+    }
+    return {};
 }
 
 } // namespace
 
-Vault::Vault(std::filesystem::path const& path, VaultFile::Access access)
-    : file_(path, access), repository_(std::make_unique<KivVcs::MemObjectsStorage>(std::initializer_list<TextView>{})) {
-    if (file_.IsNew()) {
-        Storage().CreateBranch(firstBranch, nullptr);
+Vault::Vault(VaultPlace const& place, Access access) : file_(RealPath(place.file)) {
+    struct stat status {};
+    const bool isThere = !place.file.empty() && stat(file_.c_str(), &status) == 0;
+    if (!isThere && access == Access::Existing)
+        throw Problem("there is no vault " + PrintableName(StoredName(place.file)) + " (save makes one)");
+    if (isThere && S_ISDIR(status.st_mode))
+        throw Problem(PrintableName(StoredName(place.file)) + " is a directory, not a vault file");
+    isMadeHere_ = !isThere;
+    if (isThere)
+        UpgradeOldVault(file_, place.wait);
+    KivArchive::SqliteOptions options;
+    options.create = access == Access::Create;
+    options.wait = place.wait;
+    archive_ = std::make_shared<KivArchive::SqliteArchive>(file_, options);
+}
+
+Vault::~Vault() {
+    if (!isMadeHere_)
         return;
+    try {
+        if (!archive_->ReadBranches().empty())
+            return;
+        archive_.reset();
+        for (auto const* const suffix : {"", "-wal", "-shm"})
+            unlink((file_ + suffix).c_str());
+    } catch (std::exception const&) {
+        // It stays; the next save uses it.
     }
-    Progress progress("loading");
-    // Branches come when all commits are there: until then the current branch has no head, as loading demands.
-    std::map<std::string, CommitHandle> heads;
-    for (auto const& [name, head] : file_.ReadBranches())
-        heads.emplace(name, Load(file_, head, progress));
-    for (auto const& [name, head] : heads)
-        Storage().CreateBranch(StoredText(file_, name), head);
-    if (const auto current = file_.ReadCurrentBranch(); !repository_.Checkout(StoredText(file_, current)))
-        throw Problem(Printable(path.native()) + ": the current branch is missing: " + Printable(current),
-                      findingsExitStatus);
 }
 
-Vault::CommitHandle Vault::Import(VaultFile& from, std::string const& head) {
-    // While commits are loaded the current branch must have no head; it gets it back afterwards.
-    const auto current = repository_.GetCurentBranch();
-    const auto currentHead = repository_.GetHead();
-    Storage().RemoveBranch(current);
-    Progress progress("reading " + Printable(from.Path().native()));
-    auto imported = Load(from, head, progress);
-    Storage().CreateBranch(current, currentHead);
-    return imported;
+Text Vault::CurrentBranch() const {
+    const auto records = archive_->ReadRecords(std::span(&currentBranchRecord, 1));
+    if (records.empty() || !records.front().value)
+        return firstBranch;
+    return RequireUtf8(BytesOf(*records.front().value), "the current branch");
 }
 
-Vault::CommitHandle Vault::Load(VaultFile& from, std::string const& head, Progress& progress) {
-    if (head.empty())
-        return nullptr;
-    const bool isOwn = &from == &file_;
-    HistoryLoader loader(from, repository_, progress, [&](Id const& id) {
-        if (isOwn)
-            inFile_.insert(id);
-    });
-    auto commit = loader.Load(Id(StoredText(from, head)));
-    if (!commit)
-        ReportDamage(from, head);
-    return commit;
+KivArchive::RecordChange Vault::MakeCurrent(Text const& name) {
+    return {{currentBranchRecord, BufferOf(ToUtf8(name))}, false, {}};
 }
 
-std::size_t Vault::Write() {
-    const auto written = WriteObjects();
-    WriteBranches();
-    file_.Commit();
-    return written;
-}
-
-void Vault::WriteAndPrune() {
-    WriteObjects();
-    for (auto const& name : file_.ListObjects()) {
-        const Id id(StoredText(file_, name));
-        if (!Storage().GetCommit(id) && !Storage().GetTree(id) && !Storage().GetBlob(id))
-            file_.DeleteObject(name);
+Id Vault::HeadOf(Text const& branch) const {
+    for (auto const& [name, head] : archive_->ReadBranches()) {
+        if (name == branch)
+            return head;
     }
-    WriteBranches();
-    file_.Commit();
+    return {};
 }
 
-std::size_t Vault::WriteObjects() {
-    // What a merge or a rebase made on its way and nothing refers to stays out of the file.
-    repository_.UpdateStorage();
-    Progress progress("writing");
-    std::size_t written = 0;
-    const auto writeNew = [&](auto const& table) {
-        for (auto const& [id, object] : table) {
-            if (inFile_.contains(id))
-                continue;
-            auto const& packed = object->GetPackedData();
-            file_.WriteObject(ToUtf8(id), packed);
-            progress.Step(packed.GetSize());
-            ++written;
+Id Vault::RequireBranch(std::string const& name) const {
+    auto head = HeadOf(RequireUtf8(name, "a branch name"));
+    if (head.IsEmpty())
+        throw Problem("no such branch: " + Printable(name));
+    return head;
+}
+
+CommitRecord Vault::Find(std::string const& revision) const {
+    const auto name = revision.empty() ? CurrentBranch() : RequireUtf8(revision, "the revision");
+    Id id = HeadOf(name);
+    if (id.IsEmpty() && (revision.empty() || name == CurrentBranch()))
+        throw Problem("branch " + Printable(name) + " has no versions yet");
+    if (id.IsEmpty() && revision.size() <= 64 && revision.find_first_not_of("0123456789abcdef") == std::string::npos) {
+        std::vector<Id> found;
+        for (auto const& facts : archive_->ListAncestry(Before(revision), 16)) {
+            if (DigitsOf(facts.commit).starts_with(revision))
+                found.push_back(facts.commit);
         }
-    };
-    writeNew(Storage().GetBlobs());
-    writeNew(Storage().GetTrees());
-    writeNew(Storage().GetCommits());
-    return written;
+        const auto missing = archive_->FindMissing(found);
+        if (missing.size() == found.size() && !found.empty())
+            throw Problem("version " + Printable(revision) + " has been forgotten");
+        std::erase_if(found,
+                      [&](Id const& one) { return std::find(missing.begin(), missing.end(), one) != missing.end(); });
+        if (found.size() > 1)
+            throw Problem("ambiguous revision: " + Printable(revision) + " begins " + std::to_string(found.size()) +
+                          " identifiers");
+        if (!found.empty())
+            id = found.front();
+    }
+    if (id.IsEmpty())
+        throw Problem("no such revision: " + Printable(revision));
+    auto commits = KivArchive::ReadCommits(*archive_, std::span(&id, 1));
+    if (commits.empty() || commits.front().state != KivArchive::CommitState::Sound)
+        throw Problem("version " + DigitsOf(id) + " is damaged or missing", findingsExitStatus);
+    return std::move(commits.front());
 }
 
-void Vault::WriteBranches() {
-    VaultFile::Branches branches;
-    for (auto const& [name, head] : Storage().GetRefs())
-        branches.emplace(ToUtf8(name), head ? ToUtf8(head->GetId()) : "");
-    file_.WriteBranches(branches, ToUtf8(repository_.GetCurentBranch()));
+Target Vault::FindTarget(std::string const& target) const {
+    const auto colon = target.find(':');
+    Target found{Find(target.substr(0, colon)), {}, {}};
+    if (colon != std::string::npos)
+        found.path = StoredPath(std::string_view(target).substr(colon + 1));
+    TreeReader reader(*archive_);
+    auto entry = reader.Find(found.commit.tree, found.path);
+    if (!entry)
+        throw Problem("no such file or directory in this version: " + PrintableName(found.path));
+    found.entry = *std::move(entry);
+    return found;
+}
+
+Text RequireBranchName(std::string const& name) {
+    if (name.empty() || name.find(':') != std::string::npos || Printable(name) != name)
+        throw Problem("a branch name is not empty and has neither ':' nor control characters: " + Printable(name));
+    return RequireUtf8(name, "a branch name");
+}
+
+std::string StoredPath(std::string_view filePath) {
+    std::string path;
+    while (!filePath.empty()) {
+        const auto end = std::min(filePath.find('/'), filePath.size());
+        const auto name = filePath.substr(0, end);
+        filePath.remove_prefix(std::min(end + 1, filePath.size()));
+        if (!name.empty() && name != ".")
+            path += (path.empty() ? "" : "/") + StoredName(name);
+    }
+    return path;
+}
+
+bool MoveHead(Vault& vault, KivArchive::Change change, Text const& branch, Id const& expected, Id const& head) {
+    change.branches.push_back({branch, expected, head});
+    return vault.Archive().Apply(change).applied;
 }
 
 } // namespace vault

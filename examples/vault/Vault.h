@@ -1,44 +1,79 @@
 #pragma once
 
-#include "Progress.h"
 #include "Text.h"
-#include "VaultFile.h"
+#include "Trees.h"
 
-#include <unordered_set>
+#include <KivArchive/Listings.h>
+#include <KivArchive/SqliteArchive.h>
+#include <chrono>
+#include <memory>
 
 namespace vault {
 
-/// A vault file whose history is in memory: everything that branches reach, read back through the library and linked.
-///
-/// Commands change the repository and then call `Write`; without it the file stays as it is.
+using KivArchive::Branch;
+using KivArchive::CommitRecord;
+
+/// Which vault to work with, and how.
+struct VaultPlace {
+    std::string file = "vault.db";
+    /// How long to wait while somebody else writes.
+    std::chrono::seconds wait{30};
+};
+
+/// What a revision and a path lead to.
+struct Target {
+    CommitRecord commit;
+    /// As trees have it; empty for the whole version.
+    std::string path;
+    Entry entry;
+};
+
+/// An archive in one file, with a branch that is the current one.
 class Vault {
 public:
-    /// @throws Problem that names every damaged object of the file
-    Vault(std::filesystem::path const& path, VaultFile::Access access);
+    enum class Access { Existing, Create };
 
-    [[nodiscard]] KivVcs::Repository& Repository() noexcept { return repository_; }
-    [[nodiscard]] KivVcs::IObjectsStorage& Storage() noexcept { return *repository_.GetStorage(); }
-    [[nodiscard]] VaultFile& File() noexcept { return file_; }
+    /// Opens the file, bringing one of an earlier release up to date first; or makes it.
+    /// @throws Problem, KivArchive::ArchiveError
+    explicit Vault(VaultPlace const& place, Access access = Access::Existing);
+    Vault(Vault const&) = delete;
+    Vault& operator=(Vault const&) = delete;
+    /// Takes a file away that was made here and has got no version.
+    ~Vault();
 
-    /// Brings in a history from another file, or finds that it is here already.
-    [[nodiscard]] KivVcs::cow_ptr<KivVcs::Commit> Import(VaultFile& from, std::string const& head);
+    [[nodiscard]] std::string const& File() const noexcept { return file_; }
+    [[nodiscard]] IArchive& Archive() const noexcept { return *archive_; }
+    [[nodiscard]] std::shared_ptr<IArchive> SharedArchive() const noexcept { return archive_; }
 
-    /// Writes the objects that the file lacks and the branches, as one transaction, and returns the number of those
-    /// objects.
-    std::size_t Write();
-    /// The same, and deletes the objects that no branch reaches.
-    void WriteAndPrune();
+    [[nodiscard]] Text CurrentBranch() const;
+    /// What makes @p name the current branch.
+    [[nodiscard]] static KivArchive::RecordChange MakeCurrent(Text const& name);
+    /// The head of a branch; null if there is none.
+    [[nodiscard]] Id HeadOf(Text const& branch) const;
+    /// @throws Problem if there is no such branch
+    [[nodiscard]] Id RequireBranch(std::string const& name) const;
+
+    /// The commit that is the head of a branch of that name, or whose identifier it is, or begins; the head of the current
+    /// branch if @p revision is empty.
+    /// @throws Problem if there is none, more than one, or it is damaged
+    [[nodiscard]] CommitRecord Find(std::string const& revision) const;
+    /// What REVISION or REVISION:PATH leads to. @throws Problem
+    [[nodiscard]] Target FindTarget(std::string const& target) const;
 
 private:
-    using CommitHandle = KivVcs::cow_ptr<KivVcs::Commit>;
-
-    [[nodiscard]] CommitHandle Load(VaultFile& from, std::string const& head, Progress& progress);
-    std::size_t WriteObjects();
-    void WriteBranches();
-
-    VaultFile file_;
-    KivVcs::Repository repository_;
-    std::unordered_set<KivVcs::Id> inFile_;
+    std::string file_;
+    std::shared_ptr<KivArchive::SqliteArchive> archive_;
+    bool isMadeHere_ = false;
 };
+
+/// @p name as text. @throws Problem if it cannot name a branch: such a branch could not be given as a revision
+[[nodiscard]] Text RequireBranchName(std::string const& name);
+
+/// A path that a user gave as trees have it, without empty and "." components.
+[[nodiscard]] std::string StoredPath(std::string_view filePath);
+
+/// The current branch's new head, and what else is to change with it. @return false if somebody else has moved it
+[[nodiscard]] bool MoveHead(Vault& vault, KivArchive::Change change, Text const& branch, Id const& expected,
+                            Id const& head);
 
 } // namespace vault

@@ -1,0 +1,35 @@
+#pragma once
+
+#include "Trees.h"
+
+#include <KivVcs/Tree.h>
+
+namespace vault {
+
+/// What a merge of versions starts from.
+struct MergedVersions {
+    /// The trees of both sides, and of the versions where their histories met.
+    Id left;
+    Id right;
+    std::vector<Id> bases;
+    /// Whether the right side wins where both changed a mode differently.
+    bool prefersRight = false;
+    /// Under which path a file was that is kept under another one.
+    std::unordered_map<std::string, std::string> renamed;
+};
+
+/// A merged tree that is ready to be stored.
+struct MergedTree {
+    Id tree;
+    /// The objects that are new, and what they rely on.
+    KivArchive::Change change;
+    /// Paths whose mode both sides changed differently.
+    std::vector<std::string> conflicts;
+};
+
+/// Gives every entry of @p merged the attributes of the side that it came from; what only one side changed since they
+/// parted is taken from that one. Until now the attributes in it are those of one side, directory by directory.
+[[nodiscard]] MergedTree MergeAttributes(IArchive& archive, KivVcs::cow_ptr<KivVcs::Tree> const& merged,
+                                         MergedVersions const& versions);
+
+} // namespace vault

@@ -1,0 +1,90 @@
+#include "Output.h"
+
+#include "Names.h"
+#include "Problem.h"
+
+#include <cstdlib>
+#include <ctime>
+#include <iomanip>
+#include <iostream>
+#include <sstream>
+#include <unistd.h>
+
+namespace vault {
+
+namespace {
+
+constexpr std::size_t shortLength = 12;
+
+} // namespace
+
+std::string DescribeAuthor(CommitRecord const& commit) {
+    return Printable(commit.authorName) + " <" + Printable(commit.authorEmail) + '>';
+}
+
+std::string DescribeTime(CommitRecord const& commit) {
+    const auto time = static_cast<std::time_t>(commit.time.ToTimeT(KivVcs::TimeZone::Utc));
+    std::tm parts{};
+    localtime_r(&time, &parts);
+    std::ostringstream text;
+    text << std::put_time(&parts, "%Y-%m-%dT%H:%M:%S%z");
+    auto described = text.str();
+    return described.insert(described.size() - 2, ":");
+}
+
+std::string Shortened(Id const& id) {
+    return DigitsOf(id).substr(0, shortLength);
+}
+
+std::string DescribeMessage(CommitRecord const& commit) {
+    switch (commit.state) {
+    case KivArchive::CommitState::Sound:
+        break;
+    case KivArchive::CommitState::Missing:
+        return "(forgotten)";
+    case KivArchive::CommitState::Damaged:
+    case KivArchive::CommitState::Unrepresentable:
+        return "(damaged)";
+    }
+    return Printable(commit.description);
+}
+
+std::string JsonCommit(CommitRecord const& commit) {
+    std::string merged;
+    for (auto const& id : commit.merged)
+        merged += (merged.empty() ? "\"" : ",\"") + DigitsOf(id) + '"';
+    return "{\"id\":\"" + DigitsOf(commit.id) + "\",\"parent\":\"" + DigitsOf(commit.parent) + "\",\"merged\":[" +
+           merged + "],\"tree\":\"" + DigitsOf(commit.tree) +
+           "\",\"readable\":" + (commit.state == KivArchive::CommitState::Sound ? "true" : "false") +
+           ",\"author\":" + JsonText(ToUtf8(commit.authorName)) + ",\"email\":" + JsonText(ToUtf8(commit.authorEmail)) +
+           ",\"time\":\"" + DescribeTime(commit) + "\",\"message\":" + JsonText(ToUtf8(commit.description)) + '}';
+}
+
+bool IsTerminal() noexcept {
+    return isatty(STDOUT_FILENO) == 1;
+}
+
+std::string Coloured(std::string_view text, Colour colour) {
+    // NOLINTNEXTLINE(concurrency-mt-unsafe): nobody changes the environment
+    auto const* const noColour = std::getenv("NO_COLOR");
+    if (!IsTerminal() || (noColour != nullptr && *noColour != '\0'))
+        return std::string(text);
+    return "\x1b[" + std::to_string(static_cast<int>(colour)) + 'm' + std::string(text) + "\x1b[0m";
+}
+
+void Warn(std::string_view line) {
+    std::cerr << "vault: " << line << '\n';
+}
+
+bool Confirm(std::string const& question, bool yes) {
+    if (yes)
+        return true;
+    if (isatty(STDIN_FILENO) != 1)
+        throw Problem(question + " Nobody is here to ask: say --yes if so");
+    std::cerr << question << " [y/N] " << std::flush;
+    std::string answer;
+    std::getline(std::cin, answer);
+    return answer == "y" || answer == "yes";
+}
+
+} // namespace vault
