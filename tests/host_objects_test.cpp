@@ -120,6 +120,40 @@ TEST(HostObjects, AreComparedByTheIdentifierThatTheyGive) {
     EXPECT_TRUE(one.GetIdPrefix() == again.GetIdPrefix() && one.GetIdPrefix() != two.GetIdPrefix());
 }
 
+/// A blob that has told its identifier, and must not be asked what it shows.
+class TellingBlob final : public Blob {
+public:
+    explicit TellingBlob(Id::Digest const& digest) : Blob(digest) {}
+    TellingBlob(TellingBlob const& other) : Blob(*other.GetKnownDigest()) {}
+    KivStringT<char> GetHeader() const override { throw std::logic_error("asked"); }
+    KivStringT<char> GetStoragePrefix() const override { throw std::logic_error("asked"); }
+    Buffer const& GetData() const override { throw std::logic_error("asked"); }
+
+protected:
+    cow_ptr<Blob> Copy() const override { return immu::make<TellingBlob>(*this); }
+};
+
+TEST(HostObjects, AreShownByTheIdentifierThatTheyHaveTold) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    const TellingBlob telling(*Id::Parse(abcId)->GetDigest());
+    Tree told;
+    for (int i = 0; i < 300; ++i)
+        told.AddBlob(&repo, Wide("f" + std::to_string(i)),
+                     i == 7 ? static_cast<Blob const&>(telling) : MakeBlob(std::to_string(i)));
+    told.RemoveObject(&repo, u"f9");
+    EXPECT_TRUE(dynamic_cast<TellingBlob const*>(told.GetLocalBlob(u"f7").get()) != nullptr);
+    // A repository of its own, in which nobody has stored the same content.
+    Repository own(std::make_unique<MemObjectsStorage>());
+    Tree plain = told;
+    plain.AddBlob(&own, u"f7", MakeBlob("abc"));
+    EXPECT_EQ(IdText(told), IdText(plain));
+    EXPECT_EQ(Bytes(told.GetData()), Bytes(plain.GetData()));
+    const TellingBlob copy(telling);
+    EXPECT_TRUE(IdText(copy) == abcId && copy.HasSameId(MakeBlob("abc")) && copy.IsOfHostClass());
+    const Blob sliced(copy);
+    EXPECT_EQ(IdText(sliced), IdText(Blob()));
+}
+
 TEST(HostObjects, AreCopiedAsWhatTheyAre) {
     int fetched = 0;
     cow_ptr<Blob> shared = immu::make<LazyBlob>("abc", fetched);

@@ -4,11 +4,10 @@
 
 namespace KivArchive {
 
-ArchivedBlob::ArchivedBlob(Id const& id, std::shared_ptr<ContentGroup> group) noexcept
-    : contentId_(id), group_(std::move(group)) {}
+ArchivedBlob::ArchivedBlob(Id::Digest const& digest, std::shared_ptr<ContentGroup> group) noexcept
+    : Blob(digest), group_(std::move(group)) {}
 
-ArchivedBlob::ArchivedBlob(ArchivedBlob const& other)
-    : Blob(other), contentId_(other.contentId_), group_(other.group_) {
+ArchivedBlob::ArchivedBlob(ArchivedBlob const& other) : Blob(*other.GetKnownDigest()), group_(other.group_) {
     if (Buffer const* const content = other.content_.load(std::memory_order_acquire))
         content_.store(std::make_unique<Buffer>(*content).release(), std::memory_order_relaxed);
 }
@@ -20,7 +19,7 @@ ArchivedBlob::~ArchivedBlob() {
 Buffer const& ArchivedBlob::GetData() const {
     if (Buffer const* const content = content_.load(std::memory_order_acquire))
         return *content;
-    auto fetched = std::make_unique<Buffer const>(group_->GetContents()->Fetch(contentId_));
+    auto fetched = std::make_unique<Buffer const>(group_->GetContents()->Fetch(GetId()));
     Buffer const* held = nullptr;
     // Of several threads that fetch at once, the first one's content is everybody's.
     if (content_.compare_exchange_strong(held, fetched.get(), std::memory_order_acq_rel, std::memory_order_acquire))
@@ -30,18 +29,18 @@ Buffer const& ArchivedBlob::GetData() const {
 
 std::uint64_t ArchivedBlob::GetSize() const {
     Buffer const* const content = content_.load(std::memory_order_acquire);
-    return content != nullptr ? content->GetSize() : group_->SizeOf(contentId_);
+    return content != nullptr ? content->GetSize() : group_->SizeOf(GetId());
 }
 
 Buffer ArchivedBlob::ReadContent() const {
     Buffer const* const content = content_.load(std::memory_order_acquire);
-    return content != nullptr ? *content : group_->GetContents()->Read(contentId_);
+    return content != nullptr ? *content : group_->GetContents()->Read(GetId());
 }
 
 StreamIO ArchivedBlob::OpenContent() const {
     Buffer const* const content = content_.load(std::memory_order_acquire);
     return content != nullptr ? StreamIO(KivVcs::MemStream::CreateOnCopy(*content))
-                              : group_->GetContents()->Open(contentId_);
+                              : group_->GetContents()->Open(GetId());
 }
 
 bool ArchivedBlob::IsContentHeld() const noexcept {

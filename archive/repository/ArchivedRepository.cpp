@@ -41,10 +41,10 @@ std::vector<Id> ArchivedRepository::Load(std::span<const Id> ids) {
     for (auto const& [id, failure] : state_->source->LoadCommits(commits))
         if (failure != Failure::Collected)
             ThrowUnreadable(failure, "version", id);
-    for (Id const& id : trees)
-        static_cast<void>(state_->source->FetchTree(id));
+    state_->source->LoadTrees(trees);
     state_->source->LoadBlobs(blobs);
-    return state_->Archive().FindMissing(ids);
+    bool const isAll = commits.size() + trees.size() + blobs.size() == ids.size();
+    return isAll ? std::vector<Id>() : state_->Archive().FindMissing(ids);
 }
 
 Buffer ArchivedRepository::ReadContent(Id const& id) {

@@ -90,15 +90,16 @@ void ArchivedStorage::AddCommit(cow_ptr<Commit> commit) {
     Lock const lock = LockTables();
     Settle();
     Id const id = commit->GetId();
-    bool const wasHidden = hidden_.contains(id);
-    if (objects_.GetCommit(id) && !wasHidden)
-        return;
+    if (cow_ptr<Commit> const living = objects_.GetCommit(id)) {
+        if (!hidden_.contains(id))
+            return;
+        // What was deleted makes room for what the host brings.
+        objects_.DeleteCommit(living);
+        --hiddenCount_;
+    }
     unpublished_.insert(id);
-    if (wasHidden)
-        objects_.DeleteCommit(commit);
     objects_.AddCommit(std::move(commit));
-    if (hidden_.erase(id) != 0)
-        CountHidden();
+    hidden_.erase(id);
 }
 
 void ArchivedStorage::AddTree(cow_ptr<Tree> tree) {

@@ -34,6 +34,8 @@ class BudgetedStream final : public KivVcs::IStream {
 public:
     BudgetedStream(std::shared_ptr<Contents> contents, Id const& id)
         : contents_(std::move(contents)), stream_(ContentStream(*contents_->archive_, id)) {
+        if (!stream_)
+            ThrowUnreadable(Failure::Collected, "file", id);
         contents_->Reserve(windowSize);
     }
     BudgetedStream(BudgetedStream const&) = delete;

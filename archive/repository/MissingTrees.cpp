@@ -139,6 +139,9 @@ std::string MissingTrees::PathOf(std::size_t directory, KivStringViewT<char16_t>
     std::string path;
     for (; !names.empty(); names.pop_back())
         path += (path.empty() ? "" : "/") + names.back();
+    // Sentences end at their first zero byte.
+    for (std::size_t zero = path.find('\0'); zero != std::string::npos; zero = path.find('\0', zero))
+        path.replace(zero, 1, "\\0");
     return path;
 }
 

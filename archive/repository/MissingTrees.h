@@ -56,8 +56,8 @@ public:
     /// The number of a directory that was looked for.
     [[nodiscard]] std::size_t NumberOf(Id const& id) const { return numbers_.at(id); }
     [[nodiscard]] NewDirectory const& At(std::size_t number) const { return directories_[number]; }
-    /// The path of an entry, for a person.
-    [[nodiscard]] std::string PathOf(std::size_t directory, KivStringViewT<char16_t> name) const;
+    /// Says by its path that an entry of a directory cannot be shown.
+    [[noreturn]] void Refuse(std::size_t directory, KivStringViewT<char16_t> name, const char* why) const;
 
 private:
     void List(std::size_t number);
@@ -66,7 +66,7 @@ private:
     std::size_t AddDirectory(NewDirectory directory);
     void CheckEntry(std::size_t number, KivStringT<char16_t> const& name, KivVcs::Object const& object,
                     std::string_view word, std::string_view mode) const;
-    [[noreturn]] void Refuse(std::size_t directory, KivStringViewT<char16_t> name, const char* why) const;
+    [[nodiscard]] std::string PathOf(std::size_t directory, KivStringViewT<char16_t> name) const;
 
     IArchive& archive_;
     std::vector<NewDirectory> directories_;

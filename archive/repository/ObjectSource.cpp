@@ -1,5 +1,6 @@
 #include "repository/ObjectSource.h"
 
+#include "Changes.h"
 #include "KivArchive/ArchivedBlob.h"
 #include "repository/ArchivedStorage.h"
 #include "repository/CommitForm.h"
@@ -138,7 +139,11 @@ cow_ptr<Commit> ObjectSource::ReadObject(ArchivedObject const& object) {
 }
 
 cow_ptr<Tree> ObjectSource::FetchTree(Id const& id) {
-    return TreeFetch(*this).Fetch(id);
+    return TreeFetch(*this).Fetch({&id, 1}).front();
+}
+
+void ObjectSource::LoadTrees(std::span<const Id> ids) {
+    static_cast<void>(TreeFetch(*this).Fetch(ids));
 }
 
 ObjectSource::Failures ObjectSource::LoadCommits(std::span<const Id> ids) {
@@ -169,7 +174,7 @@ ObjectSource::Failures ObjectSource::LoadCommits(std::span<const Id> ids) {
 void ObjectSource::LoadBlobs(std::span<const Id> ids) {
     auto const group = std::make_shared<ContentGroup>(contents_, std::vector<Id>(ids.begin(), ids.end()));
     for (Id const& id : ids) {
-        cow_ptr<Blob> const blob = KivVcs::immu::make<ArchivedBlob>(id, group);
+        cow_ptr<Blob> const blob = KivVcs::immu::make<ArchivedBlob>(DigestOf(id), group);
         Lock const lock(mutex_);
         cow_ptr<Blob> const living = FindBlob(id);
         Enter(living ? living : blob);

@@ -12,7 +12,7 @@ namespace KivArchive {
 namespace {
 
 /// How often a publish is tried whose ground others have collected.
-constexpr int collectedAttempts = 3;
+constexpr int mostAttempts = 3;
 
 /// How many facts are looked at for a head that was rewritten.
 constexpr std::size_t mostFactsOfRewriting = 10'000;
@@ -86,15 +86,26 @@ PublishOutcome ArchivedRepository::Publish(IProgress* progress) {
 
 PublishOutcome ArchivedRepository::Publish(std::span<const KivStringT<char16_t>> branches,
                                            std::vector<RecordChange> const& records, IProgress* progress) {
+    bool asksForAll = false;
     for (int attempt = 1;; ++attempt) {
         try {
-            return PublishOnce(branches, records, attempt > 1, progress);
+            PublishOutcome outcome = PublishOnce(branches, records, asksForAll, progress);
+            if (!IsOwnDoing(outcome) || attempt == mostAttempts)
+                return outcome;
         } catch (ArchiveError const& error) {
-            if (error.GetKind() != Failure::Collected || attempt == collectedAttempts)
+            if (error.GetKind() != Failure::Collected || attempt == mostAttempts)
                 throw;
+            asksForAll = true;
         }
         Refresh();
     }
+}
+
+/// Whether a race was lost only because an earlier try has succeeded, although it ended with an exception.
+bool ArchivedRepository::IsOwnDoing(PublishOutcome const& outcome) const {
+    return !outcome.published && outcome.changedRecords.empty() &&
+           std::all_of(outcome.moved.begin(), outcome.moved.end(),
+                       [this](Branch const& branch) { return state_->OwnHead(branch.name) == branch.head; });
 }
 
 PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16_t>> branches,
@@ -139,7 +150,8 @@ PublishMergingOutcome ArchivedRepository::PublishMerging(MergeResolvers const& r
     std::chrono::milliseconds wait = state_->options.backOff;
     while (outcome.attempts < state_->options.attempts) {
         ++outcome.attempts;
-        for (auto const& branch : Refresh().diverged) {
+        RefreshOutcome const refreshed = Refresh();
+        for (auto const& branch : refreshed.diverged) {
             outcome.merges.push_back(MergeDiverged(branch, resolvers));
             if (!outcome.merges.back().Succeeded()) {
                 outcome.result = PublishMergingResult::GaveUp;

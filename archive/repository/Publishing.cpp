@@ -14,9 +14,7 @@ namespace {
 constexpr std::uint64_t changeSize = 8 * largestWholeContent;
 constexpr std::size_t commitsTogether = 256;
 
-[[noreturn]] void RefuseContent(std::string const& path) {
-    throw ArchiveError(Failure::Unrepresentable, {}, "\"" + path + "\" is not what its identifier says.");
-}
+constexpr const char* notItself = "is not what its identifier says";
 
 } // namespace
 
@@ -56,7 +54,8 @@ void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
         if (!trees.IsMissing(directory.id) || stored_.contains(directory.id))
             continue;
         if (isDone) {
-            StoreDirectory(directory, trees.PathOf(directory.holder, directory.name));
+            if (!StoreDirectory(directory))
+                trees.Refuse(directory.holder, directory.name, notItself);
             continue;
         }
         StoreFiles(trees, number);
@@ -69,35 +68,37 @@ void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
 
 void Publishing::StoreFiles(MissingTrees const& trees, std::size_t directory) {
     for (NewDirectory::File const& file : trees.At(directory).files)
-        if (trees.IsMissing(file.id) && !stored_.contains(file.id))
-            StoreFile(file, trees.PathOf(directory, file.name));
+        if (trees.IsMissing(file.id) && !stored_.contains(file.id) && !StoreFile(file))
+            trees.Refuse(directory, file.name, notItself);
 }
 
-void Publishing::StoreFile(NewDirectory::File const& file, std::string const& path) {
+bool Publishing::StoreFile(NewDirectory::File const& file) {
     auto const* const archived =
         file.blob->IsOfHostClass() ? dynamic_cast<ArchivedBlob const*>(file.blob.get()) : nullptr;
     // Another archive's, then: this one does not have it.
     if (archived != nullptr && archived->GetSize() > largestWholeContent)
-        return StoreLarge(file, archived->OpenContent(), path);
+        return StoreLarge(file, archived->OpenContent());
     Buffer const data = archived != nullptr ? archived->ReadContent() : file.blob->GetData();
     if (data.GetSize() > largestWholeContent)
-        return StoreLarge(file, StreamIO(KivVcs::MemStream::CreateOnCopy(data)), path);
+        return StoreLarge(file, StreamIO(KivVcs::MemStream::CreateOnCopy(data)));
     if (archived == nullptr && file.blob->IsOfHostClass() && !(Identify(ObjectType::Blob, data) == file.id))
-        RefuseContent(path);
+        return false;
     Add({file.id, ObjectType::Blob, data, file.earlier});
+    return true;
 }
 
-void Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content, std::string const& path) {
+bool Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content) {
     if (!archive_.StoreContent(file.id, content, file.earlier, progress_))
-        RefuseContent(path);
+        return false;
     stored_.insert(file.id);
     ++storedCount_;
+    return true;
 }
 
-void Publishing::StoreDirectory(NewDirectory const& directory, std::string const& path) {
+bool Publishing::StoreDirectory(NewDirectory const& directory) {
     Buffer const& data = directory.tree->GetData();
     if (directory.tree->IsOfHostClass() && !(Identify(ObjectType::Tree, data) == directory.id))
-        RefuseContent(path);
+        return false;
     for (NewDirectory::File const& file : directory.files)
         RelyOn(file.id);
     for (auto const& name : directory.earlier ? directory.tree->GetLocalTreeDiffs(directory.earlier)
@@ -107,6 +108,7 @@ void Publishing::StoreDirectory(NewDirectory const& directory, std::string const
     if (directory.earlier)
         RelyOn(directory.earlier->GetId());
     Add({directory.id, ObjectType::Tree, data, directory.earlier ? directory.earlier->GetId() : Id()});
+    return true;
 }
 
 void Publishing::StoreCommit(Commit const& commit) {

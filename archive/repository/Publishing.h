@@ -29,9 +29,10 @@ private:
     void StoreTogether(std::span<cow_ptr<Commit> const> commits);
     void StoreTree(MissingTrees const& trees, std::size_t root);
     void StoreFiles(MissingTrees const& trees, std::size_t directory);
-    void StoreFile(NewDirectory::File const& file, std::string const& path);
-    void StoreLarge(NewDirectory::File const& file, StreamIO content, std::string const& path);
-    void StoreDirectory(NewDirectory const& directory, std::string const& path);
+    /// @return false if what is to be stored is not what its identifier says; so does everything that stores here
+    [[nodiscard]] bool StoreFile(NewDirectory::File const& file);
+    [[nodiscard]] bool StoreLarge(NewDirectory::File const& file, StreamIO content);
+    [[nodiscard]] bool StoreDirectory(NewDirectory const& directory);
     void StoreCommit(Commit const& commit);
     void RelyOn(Id const& id);
     void Add(NewObject object);

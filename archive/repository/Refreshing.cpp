@@ -24,24 +24,22 @@ void ArchivedRepository::RefreshBranch(Branch const& theirs, RefreshOutcome& out
     KnownBranch& known = state_->branches.try_emplace(theirs.name).first->second;
     bool const isThere = state_->storage->BranchExist(theirs.name);
     Id const own = state_->OwnHead(theirs.name);
-    bool const hasMoved = !(known.published == theirs.head);
+    bool const isNew = !(known.taken == theirs.head);
     bool const isToBeRead = known.unreadable && isThere && own.IsEmpty();
+    bool const hasUnpublished = !isToBeRead && !(own == known.taken);
     known.published = theirs.head;
     if (own == theirs.head) {
         known.taken = theirs.head;
         known.unreadable.reset();
         return;
     }
-    bool const hasUnpublished = !isToBeRead && !(own == known.taken);
-    if (hasUnpublished && (isThere || !hasMoved)) {
-        if (isThere && !(known.taken == theirs.head))
-            outcome.diverged.push_back(theirs.name);
+    if (hasUnpublished && isThere && isNew)
+        outcome.diverged.push_back(theirs.name);
+    // One that was removed here comes back if others have moved it.
+    if (hasUnpublished && (isThere || !isNew))
         return;
-    }
-    if (hasMoved || isToBeRead) {
-        TakePublished(theirs.name);
-        outcome.moved.push_back(theirs.name);
-    }
+    TakePublished(theirs.name);
+    outcome.moved.push_back(theirs.name);
 }
 
 void ArchivedRepository::ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome) {
@@ -74,7 +72,8 @@ void ArchivedRepository::TakePublished(KivStringT<char16_t> const& branch) {
         if (!isLocal)
             throw;
         known.unreadable = error.GetKind();
-        state_->storage->RemoveBranch(branch);
+        if (state_->storage->GetHead(branch))
+            state_->storage->RemoveBranch(branch);
         state_->storage->CreateBranch(branch, nullptr);
         known.taken = known.published;
         return;

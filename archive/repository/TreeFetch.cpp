@@ -1,6 +1,8 @@
 #include "repository/TreeFetch.h"
 
+#include "Changes.h"
 #include "KivArchive/ArchivedBlob.h"
+#include "PackedForms.h"
 #include "repository/ArchivedStorage.h"
 #include "repository/Unreadable.h"
 
@@ -14,46 +16,38 @@ namespace KivArchive {
 /// Makes trees of the forms that were read, in a storage of its own.
 class TreeFetch::Assembly {
 public:
-    explicit Assembly(TreeFetch& fetch) : fetch_(fetch), staging_(std::make_unique<KivVcs::MemObjectsStorage>()) {
+    explicit Assembly(TreeFetch const& fetch) : fetch_(fetch), staging_(std::make_unique<KivVcs::MemObjectsStorage>()) {
         AddBlobs();
         for (auto const& [id, tree] : fetch.living_)
             staging_.AddTreeToStorage(tree);
+        // Reading gives none without entries.
+        for (auto const& [id, form] : fetch.forms_)
+            if (form.entries.empty())
+                staging_.AddTreeToStorage(KivVcs::immu::make<Tree>());
     }
 
-    cow_ptr<Tree> Make(Id const& root) {
-        // On a stack of its own: nesting has no bound that a thread's stack would hold.
-        std::vector<Id> open{root};
-        while (!open.empty()) {
-            Id const id = open.back();
-            if (staging_.GetTreeFromStorage(id)) {
-                open.pop_back();
-                continue;
-            }
-            std::size_t const before = open.size();
-            for (Link const& link : fetch_.forms_.at(id).links)
-                if (link.type == ObjectType::Tree && !staging_.GetTreeFromStorage(link.id))
-                    open.push_back(link.id);
-            if (open.size() == before) {
-                MakeOne(id, fetch_.forms_.at(id));
-                open.pop_back();
-            }
-        }
-        return staging_.GetTreeFromStorage(root);
+    [[nodiscard]] cow_ptr<Tree> Make(Id const& root) {
+        cow_ptr<Tree> tree = Tree::Deserialize(root, &staging_, [this](Id const& id) { return OpenForm(id); });
+        // The last word on whether everything has been understood.
+        if (!tree || !(tree->GetId() == root))
+            ThrowUnreadable(Failure::Unrepresentable, "directory", root);
+        return tree;
     }
 
     /// Enters everything into the storages. @return false, entering nothing, if another thread was faster with some of it
     [[nodiscard]] bool Publish() const {
         ObjectSource& source = fetch_.source_;
+        auto const& trees = std::as_const(staging_).GetStorage()->GetTrees();
         ObjectSource::Lock const lock(source.mutex_);
-        for (auto const& tree : made_)
-            if (source.FindTree(tree->GetId()))
+        for (auto const& [id, tree] : trees)
+            if (!fetch_.living_.contains(id) && source.FindTree(id))
                 return false;
         for (auto const& blob : madeBlobs_)
             if (source.FindBlob(blob->GetId()))
                 return false;
         for (auto const& blob : madeBlobs_)
             source.Enter(blob);
-        for (auto const& tree : made_)
+        for (auto const& [id, tree] : trees)
             source.Enter(tree);
         return true;
     }
@@ -62,9 +56,9 @@ private:
     void AddBlobs() {
         std::unordered_set<Id> ids;
         for (auto const& [id, form] : fetch_.forms_)
-            for (Link const& link : form.links)
-                if (link.type == ObjectType::Blob)
-                    ids.insert(link.id);
+            for (Entry const& entry : form.entries)
+                if (!entry.isTree)
+                    ids.insert(entry.id);
         std::vector<Id> missing;
         {
             ObjectSource::Lock const lock(fetch_.source_.mutex_);
@@ -77,62 +71,52 @@ private:
         }
         auto const group = std::make_shared<ContentGroup>(fetch_.source_.GetContents(), missing);
         for (Id const& id : missing) {
-            madeBlobs_.push_back(KivVcs::immu::make<ArchivedBlob>(id, group));
+            madeBlobs_.push_back(KivVcs::immu::make<ArchivedBlob>(DigestOf(id), group));
             staging_.AddBlobToStorage(madeBlobs_.back());
         }
     }
 
-    void MakeOne(Id const& id, Form const& form) {
-        auto tree = KivVcs::immu::make<Tree>();
-        Tree& made = *tree.write();
-        for (Link const& link : form.links) {
-            auto const name = KivVcs::FromUtf8(link.name);
-            KivStringViewT<char16_t> const component = name;
-            // A path could not lead there.
-            if (component.IsEmpty() || component.Find(u"/") >= 0)
-                ThrowUnreadable(Failure::Unrepresentable, "directory", id);
-            if (link.type == ObjectType::Blob)
-                made.AddObjectToTree<Blob>(&staging_, {&component, 1}, *staging_.GetBlobFromStorage(link.id));
-            else
-                made.AddObjectToTree<Tree>(&staging_, {&component, 1}, *staging_.GetTreeFromStorage(link.id));
-        }
-        // The last word on whether everything has been understood.
-        if (!(made.GetId() == id))
-            ThrowUnreadable(Failure::Unrepresentable, "directory", id);
-        staging_.AddTreeToStorage(tree);
-        made_.push_back(std::move(tree));
+    [[nodiscard]] StreamIO OpenForm(Id const& id) const {
+        auto const form = fetch_.forms_.find(id);
+        if (form == fetch_.forms_.end())
+            return {};
+        std::string const header = "tree " + std::to_string(form->second.data.GetSize());
+        Buffer packed;
+        packed.Append(header.c_str(), header.size() + 1);
+        packed.Append(form->second.data);
+        return StreamIO(KivVcs::MemStream::CreateOnCopy(std::move(packed)));
     }
 
-    TreeFetch& fetch_;
+    TreeFetch const& fetch_;
     KivVcs::Repository staging_;
-    std::vector<cow_ptr<Tree>> made_;
     std::vector<cow_ptr<Blob>> madeBlobs_;
 };
 
-cow_ptr<Tree> TreeFetch::Fetch(Id const& id) {
-    std::vector<Id> level{id};
+std::vector<cow_ptr<Tree>> TreeFetch::Fetch(std::span<const Id> ids) {
+    ReadForms({ids.begin(), ids.end()});
+    for (;;) {
+        Assembly assembly(*this);
+        std::vector<cow_ptr<Tree>> trees;
+        for (Id const& id : ids)
+            trees.push_back(assembly.Make(id));
+        if (assembly.Publish())
+            return trees;
+        std::vector<Id> read;
+        for (auto const& [id, form] : forms_)
+            read.push_back(id);
+        FindLiving(read);
+        for (auto const& [id, living] : living_)
+            forms_.erase(id);
+    }
+}
+
+void TreeFetch::ReadForms(std::vector<Id> level) {
     for (std::size_t depth = 0; !level.empty(); ++depth) {
         if (depth > KivVcs::deepestLoadedNesting)
-            ThrowUnreadable(Failure::Unrepresentable, "directory", id);
+            ThrowUnreadable(Failure::Unrepresentable, "directory", level.front());
         FindLiving(level);
         ReadLevel(level);
         level = TakeSubtrees(level);
-    }
-    if (auto const found = living_.find(id); found != living_.end())
-        return found->second;
-    for (;;) {
-        Assembly assembly(*this);
-        cow_ptr<Tree> tree = assembly.Make(id);
-        if (assembly.Publish())
-            return tree;
-        std::vector<Id> read;
-        for (auto const& [treeId, form] : forms_)
-            read.push_back(treeId);
-        FindLiving(read);
-        for (auto const& [treeId, living] : living_)
-            forms_.erase(treeId);
-        if (auto const found = living_.find(id); found != living_.end())
-            return found->second;
     }
 }
 
@@ -149,17 +133,22 @@ void TreeFetch::FindLiving(std::vector<Id>& level) {
     });
 }
 
+TreeFetch::Form TreeFetch::ReadForm(ArchivedObject const& object) {
+    Form form;
+    form.data.Append(object.data.data(), object.data.size());
+    PackedEntries entries(BytesOf(form.data));
+    while (entries.Next())
+        form.entries.push_back({entries.Get().isTree, entries.Get().name, entries.Get().GetId()});
+    if (object.type != ObjectType::Tree || !entries.AreSound())
+        ThrowUnreadable(Failure::Unrepresentable, "directory", object.id);
+    return form;
+}
+
 void TreeFetch::ReadLevel(std::vector<Id> const& level) {
     if (level.empty())
         return;
-    ReadOutcome const outcome = source_.archive_->Read(level, [this](ArchivedObject const& object) {
-        Form form;
-        form.data.Append(object.data.data(), object.data.size());
-        for (auto const& chunk : form.data.LockForRead())
-            if (object.type != ObjectType::Tree || !ReadLinks(object.type, chunk, form.links))
-                ThrowUnreadable(Failure::Unrepresentable, "directory", object.id);
-        forms_.insert_or_assign(object.id, std::move(form));
-    });
+    ReadOutcome const outcome = source_.archive_->Read(
+        level, [this](ArchivedObject const& object) { forms_.insert_or_assign(object.id, ReadForm(object)); });
     if (!outcome.damaged.empty())
         ThrowUnreadable(Failure::Damaged, "directory", outcome.damaged.front());
     if (!outcome.missing.empty())
@@ -170,9 +159,9 @@ void TreeFetch::ReadLevel(std::vector<Id> const& level) {
 std::vector<Id> TreeFetch::TakeSubtrees(std::vector<Id> const& level) const {
     std::unordered_set<Id> subtrees;
     for (Id const& id : level)
-        for (Link const& link : forms_.at(id).links)
-            if (link.type == ObjectType::Tree && !forms_.contains(link.id) && !living_.contains(link.id))
-                subtrees.insert(link.id);
+        for (Entry const& entry : forms_.at(id).entries)
+            if (entry.isTree && !forms_.contains(entry.id) && !living_.contains(entry.id))
+                subtrees.insert(entry.id);
     return {subtrees.begin(), subtrees.end()};
 }
 

@@ -3,31 +3,40 @@
 /// @file
 /// Trees read whole, level by level.
 
-#include "KivArchive/Upkeep.h"
 #include "repository/ObjectSource.h"
 
 #include <KivVcs/Tree.h>
 
+#include <string_view>
+
 namespace KivArchive {
 
-/// One fetch of a tree with everything below it, except for the contents: one batch for each level.
+/// One fetch of trees with everything below them, except for the contents: one batch for each level.
 class TreeFetch {
 public:
     explicit TreeFetch(ObjectSource& source) : source_(source) {}
 
     /// @throws ArchiveError if anything of it cannot be had; nothing has entered a storage then
-    [[nodiscard]] cow_ptr<Tree> Fetch(Id const& id);
+    [[nodiscard]] std::vector<cow_ptr<Tree>> Fetch(std::span<const Id> ids);
 
 private:
+    struct Entry {
+        bool isTree = false;
+        /// Within the packed form that it was read from.
+        std::string_view name;
+        Id id;
+    };
     /// The packed form of one directory.
     struct Form {
         Buffer data;
-        std::vector<Link> links;
+        std::vector<Entry> entries;
     };
 
     class Assembly;
 
+    void ReadForms(std::vector<Id> level);
     void FindLiving(std::vector<Id>& level);
+    [[nodiscard]] static Form ReadForm(ArchivedObject const& object);
     void ReadLevel(std::vector<Id> const& level);
     [[nodiscard]] std::vector<Id> TakeSubtrees(std::vector<Id> const& level) const;
 

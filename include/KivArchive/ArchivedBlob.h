@@ -26,12 +26,11 @@ class ContentGroup;
 class KIVARCHIVE_EXPORT ArchivedBlob final : public KivVcs::Blob {
 public:
     /// Blobs are made by the repository that reads a directory, a group for each.
-    ArchivedBlob(Id const& id, std::shared_ptr<ContentGroup> group) noexcept;
+    ArchivedBlob(Id::Digest const& digest, std::shared_ptr<ContentGroup> group) noexcept;
     ArchivedBlob(ArchivedBlob const& other);
     ArchivedBlob& operator=(ArchivedBlob const&) = delete;
     ~ArchivedBlob() override;
 
-    [[nodiscard]] Id GetId() const override { return contentId_; }
     /// The content, fetched by the first call and kept until the blob dies.
     [[nodiscard]] Buffer const& GetData() const override;
 
@@ -52,7 +51,6 @@ protected:
     [[nodiscard]] KivVcs::cow_ptr<KivVcs::Blob> Copy() const override;
 
 private:
-    Id contentId_;
     std::shared_ptr<ContentGroup> group_;
     /// Null until the content has been asked for.
     mutable std::atomic<Buffer const*> content_{nullptr};

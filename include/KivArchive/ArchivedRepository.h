@@ -9,7 +9,9 @@
 
 #include <KivVcs/Repository.h>
 
+#include <functional>
 #include <memory>
+#include <string>
 
 namespace KivArchive {
 
@@ -21,6 +23,8 @@ struct RepositoryOptions {
     /// The most bytes of contents that are kept for those who read them again, and that streams hold; what was not used
     /// for the longest time goes first. Contents that a blob keeps, since its `GetData` was called, are not counted.
     std::uint64_t contentBytes = std::uint64_t{64} * 1024 * 1024;
+    /// On how many threads `ReadContents` reads; 0 stands for as many as there are processors.
+    unsigned workers = 0;
     /// How many times `PublishMerging` tries.
     unsigned attempts = 20;
     /// How long it waits after it has lost a race for the first time, at most; twice as long each further time, up to a
@@ -101,6 +105,33 @@ public:
     [[nodiscard]] Buffer ReadContent(Id const& id);
     [[nodiscard]] StreamIO OpenContent(Id const& id);
 
+    /// Hands all these contents to @p receiver, verified, on up to `RepositoryOptions::workers` threads at once, this one
+    /// among them; each of a part of @p ids, so that these are best given in the order of their paths. Of a content larger
+    /// than `largestWholeContent` the receiver gets no data, and calls `OpenContent`. Nothing is kept.
+    /// @param receiver may be called on several threads at once; what it throws ends all of them and passes through
+    /// @param progress may be null; called on this thread
+    /// @return what could not be given
+    ReadOutcome ReadContents(std::span<const Id> ids, ObjectReceiver const& receiver, IProgress* progress = nullptr);
+
+    /// Opens a content at its beginning each time it is called.
+    using ContentOpener = std::function<StreamIO()>;
+
+    /// A stored blob with the content of a stream. One larger than `largestWholeContent` is not held: it goes to the
+    /// archive at once, in pieces, where nothing shows it until a commit that has it is published. It is read twice, to be
+    /// identified first.
+    /// @param earlier the content that this one replaces under its path, which makes it cheap to store; may be null
+    /// @param progress may be null
+    /// @return null if the stream cannot be read to its end, or gives something else the second time
+    cow_ptr<KivVcs::Blob> StoreContent(ContentOpener const& open, Id const& earlier = {},
+                                       IProgress* progress = nullptr);
+    /// The same for a file. @param path in the encoding of the file system
+    cow_ptr<KivVcs::Blob> StoreFile(std::string const& path, Id const& earlier = {}, IProgress* progress = nullptr);
+
+    /// Writes a content to a new file, in pieces; an existing file is replaced. After a failure there is none.
+    /// @param progress may be null
+    /// @throws ArchiveError, `Unavailable` or `DiskFull` if the file cannot be written
+    void RestoreFile(Id const& id, std::string const& path, IProgress* progress = nullptr);
+
     /// The head that a branch had in the archive when that was last looked at; null if it had none.
     [[nodiscard]] Id GetPublishedHead(KivStringViewT<char16_t> branch) const;
     /// Whether a branch stands elsewhere than in the archive, as far as that is known, because it was moved here.
@@ -180,6 +211,7 @@ private:
     [[nodiscard]] bool IsContained(Id const& commit, cow_ptr<Commit> const& in) const;
     PublishOutcome PublishOnce(std::span<const KivStringT<char16_t>> branches, std::vector<RecordChange> const& records,
                                bool asksForAll, IProgress* progress);
+    [[nodiscard]] bool IsOwnDoing(PublishOutcome const& outcome) const;
     void RefreshBranch(Branch const& theirs, RefreshOutcome& outcome);
     void ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome);
     void TakePublished(KivStringT<char16_t> const& branch);

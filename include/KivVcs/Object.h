@@ -78,7 +78,7 @@ public:
     [[nodiscard]] virtual bool IsOfHostClass() const noexcept { return true; }
 
     /// The digest of the identifier, valid until `ResetState`; null if that would have to be asked for: of an
-    /// object of a host's class, and of one whose identifier has not been computed yet.
+    /// object of a host's class that has not told it, and of one whose identifier has not been computed yet.
     [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept {
         if (id_.IsOwn())
             return &id_.Digest();
@@ -102,6 +102,8 @@ public:
 
 protected:
     Object() noexcept = default;
+    /// An object with a known identifier, which a state that is reset leaves as it is.
+    explicit Object(Id::Digest const& digest) noexcept { id_.Tell(Id::FromDigest(digest)); }
     Object(Object const& other) : IObject(other) { TakeKept(other); }
     Object(Object&& other) noexcept : IObject(other) { TakeKept(std::move(other)); }
     Object& operator=(Object const& other) {

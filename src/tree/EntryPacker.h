@@ -55,10 +55,10 @@ inline char* PackName(KivStringViewT<char16_t> name, char* out) noexcept {
                : DataEncoding::Utf8Write(UntilZero(name), begin);
 }
 
-/// Whether a packed form shows an object of a host's class.
+/// Whether a packed form shows an object of a host's class, which has to be asked what it shows.
 inline bool ShowsHostObject(Held const& held) noexcept {
     Object const* const object = held.Packed();
-    return object != nullptr && object->IsOfHostClass();
+    return object != nullptr && object->IsOfHostClass() && object->GetKnownDigest() == nullptr;
 }
 
 inline std::string_view WordsFor(Held const& held) noexcept {

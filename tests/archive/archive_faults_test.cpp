@@ -1,4 +1,5 @@
 #include "FaultyFiles.h"
+#include "KivArchive/ArchivedRepository.h"
 #include "Trials.h"
 
 #include <gtest/gtest.h>
@@ -141,10 +142,39 @@ void Copy(std::string const& path) {
     archive.Backup(path + ".copy", &callbacks);
 }
 
+/// Commits on what is fetched for that, publishes, walks and refreshes, while others publish. Goes on once after a failed
+/// publish, which must have left the repository as it was.
+void UseRepository(std::string const& path) {
+    auto const archive = std::make_shared<SqliteArchive>(path, OneWorker());
+    ArchivedRepository repository(archive);
+    KivVcs::Commit commit(&repository, false);
+    commit.AddBlob(&repository, u"docs/new", KivVcs::Blob::CopyText("new"));
+    commit.AddBlob(&repository, u"text", KivVcs::Blob::CopyText(SomeText(9, 5000)));
+    auto const made = repository.DoCommit(commit);
+    auto const publish = [&] {
+        if (!repository.Publish(&callbacks).published)
+            ADD_FAILURE() << "a publish that was refused without a word";
+    };
+    try {
+        publish();
+    } catch (...) {
+        publish();
+        throw;
+    }
+    if (!(HeadOf(*archive) == made->GetId()))
+        ADD_FAILURE() << "a publish that did nothing";
+    for (auto ancestor = made; ancestor; ancestor = ancestor->GetParent())
+        static_cast<void>(ancestor->GetCommitTree()->GetBlob(u"text")->GetData());
+    SmallHost(*archive, 4).Publish();
+    if (repository.Refresh().moved.size() != 1)
+        ADD_FAILURE() << "a refresh that found nothing";
+}
+
 constexpr Operation operations[] = {{"Open", Open},
                                     {"MakeNew", MakeNew},
                                     {"Publish", Publish},
                                     {"PublishBranch", PublishBranch, true},
+                                    {"UseRepository", UseRepository, true},
                                     {"Collect", CollectAll, true},
                                     {"Synchronize", Take, true},
                                     {"Repair", RepairAll, true, true},

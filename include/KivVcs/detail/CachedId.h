@@ -14,7 +14,8 @@ namespace KivVcs::detail {
 /// one of the library's classes, or one of a class that a host derived.
 ///
 /// A copy takes it along before anybody knows of which class the copy will be. It counts for an object of the kind that
-/// it is that of; for another it is never looked at, and gives way to the one that the object computes itself.
+/// it is that of; for another it is never looked at, and gives way to the one that the object computes itself. One that a
+/// host has told stays with the object that it was told of, and is not taken along.
 class CachedId {
 public:
     CachedId() noexcept = default;
@@ -22,8 +23,8 @@ public:
     CachedId& operator=(CachedId const&) = delete;
     ~CachedId() = default;
 
-    /// Whether there is an identifier that is known to be that of a library's object.
-    [[nodiscard]] bool IsOwn() const noexcept { return state_.Get() == State::Own; }
+    /// Whether there is an identifier that is known to be that of a library's object, or that a host has told.
+    [[nodiscard]] bool IsOwn() const noexcept { return state_.Get() >= State::Own; }
     /// Whether there is one that will be, should the object be a library's.
     [[nodiscard]] bool IsCopied() const noexcept { return state_.Get() == State::Copied; }
     /// Whether there is one that counts, should the object be of a host's class.
@@ -32,6 +33,13 @@ public:
     /// The identifier, and its digest. @pre there is one
     [[nodiscard]] Id Get() const noexcept { return {digest_, std::bit_cast<std::size_t>(hash_)}; }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
+
+    /// Keeps an identifier from now on, whatever changes.
+    void Tell(Id const& id) noexcept {
+        digest_ = *id.GetDigest();
+        hash_ = std::bit_cast<Hash>(id.Hash());
+        state_.Set(State::Told);
+    }
 
     /// Says that the object with a copied identifier is a library's.
     void Confirm() const noexcept {
@@ -59,10 +67,13 @@ public:
         state_.Set(isHosts ? State::Hosts : State::Copied);
     }
 
-    void Reset() noexcept { state_.Set(State::Empty); }
+    void Reset() noexcept {
+        if (state_.Get() != State::Told)
+            state_.Set(State::Empty);
+    }
 
 private:
-    enum class State : std::uint32_t { Empty, Writing, Own, Copied, Hosts };
+    enum class State : std::uint32_t { Empty, Writing, Copied, Hosts, Own, Told };
     using Hash = std::array<std::byte, sizeof(std::size_t)>;
 
     // Nothing here is aligned to more than four bytes, so that an object has all of it right behind its use count.
