@@ -45,8 +45,14 @@ std::span<const LocalFacts::CommitHandle> LocalFacts::MergedBy(Id const& id) con
 std::vector<Ancestry> LocalFacts::All() const {
     std::vector<Ancestry> all;
     all.reserve(entries_.size());
-    for (auto const& [id, entry] : entries_)
+    auto const isDigest = [](Id const& known) { return known.IsEmpty() || known.GetDigest() != nullptr; };
+    for (auto const& [id, entry] : entries_) {
+        // Nothing else is known to an archive.
+        if (!isDigest(id) || !isDigest(entry.facts.parent) || !isDigest(entry.facts.tree))
+            continue;
         all.push_back(entry.facts);
+        std::erase_if(all.back().contains, [&](ContainedCommit const& contained) { return !isDigest(contained.id); });
+    }
     return all;
 }
 

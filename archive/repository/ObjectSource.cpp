@@ -97,6 +97,14 @@ cow_ptr<Commit> ObjectSource::FetchCommit(Id const& id) {
     });
     if (fetched)
         return fetched;
+    {
+        // Another thread may have been faster.
+        Lock const lock(mutex_);
+        if (cow_ptr<Commit> living = FindCommit(id)) {
+            Enter(living);
+            return living;
+        }
+    }
     bool const isDamaged = std::find(outcome.damaged.begin(), outcome.damaged.end(), id) != outcome.damaged.end();
     ThrowUnreadable(failure.value_or(isDamaged ? Failure::Damaged : Failure::Collected), "version", id);
 }

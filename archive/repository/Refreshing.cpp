@@ -39,24 +39,23 @@ void ArchivedRepository::RefreshBranch(Branch const& theirs, RefreshOutcome& out
     if (hasUnpublished && (isThere || !isNew))
         return;
     TakePublished(theirs.name);
-    outcome.moved.push_back(theirs.name);
+    if (known.taken == theirs.head)
+        outcome.moved.push_back(theirs.name);
 }
 
 void ArchivedRepository::ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome) {
-    for (auto known = state_->branches.begin(); known != state_->branches.end();) {
-        auto const& [name, state] = *known;
-        bool const isThere = std::any_of(theirs.begin(), theirs.end(),
-                                         [&name = name](Branch const& branch) { return branch.name == name; });
-        if (isThere) {
-            ++known;
-            continue;
-        }
+    std::vector<KivStringT<char16_t>> removed;
+    for (auto const& [name, known] : state_->branches)
+        if (std::none_of(theirs.begin(), theirs.end(),
+                         [&name = name](Branch const& branch) { return branch.name == name; }))
+            removed.push_back(name);
+    for (auto const& name : removed) {
         if (BranchExist(name) && !HasUnpublished(name)) {
             RemoveBranch(name);
             outcome.moved.push_back(name);
         }
         // What is left here is a new branch from now on.
-        known = state_->branches.erase(known);
+        state_->branches.erase(name);
     }
 }
 
@@ -78,12 +77,13 @@ void ArchivedRepository::TakePublished(KivStringT<char16_t> const& branch) {
         known.taken = known.published;
         return;
     }
-    if (BranchExist(branch))
-        MoveBranchTo(branch, std::move(head));
-    else
-        CreateBranch(branch, std::move(head));
-    known.taken = known.published;
-    known.unreadable.reset();
+    bool const hasMoved =
+        BranchExist(branch) ? MoveBranchTo(branch, std::move(head)) : CreateBranch(branch, std::move(head));
+    // A host's class may refuse; what has not been taken in must not be taken for something to publish over it.
+    if (hasMoved && state_->OwnHead(branch) == known.published) {
+        known.taken = known.published;
+        known.unreadable.reset();
+    }
 }
 
 } // namespace KivArchive

@@ -136,6 +136,7 @@ void TreeFetch::FindLiving(std::vector<Id>& level) {
 TreeFetch::Form TreeFetch::ReadForm(ArchivedObject const& object) {
     Form form;
     form.data.Append(object.data.data(), object.data.size());
+    form.data = Joined(form.data);
     PackedEntries entries(BytesOf(form.data));
     while (entries.Next())
         form.entries.push_back({entries.Get().isTree, entries.Get().name, entries.Get().GetId()});

@@ -482,6 +482,48 @@ TEST(ArchivedRepository, UnpublishedCommitsFollowAHeadThatWasRewritten) {
     EXPECT_EQ(ProblemsOf(*archive), "");
 }
 
+TEST(ArchivedRepository, TakesTreesFromAnotherArchive) {
+    auto const far = std::make_shared<MemArchive>();
+    auto const near = std::make_shared<MemArchive>();
+    std::string const large = Conformance::SomeNoise(3, 2 * 1024 * 1024);
+    {
+        ArchivedRepository theirs(far);
+        Commit commit(&theirs, false);
+        commit.AddBlob(&theirs, u"d/large", MakeBlob(large));
+        commit.AddBlob(&theirs, u"d/small", MakeBlob("small"));
+        theirs.DoCommit(commit);
+        ASSERT_TRUE(theirs.Publish().published);
+    }
+    ArchivedRepository ours(near);
+    Commit commit(&ours, false);
+    commit.AddTree(&ours, u"copied", *ArchivedRepository(far).GetHead()->GetCommitTree()->GetRoot());
+    ours.DoCommit(commit);
+    EXPECT_TRUE(ours.Publish().published);
+    EXPECT_EQ(ProblemsOf(*near), "");
+    auto const blob = ArchivedRepository(near).GetHead()->GetBlob(u"copied/d/large");
+    EXPECT_TRUE(blob->CopyToString() == large);
+}
+
+/// A host that does not let its branches be moved.
+class Stubborn final : public ArchivedRepository {
+public:
+    using ArchivedRepository::ArchivedRepository;
+    bool MoveBranchTo(KivStringViewT<char16_t>, cow_ptr<Commit>) override { return false; }
+};
+
+TEST(ArchivedRepository, ABranchThatIsNotLetMoveTakesNothingBack) {
+    auto const archive = std::make_shared<MemArchive>();
+    ArchivedRepository theirs(archive);
+    CommitFiles(theirs, "a=1", "one");
+    ASSERT_TRUE(theirs.Publish().published);
+    Stubborn stubborn(archive);
+    CommitFiles(theirs, "a=2", "two");
+    ASSERT_TRUE(theirs.Publish().published);
+    EXPECT_TRUE(stubborn.Refresh().moved.empty());
+    EXPECT_TRUE(stubborn.Publish().published);
+    EXPECT_EQ(HeadOf(*archive), theirs.GetHead()->GetId()) << "what others have published stays";
+}
+
 /// A file of a host's, whose content cannot be had a number of times.
 class FailingBlob final : public Blob {
 public:
