@@ -1,7 +1,8 @@
 #include "objects/Sha256Lanes.h"
 
-#if defined(__has_builtin)
-#if __has_builtin(__builtin_shufflevector) && (defined(__x86_64__) || defined(__i386__))
+// GCC does not align large vectors on the stack where Windows unwinds it, and with 32 bits there are too few registers.
+#if defined(__has_builtin) && defined(__x86_64__) && !defined(_WIN32)
+#if __has_builtin(__builtin_shufflevector)
 #define KIVVCS_HAS_VECTORS
 #endif
 #endif
