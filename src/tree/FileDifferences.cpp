@@ -1,5 +1,6 @@
 #include "KivVcs/Differences.h"
 
+#include "tree/ForEachDifference.h"
 #include "tree/PathPrefix.h"
 
 #include <algorithm>
@@ -8,36 +9,39 @@
 
 namespace KivVcs {
 
+using detail::Held;
+
 namespace {
 
-Id IdOf(cow_ptr<Object> const& object) {
-    return object ? object->GetId() : Id();
+Id IdOf(Object const* object) {
+    return object != nullptr ? object->GetId() : Id();
 }
 
 /// Two directories of one path, either of which may be null, and how much of the path of the directory entered last is
 /// also the beginning of theirs.
 struct DirectoryPair {
-    cow_ptr<Tree> before;
-    cow_ptr<Tree> after;
-    KivStringT<char16_t> name;
+    Tree const* before;
+    Tree const* after;
+    KivStringT<char16_t> const* name;
     std::size_t prefixLength;
 };
 
-/// Walks the directories that differ, with a stack of its own, since they may be nested deeper than calls can be.
+/// Walks the directories that differ, with a stack of its own, since they may be nested deeper than calls can be. Both trees
+/// stay as they are meanwhile, and hold all that it looks at.
 class DifferenceWalk {
 public:
     explicit DifferenceWalk(std::size_t atMost) : atMost_(atMost) {}
 
     /// False if there was more than wanted.
-    bool Run(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after) {
+    bool Run(Tree const* before, Tree const* after) {
         if (!Compare(before, after))
             return false;
         for (std::size_t entered = 0; !open_.empty(); ++entered) {
             if (entered == atMost_)
                 return false;
-            const DirectoryPair pair = std::move(open_.back());
+            const DirectoryPair pair = open_.back();
             open_.pop_back();
-            prefix_.Enter(pair.prefixLength, pair.name);
+            prefix_.Enter(pair.prefixLength, *pair.name);
             if (!Compare(pair.before, pair.after))
                 return false;
         }
@@ -47,41 +51,40 @@ public:
     [[nodiscard]] std::vector<Difference> Take() noexcept { return std::move(found_); }
 
 private:
-    bool Compare(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after) {
-        if (!before && !after)
-            return true;
-        Tree const& one = before ? *before : *after;
-        cow_ptr<Tree> const& other = before ? after : before;
-        for (auto const& name : one.GetLocalBlobDiffs(other)) {
-            if (found_.size() == atMost_)
-                return false;
-            Add(name, before, after);
-        }
-        const PathList directories = one.GetLocalTreeDiffs(other);
-        std::for_each(directories.rbegin(), directories.rend(), [&](KivStringT<char16_t> const& name) {
-            auto mine = before ? before->GetLocalTree(name) : nullptr;
-            auto theirs = after ? after->GetLocalTree(name) : nullptr;
-            const bool isHiddenAndSame = mine && theirs && mine->GetId() == theirs->GetId();
-            if (!name.IsEmpty() && !isHiddenAndSame)
-                open_.push_back({std::move(mine), std::move(theirs), name, prefix_.GetLength()});
-        });
-        return true;
+    bool Compare(Tree const* before, Tree const* after) {
+        const auto openBefore = static_cast<std::ptrdiff_t>(open_.size());
+        bool isComplete = true;
+        detail::ForEachDifference(
+            detail::TopOf(before), detail::TopOf(after),
+            [&](KivStringT<char16_t> const& name, Held const& was, Held const& is) {
+                if (detail::BlobDiffers(was, is)) {
+                    isComplete = isComplete && found_.size() < atMost_;
+                    if (isComplete)
+                        Add(name, was, is);
+                }
+                // One that a blob of the same name hides may be the same on both sides.
+                if (isComplete && !name.IsEmpty() && detail::TreeDiffers(was, is) && !IsSame(was.GetTree(), is.GetTree()))
+                    open_.push_back({was.GetTree(), is.GetTree(), &name, prefix_.GetLength()});
+            });
+        std::reverse(open_.begin() + openBefore, open_.end());
+        return isComplete;
     }
 
-    void Add(KivStringT<char16_t> const& name, cow_ptr<Tree> const& before, cow_ptr<Tree> const& after) {
-        const bool wasFile = before && before->GetLocalBlob(name);
-        const bool isFile = after && after->GetLocalBlob(name);
-        Difference difference;
-        difference.oldId = IdOf(before ? before->GetLocalObject(name) : nullptr);
-        difference.newId = IdOf(after ? after->GetLocalObject(name) : nullptr);
-        if (wasFile && isFile)
+    [[nodiscard]] static bool IsSame(Tree const* before, Tree const* after) {
+        return before != nullptr && after != nullptr && before->HasSameId(*after);
+    }
+
+    void Add(KivStringT<char16_t> const& name, Held const& was, Held const& is) {
+        Difference& difference = found_.emplace_back();
+        difference.oldId = IdOf(was.Visible());
+        difference.newId = IdOf(is.Visible());
+        if (was.GetBlob() != nullptr && is.GetBlob() != nullptr)
             difference.kind = ChangeKind::Changed;
-        else if (wasFile)
+        else if (was.GetBlob() != nullptr)
             difference.kind = difference.newId.IsEmpty() ? ChangeKind::Removed : ChangeKind::FileBecameDirectory;
         else
             difference.kind = difference.oldId.IsEmpty() ? ChangeKind::Added : ChangeKind::DirectoryBecameFile;
         difference.path = prefix_.PathOf(name);
-        found_.push_back(std::move(difference));
     }
 
     std::size_t atMost_;
@@ -148,11 +151,12 @@ void PairRenames(std::vector<Difference>& differences) {
 
 Differences::Differences(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after, DifferenceOptions const& options) {
     DifferenceWalk walk(options.atMost);
-    isComplete_ = walk.Run(before, after);
+    isComplete_ = walk.Run(before.get(), after.get());
     differences_ = walk.Take();
-    // Names are visited in order; only a directory whose name begins another one's breaks the order of paths.
-    std::sort(differences_.begin(), differences_.end(),
-              [](Difference const& left, Difference const& right) { return left.path < right.path; });
+    // Names are visited in order; what breaks the order of paths are files beside directories.
+    const auto isBefore = [](Difference const& left, Difference const& right) { return left.path < right.path; };
+    if (!std::is_sorted(differences_.begin(), differences_.end(), isBefore))
+        std::sort(differences_.begin(), differences_.end(), isBefore);
     if (options.findRenames)
         PairRenames(differences_);
 }

@@ -4,6 +4,24 @@
 
 namespace KivVcs::detail {
 
+/// Whether a lookup by name finds something else on the other side than @p object, which may be null.
+[[nodiscard]] inline bool IsMissingIn(Held const& other, Object const* object) {
+    return object != nullptr && (other.Visible() == nullptr || !object->HasSameId(*other.Visible()));
+}
+
+[[nodiscard]] inline bool BlobDiffers(Held const& mine, Held const& theirs) {
+    return IsMissingIn(theirs, mine.GetBlob()) || IsMissingIn(mine, theirs.GetBlob());
+}
+
+[[nodiscard]] inline bool TreeDiffers(Held const& mine, Held const& theirs) {
+    return (mine.HasTree() || theirs.HasTree()) &&
+           (IsMissingIn(theirs, mine.GetTree()) || IsMissingIn(mine, theirs.GetTree()));
+}
+
+[[nodiscard]] inline Node const* TopOf(Tree const* tree) noexcept {
+    return tree == nullptr ? nullptr : TreeAccess::Top(*tree).get();
+}
+
 /// Whether two nodes have their children separated alike, so that child can be compared with child.
 [[nodiscard]] inline bool AreSeparatedAlike(Node const& left, Node const& right) noexcept {
     if (left.IsLeaf() || left.Height() != right.Height() || left.Count() != right.Count())

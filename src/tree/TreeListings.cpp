@@ -7,9 +7,11 @@
 
 namespace KivVcs {
 
+using detail::BlobDiffers;
 using detail::Entry;
 using detail::Held;
-using detail::Node;
+using detail::TopOf;
+using detail::TreeDiffers;
 
 namespace {
 
@@ -55,24 +57,6 @@ struct DirectoryPair {
     Tree const* theirs;
     std::size_t prefixLength;
 };
-
-/// Whether a lookup by name finds something else on the other side than @p object, which may be null.
-bool IsMissingIn(Held const& other, Object const* object) {
-    return object != nullptr && (other.Visible() == nullptr || !object->HasSameId(*other.Visible()));
-}
-
-bool BlobDiffers(Held const& mine, Held const& theirs) {
-    return IsMissingIn(theirs, mine.GetBlob()) || IsMissingIn(mine, theirs.GetBlob());
-}
-
-bool TreeDiffers(Held const& mine, Held const& theirs) {
-    return (mine.HasTree() || theirs.HasTree()) &&
-           (IsMissingIn(theirs, mine.GetTree()) || IsMissingIn(mine, theirs.GetTree()));
-}
-
-Node const* TopOf(Tree const* tree) noexcept {
-    return tree == nullptr ? nullptr : detail::TreeAccess::Top(*tree).get();
-}
 
 /// Adds the paths that differ right in a pair of directories, and puts the pairs of subdirectories that differ on @p open,
 /// the first one last.
