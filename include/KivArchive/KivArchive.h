@@ -4,9 +4,9 @@
 /// The whole archive.
 
 #include "KivArchive/ArchiveError.h"
-#include "KivArchive/CachingArchive.h"
 #include "KivArchive/ArchivedBlob.h"
 #include "KivArchive/ArchivedRepository.h"
+#include "KivArchive/CachingArchive.h"
 #include "KivArchive/IArchive.h"
 #include "KivArchive/Listings.h"
 #include "KivArchive/MemArchive.h"

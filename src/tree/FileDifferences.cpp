@@ -54,18 +54,18 @@ private:
     bool Compare(Tree const* before, Tree const* after) {
         const auto openBefore = static_cast<std::ptrdiff_t>(open_.size());
         bool isComplete = true;
-        detail::ForEachDifference(
-            detail::TopOf(before), detail::TopOf(after),
-            [&](KivStringT<char16_t> const& name, Held const& was, Held const& is) {
-                if (detail::BlobDiffers(was, is)) {
-                    isComplete = isComplete && found_.size() < atMost_;
-                    if (isComplete)
-                        Add(name, was, is);
-                }
-                // One that a blob of the same name hides may be the same on both sides.
-                if (isComplete && !name.IsEmpty() && detail::TreeDiffers(was, is) && !IsSame(was.GetTree(), is.GetTree()))
-                    open_.push_back({was.GetTree(), is.GetTree(), &name, prefix_.GetLength()});
-            });
+        detail::ForEachDifference(detail::TopOf(before), detail::TopOf(after),
+                                  [&](KivStringT<char16_t> const& name, Held const& was, Held const& is) {
+                                      if (detail::BlobDiffers(was, is)) {
+                                          isComplete = isComplete && found_.size() < atMost_;
+                                          if (isComplete)
+                                              Add(name, was, is);
+                                      }
+                                      // One that a blob of the same name hides may be the same on both sides.
+                                      if (isComplete && !name.IsEmpty() && detail::TreeDiffers(was, is) &&
+                                          !IsSame(was.GetTree(), is.GetTree()))
+                                          open_.push_back({was.GetTree(), is.GetTree(), &name, prefix_.GetLength()});
+                                  });
         std::reverse(open_.begin() + openBefore, open_.end());
         return isComplete;
     }
