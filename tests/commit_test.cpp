@@ -54,6 +54,23 @@ TEST_F(Commits, HaveTheIdentifiersThatAnIndependentScriptComputes) {
     EXPECT_EQ(Bytes(Commit().GetData()), "tree \nauthor  <> 0 +0000\ncommitter  <> 0 +0000\n\n\n");
 }
 
+TEST_F(Commits, HaveAnotherIdentifierAfterEveryChange) {
+    Commit commit(nullptr, false);
+    const std::function<void()> changes[] = {[&] { commit.SetAuthorName(u"x"); },
+                                             [&] { commit.SetAuthorEmail(u"x"); },
+                                             [&] { commit.SetDescription(u"x"); },
+                                             [&] { commit.SetCommitTime(Time(10'000'000)); },
+                                             [&] { commit.SetCommitTimezoneBias(TimeDelta(ticksPerMinute)); },
+                                             [&] { commit.SetParent(immu::make<Commit>()); },
+                                             [&] { commit.AddBlob(&repo, u"x", Blob()); },
+                                             [&] { commit.RemoveObject(&repo, u"x"); }};
+    for (auto const& change : changes) {
+        const std::string before = IdText(commit);
+        change();
+        EXPECT_NE(IdText(commit), before) << &change - changes;
+    }
+}
+
 /// The examples of docs/formats.md. Their identifiers come from sha256sum.
 TEST_F(Commits, ThePackedFormsThatAreDocumentedAreExact) {
     using namespace std::string_literals;
