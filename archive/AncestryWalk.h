@@ -14,8 +14,8 @@ template <class LookUp>
 [[nodiscard]] std::vector<Ancestry> WalkAncestry(std::span<const Id> commits, Follow follow, std::size_t more,
                                                  LookUp lookUp) {
     std::vector<Ancestry> found;
-    constexpr std::size_t mostReserved = 4096;
-    found.reserve(std::min(commits.size() + std::min(more, mostReserved), mostReserved));
+    constexpr std::size_t maximumReserved = 4096;
+    found.reserve(std::min(commits.size() + std::min(more, maximumReserved), maximumReserved));
     std::unordered_set<Id> met;
     auto const meet = [&](Id const& id) {
         if (id.IsEmpty() || !met.insert(id).second)

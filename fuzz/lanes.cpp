@@ -30,11 +30,11 @@ void CompareCompressions(std::vector<std::uint8_t> const& source, std::vector<Me
     for (auto const& [lanes, compress] :
          {Sha256::FindPairCompression(), Sha256::FindEightLanes(), Sha256::FindSixteenLanes()}) {
         for (std::size_t first = 0; compress != nullptr && first < messages.size(); first += lanes) {
-            std::array<Sha256::State, Sha256::mostLanes> beside;
+            std::array<Sha256::State, Sha256::maximumLanes> beside;
             beside.fill(Sha256::initialState);
             auto alone = beside;
-            std::array<Sha256::State*, Sha256::mostLanes> states{};
-            std::array<const std::uint8_t*, Sha256::mostLanes> blocks{};
+            std::array<Sha256::State*, Sha256::maximumLanes> states{};
+            std::array<const std::uint8_t*, Sha256::maximumLanes> blocks{};
             const std::size_t count = messages[first].length / Sha256::blockSize;
             for (std::size_t lane = 0; lane < lanes; ++lane) {
                 states[lane] = &beside[lane];

@@ -26,7 +26,7 @@ struct CachingArchive::State {
 
     State(std::shared_ptr<IArchive> nearArchive, std::shared_ptr<IArchive> farArchive,
           CachingOptions const& givenOptions)
-        : near(std::move(nearArchive), givenOptions.mostBytes), far(std::move(farArchive)),
+        : near(std::move(nearArchive), givenOptions.maximumBytes), far(std::move(farArchive)),
           pause(std::chrono::duration_cast<Clock::duration>(givenOptions.pause).count()) {}
 
     /// Calls `ask(far)`, and notes whether it could be reached.

@@ -69,8 +69,8 @@ Id::Digest TakeDigest(ByteReader& reader) {
 
 } // namespace
 
-NearArchive::NearArchive(std::shared_ptr<IArchive> archive, std::uint64_t mostBytes)
-    : archive_(std::move(archive)), mostBytes_(mostBytes) {}
+NearArchive::NearArchive(std::shared_ptr<IArchive> archive, std::uint64_t maximumBytes)
+    : archive_(std::move(archive)), maximumBytes_(maximumBytes) {}
 
 NearArchive::~NearArchive() {
     try {
@@ -176,7 +176,7 @@ void NearArchive::NoteStored(std::uint64_t bytes) {
             unwatched_ -= bytes;
             return;
         }
-        unwatched_ = mostBytes_ / partWatched;
+        unwatched_ = maximumBytes_ / partWatched;
     }
     if (std::unique_lock const turn(removing_, std::try_to_lock); turn)
         Try([this] { RemoveOldest(); });
@@ -209,14 +209,14 @@ std::vector<NearArchive::Candidate> NearArchive::ListByUse() {
 void NearArchive::RemoveOldest() {
     ArchiveStatistics const statistics = archive_->GetStatistics();
     std::uint64_t const taken = statistics.bytes - std::min(statistics.bytes, statistics.unusedBytes);
-    if (taken <= mostBytes_)
+    if (taken <= maximumBytes_)
         return;
     std::vector<Candidate> const candidates = ListByUse();
     std::uint64_t sum = 0;
     for (Candidate const& candidate : candidates)
         sum += candidate.info.size;
     // A quarter more than has to go; sizes are told before compression.
-    double const share = static_cast<double>(taken - mostBytes_ + mostBytes_ / 4) / static_cast<double>(taken);
+    double const share = static_cast<double>(taken - maximumBytes_ + maximumBytes_ / 4) / static_cast<double>(taken);
     auto const wanted = static_cast<std::uint64_t>(share * static_cast<double>(sum));
     std::vector<Id> page;
     Uses kept;
@@ -233,7 +233,7 @@ void NearArchive::RemoveOldest() {
     }
     RemoveAll(page);
     WriteUses(kept);
-    while (archive_->Compact(mostBytes_ / partWatched) > 0) {
+    while (archive_->Compact(maximumBytes_ / partWatched) > 0) {
     }
 }
 

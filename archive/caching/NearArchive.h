@@ -15,7 +15,7 @@ namespace KivArchive {
 /// Any number of threads may use it.
 class NearArchive {
 public:
-    NearArchive(std::shared_ptr<IArchive> archive, std::uint64_t mostBytes);
+    NearArchive(std::shared_ptr<IArchive> archive, std::uint64_t maximumBytes);
     NearArchive(NearArchive const&) = delete;
     NearArchive& operator=(NearArchive const&) = delete;
     /// Notes what was used.
@@ -31,7 +31,7 @@ public:
     bool KeepContent(Id const& id, StreamIO& content);
     void Drop(std::span<const Id> ids);
     /// Whether a content of so many bytes is worth keeping.
-    [[nodiscard]] bool HasRoomFor(std::uint64_t size) const noexcept { return size <= mostBytes_ / 4; }
+    [[nodiscard]] bool HasRoomFor(std::uint64_t size) const noexcept { return size <= maximumBytes_ / 4; }
 
     /// What the far archive said last.
     void KeepBranches(std::vector<Branch> const& branches);
@@ -62,7 +62,7 @@ private:
     void SaveUses();
 
     std::shared_ptr<IArchive> archive_;
-    std::uint64_t mostBytes_;
+    std::uint64_t maximumBytes_;
     std::mutex mutex_;
     /// Objects used since this was made, in order.
     std::unordered_map<Id, std::uint64_t> used_;

@@ -77,7 +77,7 @@ AncestryGraph::Meeting const* EntryBases::MeetingOf(Pair pair) {
     auto const known = meetings_.find(pair);
     if (known != meetings_.end())
         return &known->second;
-    if (meetings_.size() == mostPairs)
+    if (meetings_.size() == maximumPairs)
         return nullptr;
     return &meetings_.emplace(pair, graph_.Meet(pair.first, pair.second)).first->second;
 }
@@ -128,7 +128,7 @@ BaseEntry EntryBases::Find(Pair pair, KivStringT<char16_t> const* name, Found& f
     auto const known = found.entries.find(pair);
     if (known != found.entries.end())
         return known->second;
-    if (found.depth == deepest || found.entries.size() == mostPairsOfEntry)
+    if (found.depth == deepest || found.entries.size() == maximumPairsOfEntry)
         return {};
     AncestryGraph::Meeting const* const meeting = MeetingOf(pair);
     // Where each contains the other neither is older.

@@ -88,8 +88,8 @@ private:
     static constexpr unsigned deepest = 16;
     /// The most pairs that are looked at for one entry, and the most whose meeting is looked for at all. What lies beyond
     /// counts as not known, so that somebody is asked.
-    static constexpr std::size_t mostPairsOfEntry = 256;
-    static constexpr std::size_t mostPairs = 4096;
+    static constexpr std::size_t maximumPairsOfEntry = 256;
+    static constexpr std::size_t maximumPairs = 4096;
 
     [[nodiscard]] AncestryGraph::Meeting const* MeetingOf(Pair pair);
     [[nodiscard]] BaseEntry Find(Pair pair, KivStringT<char16_t> const* name, Found& found);

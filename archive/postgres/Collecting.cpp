@@ -221,12 +221,13 @@ void PostgresArchive::Unmark(std::span<const Id> ids) {
 }
 
 std::vector<Id> PostgresArchive::ListMarked(std::chrono::seconds grace, Id const& after, std::size_t limit) {
-    constexpr std::size_t mostRows = 1U << 17U;
+    constexpr std::size_t maximumRows = 1U << 17U;
     return store_->Run([&](Connection& connection) {
         RoundTrip trip(connection);
-        trip.Add(
-            Statement::ListMarked,
-            Parameters().With(CountOf(grace)).With(after).With(static_cast<std::uint64_t>(std::min(limit, mostRows))));
+        trip.Add(Statement::ListMarked, Parameters()
+                                            .With(CountOf(grace))
+                                            .With(after)
+                                            .With(static_cast<std::uint64_t>(std::min(limit, maximumRows))));
         return IdsIn(trip.Run().front());
     });
 }

@@ -8,7 +8,7 @@ namespace {
 
 /// A version is that many steps from one that is no difference at most, one for each bit of its number.
 constexpr std::size_t maximumSteps = 64;
-constexpr std::uint64_t mostMade = std::uint64_t{32} * 1024 * 1024;
+constexpr std::uint64_t maximumMade = std::uint64_t{32} * 1024 * 1024;
 
 } // namespace
 
@@ -118,7 +118,7 @@ Form Forms::FormOf(Id const& id, Compressor& compressor) {
 }
 
 void Forms::Keep(Id const& id, std::shared_ptr<const Bytes> const& form) {
-    if (madeSize_ + form->size() > mostMade) {
+    if (madeSize_ + form->size() > maximumMade) {
         made_.clear();
         madeSize_ = 0;
     }

@@ -13,10 +13,10 @@ using namespace Postgres;
 namespace {
 
 /// The most rows that one answer has, whatever a host asks for.
-constexpr std::size_t mostRows = 1U << 17U;
+constexpr std::size_t maximumRows = 1U << 17U;
 
 std::uint64_t LimitOf(std::size_t limit) noexcept {
-    return std::min(limit, mostRows);
+    return std::min(limit, maximumRows);
 }
 
 Rows Ask(Store& store, Statement statement, Parameters const& parameters = {}) {

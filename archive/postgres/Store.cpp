@@ -73,12 +73,12 @@ bool Attempts::WaitAfterConflict() {
 }
 
 bool Attempts::Wait(std::chrono::milliseconds atMost) {
-    constexpr unsigned mostDoublings = 8;
+    constexpr unsigned maximumDoublings = 8;
     if (Clock::now() - begin_ > atMost)
         return false;
     // Twice as long each time, and never as long as others: those who got into each other's way must not meet again.
     thread_local std::minstd_rand random(std::random_device{}());
-    int const longest = 4 << std::min(count_++, mostDoublings);
+    int const longest = 4 << std::min(count_++, maximumDoublings);
     std::this_thread::sleep_for(std::chrono::milliseconds(std::uniform_int_distribution(longest / 4, longest)(random)));
     return true;
 }

@@ -7,9 +7,9 @@ namespace KivArchive {
 namespace {
 
 /// How many commits of one line are asked about at once.
-constexpr std::size_t mostAskedOfLine = 1000;
+constexpr std::size_t maximumAskedOfLine = 1000;
 /// A few that a host has just made are taken for missing unasked: to store what is there costs less than to ask.
-constexpr std::size_t mostUnasked = 8;
+constexpr std::size_t maximumUnasked = 8;
 
 } // namespace
 
@@ -21,7 +21,7 @@ std::vector<cow_ptr<Commit>> MissingCommits::Find(std::vector<cow_ptr<Commit>> c
 /// The commit and its ancestors up to the first that the archive is known to have had.
 std::vector<cow_ptr<Commit>> MissingCommits::LineToAskFor(cow_ptr<Commit> commit) const {
     std::vector<cow_ptr<Commit>> line;
-    for (; commit && line.size() < mostAskedOfLine; commit = commit->GetHeldParent()) {
+    for (; commit && line.size() < maximumAskedOfLine; commit = commit->GetHeldParent()) {
         Id const id = commit->GetId();
         if (asked_.contains(id) || !MustAskFor(id))
             break;
@@ -41,7 +41,7 @@ void MissingCommits::Discover(std::vector<cow_ptr<Commit>> open) {
                     ids.push_back(asked->GetId());
         }
         open.clear();
-        std::vector<Id> const found = ids.size() <= mostUnasked && !asksForAll_ ? ids : archive_.FindMissing(ids);
+        std::vector<Id> const found = ids.size() <= maximumUnasked && !asksForAll_ ? ids : archive_.FindMissing(ids);
         std::unordered_set<Id> const missing(found.begin(), found.end());
         std::vector<Id> unheld;
         for (auto const& line : lines) {

@@ -166,9 +166,9 @@ private:
         if (row.isOfTable)
             row.number = static_cast<std::int64_t>(TakeVarint(reader));
         constexpr std::uint64_t most = pageSize - 35;
-        constexpr std::uint64_t mostOfIndex = (pageSize - 12) * 64 / 255 - 23;
+        constexpr std::uint64_t maximumOfIndex = (pageSize - 12) * 64 / 255 - 23;
         constexpr std::uint64_t least = (pageSize - 12) * 32 / 255 - 23;
-        std::uint64_t const whole = row.isOfTable ? most : mostOfIndex;
+        std::uint64_t const whole = row.isOfTable ? most : maximumOfIndex;
         std::uint64_t local = size;
         if (size > whole) {
             local = least + (size - least) % (pageSize - 4);

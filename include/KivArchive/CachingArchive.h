@@ -12,7 +12,7 @@ namespace KivArchive {
 struct CachingOptions {
     /// The most bytes that the near archive may take; what was not used for the longest time goes first. A little more
     /// may be taken until that is noticed.
-    std::uint64_t mostBytes = std::uint64_t{1024} * 1024 * 1024;
+    std::uint64_t maximumBytes = std::uint64_t{1024} * 1024 * 1024;
     /// How long the far archive is not asked again after it could not be reached.
     std::chrono::milliseconds pause{2000};
 };

@@ -14,7 +14,7 @@ namespace {
 
 using Sha256::blockSize;
 using Sha256::LaneCompression;
-using Sha256::mostLanes;
+using Sha256::maximumLanes;
 
 /// The message of one lane: a packed form and its padding, as runs of blocks that lie in memory one after the other.
 class Lane {
@@ -34,7 +34,7 @@ public:
         messageSize_ = header + data.GetSize();
         isLastRun_ = false;
         // Only what is short is put together as a whole; the rest of what is long is hashed where it lies.
-        StageFrom(header, messageSize_ <= mostStaged ? mostStaged : blockSize);
+        StageFrom(header, messageSize_ <= maximumStaged ? maximumStaged : blockSize);
     }
 
     /// The blocks that are there; none when the message has ended.
@@ -61,11 +61,11 @@ public:
 private:
     using Chunk = Memory::BufferChunks::Chunk;
 
-    static constexpr std::size_t mostStaged = 8 * blockSize;
+    static constexpr std::size_t maximumStaged = 8 * blockSize;
 
     void FindBlocks() noexcept {
         if (rest_.size() < blockSize)
-            return StageFrom(0, mostStaged);
+            return StageFrom(0, maximumStaged);
         next_ = reinterpret_cast<const std::uint8_t*>(rest_.data());
         blocks_ = rest_.size() / blockSize;
         Consume(blocks_ * blockSize);
@@ -111,7 +111,7 @@ private:
     const Chunk* chunk_ = nullptr;
     /// Of the chunk that is being read, what has not been read yet.
     Chunk rest_{};
-    std::array<std::uint8_t, mostStaged + blockSize> staged_;
+    std::array<std::uint8_t, maximumStaged + blockSize> staged_;
 };
 
 void CompressOne(Sha256::State* const* states, const std::uint8_t* const* blocks, std::size_t count) noexcept {
@@ -153,8 +153,8 @@ std::size_t Compress(std::span<Lane* const> messages) noexcept {
     for (Lane const* message : messages)
         count = std::min(count, message->Blocks());
     Sha256::State idle{};
-    std::array<Sha256::State*, mostLanes> states;
-    std::array<const std::uint8_t*, mostLanes> blocks;
+    std::array<Sha256::State*, maximumLanes> states;
+    std::array<const std::uint8_t*, maximumLanes> blocks;
     states.fill(&idle);
     blocks.fill(messages[0]->Next());
     for (std::size_t i = 0; i < messages.size(); ++i) {
@@ -170,8 +170,8 @@ std::size_t Compress(std::span<Lane* const> messages) noexcept {
 } // namespace
 
 void DigestBesideEachOther(DigestCustomer& customer) {
-    std::array<Lane, mostLanes> lanes;
-    std::array<Lane*, mostLanes> busy{};
+    std::array<Lane, maximumLanes> lanes;
+    std::array<Lane*, maximumLanes> busy{};
     std::size_t busyCount = 0;
     const auto begin = [&](Lane& lane) {
         lane.form = {};
@@ -180,7 +180,7 @@ void DigestBesideEachOther(DigestCustomer& customer) {
         lane.Begin();
         return true;
     };
-    const std::size_t lanesUsed = FastestFor(mostLanes).lanes;
+    const std::size_t lanesUsed = FastestFor(maximumLanes).lanes;
     while (busyCount < lanesUsed && begin(lanes[busyCount])) {
         busy[busyCount] = &lanes[busyCount];
         ++busyCount;

@@ -5,7 +5,7 @@
 /// Compressing several messages beside each other: one stream leaves most of a processor's units idle.
 namespace KivVcs::Sha256 {
 
-inline constexpr std::size_t mostLanes = 16;
+inline constexpr std::size_t maximumLanes = 16;
 
 /// A compression that takes blocks of several messages at once.
 struct LaneCompression {

@@ -4,12 +4,12 @@ namespace KivVcs::detail {
 
 namespace {
 
-constexpr std::size_t mostElements = Node::maxElements;
+constexpr std::size_t maximumElements = Node::maxElements;
 
 /// The nodes above @p nodes, of which there are several, all about equally full.
 std::vector<Child> NodesAbove(std::vector<Child> nodes) {
     const int height = nodes.front().node->Height() + 1;
-    const std::size_t count = (nodes.size() + mostElements - 1) / mostElements;
+    const std::size_t count = (nodes.size() + maximumElements - 1) / maximumElements;
     std::vector<Child> above;
     above.reserve(count);
     for (std::size_t index = 0; index < count; ++index) {
@@ -24,7 +24,7 @@ std::vector<Child> NodesAbove(std::vector<Child> nodes) {
 } // namespace
 
 void SortedEntries::Add(KivStringT<char16_t> name, Held held) {
-    if (entries_.size() == mostElements)
+    if (entries_.size() == maximumElements)
         MakeLeaf();
     entries_.push_back({std::move(name), std::move(held)});
 }

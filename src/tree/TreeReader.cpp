@@ -113,8 +113,8 @@ private:
         bool isRead;
     };
 
-    static constexpr std::size_t mostWaiting = 32;
-    static constexpr std::uint64_t mostWaitingBytes = 1 << 19;
+    static constexpr std::size_t maximumWaiting = 32;
+    static constexpr std::uint64_t maximumWaitingBytes = 1 << 19;
 
     static std::string_view TextOf(Buffer const& data) noexcept {
         const auto chunk = *data.LockForRead().begin();
@@ -179,7 +179,7 @@ private:
 
     void FindOrReadBlob(std::string_view name, Id const& id) {
         // One that is named again is asked for when it has been stored.
-        if (waiting_.size() == mostWaiting || waitingBytes_ > mostWaitingBytes || IsWaiting(id))
+        if (waiting_.size() == maximumWaiting || waitingBytes_ > maximumWaitingBytes || IsWaiting(id))
             EnterWaiting();
         if (cow_ptr<Blob> stored = repo_.GetBlobFromStorage(id))
             return Wait({name, id, std::move(stored), false});

@@ -44,8 +44,8 @@ struct CachingArchiveTest : testing::Test {
     std::shared_ptr<FarArchive> far = std::make_shared<FarArchive>();
 
     std::shared_ptr<IArchive> OpenNear() { return std::make_shared<SqliteArchive>(directory.Path("near")); }
-    CachingArchive OpenCache(std::uint64_t mostBytes = 1U << 30U) {
-        return {OpenNear(), far, {mostBytes, std::chrono::milliseconds(0)}};
+    CachingArchive OpenCache(std::uint64_t maximumBytes = 1U << 30U) {
+        return {OpenNear(), far, {maximumBytes, std::chrono::milliseconds(0)}};
     }
     std::vector<Id> StoreFar(std::uint32_t seed, int count) {
         Change change;
