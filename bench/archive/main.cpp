@@ -3,7 +3,8 @@
 //   versions ARCHIVE              publishes versions given on standard input: "F PATH SIZE\nBYTES\n", then "C\n" for each
 //   restore ARCHIVE DIRECTORY     writes the newest version to a new directory
 //   log ARCHIVE COUNT             prints the newest commits
-//   diff ARCHIVE COUNT            prints what differs between the newest version and the one so many before it
+//   diff ARCHIVE COMMIT COMMIT    prints what differs between two versions
+//   start ARCHIVE                 does nothing
 //   commits ARCHIVE COUNT         makes commits of one empty tree
 //   directory ARCHIVE COUNT EDITS edits one entry of a directory again and again, and prints times and growth
 //   edits ARCHIVE COUNT           publishes one change again and again, and prints the times
@@ -46,31 +47,6 @@ Id IdOfDigits(std::string_view digits) {
     return Id(KivStringT<char16_t>(KivStringT<char>(digits.data(), static_cast<int>(digits.size()))));
 }
 
-struct TreeEntry {
-    bool isTree = false;
-    std::string name;
-    Id id;
-};
-
-std::vector<TreeEntry> EntriesOf(std::string const& data) {
-    std::vector<TreeEntry> entries;
-    for (std::size_t at = 0; at < data.size();) {
-        bool const isTree = data[at] == '4';
-        std::size_t const name = at + (isTree ? 11 : 12);
-        std::size_t const end = data.find('\0', name);
-        entries.push_back(
-            {isTree, data.substr(name, end - name), IdOfDigits(std::string_view(data).substr(end + 1, 64))});
-        at = end + 65;
-    }
-    return entries;
-}
-
-std::unordered_map<Id, std::string> ReadAll(IArchive& archive, std::vector<Id> const& ids) {
-    std::unordered_map<Id, std::string> found;
-    archive.Read(ids, [&](ArchivedObject const& object) { found[object.id] = TextOf(object.data); });
-    return found;
-}
-
 void Versions(IArchive& archive) {
     Publisher publisher(archive, workers);
     std::string word;
@@ -91,34 +67,22 @@ void Versions(IArchive& archive) {
 
 void Restore(IArchive& archive, std::string const& target) {
     namespace fs = std::filesystem;
-    auto const head = HeadOf(archive);
-    std::vector<std::pair<std::string, Id>> level{
-        {target, archive.ReadAncestry({&head, 1}, Follow::Parents, 0)[0].tree}};
+    Id const head = HeadOf(archive);
+    Id const tree = archive.ReadAncestry({&head, 1}, Follow::Parents, 0).at(0).tree;
     std::unordered_map<Id, std::vector<std::string>> paths;
     std::vector<Id> blobs;
-    while (!level.empty()) {
-        std::vector<Id> ids;
-        for (auto const& [path, id] : level)
-            ids.push_back(id);
-        auto const trees = ReadAll(archive, ids);
-        std::vector<std::pair<std::string, Id>> next;
-        for (auto const& [path, id] : level) {
-            fs::create_directories(path);
-            for (TreeEntry const& entry : EntriesOf(trees.at(id))) {
-                if (entry.isTree) {
-                    next.emplace_back(path + "/" + entry.name, entry.id);
-                    continue;
-                }
-                auto& names = paths[entry.id];
-                if (names.empty())
-                    blobs.push_back(entry.id);
-                names.push_back(path + "/" + entry.name);
-            }
+    std::string made;
+    for (EntryRecord const& file : ListFiles(archive, tree, std::numeric_limits<std::size_t>::max(), nullptr).files) {
+        std::string path = target + "/" + KivVcs::ToUtf8(file.path);
+        if (std::string directory = SplitPath(path).first; directory != made) {
+            fs::create_directories(directory);
+            made = std::move(directory);
         }
-        level = std::move(next);
+        auto& names = paths[file.id];
+        if (names.empty())
+            blobs.push_back(file.id);
+        names.push_back(std::move(path));
     }
-    std::sort(blobs.begin(), blobs.end(),
-              [&](Id const& left, Id const& right) { return paths.at(left).front() < paths.at(right).front(); });
     auto const write = [&](std::span<const Id> ids) {
         archive.Read(ids, [&](ArchivedObject const& object) {
             for (std::string const& path : paths.at(object.id)) {
@@ -160,13 +124,13 @@ void Log(IArchive& archive, std::uint64_t count) {
     std::fwrite(out.data(), 1, out.size(), stdout);
 }
 
-void Diff(IArchive& archive, std::size_t back) {
-    Id const head = HeadOf(archive);
-    auto const history = archive.ReadAncestry({&head, 1}, Follow::Parents, back);
+void Diff(IArchive& archive, std::string_view before, std::string_view after) {
+    std::vector<Id> const commits{IdOfDigits(before), IdOfDigits(after)};
+    auto const facts = archive.ReadAncestry(commits, Follow::Parents, 0);
     static constexpr std::string_view letters = "UADMTTR";
     std::string out;
     for (auto const& difference :
-         ListDifferences(archive, history.back().tree, history.front().tree, {}, nullptr).differences) {
+         ListDifferences(archive, facts.at(0).tree, facts.at(1).tree, {}, nullptr).differences) {
         out += letters[static_cast<std::size_t>(difference.kind)];
         out.append("\t").append(KivVcs::ToUtf8(difference.path)).append("\n");
     }
@@ -360,10 +324,12 @@ void TellPeak() {
 int Run(std::vector<std::string> const& arguments) {
     if (arguments.size() < 2)
         throw std::invalid_argument("kivvcs_archive_bench COMMAND ARCHIVE [ARGUMENT...]");
+    std::string const& command = arguments[0];
+    if (command == "start")
+        return 0;
     SqliteOptions options;
     options.workers = workers;
     SqliteArchive archive(arguments[1], options);
-    std::string const& command = arguments[0];
     auto const argument = [&](std::size_t i) { return arguments.at(i + 2); };
     auto const number = [&](std::size_t i) { return std::stoi(argument(i)); };
     if (command == "import") {
@@ -377,7 +343,7 @@ int Run(std::vector<std::string> const& arguments) {
     } else if (command == "log") {
         Log(archive, static_cast<std::uint64_t>(number(0)));
     } else if (command == "diff") {
-        Diff(archive, static_cast<std::size_t>(number(0)));
+        Diff(archive, argument(0), argument(1));
     } else if (command == "commits") {
         Commits(archive, number(0));
     } else if (command == "directory") {
