@@ -50,13 +50,19 @@ public:
                 Settle(level, level.entries[level.next]);
                 continue;
             }
-            const auto id = Finish(level);
+            KeepChangedModes(level);
+            const bool isGone = levels_.size() > 1 && IsGone(level);
+            const auto id = isGone ? Id() : Finish(level);
             levels_.pop_back();
             if (levels_.empty()) {
                 result_.tree = id;
                 break;
             }
-            levels_.back().entries[levels_.back().next++].id = id;
+            auto& above = levels_.back();
+            if (isGone)
+                above.entries.erase(above.entries.begin() + static_cast<std::ptrdiff_t>(above.next));
+            else
+                above.entries[above.next++].id = id;
         }
         AddContents();
         return std::move(result_);
@@ -170,9 +176,39 @@ private:
             chosen.mode = left.mode;
             chosen.isLink = left.isLink;
         } else if (!left.IsLike(right) && isAsked) {
-            result_.conflicts.push_back(path);
+            result_.conflicts.push_back({path});
         }
         return chosen;
+    }
+
+    /// A file that one side removed while the other one changed nothing but its mode goes without a question from a merge of
+    /// contents; it is for somebody to decide, too.
+    void KeepChangedModes(Level& level) {
+        if (level.bases.empty())
+            return;
+        for (auto const& before : level.bases.front().entries) {
+            auto const* const left = level.left.Find(before.name);
+            auto const* const right = level.right.Find(before.name);
+            auto const* const only = left != nullptr ? left : right;
+            const bool isChanged = (left == nullptr) != (right == nullptr) && !before.isDirectory &&
+                                   !only->isDirectory && only->id == before.id && only->attributes &&
+                                   before.attributes && !only->attributes->IsLike(*before.attributes);
+            const auto at = std::lower_bound(
+                level.entries.begin(), level.entries.end(), before.name,
+                [](Entry const& entry, std::string const& name) { return ComesBefore(entry.name, name); });
+            if (!isChanged || (at != level.entries.end() && at->name == before.name))
+                continue;
+            result_.conflicts.push_back({level.path + before.name, left == nullptr, right == nullptr});
+            if (versions_.prefersRight == (left == nullptr))
+                level.entries.insert(at, *only);
+        }
+    }
+
+    /// Whether nothing but attributes is left of a directory that one side removed.
+    static bool IsGone(Level const& level) {
+        auto const& origins = level.origins;
+        return level.entries.empty() && (origins.left.IsEmpty() || origins.right.IsEmpty()) &&
+               std::any_of(origins.bases.begin(), origins.bases.end(), [](Id const& base) { return !base.IsEmpty(); });
     }
 
     Id Finish(Level& level) {

@@ -18,13 +18,19 @@ struct MergedVersions {
     std::unordered_map<std::string, std::string> renamed;
 };
 
+/// A path whose mode one side changed, while the other one changed it differently, or removed the path.
+struct ModeConflict {
+    std::string path;
+    bool leftRemoved = false;
+    bool rightRemoved = false;
+};
+
 /// A merged tree that is ready to be stored.
 struct MergedTree {
     Id tree;
     /// The objects that are new, and what they rely on.
     KivArchive::Change change;
-    /// Paths whose mode both sides changed differently.
-    std::vector<std::string> conflicts;
+    std::vector<ModeConflict> conflicts;
 };
 
 /// Gives every entry of @p merged the attributes of the side that it came from; what only one side changed since they

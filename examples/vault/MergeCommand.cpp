@@ -70,6 +70,10 @@ std::string WordFor(ChangeKind kind) {
     return "changed it";
 }
 
+std::string WordForMode(bool isRemoved) {
+    return isRemoved ? "removed it" : "changed its mode";
+}
+
 std::string_view WordFor(ConflictSettlement settlement) noexcept {
     switch (settlement) {
     case ConflictSettlement::Left:
@@ -148,9 +152,9 @@ public:
             else
                 std::cout << Coloured("merged ", Colour::Green) << path << ": both changed it, in different lines\n";
         }
-        for (auto const& path : modes_)
-            std::cout << Coloured("conflict ", Colour::Red) << PrintableName(path)
-                      << ": left changed its mode, right changed its mode; "
+        for (auto const& conflict : modes_)
+            std::cout << Coloured("conflict ", Colour::Red) << PrintableName(conflict.path) << ": left "
+                      << WordForMode(conflict.leftRemoved) << ", right " << WordForMode(conflict.rightRemoved) << "; "
                       << (isStopped_               ? "undecided"
                           : versions_.prefersRight ? "took right"
                                                    : "took left")
@@ -164,10 +168,11 @@ public:
                 "{\"path\":" + JsonText(ToUtf8(conflict.path)) + ",\"left\":\"" + WordFor(conflict.leftChange) +
                 "\",\"right\":\"" + WordFor(conflict.rightChange) + "\",\"taken\":\"" +
                 std::string(WordFor(conflict.settlement)) + "\"}";
-        for (auto const& path : modes_)
-            (json += json.size() == 1 ? "\n" : ",\n") +=
-                "{\"path\":" + JsonText(path) + R"(,"left":"changed its mode","right":"changed its mode","taken":")" +
-                (versions_.prefersRight ? "right" : "left") + "\"}";
+        for (auto const& conflict : modes_)
+            (json += json.size() == 1 ? "\n" : ",\n") += "{\"path\":" + JsonText(conflict.path) + ",\"left\":\"" +
+                                                         WordForMode(conflict.leftRemoved) + "\",\"right\":\"" +
+                                                         WordForMode(conflict.rightRemoved) + "\",\"taken\":\"" +
+                                                         (versions_.prefersRight ? "right" : "left") + "\"}";
         return json + "\n]";
     }
 
@@ -226,9 +231,9 @@ private:
     }
 
     ConflictChoice Decide(PathView path, MergeTrees const& trees) {
-        // Attributes are brought together afterwards, entry by entry.
+        // Attributes are brought together afterwards, entry by entry, of directories that are still there.
         if (!path.empty() && IsOwn(ToUtf8(path.back())))
-            return ConflictChoice::Left;
+            return trees.left && trees.left->GetDeepObject(path) ? ConflictChoice::Left : ConflictChoice::Right;
         if (!path.empty() && ToUtf8(path.back()) == stampName)
             return newest_(path, trees);
         switch (options_.policy) {
@@ -296,7 +301,7 @@ private:
     KivVcs::BlobConflictResolver newest_;
     MergedVersions versions_;
     std::vector<MergeConflict> conflicts_;
-    std::vector<std::string> modes_;
+    std::vector<ModeConflict> modes_;
     /// Files that have conflicts marked in them.
     std::vector<std::string> marked_;
     bool isStopped_ = false;
