@@ -5,6 +5,7 @@
 # floor in turn, and prints one table with the medians over nine rounds; build/bench/result.json holds the numbers. --quick
 # runs a quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws build/bench/performance.svg.
 # With `archive` or `vault` as FILTER it runs that beside git instead, and prints one table with the limits that it keeps to.
+# With `postgres` as FILTER it runs archives in a database beside bare transactions and archives in files.
 # --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
 # says by over 5 %; --update writes that file. docs/performance.md says what is measured.
 
@@ -58,6 +59,12 @@ if [[ ${1:-} == vault ]]; then
     install_packages build archive vault demo
     build_preset release
     exec /usr/bin/python3 "$source_directory/bench/vault.py" "$build_directory/examples/vault/vault" ${mode:+"$mode"}
+fi
+if [[ ${1:-} == postgres ]]; then
+    [[ $# -eq 1 && ${mode:---quick} == --quick ]] || usage 1
+    install_packages build archive postgres bench
+    build_preset bench
+    exec /usr/bin/python3 "$source_directory/bench/postgres/compare.py" "$build_directory/bench" ${mode:+"$mode"}
 fi
 if [ $# -gt 1 ] || [[ $mode == --check && ${1:---update} != --update ]]; then
     usage 1

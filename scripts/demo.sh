@@ -1,12 +1,14 @@
 #!/bin/bash
 # usage: scripts/demo.sh [PICTURE]
+#        scripts/demo.sh --team
 # Installs what is missing, builds the example host `vault`, and shows what it does with this project: versions its
 # history (or, where there is none, its tree), lists and compares versions and verifies them; then lets two people work
 # apart and bring their work together three times, and a damaged vault be repaired. Draws the history that comes out of it
 # to PICTURE, an SVG file, by default beside the vaults.
+# With --team three processes publish at once on one branch of a database, and end with one head.
 
 . "$(dirname "$0")/lib.sh"
-[[ $# -le 1 && ${1:-} != -* ]] || usage 1
+[[ $# -le 1 && (${1:-} != -* || $1 == --team) ]] || usage 1
 versions_shown=36
 content_size=0
 
@@ -156,6 +158,39 @@ draw() {
     printf 'The history that is left is drawn in %s\n' "$1"
 }
 
+# Three members of a team, who publish at once.
+show_team() {
+    local server heads member
+    build_directory=$build_root/release
+    quietly cmake -S "$source_directory" --preset release -B "$build_directory" || die "configuring failed"
+    quietly cmake --build "$build_directory" --parallel "$jobs" --target team || die "building failed"
+    workshop=$(mktemp -d)
+    chmod 711 "$workshop"
+    server=$workshop/server
+    # shellcheck disable=SC2064
+    trap "'$source_directory/scripts/postgres.sh' stop '$server'; rm -rf '$workshop'" EXIT
+    address=$("$source_directory/scripts/postgres.sh" start "$server")
+    step "Ann, Ben and Cleo publish five notes each on one branch of one database"
+    for member in Ann Ben Cleo; do
+        "$build_directory/examples/team" "$address" "$member" 5 3 >"$workshop/$member" &
+    done
+    wait
+    for member in Ann Ben Cleo; do
+        printf '%s:\n' "$member"
+        cat "$workshop/$member"
+    done
+    heads=$(grep -h '^head' "$workshop"/{Ann,Ben,Cleo})
+    [ "$(wc -l <<<"$heads")" -eq 3 ] || die "not everybody has a head"
+    [ "$(sort -u <<<"$heads" | wc -l)" -eq 1 ] || die "the heads differ"
+    grep -q ', 18 files$' <<<"$heads" || die "something is lost"
+    step "Three equal heads, and everybody's notes"
+}
+
+if [[ ${1:-} == --team ]]; then
+    install_packages build archive postgres
+    show_team
+    exit
+fi
 install_packages build vault demo
 build_vault
 workshop=$(mktemp -d)

@@ -8,7 +8,8 @@ namespace {
 
 // "@" stands for the schema. Types of rows that are kept as bases only are 8 higher than those of objects, 3 is a piece of a
 // content. A check that does not hold divides by zero, which ends the transaction on the server: so all of it goes in one
-// round trip, whether it comes to its end or not.
+// round trip, whether it comes to its end or not. What is looked up row by row is fenced by OFFSET 0: joined, small tables would
+// be read whole for each step.
 constexpr std::string_view TemplateOf(Statement statement) {
     switch (statement) {
     case Statement::Begin:
@@ -56,10 +57,11 @@ constexpr std::string_view TemplateOf(Statement statement) {
         return "SELECT id, CAST(type AS bigint) FROM @.objects WHERE id = ANY($1::bytea[])";
     case Statement::ReadRows:
         // Rows, and all that they are differences to; without their forms if these are too much for one answer.
-        return "WITH RECURSIVE wanted(id) AS (SELECT unnest($1::bytea[]) UNION "
-               "SELECT o.base FROM wanted w JOIN @.objects o ON o.id = w.id WHERE o.base <> '\\x'), "
+        return "WITH RECURSIVE wanted(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.base FROM wanted w "
+               "CROSS JOIN LATERAL (SELECT base FROM @.objects WHERE id = w.id AND base <> '\\x' OFFSET 0) l), "
                "found AS (SELECT o.id, o.type, o.size, o.base, o.form, "
-               "sum(octet_length(o.form)) OVER () AS total FROM wanted w JOIN @.objects o ON o.id = w.id) "
+               "sum(octet_length(o.form)) OVER () AS total FROM wanted w CROSS JOIN LATERAL "
+               "(SELECT id, type, size, base, form FROM @.objects WHERE id = w.id OFFSET 0) o) "
                "SELECT id, CAST(type AS bigint), size, base, CAST(octet_length(form) AS bigint), "
                "CASE WHEN total <= $2::bigint THEN form END FROM found";
     case Statement::ListObjects:
@@ -78,27 +80,31 @@ constexpr std::string_view TemplateOf(Statement statement) {
                "WHERE m.time <= CAST(extract(epoch FROM now()) AS bigint) - $1::bigint AND m.id > $2::bytea "
                "AND o.type <> 3 AND o.type < 8 ORDER BY m.id LIMIT $3::bigint";
     case Statement::WalkParents:
-        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION "
-               "SELECT a.parent FROM walk w JOIN @.ancestry a ON a.id = w.id WHERE a.parent <> '\\x'), "
+        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
+               "LATERAL "
+               "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' OFFSET 0) l), "
                "near AS (SELECT id FROM walk LIMIT $2::bigint) "
                "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-               "LEFT JOIN @.ancestry a ON a.id = n.id LEFT JOIN @.contained c ON c.id = n.id";
+               "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+               "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true";
     case Statement::WalkReachable:
-        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION "
-               "SELECT l.link FROM walk w JOIN (SELECT id, parent AS link FROM @.ancestry WHERE parent <> '\\x' UNION "
-               "ALL "
-               "SELECT id, other FROM @.contained WHERE how = 0) l ON l.id = w.id), "
+        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
+               "LATERAL "
+               "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
+               "SELECT other FROM @.contained WHERE id = w.id AND how = 0 OFFSET 0) l), "
                "near AS (SELECT id FROM walk LIMIT $2::bigint) "
                "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-               "LEFT JOIN @.ancestry a ON a.id = n.id LEFT JOIN @.contained c ON c.id = n.id";
+               "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+               "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true";
     case Statement::WalkEverything:
-        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION "
-               "SELECT l.link FROM walk w JOIN (SELECT id, parent AS link FROM @.ancestry WHERE parent <> '\\x' UNION "
-               "ALL "
-               "SELECT id, other FROM @.contained) l ON l.id = w.id), "
+        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
+               "LATERAL "
+               "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
+               "SELECT other FROM @.contained WHERE id = w.id OFFSET 0) l), "
                "near AS (SELECT id FROM walk LIMIT $2::bigint) "
                "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-               "LEFT JOIN @.ancestry a ON a.id = n.id LEFT JOIN @.contained c ON c.id = n.id";
+               "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+               "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true";
     case Statement::ListAncestry:
         return "SELECT a.id, a.parent, a.tree, CAST(c.how AS bigint), c.other "
                "FROM (SELECT id, parent, tree FROM @.ancestry WHERE id > $1::bytea ORDER BY id LIMIT $2::bigint) a "

@@ -10,6 +10,7 @@
 //   edits ARCHIVE COUNT           publishes one change again and again, and prints the times
 //   store ARCHIVE FILE, fetch ARCHIVE FILE    streams one content in, and out
 
+#include "OpenArchive.h"
 #include "Publishing.h"
 
 #include <KivVcs/SHADigest256.h>
@@ -327,9 +328,8 @@ int Run(std::vector<std::string> const& arguments) {
     std::string const& command = arguments[0];
     if (command == "start")
         return 0;
-    SqliteOptions options;
-    options.workers = workers;
-    SqliteArchive archive(arguments[1], options);
+    auto const opened = OpenArchive(arguments[1], workers);
+    IArchive& archive = *opened;
     auto const argument = [&](std::size_t i) { return arguments.at(i + 2); };
     auto const number = [&](std::size_t i) { return std::stoi(argument(i)); };
     if (command == "import") {
