@@ -25,7 +25,7 @@ public:
     using Fetch = Delegate<cow_ptr<Fetched>(Id const&)>;
 
     DeferredLink() noexcept = default;
-    DeferredLink(Id const& id, Fetch fetch) noexcept : id_(id), fetch_(std::move(fetch)) {}
+    DeferredLink(Id id, Fetch fetch) noexcept : id_(std::move(id)), fetch_(std::move(fetch)) {}
     DeferredLink(DeferredLink const& other) : id_(other.id_), fetch_(other.fetch_) {
         if (cow_ptr<Holder> const* const held = other.GetHeld()) {
             held_ = *held;
