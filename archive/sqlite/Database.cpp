@@ -160,10 +160,12 @@ ByteView Query::Blob(int column) const {
     return {static_cast<const std::byte*>(data), data == nullptr ? 0 : size};
 }
 
+Id Query::OptionalIdentifier(int column) const {
+    return Blob(column).empty() ? Id() : Identifier(column);
+}
+
 Id Query::Identifier(int column) const {
     ByteView const bytes = Blob(column);
-    if (bytes.empty())
-        return {};
     Id::Digest digest{};
     if (bytes.size() != digest.size())
         database_.Fail(SQLITE_CORRUPT);

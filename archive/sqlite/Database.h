@@ -81,7 +81,10 @@ public:
     [[nodiscard]] std::int64_t Number(int column) const { return sqlite3_column_int64(statement_, column); }
     /// Valid until the next row.
     [[nodiscard]] ByteView Blob(int column) const;
+    /// @throws ArchiveError of kind `Damaged` if it is none, as if it were null
     [[nodiscard]] Id Identifier(int column) const;
+    /// Null for no bytes.
+    [[nodiscard]] Id OptionalIdentifier(int column) const;
 
 private:
     Database& database_;

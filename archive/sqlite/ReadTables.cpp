@@ -21,7 +21,7 @@ public:
         Query query(database_, "SELECT parent, tree FROM ancestry WHERE id=?");
         if (!query.With(DigestOf(id)).Next())
             return std::nullopt;
-        return FactsOf(id, query.Identifier(0), query.Identifier(1));
+        return FactsOf(id, query.OptionalIdentifier(0), query.OptionalIdentifier(1));
     }
 
     [[nodiscard]] Ancestry FactsOf(Id const& id, Id parent, Id tree) {
@@ -114,7 +114,7 @@ std::vector<Ancestry> SqliteArchive::ListAncestry(Id const& after, std::size_t l
     Query query(connection->database, "SELECT id, parent, tree FROM ancestry WHERE id>? ORDER BY id LIMIT ?");
     query.With(after).With(LimitOf(limit));
     while (query.Next())
-        listed.push_back(reader.FactsOf(query.Identifier(0), query.Identifier(1), query.Identifier(2)));
+        listed.push_back(reader.FactsOf(query.Identifier(0), query.OptionalIdentifier(1), query.OptionalIdentifier(2)));
     return listed;
 }
 

@@ -176,6 +176,8 @@ const char* const rowDamages[] = {
     "UPDATE segments SET form=substr(form, 1, 30)||zeroblob(99999999) WHERE number%2=0",
     "UPDATE segments SET form=x'0000000000000000018080808080808080808001' WHERE number%3=1",
     "UPDATE branches SET head=zeroblob(31)",
+    "UPDATE branches SET head=zeroblob(0)",
+    "UPDATE ancestry SET id=zeroblob(0) WHERE id=(SELECT max(id) FROM ancestry)",
     "UPDATE ancestry SET parent=id, tree=zeroblob(1000000)",
     "UPDATE OR REPLACE dependencies SET base=segment",
     "INSERT OR IGNORE INTO sparse SELECT number FROM segments; UPDATE segments SET number=number+(1<<62)",
