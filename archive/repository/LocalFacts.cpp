@@ -3,6 +3,7 @@
 #include "Changes.h"
 
 #include <algorithm>
+#include <utility>
 
 namespace KivArchive {
 
@@ -11,7 +12,8 @@ LocalFacts::Entry& LocalFacts::EntryOf(KivVcs::Commit const& commit) {
     auto const found = entries_.find(id);
     return found != entries_.end()
                ? found->second
-               : entries_.emplace(id, Entry{{id, commit.GetParentId(), commit.GetRootId(), {}}, {}}).first->second;
+               : entries_.emplace(id, Entry{{id, commit.GetParentId(), commit.GetRootId(), {}}, {}, false})
+                     .first->second;
 }
 
 void LocalFacts::Add(KivVcs::Commit const& commit, ContainedCommit const& contained, CommitHandle merged) {
@@ -22,13 +24,17 @@ void LocalFacts::Add(KivVcs::Commit const& commit, ContainedCommit const& contai
 }
 
 void LocalFacts::AddLine(CommitHandle commit, IsUnpublished const& isUnpublished) {
-    bool isKnown = false;
-    for (; commit && !isKnown; commit = commit->GetHeldParent()) {
-        Id const id = commit->GetId();
-        if (!isUnpublished(id))
-            return;
-        isKnown = entries_.contains(id);
-        static_cast<void>(EntryOf(*commit));
+    std::vector<CommitHandle> open{std::move(commit)};
+    while (!open.empty()) {
+        CommitHandle const next = std::move(open.back());
+        open.pop_back();
+        if (!next || !isUnpublished(next->GetId()))
+            continue;
+        Entry& entry = EntryOf(*next);
+        if (std::exchange(entry.hasLine, true))
+            continue;
+        open.insert(open.end(), entry.merged.begin(), entry.merged.end());
+        open.push_back(next->GetHeldParent());
     }
 }
 

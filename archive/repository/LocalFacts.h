@@ -21,7 +21,7 @@ public:
 
     /// @param merged what must not be purged before @p commit is published; may be null
     void Add(KivVcs::Commit const& commit, ContainedCommit const& contained, CommitHandle merged);
-    /// Adds the facts of @p commit and of its ancestors, as far as they are unpublished.
+    /// Adds the facts of @p commit, of its ancestors and of what these have merged, as far as they are unpublished.
     void AddLine(CommitHandle commit, IsUnpublished const& isUnpublished);
 
     /// Null if nothing but its parent and its tree is to be said of the commit.
@@ -37,6 +37,8 @@ private:
     struct Entry {
         Ancestry facts;
         std::vector<CommitHandle> merged;
+        /// Whether what is unpublished below it has been added, too: it may have become known for what it merged.
+        bool hasLine = false;
     };
 
     Entry& EntryOf(KivVcs::Commit const& commit);
