@@ -173,7 +173,7 @@ const char* const rowDamages[] = {
     "UPDATE objects SET type=4 WHERE type=0",
     "UPDATE objects SET type=77, segment=-1",
     "UPDATE segments SET form=(SELECT form FROM segments AS other WHERE other.number=segments.number+1) WHERE number<9",
-    "UPDATE segments SET form=zeroblob(9999999) WHERE number%2=0",
+    "UPDATE segments SET form=zeroblob(200000) WHERE number%2=0",
     "UPDATE segments SET form=x'0000000000000000018080808080808080808001' WHERE number%3=1",
     "UPDATE branches SET head=zeroblob(31)",
     "UPDATE branches SET head=zeroblob(0)",
