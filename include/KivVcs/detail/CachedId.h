@@ -4,9 +4,9 @@
 #include "KivVcs/detail/PublishedWord.h"
 
 #include <array>
-#include <bit>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 
 namespace KivVcs::detail {
 
@@ -31,13 +31,17 @@ public:
     [[nodiscard]] bool IsHosts() const noexcept { return state_.Get() == State::Hosts; }
 
     /// The identifier, and its digest. @pre there is one
-    [[nodiscard]] Id Get() const noexcept { return {digest_, std::bit_cast<std::size_t>(hash_)}; }
+    [[nodiscard]] Id Get() const noexcept {
+        std::size_t hash = 0;
+        std::memcpy(&hash, hash_.data(), sizeof hash);
+        return {digest_, hash};
+    }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
     /// Keeps an identifier from now on, whatever changes.
     void Tell(Id const& id) noexcept {
         digest_ = *id.GetDigest();
-        hash_ = std::bit_cast<Hash>(id.Hash());
+        KeepHash(id.Hash());
         state_.Set(State::Told);
     }
 
@@ -54,7 +58,7 @@ public:
             !state_.Replace(known, State::Writing))
             return;
         digest_ = *id.GetDigest();
-        hash_ = std::bit_cast<Hash>(id.Hash());
+        KeepHash(id.Hash());
         state_.Publish(isHosts ? State::Hosts : State::Own);
     }
 
@@ -75,6 +79,8 @@ public:
 private:
     enum class State : std::uint32_t { Empty, Writing, Copied, Hosts, Own, Told };
     using Hash = std::array<std::byte, sizeof(std::size_t)>;
+
+    void KeepHash(std::size_t hash) const noexcept { std::memcpy(hash_.data(), &hash, sizeof hash); }
 
     // Nothing here is aligned to more than four bytes, so that an object has all of it right behind its use count.
     PublishedWord<State> state_;
