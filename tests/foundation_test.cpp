@@ -341,7 +341,7 @@ TEST(Buffer, AdoptsWhatIsOwnedAndNothingElse) {
     EXPECT_EQ(ContentOf(copy), std::string(1000, 'v'));
     EXPECT_EQ(ContentOf(adopted), std::string(1000, 'v') + "more");
 
-    for (const std::size_t size : {511, 70'000}) {
+    for (const std::size_t size : {std::size_t{511}, std::size_t{70'000}}) {
         const std::string text(size, 't');
         int given = 0;
         const auto giveBack = [&given](const void* memory) noexcept { given += memory == nullptr ? 100 : 1; };

@@ -52,7 +52,7 @@ void CopyBuffers(World& w) {
 }
 
 void AdoptText(World& w) {
-    for (const std::size_t size : {100, 10'000}) {
+    for (const std::size_t size : {std::size_t{100}, std::size_t{10'000}}) {
         std::string text(size, 'a');
         try {
             w.done = Blob::AdoptText(std::move(text)).GetData().GetSize() == size;
