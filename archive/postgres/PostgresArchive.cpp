@@ -9,10 +9,6 @@ PostgresArchive::PostgresArchive(std::string const& address, PostgresOptions con
 
 PostgresArchive::~PostgresArchive() = default;
 
-bool PostgresArchive::IsAddress(std::string_view address) noexcept {
-    return address.starts_with("postgresql://") || address.starts_with("postgres://");
-}
-
 std::uint64_t PostgresArchive::GetRoundTrips() const noexcept {
     return store_->RoundTrips();
 }

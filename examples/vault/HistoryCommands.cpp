@@ -1,4 +1,5 @@
 #include "Commands.h"
+#include "Database.h"
 #include "Names.h"
 #include "Output.h"
 #include "Problem.h"
@@ -34,11 +35,13 @@ KivArchive::CollectReport CollectUnreached(IArchive& archive, std::chrono::secon
     return report;
 }
 
-std::uint64_t SizeOf(std::string const& file) {
+std::uint64_t SizeOf(VaultPlace const& place) {
+    if (IsDatabase(place.file))
+        return Vault(place).Stored().GetStatistics().bytes;
     std::uint64_t size = 0;
     for (auto const* const suffix : {"", "-wal"}) {
         struct stat status {};
-        if (stat((file + suffix).c_str(), &status) == 0)
+        if (stat((place.file + suffix).c_str(), &status) == 0)
             size += static_cast<std::uint64_t>(status.st_size);
     }
     return size;
@@ -211,12 +214,9 @@ int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions 
 }
 
 int Compact(VaultPlace const& place, RemovalOptions const& options) {
-    std::string file;
-    std::uint64_t size = 0;
+    const auto size = SizeOf(place);
     {
         Vault vault(place);
-        file = vault.File();
-        size = SizeOf(file);
         ArchivedRepository repository(vault.SharedArchive());
         const auto before = CountCommits(repository);
         repository.SimplifyCommitGraph(true);
@@ -231,8 +231,8 @@ int Compact(VaultPlace const& place, RemovalOptions const& options) {
         Publish(repository);
         CollectUnreached(vault.Archive(), std::chrono::seconds(0));
     }
-    // The database gives back what it can when it is closed.
-    const auto left = SizeOf(file);
+    // A file gives back what it can when it is closed.
+    const auto left = SizeOf(place);
     std::cout << size - std::min(size, left) << " bytes reclaimed, " << left << " left\n";
     return 0;
 }
@@ -256,6 +256,8 @@ int Collect(VaultPlace const& place, unsigned days, RemovalOptions const& option
 int Sync(VaultPlace const& place, std::string const& other, bool yes) {
     struct stat one {};
     struct stat two {};
+    if (IsDatabase(place.file) && place.file == other)
+        throw Problem("a vault cannot be synced with itself");
     if (stat(place.file.c_str(), &one) == 0 && stat(other.c_str(), &two) == 0 && one.st_dev == two.st_dev &&
         one.st_ino == two.st_ino)
         throw Problem("a vault cannot be synced with itself");
@@ -299,7 +301,7 @@ int Verify(VaultPlace const& place, bool json) {
     KivArchive::VerifyReport report;
     {
         Progress progress("verifying");
-        report = KivArchive::Verify(vault.Archive(), &progress);
+        report = KivArchive::Verify(vault.Stored(), &progress);
     }
     if (json)
         std::cout << "{\"objects\":" << report.objects << ",\"sound\":" << (report.IsSound() ? "true" : "false")
@@ -325,8 +327,8 @@ int Verify(VaultPlace const& place, bool json) {
     else if (report.IsSound())
         std::cout << "verified " << report.objects << " objects\n";
     else
-        throw Problem(PrintableName(StoredName(place.file)) + " is damaged: " + std::to_string(count) +
-                          " findings (repair takes them from another vault)",
+        throw Problem((IsDatabase(place.file) ? "the database" : PrintableName(StoredName(place.file))) +
+                          " is damaged: " + std::to_string(count) + " findings (repair takes them from another vault)",
                       findingsExitStatus);
     return report.IsSound() ? 0 : findingsExitStatus;
 }
@@ -337,7 +339,7 @@ int Repair(VaultPlace const& place, std::string const& other) {
     KivArchive::RepairReport report;
     {
         Progress progress("repairing");
-        report = KivArchive::Repair(vault.Archive(), theirs.Archive(), &progress);
+        report = KivArchive::Repair(vault.Stored(), theirs.Stored(), &progress);
     }
     for (auto const& id : report.lost)
         Warn("not to be had there: object " + DigitsOf(id));

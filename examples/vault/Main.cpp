@@ -44,7 +44,7 @@ be saved or restored; 2 the command could not be carried out; 3 a listing was cu
 /// The command line, as the library that reads it sees it: each command stores its arguments here, and what is to be run
 /// when all are read.
 struct CommandLine {
-    CLI::App app{"Keeps versions of directories in one file.", "vault"};
+    CLI::App app{"Keeps versions of directories in one file, or in a database.", "vault"};
     VaultPlace place;
     unsigned waitSeconds = 30;
     SaveOptions save;
@@ -178,7 +178,7 @@ void DescribeBranches(CommandLine& line) {
 
     auto* const sync = line.Add("sync", "bring in the branches of another vault as other/NAME",
                                 [&line] { return Sync(line.place, line.first, line.removal.yes); });
-    sync->add_option("OTHER", line.first, "the other vault file")->required();
+    sync->add_option("OTHER", line.first, "the other vault")->required();
     sync->add_flag("--yes", line.removal.yes, "also bring back what was forgotten, without asking");
 
     auto* const rebase = line.Add("rebase", "put a branch's own versions, as they are, on top of another branch",
@@ -199,7 +199,7 @@ void DescribeUpkeep(CommandLine& line) {
     verify->add_flag("--json", line.listing.json, "write JSON");
     auto* const repair = line.Add("repair", "take what is damaged or missing from another vault",
                                   [&line] { return Repair(line.place, line.first); });
-    repair->add_option("OTHER", line.first, "the other vault file")->required();
+    repair->add_option("OTHER", line.first, "the other vault")->required();
 
     auto* const forget = line.Add("forget", "delete the history before a version, but for the heads of branches",
                                   [&line] { return Forget(line.place, line.first, line.removal); });
@@ -266,7 +266,9 @@ int Run(CommandLine& line, int argumentCount, char** arguments) {
     app.set_version_flag("--version", std::string(VAULT_VERSION));
     app.footer(footer);
     app.get_formatter()->column_width(34);
-    app.add_option("-f,--file", line.place.file, "the vault file")->envname("VAULT_FILE")->capture_default_str();
+    app.add_option("-f,--file", line.place.file, "the vault: a file, or the address of a database (postgresql://...)")
+        ->envname("VAULT_FILE")
+        ->capture_default_str();
     app.add_option("--wait", line.waitSeconds, "how many seconds to wait while somebody else writes")
         ->capture_default_str();
     DescribeFiles(line);

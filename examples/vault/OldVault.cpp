@@ -5,6 +5,7 @@
 #include "Trees.h"
 #include "Vault.h"
 
+#include <KivArchive/SqliteArchive.h>
 #include <KivArchive/Upkeep.h>
 #include <array>
 #include <fstream>

@@ -1,10 +1,12 @@
 #include "Vault.h"
 
+#include "Database.h"
 #include "Descriptor.h"
 #include "Names.h"
 #include "OldVault.h"
 #include "Problem.h"
 
+#include <KivArchive/SqliteArchive.h>
 #include <algorithm>
 #include <sys/stat.h>
 
@@ -33,7 +35,14 @@ Id Before(std::string digits) {
 
 } // namespace
 
-Vault::Vault(VaultPlace const& place, Access access) : file_(RealPath(place.file)) {
+Vault::Vault(VaultPlace const& place, Access access)
+    : file_(IsDatabase(place.file) ? place.file : RealPath(place.file)) {
+    if (IsDatabase(file_)) {
+        auto database = OpenDatabase(file_, access == Access::Create, place.wait);
+        archive_ = std::move(database.cached);
+        stored_ = std::move(database.stored);
+        return;
+    }
     struct stat status {};
     const bool isThere = !place.file.empty() && stat(file_.c_str(), &status) == 0;
     if (!isThere && access == Access::Existing)
@@ -47,6 +56,7 @@ Vault::Vault(VaultPlace const& place, Access access) : file_(RealPath(place.file
     options.create = access == Access::Create;
     options.wait = place.wait;
     archive_ = std::make_shared<KivArchive::SqliteArchive>(file_, options);
+    stored_ = archive_;
 }
 
 Vault::~Vault() {
@@ -56,6 +66,7 @@ Vault::~Vault() {
         if (!archive_->ReadBranches().empty())
             return;
         archive_.reset();
+        stored_.reset();
         for (auto const* const suffix : {"", "-wal", "-shm"})
             unlink((file_ + suffix).c_str());
     } catch (std::exception const&) {

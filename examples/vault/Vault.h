@@ -4,7 +4,6 @@
 #include "Trees.h"
 
 #include <KivArchive/Listings.h>
-#include <KivArchive/SqliteArchive.h>
 #include <chrono>
 #include <memory>
 
@@ -15,6 +14,7 @@ using KivArchive::CommitRecord;
 
 /// Which vault to work with, and how.
 struct VaultPlace {
+    /// A file, or the address of a database.
     std::string file = "vault.db";
     /// How long to wait while somebody else writes.
     std::chrono::seconds wait{30};
@@ -28,12 +28,12 @@ struct Target {
     Entry entry;
 };
 
-/// An archive in one file, with a branch that is the current one.
+/// An archive in one file, or in a database, with a branch that is the current one.
 class Vault {
 public:
     enum class Access { Existing, Create };
 
-    /// Opens the file, bringing one of an earlier release up to date first; or makes it.
+    /// Opens the database, or the file, bringing one of an earlier release up to date first; or makes it.
     /// @throws Problem, KivArchive::ArchiveError
     explicit Vault(VaultPlace const& place, Access access = Access::Existing);
     Vault(Vault const&) = delete;
@@ -43,6 +43,8 @@ public:
 
     [[nodiscard]] std::string const& File() const noexcept { return file_; }
     [[nodiscard]] IArchive& Archive() const noexcept { return *archive_; }
+    /// The same without the cache that a database has in front of it.
+    [[nodiscard]] IArchive& Stored() const noexcept { return *stored_; }
     [[nodiscard]] std::shared_ptr<IArchive> SharedArchive() const noexcept { return archive_; }
 
     [[nodiscard]] Text CurrentBranch() const;
@@ -62,7 +64,8 @@ public:
 
 private:
     std::string file_;
-    std::shared_ptr<KivArchive::SqliteArchive> archive_;
+    std::shared_ptr<IArchive> archive_;
+    std::shared_ptr<IArchive> stored_;
     bool isMadeHere_ = false;
 };
 

@@ -54,9 +54,6 @@ public:
     /// @pre no call is running
     ~PostgresArchive() override;
 
-    /// Whether @p address is one of a database, rather than a path: begins with "postgresql://" or "postgres://".
-    [[nodiscard]] static bool IsAddress(std::string_view address) noexcept;
-
     /// One or two round trips, whatever the number of objects; more for those of more than a few MiB altogether.
     ReadOutcome Read(std::span<const Id> ids, ObjectReceiver const& receiver) override;
     /// One round trip where the change names no earlier versions, otherwise two; beyond a few MiB of earlier versions more.
