@@ -4,7 +4,6 @@
 #include "tree/PathPrefix.h"
 
 #include <algorithm>
-#include <tuple>
 #include <utility>
 
 namespace KivVcs {
@@ -100,10 +99,49 @@ KivStringViewT<char16_t> NameOf(KivStringT<char16_t> const& path) noexcept {
     return KivStringViewT<char16_t>(path).Mid(begin);
 }
 
-/// Makes every file that went and one of equal content that came one renamed file, where @p keyOf, which begins with the
-/// identifier, has both the same; of several such the first ones.
-template <class KeyOf>
-void PairByKey(std::vector<Difference>& differences, KeyOf keyOf) {
+using Order = bool (*)(Difference const&, Difference const&);
+
+bool IsBeforeByPath(Difference const& left, Difference const& right) {
+    return left.path < right.path;
+}
+
+Id const& ContentOf(Difference const& each) noexcept {
+    return each.kind == ChangeKind::Removed ? each.oldId : each.newId;
+}
+
+bool IsBeforeByContent(Difference const& left, Difference const& right) {
+    return ContentOf(left) < ContentOf(right);
+}
+
+bool IsBeforeByContentAndName(Difference const& left, Difference const& right) {
+    const auto order = ContentOf(left) <=> ContentOf(right);
+    return order < 0 || (order == 0 && NameOf(left.path) < NameOf(right.path));
+}
+
+/// Sorts what points into one list; equal ones stay as they are in the list. All orders share this one function, since the
+/// code of a sort is large where programs are counted in kilobytes.
+void Sort(std::vector<Difference*>& differences, Order isBefore) {
+    std::sort(differences.begin(), differences.end(), [isBefore](Difference const* left, Difference const* right) {
+        return isBefore(*left, *right) || (left < right && !isBefore(*right, *left));
+    });
+}
+
+void SortByPath(std::vector<Difference>& differences) {
+    std::vector<Difference*> order;
+    order.reserve(differences.size());
+    for (auto& difference : differences)
+        order.push_back(&difference);
+    Sort(order, IsBeforeByPath);
+    std::vector<Difference> sorted;
+    sorted.reserve(differences.size());
+    for (Difference* const difference : order)
+        sorted.push_back(std::move(*difference));
+    differences = std::move(sorted);
+}
+
+/// Makes every file that went and one that came one renamed file, where neither is before the other; of several such the
+/// first ones. @p isBefore looks at the contents first.
+void PairEqual(std::vector<Difference>& differences, Order isBefore) {
     std::vector<Difference*> gone;
     std::vector<Difference*> come;
     for (auto& difference : differences) {
@@ -112,17 +150,14 @@ void PairByKey(std::vector<Difference>& differences, KeyOf keyOf) {
         else if (difference.kind == ChangeKind::Added)
             come.push_back(&difference);
     }
-    const auto byKey = [&keyOf](Difference const* left, Difference const* right) {
-        return keyOf(*left) < keyOf(*right);
-    };
-    std::stable_sort(gone.begin(), gone.end(), byKey);
-    std::stable_sort(come.begin(), come.end(), byKey);
+    Sort(gone, isBefore);
+    Sort(come, isBefore);
     auto from = gone.begin();
     for (Difference* const to : come) {
-        from = std::find_if_not(from, gone.end(), [&](Difference const* each) { return byKey(each, to); });
+        from = std::find_if_not(from, gone.end(), [&](Difference const* each) { return isBefore(*each, *to); });
         if (from == gone.end())
             break;
-        if (byKey(to, *from))
+        if (isBefore(*to, **from))
             continue;
         to->kind = ChangeKind::Renamed;
         to->oldId = (*from)->oldId;
@@ -140,13 +175,8 @@ cow_ptr<Tree> RootOf(cow_ptr<CommitTree> const& tree) {
 } // namespace
 
 void PairRenames(std::vector<Difference>& differences) {
-    const auto contentOf = [](Difference const& each) -> Id const& {
-        return each.kind == ChangeKind::Removed ? each.oldId : each.newId;
-    };
-    PairByKey(differences, [&](Difference const& each) {
-        return std::tuple<Id const&, KivStringViewT<char16_t>>(contentOf(each), NameOf(each.path));
-    });
-    PairByKey(differences, [&](Difference const& each) { return std::tuple<Id const&>(contentOf(each)); });
+    PairEqual(differences, IsBeforeByContentAndName);
+    PairEqual(differences, IsBeforeByContent);
 }
 
 Differences::Differences(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after, DifferenceOptions const& options) {
@@ -154,9 +184,8 @@ Differences::Differences(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after
     isComplete_ = walk.Run(before.get(), after.get());
     differences_ = walk.Take();
     // Names are visited in order; what breaks the order of paths are files beside directories.
-    const auto isBefore = [](Difference const& left, Difference const& right) { return left.path < right.path; };
-    if (!std::is_sorted(differences_.begin(), differences_.end(), isBefore))
-        std::sort(differences_.begin(), differences_.end(), isBefore);
+    if (!std::is_sorted(differences_.begin(), differences_.end(), IsBeforeByPath))
+        SortByPath(differences_);
     if (options.findRenames)
         PairRenames(differences_);
 }
