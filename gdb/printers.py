@@ -160,7 +160,7 @@ def pointee_of(pointer):
     if int(counted) == 0:
         return None
     held = pointer.type.strip_typedefs().template_argument(0).strip_typedefs()
-    if is_derived(held, "KivUtils::reference_counted"):
+    if is_derived(held, "KivPlatform::reference_counted"):
         thing = counted.cast(held.const().pointer()).dereference()
         return thing.cast(thing.dynamic_type) if is_derived(thing.dynamic_type, str(held)) else thing
     holder = counted.cast(gdb.lookup_type("KivUtils::object_holder").pointer()).dereference()
