@@ -1,7 +1,8 @@
 #include "KivVcs/Conflicts.h"
 
+#include "merge/DiffCategories.h"
+
 #include <algorithm>
-#include <iterator>
 #include <utility>
 
 namespace KivVcs {
@@ -54,23 +55,6 @@ struct OpenDirectory {
     std::size_t depth;
 };
 
-cow_ptr<Object> ObjectAt(cow_ptr<Tree> const& tree, KivStringT<char16_t> const& name) {
-    return tree ? tree->GetLocalObject(name) : nullptr;
-}
-
-/// The names that both sides changed, to different states.
-PathList Disputed(MergeTrees const& trees, PathList const& leftDiffs, PathList const& rightDiffs) {
-    PathList names;
-    std::set_intersection(leftDiffs.begin(), leftDiffs.end(), rightDiffs.begin(), rightDiffs.end(),
-                          std::back_inserter(names));
-    std::erase_if(names, [&trees](KivStringT<char16_t> const& name) {
-        const auto left = ObjectAt(trees.left, name);
-        const auto right = ObjectAt(trees.right, name);
-        return left && right ? left->GetId() == right->GetId() : left == right;
-    });
-    return names;
-}
-
 /// Walks the disputed directories as the merge does, with a stack of its own.
 class ConflictWalk {
 public:
@@ -94,11 +78,10 @@ private:
             return;
         if (!trees.root)
             trees.root.write();
-        for (auto const& name :
-             Disputed(trees, trees.root->GetLocalBlobDiffs(trees.left), trees.root->GetLocalBlobDiffs(trees.right)))
+        const DiffCategories files = CategorizeBlobDiffs(trees);
+        for (auto const& name : files.conflicting)
             Add(name);
-        const PathList directories =
-            Disputed(trees, trees.root->GetLocalTreeDiffs(trees.left), trees.root->GetLocalTreeDiffs(trees.right));
+        const PathList directories = CategorizeTreeDiffs(trees).conflicting;
         std::for_each(directories.rbegin(), directories.rend(), [&](KivStringT<char16_t> const& name) {
             const auto below = [&name](cow_ptr<Tree> const& tree) { return tree ? tree->GetLocalTree(name) : nullptr; };
             open_.push_back({{below(trees.left), below(trees.root), below(trees.right)}, name, path_.size()});

@@ -1,47 +1,11 @@
 #include "KivVcs/IRepository.h"
-#include "KivVcs/Merge.h"
+#include "merge/DiffCategories.h"
 
 #include <utility>
 
 namespace KivVcs {
 
 namespace {
-
-/// The names of one directory level that either side changed, sorted and disjoint.
-struct DiffCategories {
-    PathList conflicting;
-    PathList identical;
-    PathList leftOnly;
-    PathList rightOnly;
-};
-
-bool SidesAgree(MergeTrees const& trees, KivStringT<char16_t> const& name) {
-    const auto left = trees.left ? trees.left->GetDeepObject(name) : nullptr;
-    const auto right = trees.right ? trees.right->GetDeepObject(name) : nullptr;
-    return left && right ? left->HasSameId(*right) : left == right;
-}
-
-/// @param leftDiffs, rightDiffs names, sorted, each once
-DiffCategories GetDiffCategories(MergeTrees const& trees, PathList leftDiffs, PathList rightDiffs) {
-    DiffCategories categories;
-    auto left = leftDiffs.begin();
-    auto right = rightDiffs.begin();
-    while (left != leftDiffs.end() || right != rightDiffs.end()) {
-        const int order = left == leftDiffs.end()     ? 1
-                          : right == rightDiffs.end() ? -1
-                                                      : left->Compare(*right, CompareCase{});
-        if (order < 0) {
-            categories.leftOnly.push_back(std::move(*left++));
-        } else if (order > 0) {
-            categories.rightOnly.push_back(std::move(*right++));
-        } else {
-            (SidesAgree(trees, *left) ? categories.identical : categories.conflicting).push_back(std::move(*left));
-            ++left;
-            ++right;
-        }
-    }
-    return categories;
-}
 
 void UseChangeFrom(IRepository* repo, cow_ptr<Tree>& result, cow_ptr<Tree> const& from,
                    KivStringT<char16_t> const& name) {
@@ -66,9 +30,9 @@ void DoTrivialChanges(IRepository* repo, cow_ptr<Tree>& result, MergeTrees const
 }
 
 /// The host's resolvers together with the place of the merge that they are asked about.
-class SimpleResolvers {
+class PlacedResolvers {
 public:
-    SimpleResolvers(MergeTrees trees, Resolvers resolvers)
+    PlacedResolvers(MergeTrees trees, Resolvers resolvers)
         : trees_(std::move(trees)), resolvers_(std::move(resolvers)) {}
 
     /// The view must stay valid until `Leave`.
@@ -96,10 +60,9 @@ private:
 
 /// Merges level by level. The levels that are being merged stand on a stack of their own, since directories may be
 /// nested deeper than calls can be.
-class RecursiveThreeWayMerge {
+class LevelByLevelMerge {
 public:
-    RecursiveThreeWayMerge(IRepository* repo, SimpleResolvers resolvers)
-        : repo_(repo), resolvers_(std::move(resolvers)) {}
+    LevelByLevelMerge(IRepository* repo, PlacedResolvers resolvers) : repo_(repo), resolvers_(std::move(resolvers)) {}
 
     /// The merged tree, which may be null; nothing if the merge gave up.
     optional<cow_ptr<Tree>> Run(MergeTrees trees) {
@@ -161,16 +124,14 @@ private:
         cow_ptr<Tree> result = trees.root;
         if (!MergeBlobs(trees, result))
             return Outcome::GaveUp();
-        auto categories = GetDiffCategories(trees, trees.root->GetLocalTreeDiffs(trees.left),
-                                            trees.root->GetLocalTreeDiffs(trees.right));
+        DiffCategories categories = CategorizeTreeDiffs(trees);
         DoTrivialChanges(repo_, result, trees, categories);
         levels_.push_back({std::move(trees), std::move(result), std::move(categories.conflicting)});
         return Outcome::Opened();
     }
 
     bool MergeBlobs(MergeTrees const& trees, cow_ptr<Tree>& result) {
-        const auto categories = GetDiffCategories(trees, trees.root->GetLocalBlobDiffs(trees.left),
-                                                  trees.root->GetLocalBlobDiffs(trees.right));
+        const DiffCategories categories = CategorizeBlobDiffs(trees);
         for (auto const& name : categories.conflicting) {
             const ConflictChoice choice = resolvers_.AskAboutBlob(name);
             if (choice == ConflictChoice::Undecided)
@@ -209,7 +170,7 @@ private:
     }
 
     IRepository* repo_;
-    SimpleResolvers resolvers_;
+    PlacedResolvers resolvers_;
     std::vector<Level> levels_;
 };
 
@@ -218,7 +179,7 @@ private:
 cow_ptr<Tree> ThreeWayMerge(IRepository* repo, MergeTrees trees, Resolvers resolvers) {
     if (repo == nullptr)
         return nullptr;
-    RecursiveThreeWayMerge merge(repo, SimpleResolvers(trees, std::move(resolvers)));
+    LevelByLevelMerge merge(repo, PlacedResolvers(trees, std::move(resolvers)));
     return merge.Run(std::move(trees)).value_or(nullptr);
 }
 

@@ -1,14 +1,8 @@
 #include "KivVcs/Repository.h"
 
+#include "repository/RootTree.h"
+
 namespace KivVcs {
-
-namespace {
-
-cow_ptr<Tree> RootTreeOf(cow_ptr<Commit> const& commit) {
-    return commit && commit->GetCommitTree() ? commit->GetCommitTree()->GetRoot() : nullptr;
-}
-
-} // namespace
 
 bool Repository::Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) {
     if (!commit)

@@ -1,6 +1,6 @@
 #include "KivVcs/MergeOutcome.h"
 
-#include "KivVcs/Commit.h"
+#include "repository/RootTree.h"
 
 #include <algorithm>
 #include <utility>
@@ -10,11 +10,6 @@ namespace KivVcs {
 namespace {
 
 using Path = array_view<KivStringViewT<char16_t> const>;
-
-cow_ptr<Tree> RootTreeOf(cow_ptr<Commit> const& commit) {
-    const auto tree = commit ? commit->GetCommitTree() : nullptr;
-    return tree ? tree->GetRoot() : nullptr;
-}
 
 ConflictSettlement SettlementOf(ConflictChoice choice) noexcept {
     switch (choice) {
