@@ -5,6 +5,7 @@
 
 #include "Bytes.h"
 #include "Changes.h"
+#include "Items.h"
 
 #include <algorithm>
 #include <optional>
@@ -47,6 +48,11 @@ private:
     KivVcs::SHADigest256 digest_;
 };
 
+/// How many bytes of a content are still to be read.
+[[nodiscard]] inline std::uint64_t RestOf(StreamIO& content) {
+    return content.GetSize() - std::min(content.GetSize(), content.GetPosition());
+}
+
 /// Adds a piece to the stored form of the content that it belongs to.
 inline void AppendDigest(Buffer& list, Id const& id) {
     list.Append(DigestOf(id).data(), DigestOf(id).size());
@@ -62,6 +68,48 @@ inline std::vector<Id> ReadDigests(ByteView list) {
         pieces.push_back(Id::FromDigest(digest));
     }
     return pieces;
+}
+
+/// Stores a content: a large one as its pieces, some at a time, and then as the list of them.
+/// @param earlierPieces those of the content that it replaces
+/// @param file what failures name
+/// @param store takes items and what they rely on
+/// @return false if the content cannot be read to its end, or is not what @p id says
+template <class Store>
+[[nodiscard]] bool StoreInPieces(Id const& id, StreamIO& content, Id const& earlier,
+                                 std::vector<Id> const& earlierPieces, std::string const& file, IProgress* progress,
+                                 Store store) {
+    std::uint64_t const size = RestOf(content);
+    bool const isLarge = size > largestWholeContent;
+    PieceReader pieces(content, size);
+    Item whole{id, isLarge ? StoredType::LargeBlob : StoredType::Blob, size, {}, isLarge ? Id() : earlier};
+    Change last;
+    std::vector<Item> window;
+    for (std::uint64_t number = 0; !pieces.IsAtEnd(); ++number) {
+        ReportProgress(progress, {"storing a content", number * largestWholeContent, size}, file);
+        auto piece = pieces.Next();
+        if (!piece)
+            return false;
+        if (!isLarge) {
+            whole.data = *piece;
+            break;
+        }
+        Id digest = DigestOfBytes(BytesOf(*piece));
+        AppendDigest(whole.data, digest);
+        last.relied.push_back(digest);
+        Id const before = number < earlierPieces.size() ? earlierPieces[static_cast<std::size_t>(number)] : Id();
+        window.push_back({std::move(digest), StoredType::Piece, piece->GetSize(), *piece, before});
+        if (window.size() == piecesAtOnce || pieces.IsAtEnd()) {
+            store(window, Change());
+            window.clear();
+        }
+    }
+    ReportProgress(progress, {"storing a content", size, size}, file);
+    if (!(pieces.Finish() == id))
+        return false;
+    whole.data = Joined(whole.data);
+    store({whole}, last);
+    return true;
 }
 
 } // namespace KivArchive

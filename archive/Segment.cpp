@@ -64,10 +64,10 @@ void AppendMember(Bytes& form, Member const& member) {
     AppendNumber(form, member.base.member);
 }
 
-/// @param ownSize receives how many bytes of its own the member has
-Member TakeMember(ByteReader& reader, std::uint64_t& ownSize) {
+/// The member without its own bytes: any others of @p form, as many as they are.
+Member TakeMember(ByteReader& reader, ByteView form) {
     Member member = TakeHead(reader);
-    ownSize = 0;
+    auto const setOwnSize = [&](std::uint64_t size) { member.own = ByteReader(form).Take(size); };
     if (member.encoding == Encoding::Removed)
         return member;
     member.size = reader.TakeNumber();
@@ -75,10 +75,10 @@ Member TakeMember(ByteReader& reader, std::uint64_t& ownSize) {
     if (member.formSize > largestForm)
         throw Malformed();
     if (member.encoding == Encoding::Plain)
-        ownSize = member.formSize;
+        setOwnSize(member.formSize);
     if (member.encoding != Encoding::Difference)
         return member;
-    ownSize = reader.TakeNumber();
+    setOwnSize(reader.TakeNumber());
     member.generation = reader.TakeNumber();
     std::uint64_t const base = reader.TakeNumber();
     member.base = {(base & 1U) != 0, base >> 1U, reader.TakeNumber()};
@@ -103,9 +103,8 @@ Segment::Segment(std::uint64_t number, Bytes form, Verified verified) : number_(
     if (count > reader.Rest().size())
         throw Malformed();
     members_.reserve(static_cast<std::size_t>(count));
-    std::vector<std::uint64_t> ownSizes(static_cast<std::size_t>(count));
-    for (std::uint64_t& ownSize : ownSizes) {
-        Member member = TakeMember(reader, ownSize);
+    for (std::uint64_t i = 0; i < count; ++i) {
+        Member member = TakeMember(reader, form_);
         if (member.encoding == Encoding::Shared) {
             member.sharedOffset = sharedSize_;
             sharedSize_ += member.formSize;
@@ -113,8 +112,8 @@ Segment::Segment(std::uint64_t number, Bytes form, Verified verified) : number_(
         members_.push_back(member);
     }
     isSharedCompressed_ = reader.TakeByte() != 0;
-    for (std::size_t i = 0; i < members_.size(); ++i)
-        members_[i].own = reader.Take(ownSizes[i]);
+    for (Member& member : members_)
+        member.own = reader.Take(member.own.size());
     shared_ = reader.Rest();
     bool const fits = isSharedCompressed_ ? CanDecompressTo(shared_, sharedSize_) : shared_.size() == sharedSize_;
     if (!fits)

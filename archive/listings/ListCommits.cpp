@@ -32,18 +32,15 @@ void SetLinks(CommitRecord& record, Ancestry const& facts) {
 /// those of its text
 template <class TakesLinks>
 void ReadTexts(IArchive& archive, std::span<CommitRecord> records, TakesLinks takesLinks) {
-    std::unordered_map<Id, std::size_t> numbers;
-    numbers.reserve(records.size());
+    std::unordered_map<Id, CommitRecord*> firsts;
+    firsts.reserve(records.size());
     std::vector<Id> ids;
     ids.reserve(records.size());
-    for (CommitRecord const& record : records)
-        if (numbers.emplace(record.id, ids.size()).second)
-            ids.push_back(record.id);
-    std::vector<CommitRecord*> byNumber(ids.size());
     for (CommitRecord& record : records)
-        byNumber[numbers.at(record.id)] = &record;
+        if (firsts.emplace(record.id, &record).second)
+            ids.push_back(record.id);
     auto const outcome = archive.Read(ids, [&](ArchivedObject const& object) {
-        CommitRecord& record = *byNumber[numbers.at(object.id)];
+        CommitRecord& record = *firsts.at(object.id);
         record.state = CommitState::Unrepresentable;
         auto const packed = object.type == ObjectType::Commit ? ReadPackedCommit(object.data) : std::nullopt;
         if (!packed)
@@ -55,10 +52,12 @@ void ReadTexts(IArchive& archive, std::span<CommitRecord> records, TakesLinks ta
         }
     });
     for (Id const& id : outcome.damaged)
-        byNumber[numbers.at(id)]->state = CommitState::Damaged;
+        firsts.at(id)->state = CommitState::Damaged;
+    if (ids.size() == records.size())
+        return;
     for (CommitRecord& record : records)
-        if (CommitRecord const* const read = byNumber[numbers.at(record.id)]; read != &record)
-            record = *read;
+        if (CommitRecord const* const first = firsts.at(record.id); first != &record)
+            record = *first;
 }
 
 /// Facts in the order in which commits are listed.

@@ -58,40 +58,14 @@ Buffer ReadPieces(Connection& connection, ByteView list, std::uint64_t from, std
 
 bool PostgresArchive::StoreContent(Id const& id, StreamIO& content, Id const& earlier, IProgress* progress) {
     static_cast<void>(DigestOf(id));
-    std::uint64_t const size = content.GetSize() - std::min(content.GetSize(), content.GetPosition());
-    bool const isLarge = size > largestWholeContent;
     std::vector<Id> const earlierPieces =
-        isLarge ? store_->Run([&](Connection& connection) { return FindPieces(connection, earlier); })
-                : std::vector<Id>();
-    PieceReader pieces(content, size);
-    Item whole{id, isLarge ? StoredType::LargeBlob : StoredType::Blob, size, {}, isLarge ? Id() : earlier};
-    Change last;
-    std::vector<Item> window;
-    for (std::uint64_t number = 0; !pieces.IsAtEnd(); ++number) {
-        ReportProgress(progress, {"storing a content", number * largestWholeContent, size}, store_->Shown());
-        auto piece = pieces.Next();
-        if (!piece)
-            return false;
-        if (!isLarge) {
-            whole.data = *piece;
-            break;
-        }
-        Id digest = DigestOfBytes(BytesOf(*piece));
-        AppendDigest(whole.data, digest);
-        last.relied.push_back(digest);
-        Id const before = number < earlierPieces.size() ? earlierPieces[static_cast<std::size_t>(number)] : Id();
-        window.push_back({std::move(digest), StoredType::Piece, piece->GetSize(), *piece, before});
-        if (window.size() == piecesAtOnce || pieces.IsAtEnd()) {
-            static_cast<void>(store_->Apply(window, {}));
-            window.clear();
-        }
-    }
-    ReportProgress(progress, {"storing a content", size, size}, store_->Shown());
-    if (!(pieces.Finish() == id))
-        return false;
-    whole.data = Joined(whole.data);
-    static_cast<void>(store_->Apply({whole}, last));
-    return true;
+        RestOf(content) > largestWholeContent
+            ? store_->Run([&](Connection& connection) { return FindPieces(connection, earlier); })
+            : std::vector<Id>();
+    return StoreInPieces(id, content, earlier, earlierPieces, store_->Shown(), progress,
+                         [this](std::vector<Item> const& items, Change const& change) {
+                             static_cast<void>(store_->Apply(items, change));
+                         });
 }
 
 std::optional<Buffer> PostgresArchive::ReadContent(Id const& id, std::uint64_t offset, std::uint64_t size) {

@@ -20,26 +20,6 @@ constexpr std::uint64_t windowSize = 8 * largestWholeContent;
 /// What is smaller hardly becomes smaller still.
 constexpr std::size_t worthCompressing = 64;
 
-void MakeForm(Prepared& prepared) {
-    Item const& item = *prepared.item;
-    ByteView const data = BytesOf(item.data);
-    prepared.form = data;
-    if (item.type == StoredType::Tree || item.type == StoredType::Commit) {
-        auto compact = item.type == StoredType::Tree ? CompactTree(data) : CompactCommit(data);
-        prepared.member.isCompact = compact.has_value();
-        if (compact) {
-            prepared.compact = std::move(*compact);
-            prepared.form = prepared.compact;
-        }
-    }
-    prepared.member.type = item.type;
-    prepared.member.size = item.size;
-    prepared.member.formSize = prepared.form.size();
-    // A log reads commits as they are.
-    bool const isPlain = item.type == StoredType::Commit || prepared.form.size() < worthCompressing;
-    prepared.member.encoding = isPlain ? Encoding::Plain : Encoding::Shared;
-}
-
 void MakeDifference(Prepared& prepared, Compressor& compressor) {
     bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
                          prepared.item->type != StoredType::Commit;
@@ -70,8 +50,13 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
     });
     if (looksForPresent || hasEarlier)
         Ask(connection);
-    ForEachInParallel(prepared_.size(), workers, connection.compressor,
-                      [this](std::size_t index, Compressor&) { MakeForm(prepared_[index]); });
+    ForEachInParallel(prepared_.size(), workers, connection.compressor, [this](std::size_t index, Compressor&) {
+        Prepared& one = prepared_[index];
+        MakeForm(one);
+        // A log reads commits as they are.
+        if (one.item->type == StoredType::Commit || one.form.size() < worthCompressing)
+            one.member.encoding = Encoding::Plain;
+    });
     if (hasEarlier)
         MakeDifferencesToRows(connection, workers);
     for (Prepared& one : prepared_)

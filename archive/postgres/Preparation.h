@@ -9,12 +9,7 @@
 namespace KivArchive::Postgres {
 
 /// An item on its way into a row.
-struct Prepared {
-    Item const* item = nullptr;
-    Member member;
-    /// The form: compact where that can be, otherwise the data itself, which the item keeps.
-    Bytes compact;
-    ByteView form;
+struct Prepared : ItemForm {
     /// What it is a difference to, while and if it is one.
     Id base;
     Form baseForm;

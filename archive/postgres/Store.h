@@ -38,16 +38,6 @@ private:
     unsigned count_ = 0;
 };
 
-/// Something to be stored: an object, or a piece of a content.
-struct Item {
-    Id id;
-    StoredType type = StoredType::Blob;
-    /// The size of the data that it is, or stands for.
-    std::uint64_t size = 0;
-    Buffer data;
-    Id earlier;
-};
-
 /// What is behind one `PostgresArchive`.
 class Store {
 public:

@@ -277,7 +277,7 @@ namespace KivArchive {
 
 ChangeOutcome PostgresArchive::Apply(Change const& change) {
     CheckChange(change, store_->Shown());
-    std::vector<Postgres::Item> items;
+    std::vector<Item> items;
     items.reserve(change.objects.size());
     for (NewObject const& object : change.objects)
         items.push_back({object.id, static_cast<StoredType>(object.type), object.data.GetSize(), Joined(object.data),

@@ -11,7 +11,7 @@ ArchivedRepository::ArchivedRepository(std::shared_ptr<IArchive> archive, Reposi
 
 ArchivedRepository::ArchivedRepository(std::unique_ptr<State> state)
     : Repository(std::move(state->made)), state_(std::move(state)) {
-    ArchivedRepository::Refresh();
+    ArchivedRepository::Refresh(nullptr);
     if (state_->branches.empty())
         state_->storage->CreateBranch(u"master", nullptr);
 }
@@ -32,7 +32,8 @@ cow_ptr<Commit> ArchivedRepository::GetHead(KivStringViewT<char16_t> branch) con
     return nullptr;
 }
 
-std::vector<Id> ArchivedRepository::Load(std::span<const Id> ids) {
+std::vector<Id> ArchivedRepository::Load(std::span<const Id> ids, IProgress* progress) {
+    ReportProgress(progress, {"loading versions", 0, 0}, {});
     std::vector<Id> commits;
     std::vector<Id> trees;
     std::vector<Id> blobs;
@@ -41,7 +42,7 @@ std::vector<Id> ArchivedRepository::Load(std::span<const Id> ids) {
     for (auto const& [id, failure] : state_->source->LoadCommits(commits))
         if (failure != Failure::Collected)
             ThrowUnreadable(failure, "version", id);
-    state_->source->LoadTrees(trees);
+    state_->source->LoadTrees(trees, progress);
     state_->source->LoadBlobs(blobs);
     bool const isAll = commits.size() + trees.size() + blobs.size() == ids.size();
     return isAll ? std::vector<Id>() : state_->Archive().FindMissing(ids);

@@ -147,11 +147,11 @@ cow_ptr<Commit> ObjectSource::ReadObject(ArchivedObject const& object) {
 }
 
 cow_ptr<Tree> ObjectSource::FetchTree(Id const& id) {
-    return TreeFetch(*this).Fetch({&id, 1}).front();
+    return TreeFetch(*this, nullptr).Fetch({&id, 1}).front();
 }
 
-void ObjectSource::LoadTrees(std::span<const Id> ids) {
-    static_cast<void>(TreeFetch(*this).Fetch(ids));
+void ObjectSource::LoadTrees(std::span<const Id> ids, IProgress* progress) {
+    static_cast<void>(TreeFetch(*this, progress).Fetch(ids));
 }
 
 ObjectSource::Failures ObjectSource::LoadCommits(std::span<const Id> ids) {

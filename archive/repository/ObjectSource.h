@@ -47,8 +47,9 @@ public:
 
     /// Fetches those of @p ids that no storage has, in one batch.
     Failures LoadCommits(std::span<const Id> ids);
-    /// Fetches trees, with one batch for each level of all of them. @throws ArchiveError if one cannot be had
-    void LoadTrees(std::span<const Id> ids);
+    /// Fetches trees, with one batch for each level of all of them. @param progress may be null
+    /// @throws ArchiveError if one cannot be had
+    void LoadTrees(std::span<const Id> ids, IProgress* progress);
     /// Enters blobs, which are not fetched.
     void LoadBlobs(std::span<const Id> ids);
 

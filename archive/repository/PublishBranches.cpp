@@ -97,7 +97,7 @@ PublishOutcome ArchivedRepository::Publish(std::span<const KivStringT<char16_t>>
                 throw;
             asksForAll = true;
         }
-        Refresh();
+        Refresh(progress);
     }
 }
 
@@ -150,7 +150,7 @@ PublishMergingOutcome ArchivedRepository::PublishMerging(MergeResolvers const& r
     std::chrono::milliseconds wait = state_->options.backOff;
     while (outcome.attempts < state_->options.attempts) {
         ++outcome.attempts;
-        RefreshOutcome const refreshed = Refresh();
+        RefreshOutcome const refreshed = Refresh(progress);
         for (auto const& branch : refreshed.diverged) {
             outcome.merges.push_back(MergeDiverged(branch, resolvers));
             if (!outcome.merges.back().Succeeded()) {

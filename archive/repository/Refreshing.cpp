@@ -1,10 +1,12 @@
+#include "Changes.h"
 #include "repository/RepositoryState.h"
 
 #include <algorithm>
 
 namespace KivArchive {
 
-RefreshOutcome ArchivedRepository::Refresh() {
+RefreshOutcome ArchivedRepository::Refresh(IProgress* progress) {
+    ReportProgress(progress, {"looking at branches", 0, 0}, {});
     auto const theirs = state_->Archive().ReadBranches();
     std::vector<Id> heads;
     for (Branch const& branch : theirs) {
@@ -13,6 +15,7 @@ RefreshOutcome ArchivedRepository::Refresh() {
             heads.push_back(branch.head);
     }
     state_->source->LoadCommits(heads);
+    ReportProgress(progress, {"looking at branches", theirs.size(), theirs.size()}, {});
     RefreshOutcome outcome;
     for (Branch const& branch : theirs)
         RefreshBranch(branch, outcome);

@@ -114,6 +114,7 @@ void TreeFetch::ReadForms(std::vector<Id> level) {
     for (std::size_t depth = 0; !level.empty(); ++depth) {
         if (depth > KivVcs::deepestLoadedNesting)
             ThrowUnreadable(Failure::Unrepresentable, "directory", level.front());
+        ReportProgress(progress_, {"loading directories", forms_.size(), 0}, {});
         FindLiving(level);
         ReadLevel(level);
         level = TakeSubtrees(level);

@@ -14,7 +14,8 @@ namespace KivArchive {
 /// One fetch of trees with everything below them, except for the contents: one batch for each level.
 class TreeFetch {
 public:
-    explicit TreeFetch(ObjectSource& source) : source_(source) {}
+    /// @param progress may be null
+    TreeFetch(ObjectSource& source, IProgress* progress) : source_(source), progress_(progress) {}
 
     /// @throws ArchiveError if anything of it cannot be had; nothing has entered a storage then
     [[nodiscard]] std::vector<cow_ptr<Tree>> Fetch(std::span<const Id> ids);
@@ -41,6 +42,7 @@ private:
     [[nodiscard]] std::vector<Id> TakeSubtrees(std::vector<Id> const& level) const;
 
     ObjectSource& source_;
+    IProgress* progress_;
     std::unordered_map<Id, Form> forms_;
     /// Those that need not be read.
     std::unordered_map<Id, cow_ptr<Tree>> living_;

@@ -161,16 +161,41 @@ ByteView Query::Blob(int column) const {
 }
 
 Id Query::OptionalIdentifier(int column) const {
-    return Blob(column).empty() ? Id() : Identifier(column);
+    ByteView const bytes = Blob(column);
+    return bytes.empty() ? Id() : IdentifierOf(bytes);
 }
 
 Id Query::Identifier(int column) const {
-    ByteView const bytes = Blob(column);
+    return IdentifierOf(Blob(column));
+}
+
+Id Query::IdentifierOf(ByteView bytes) const {
     Id::Digest digest{};
     if (bytes.size() != digest.size())
         database_.Fail(SQLITE_CORRUPT);
     std::copy(bytes.begin(), bytes.end(), std::as_writable_bytes(std::span(digest)).begin());
     return Id::FromDigest(digest);
+}
+
+std::optional<Bytes> RowBlobs::Read(std::uint64_t row) {
+    auto const number = static_cast<std::int64_t>(row);
+    int code = open_ == nullptr ? SQLITE_ABORT : sqlite3_blob_reopen(open_.get(), number);
+    if (code != SQLITE_OK) {
+        open_.reset();
+        sqlite3_blob* blob = nullptr;
+        code = sqlite3_blob_open(database_.Handle(), "main", table_, column_, number, 0, &blob);
+        open_.reset(blob);
+    }
+    // No such row, or no blob in it.
+    if (code == SQLITE_ERROR)
+        return std::nullopt;
+    if (code != SQLITE_OK)
+        database_.Fail(code);
+    Bytes bytes(static_cast<std::size_t>(sqlite3_blob_bytes(open_.get())));
+    code = sqlite3_blob_read(open_.get(), bytes.data(), static_cast<int>(bytes.size()), 0);
+    if (code != SQLITE_OK)
+        database_.Fail(code);
+    return bytes;
 }
 
 Transaction::~Transaction() {

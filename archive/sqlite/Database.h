@@ -7,6 +7,7 @@
 #include "KivArchive/IArchive.h"
 
 #include <memory>
+#include <optional>
 #include <sqlite3.h>
 #include <string>
 #include <unordered_map>
@@ -87,9 +88,33 @@ public:
     [[nodiscard]] Id OptionalIdentifier(int column) const;
 
 private:
+    [[nodiscard]] Id IdentifierOf(ByteView bytes) const;
+
     Database& database_;
     sqlite3_stmt* statement_;
     int bound_ = 0;
+};
+
+/// Reads the blobs that a column holds, one row after the other, in less time than a query for each. Within one
+/// transaction.
+class RowBlobs {
+public:
+    /// @param table has row numbers
+    RowBlobs(Database& database, const char* table, const char* column) noexcept
+        : database_(database), table_(table), column_(column) {}
+
+    /// Nothing if there is no such row, or something else in it.
+    [[nodiscard]] std::optional<Bytes> Read(std::uint64_t row);
+
+private:
+    struct Close {
+        void operator()(sqlite3_blob* blob) const noexcept { sqlite3_blob_close(blob); }
+    };
+
+    Database& database_;
+    const char* table_;
+    const char* column_;
+    std::unique_ptr<sqlite3_blob, Close> open_;
 };
 
 /// A transaction, rolled back unless it is committed.

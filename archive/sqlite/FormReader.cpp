@@ -45,11 +45,10 @@ void FormCache::Keep(Place const& place, std::shared_ptr<const Bytes> const& for
 }
 
 Bytes FormReader::Load(std::uint64_t number) {
-    Query query(database_, "SELECT form FROM segments WHERE number=?");
-    if (!query.With(number).Next())
+    auto form = forms_.Read(number);
+    if (!form)
         throw Malformed();
-    ByteView const form = query.Blob(0);
-    return {form.begin(), form.end()};
+    return *std::move(form);
 }
 
 std::shared_ptr<const Segment> SegmentReader::UnverifiedSegmentAt(std::uint64_t number) {

@@ -1,8 +1,5 @@
 #include "sqlite/Lineage.h"
 
-#include "Changes.h"
-#include "CompactForms.h"
-
 namespace KivArchive {
 
 namespace {
@@ -31,24 +28,6 @@ void FindStoredBase(Prepared& prepared, Place place, std::uint64_t wanted, FormR
 }
 
 } // namespace
-
-void MakeForm(Prepared& prepared) {
-    Item const& item = *prepared.item;
-    ByteView const data = BytesOf(item.data);
-    prepared.form = data;
-    if (item.type == StoredType::Tree || item.type == StoredType::Commit) {
-        auto compact = item.type == StoredType::Tree ? CompactTree(data) : CompactCommit(data);
-        prepared.member.isCompact = compact.has_value();
-        if (compact) {
-            prepared.compact = std::move(*compact);
-            prepared.form = prepared.compact;
-        }
-    }
-    prepared.member.type = item.type;
-    prepared.member.size = item.size;
-    prepared.member.formSize = prepared.form.size();
-    prepared.member.encoding = Encoding::Shared;
-}
 
 void FindBase(Prepared& prepared, Prepared const* earlier, FormReader& reader, Database& database) {
     // What is damaged is no base; reading finds out.

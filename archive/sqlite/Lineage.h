@@ -10,12 +10,7 @@
 namespace KivArchive {
 
 /// An item on its way into a segment.
-struct Prepared {
-    Item const* item = nullptr;
-    Member member;
-    /// The stored form: compact where that can be, otherwise the data itself, which the item keeps.
-    Bytes compact;
-    ByteView form;
+struct Prepared : ItemForm {
     Bytes difference;
 
     /// The base, if there may be one: among those prepared, or stored.
@@ -29,9 +24,6 @@ struct Prepared {
     /// Where it is laid out: the number of the segment among those stored together.
     Place place;
 };
-
-/// Makes the stored form.
-void MakeForm(Prepared& prepared);
 
 /// Finds the base of @p prepared and its form: that of version v is version v & (v - 1), so that no version is more than
 /// log2(v) steps from one that is whole.

@@ -3,8 +3,8 @@
 /// @file
 /// What the operations of `SqliteArchive` share.
 
+#include "Items.h"
 #include "KivArchive/SqliteArchive.h"
-#include "Segment.h"
 #include "sqlite/Database.h"
 
 #include <list>
@@ -88,12 +88,12 @@ private:
 class FormReader final : public SegmentReader {
 public:
     FormReader(Connection& connection, FormCache& cache)
-        : SegmentReader(connection.compressor, cache), database_(connection.database) {}
+        : SegmentReader(connection.compressor, cache), forms_(connection.database, "segments", "form") {}
 
 private:
     Bytes Load(std::uint64_t number) override;
 
-    Database& database_;
+    RowBlobs forms_;
 };
 
 /// What the table of objects stores.
@@ -107,16 +107,6 @@ struct ObjectRow {
 
 /// The row of @p id; none if it is not there.
 [[nodiscard]] std::optional<ObjectRow> FindRow(Database& database, Id const& id);
-
-/// Something to be stored: an object, or a piece of a content.
-struct Item {
-    Id id;
-    StoredType type = StoredType::Blob;
-    /// The size of the data that it is, or stands for.
-    std::uint64_t size = 0;
-    Buffer data;
-    Id earlier;
-};
 
 /// What is behind one `SqliteArchive`.
 class SqliteStore {

@@ -1,8 +1,9 @@
 #!/usr/bin/python3
-"""usage: compare.py PROGRAM [--quick]
+"""usage: compare.py PROGRAM [--quick] [ROWS...]
 
 Runs kivvcs_archive_bench beside git, in turns, and prints one table: what was done, git, the archive, the ratio and the
-limit that docs/archive.md sets. Times are medians of five runs (of one with --quick), sizes sums of file sizes.
+limit that docs/archive.md sets. Times are medians of five runs (of one with --quick), sizes sums of file sizes. ROWS are
+some of the groups that ALL_ROWS names; all of them unless given.
 """
 
 import os
@@ -282,7 +283,19 @@ def edits(directory):
     row(f"publish one change: the last 100 of {times}, the first 100", f"{first:.2f} ms", f"{last:.2f} ms", last / first, 1.5)
 
 
+ALL_ROWS = {
+    "files": first_save,
+    "text": lambda directory: many_versions(directory, "text of 2 MB", text_versions(30 if QUICK else 300), 1.0),
+    "source": lambda directory: many_versions(directory, "source tree", source_versions(30 if QUICK else 300), 1.0),
+    "history": history,
+    "million": million,
+    "large": large_content,
+    "edits": edits,
+}
+
+
 def main():
+    chosen = [name for name in sys.argv[2:] if name != "--quick"] or list(ALL_ROWS)
     for line in open("/proc/cpuinfo", encoding="utf-8"):
         if line.startswith("model name"):
             print(line.split(":")[1].strip() + f", {os.cpu_count()} processors, load {os.getloadavg()[0]:.1f}")
@@ -290,13 +303,8 @@ def main():
     print(subprocess.run(["git", "--version"], capture_output=True, check=True, text=True).stdout.strip())
     print(f"{'':<58}{'git':>16}{'archive':>16}{'ratio':>8}{'limit':>7}")
     with tempfile.TemporaryDirectory(prefix="archive-bench-") as directory:
-        first_save(directory)
-        many_versions(directory, "text of 2 MB", text_versions(30 if QUICK else 300), 1.0)
-        many_versions(directory, "source tree", source_versions(30 if QUICK else 300), 1.0)
-        history(directory)
-        million(directory)
-        large_content(directory)
-        edits(directory)
+        for name in chosen:
+            ALL_ROWS[name](directory)
 
 
 main()

@@ -97,8 +97,9 @@ public:
     [[nodiscard]] cow_ptr<Commit> GetHead(KivStringViewT<char16_t> branch) const override;
 
     /// Brings commits, trees with all below them, and blobs into the storage; commits and blobs by one batch each.
+    /// @param progress may be null; of the trees none enters the storage if it asks to stop
     /// @return those that the archive does not have
-    std::vector<Id> Load(std::span<const Id> ids);
+    std::vector<Id> Load(std::span<const Id> ids, IProgress* progress = nullptr);
 
     /// The content of a blob that is in the archive, as a value or as a stream, within the byte budget. Nobody needs to
     /// have loaded the blob.
@@ -155,7 +156,8 @@ public:
 
     /// Looks at the archive's branches, and moves those that have nothing unpublished here to where they are there. A branch
     /// that was removed here comes back if others have moved it.
-    RefreshOutcome Refresh();
+    /// @param progress may be null; nothing has moved if it asks to stop
+    RefreshOutcome Refresh(IProgress* progress = nullptr);
 
     /// Publishes all branches, merging what others have published until it wins: refreshes, merges every branch that has
     /// moved on both sides, publishes, and begins again if others were faster. Where the head that is known here was

@@ -166,7 +166,7 @@ void UseRepository(std::string const& path) {
     for (auto ancestor = made; ancestor; ancestor = ancestor->GetParent())
         static_cast<void>(ancestor->GetCommitTree()->GetBlob(u"text")->GetData());
     SmallHost(*archive, 4).Publish();
-    if (repository.Refresh().moved.size() != 1)
+    if (repository.Refresh(&callbacks).moved.size() != 1)
         ADD_FAILURE() << "a refresh that found nothing";
 }
 

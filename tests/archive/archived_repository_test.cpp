@@ -1,4 +1,5 @@
 #include "ArchiveFiles.h"
+#include "ForwardingArchive.h"
 #include "KivArchive/ArchivedRepository.h"
 #include "KivArchive/MemArchive.h"
 #include "support/Builders.h"
@@ -24,62 +25,33 @@ using KivVcs::Tree;
 using KivVcs::Wide;
 
 /// An archive that counts what it is asked for.
-class CountingArchive final : public IArchive {
+class CountingArchive final : public ForwardingArchive {
 public:
-    [[nodiscard]] std::vector<Id> FindMissing(std::span<const Id> ids) override { return Far().FindMissing(ids); }
-    [[nodiscard]] std::vector<ObjectInfo> Describe(std::span<const Id> ids) override { return Far().Describe(ids); }
     ReadOutcome Read(std::span<const Id> ids, ObjectReceiver const& receiver) override {
-        return Far().Read(ids, [&](ArchivedObject const& object) {
+        return ForwardingArchive::Read(ids, [&](ArchivedObject const& object) {
             contents += object.type == ObjectType::Blob ? 1 : 0;
             receiver(object);
         });
     }
-    [[nodiscard]] std::optional<Buffer> ReadContent(Id const& id, std::uint64_t offset, std::uint64_t size) override {
+    std::optional<Buffer> ReadContent(Id const& id, std::uint64_t offset, std::uint64_t size) override {
         ++contents;
-        return Far().ReadContent(id, offset, size);
-    }
-    bool StoreContent(Id const& id, StreamIO& content, Id const& earlier, IProgress* progress) override {
-        return Far().StoreContent(id, content, earlier, progress);
+        return ForwardingArchive::ReadContent(id, offset, size);
     }
     ChangeOutcome Apply(Change const& change) override {
         stored += change.objects.size();
         relied += change.relied.size();
-        return Far().Apply(change);
+        return ForwardingArchive::Apply(change);
     }
-    [[nodiscard]] std::vector<Branch> ReadBranches() override { return Far().ReadBranches(); }
-    [[nodiscard]] std::vector<Record> ReadRecords(std::span<const KivStringT<char16_t>> names) override {
-        return Far().ReadRecords(names);
-    }
-    [[nodiscard]] std::vector<KivStringT<char16_t>> ListRecords() override { return Far().ListRecords(); }
-    [[nodiscard]] std::vector<Ancestry> ReadAncestry(std::span<const Id> commits, Follow follow,
-                                                     std::size_t more) override {
-        return Far().ReadAncestry(commits, follow, more);
-    }
-    [[nodiscard]] std::vector<Ancestry> ListAncestry(Id const& after, std::size_t limit) override {
-        return Far().ListAncestry(after, limit);
-    }
-    [[nodiscard]] std::vector<ObjectInfo> ListObjects(Id const& after, std::size_t limit) override {
-        return Far().ListObjects(after, limit);
-    }
-    void Mark(std::span<const Id> ids) override { Far().Mark(ids); }
-    void Unmark(std::span<const Id> ids) override { Far().Unmark(ids); }
-    [[nodiscard]] std::vector<Id> ListMarked(std::chrono::seconds grace, Id const& after, std::size_t limit) override {
-        return Far().ListMarked(grace, after, limit);
-    }
-    std::vector<Id> Remove(std::span<const Id> ids, std::chrono::seconds grace) override {
-        return Far().Remove(ids, grace);
-    }
-    std::uint64_t Compact(std::uint64_t bytes) override { return Far().Compact(bytes); }
-    [[nodiscard]] ArchiveStatistics GetStatistics() override { return far_.GetStatistics(); }
 
     std::size_t calls = 0;
     std::size_t contents = 0;
     std::size_t stored = 0;
     std::size_t relied = 0;
 
-private:
-    MemArchive& Far() { return ++calls, far_; }
+protected:
+    IArchive& Reach() override { return ++calls, far_; }
 
+private:
     MemArchive far_;
 };
 
@@ -555,12 +527,22 @@ TEST(ArchivedRepository, WhatFailsIsNotVisibleAndCanBeTriedAgain) {
     failures = 2;
     EXPECT_THROW(repository.Publish(), std::runtime_error);
     struct Stop final : IProgress {
-        bool Report(Progress const&) override { return false; }
+        bool Report(Progress const&) override { return left-- > 0; }
+        int left = 0;
     } stop;
     failures = 0;
     EXPECT_EQ(FailureOf([&] { repository.Publish(&stop); }), Failure::Cancelled);
     EXPECT_TRUE(archive->ReadBranches().empty() && repository.HasUnpublished(u"master"));
+    ArchivedRepository late(archive);
     EXPECT_TRUE(repository.Publish().published);
+    Id const root = repository.GetHead()->GetRootId();
+    for (int const reports : {0, 1}) {
+        stop.left = reports;
+        EXPECT_EQ(FailureOf([&] { late.Refresh(&stop); }), Failure::Cancelled);
+        stop.left = reports;
+        EXPECT_EQ(FailureOf([&] { static_cast<void>(late.Load({&root, 1}, &stop)); }), Failure::Cancelled);
+    }
+    EXPECT_TRUE(!late.GetHead() && late.GetTreeCount() == 0);
 
     // Others remove the branch, and collect everything. What is held here comes back.
     auto const collect = [&] {
