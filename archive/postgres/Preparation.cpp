@@ -1,7 +1,6 @@
 #include "postgres/Preparation.h"
 
 #include "Changes.h"
-#include "CompactForms.h"
 #include "Parallel.h"
 
 #include <algorithm>

@@ -3,8 +3,8 @@
 /// @file
 /// What the operations of `PostgresArchive` share.
 
+#include "Items.h"
 #include "KivArchive/PostgresArchive.h"
-#include "Segment.h"
 #include "postgres/Connection.h"
 
 #include <mutex>
