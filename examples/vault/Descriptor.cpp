@@ -37,21 +37,27 @@ Descriptor OpenDirectory(int parent, char const* name, int moreFlags) noexcept {
     return Descriptor(openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW | moreFlags));
 }
 
-bool ReadNames(Descriptor const& directory, std::vector<std::string>& names) {
+bool ForEachName(Descriptor const& directory, std::function<void(char const*)> const& receiver) {
     // The listing closes its descriptor, so it gets one of its own.
     Descriptor own = OpenDirectory(directory.Get(), ".");
     const std::unique_ptr<DIR, CloseListing> listing(own.IsOpen() ? fdopendir(own.Get()) : nullptr);
     if (!listing)
         return false;
     own.Release();
-    errno = 0;
-    // NOLINTNEXTLINE(concurrency-mt-unsafe): unsafe only for threads that share one listing
-    while (dirent const* const entry = readdir(listing.get())) {
+    for (;;) {
+        errno = 0;
+        // NOLINTNEXTLINE(concurrency-mt-unsafe): unsafe only for threads that share one listing
+        dirent const* const entry = readdir(listing.get());
+        if (entry == nullptr)
+            return errno == 0;
         const std::string_view name(entry->d_name);
         if (name != "." && name != "..")
-            names.emplace_back(name);
+            receiver(entry->d_name);
     }
-    return errno == 0;
+}
+
+bool ReadNames(Descriptor const& directory, std::vector<std::string>& names) {
+    return ForEachName(directory, [&names](char const* name) { names.emplace_back(name); });
 }
 
 DirectoryOpener::DirectoryOpener(std::string const& top) : top_(open(top.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC)) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <list>
 #include <string>
 #include <string_view>
@@ -43,7 +44,9 @@ private:
 /// Opens the directory @p name of @p parent, if it is no link.
 [[nodiscard]] Descriptor OpenDirectory(int parent, char const* name, int moreFlags = 0) noexcept;
 
-/// The names in a directory, without "." and "..". @return false, with errno set, if it cannot be listed
+/// Calls @p receiver with each name in a directory but "." and "..". @return false, with errno set, if it cannot be listed
+[[nodiscard]] bool ForEachName(Descriptor const& directory, std::function<void(char const*)> const& receiver);
+/// Adds these names to @p names.
 [[nodiscard]] bool ReadNames(Descriptor const& directory, std::vector<std::string>& names);
 
 /// Opens directories below a top one by their paths, of any depth and without ever following a link.

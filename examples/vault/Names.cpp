@@ -1,11 +1,14 @@
 #include "Names.h"
 
 #include <algorithm>
-#include <array>
+#include <cstring>
 
 namespace vault {
 
 namespace {
+
+/// What is compared at once.
+constexpr std::size_t wordSize = 8;
 
 unsigned char ByteAt(std::string_view bytes, std::size_t at) noexcept {
     return at < bytes.size() ? static_cast<unsigned char>(bytes[at]) : 0;
@@ -13,6 +16,13 @@ unsigned char ByteAt(std::string_view bytes, std::size_t at) noexcept {
 
 bool IsTrail(unsigned char byte) noexcept {
     return (byte & 0xC0U) == 0x80U;
+}
+
+bool IsAscii(std::string_view bytes) noexcept {
+    unsigned char all = 0;
+    for (const char byte : bytes)
+        all |= static_cast<unsigned char>(byte);
+    return all < 0x80;
 }
 
 /// The length of the UTF-8 character at @p at; 0 if there is none.
@@ -63,6 +73,8 @@ void AppendHex(std::string& text, unsigned value, int digits) {
 } // namespace
 
 std::string StoredName(std::string_view fileName) {
+    if (IsAscii(fileName))
+        return std::string(fileName);
     std::string stored;
     stored.reserve(fileName.size());
     for (std::size_t at = 0; at < fileName.size();) {
@@ -78,6 +90,8 @@ std::string StoredName(std::string_view fileName) {
 }
 
 std::string FilePath(std::string_view storedPath) {
+    if (storedPath.find('\xED') == std::string_view::npos)
+        return std::string(storedPath);
     std::string path;
     for (std::size_t at = 0; at < storedPath.size();) {
         if (const auto byte = EscapedByte(storedPath, at)) {
@@ -99,11 +113,13 @@ std::optional<std::string> FileName(std::string_view storedName) {
 }
 
 bool ComesBefore(std::string_view left, std::string_view right) noexcept {
-    const auto [at, other] = std::mismatch(left.begin(), left.end(), right.begin(), right.end());
-    if (at == left.end() || other == right.end())
-        return at == left.end() && other != right.end();
-    const auto position = static_cast<std::size_t>(at - left.begin());
-    return Rank(left, position) < Rank(right, position);
+    const auto size = std::min(left.size(), right.size());
+    std::size_t at = 0;
+    while (at + wordSize <= size && std::memcmp(left.data() + at, right.data() + at, wordSize) == 0)
+        at += wordSize;
+    while (at < size && left[at] == right[at])
+        ++at;
+    return at == size ? left.size() < right.size() : Rank(left, at) < Rank(right, at);
 }
 
 std::string PrintableName(std::string_view storedPath) {

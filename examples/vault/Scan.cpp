@@ -12,6 +12,7 @@
 #include <fcntl.h>
 #include <fnmatch.h>
 #include <fstream>
+#include <iterator>
 #include <memory>
 #include <system_error>
 
@@ -26,6 +27,7 @@ struct Pattern {
     std::string text;
     bool isPath = false;
     bool directoriesOnly = false;
+    bool isLiteral = false;
 };
 
 Pattern ParsePattern(std::string text) {
@@ -35,6 +37,7 @@ Pattern ParsePattern(std::string text) {
         text.pop_back();
     pattern.isPath = text.find('/') != std::string::npos;
     pattern.text = text.starts_with('/') ? text.substr(1) : text;
+    pattern.isLiteral = pattern.text.find_first_of("*?[\\") == std::string::npos;
     return pattern;
 }
 
@@ -88,8 +91,14 @@ private:
         ScannedEntry* entry = nullptr;
     };
 
+    /// What one thread works with.
+    struct Worker {
+        DirectoryOpener opener;
+        std::vector<ScannedEntry> found;
+    };
+
     void Work() {
-        DirectoryOpener opener(OpenDirectory(top_.Top(), "."));
+        Worker worker{DirectoryOpener(OpenDirectory(top_.Top(), ".")), {}};
         std::unique_lock lock(mutex_);
         for (;;) {
             changed_.wait(lock, [this] { return !waiting_.empty() || working_ == 0 || isStopped_; });
@@ -101,7 +110,7 @@ private:
             auto& directory = scan_.directories[task.directory];
             lock.unlock();
             try {
-                Look(task, directory, opener);
+                Look(task, directory, worker);
             } catch (...) {
                 lock.lock();
                 isStopped_ = true;
@@ -115,11 +124,14 @@ private:
         }
     }
 
-    void Look(Task const& task, ScannedDirectory& directory, DirectoryOpener& opener) {
-        auto opened = std::make_shared<Descriptor>(Open(task, directory, opener));
+    void Look(Task const& task, ScannedDirectory& directory, Worker& worker) {
+        auto opened = std::make_shared<Descriptor>(Open(task, directory, worker.opener));
         struct stat status {};
-        std::vector<std::string> names;
-        if (!opened->IsOpen() || fstat(opened->Get(), &status) != 0 || !ReadNames(*opened, names)) {
+        auto& found = worker.found;
+        found.clear();
+        if (!opened->IsOpen() || fstat(opened->Get(), &status) != 0 ||
+            !ForEachName(*opened, [&, hasVault = hasVaultDirectory_ && AreSame(status, vaultDirectory_)](
+                                      char const* name) { Add(directory, *opened, name, hasVault, found); })) {
             if (task.entry == nullptr)
                 topProblem_ = errno;
             else
@@ -127,17 +139,12 @@ private:
             return;
         }
         directory.state = StateOf(status);
-        const bool hasVault = hasVaultDirectory_ && AreSame(status, vaultDirectory_);
-        directory.entries.reserve(names.size());
-        for (auto const& name : names)
-            Add(directory, *opened, name, hasVault);
-        std::sort(directory.entries.begin(), directory.entries.end(),
+        std::sort(found.begin(), found.end(),
                   [](auto const& left, auto const& right) { return ComesBefore(left.name, right.name); });
         // A directory that is changed while it is listed may show a name twice.
-        directory.entries.erase(
-            std::unique(directory.entries.begin(), directory.entries.end(),
-                        [](auto const& left, auto const& right) { return left.name == right.name; }),
-            directory.entries.end());
+        const auto end = std::unique(found.begin(), found.end(),
+                                     [](auto const& left, auto const& right) { return left.name == right.name; });
+        directory.entries.assign(std::move_iterator(found.begin()), std::move_iterator(end));
         PutOff(task, directory, opened);
     }
 
@@ -152,22 +159,23 @@ private:
         return OpenDirectory(opener.Open(FilePath(directory.path)), ".");
     }
 
-    void Add(ScannedDirectory& directory, Descriptor const& opened, std::string const& name, bool hasVault) {
+    void Add(ScannedDirectory const& directory, Descriptor const& opened, char const* name, bool hasVault,
+             std::vector<ScannedEntry>& found) {
         ScannedEntry entry{StoredName(name), ScannedEntry::Kind::File, {}, 0};
         struct stat status {};
-        if (fstatat(opened.Get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+        if (fstatat(opened.Get(), name, &status, AT_SYMLINK_NOFOLLOW) != 0) {
             Report(entry, directory.path + entry.name);
         } else {
             if ((hasVault && IsVaultName(name)) || (hasVault_ && AreSame(status, vault_)))
                 return;
-            if (!patterns_.empty() && IsExcluded(directory.path + entry.name, name, S_ISDIR(status.st_mode)))
+            if (!patterns_.empty() && IsExcluded(directory.path, entry.name, name, S_ISDIR(status.st_mode)))
                 return;
             entry.state = StateOf(status);
             entry.kind = KindOf(status);
             if (entry.kind == ScannedEntry::Kind::Special)
                 Note(scan_.specials, PrintableName(directory.path + entry.name));
         }
-        directory.entries.push_back(std::move(entry));
+        found.push_back(std::move(entry));
     }
 
     [[nodiscard]] ScannedEntry::Kind KindOf(struct stat const& status) const noexcept {
@@ -197,15 +205,17 @@ private:
         }
     }
 
-    bool IsExcluded(std::string const& path, std::string const& name, bool isDirectory) {
+    bool IsExcluded(std::string const& directory, std::string const& storedName, char const* name, bool isDirectory) {
         const auto matches = [&](Pattern const& pattern) {
             if (pattern.directoriesOnly && !isDirectory)
                 return false;
-            return pattern.isPath ? fnmatch(pattern.text.c_str(), FilePath(path).c_str(), FNM_PATHNAME) == 0
-                                  : fnmatch(pattern.text.c_str(), name.c_str(), 0) == 0;
+            if (pattern.isPath)
+                return fnmatch(pattern.text.c_str(), FilePath(directory + storedName).c_str(), FNM_PATHNAME) == 0;
+            return pattern.isLiteral ? pattern.text == name : fnmatch(pattern.text.c_str(), name, 0) == 0;
         };
         if (std::none_of(patterns_.begin(), patterns_.end(), matches))
             return false;
+        const auto path = directory + storedName;
         if (!options_.isSaved || !options_.isSaved(path))
             return true;
         Note(scan_.excludedSaved, path);

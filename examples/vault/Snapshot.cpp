@@ -8,6 +8,7 @@
 #include <climits>
 #include <cstdlib>
 #include <ctime>
+#include <future>
 #include <memory>
 #include <unordered_set>
 
@@ -49,9 +50,16 @@ public:
 
     Snapshot Take() {
         const auto top = RealPath(options_.scan.top);
-        const auto before = ReadIndex(archive_, top);
-        index_ = options_.readsAll ? StatIndex() : StatIndex::Read(before);
-        scan_ = ScanDirectory(options_.scan);
+        // The index is read while the directory is looked at.
+        indexed_ = std::async(std::launch::async, [this, &top] {
+                       before_ = ReadIndex(archive_, top);
+                       if (!options_.readsAll)
+                           index_ = StatIndex(before_);
+                   }).share();
+        auto scanning = options_.scan;
+        scanning.isSaved = [this](std::string const& path) { return IsSaved(path); };
+        scan_ = ScanDirectory(scanning);
+        indexed_.get();
         AskAboutExcluded();
         states_.resize(scan_.directories.size());
         for (auto at = states_.size(); at-- > 0;)
@@ -68,15 +76,15 @@ public:
         for (auto const& directory : scan_.directories)
             snapshot_.files += static_cast<std::uint64_t>(
                 std::count_if(directory.entries.begin(), directory.entries.end(), IsContent));
-        if (options_.stores && (isUnread || snapshot_.tree != options_.previous || before.empty()))
-            WriteIndex(snapshot_.change, top, before, MakeIndex().Write());
+        if (options_.stores && (isUnread || snapshot_.tree != options_.previous || before_.empty()))
+            WriteIndex(snapshot_.change, top, before_, MakeIndex());
         return std::move(snapshot_);
     }
 
 private:
     /// What is known of a scanned directory.
     struct State {
-        /// Of each entry; null while it has to be read.
+        /// Of each entry, once the directory is looked at more closely; null while it has to be read.
         std::vector<Id> ids;
         /// The states that were read, which may be later than the scanned ones.
         std::vector<FileState> states;
@@ -90,6 +98,14 @@ private:
         bool isStamped = false;
     };
 
+    bool IsSaved(std::string const& path) {
+        if (options_.previous.IsEmpty())
+            return false;
+        indexed_.get();
+        const auto known = index_.Has(options_.previous, path);
+        return known ? *known : options_.scan.isSaved && options_.scan.isSaved(path);
+    }
+
     void AskAboutExcluded() {
         if (scan_.excludedSaved.empty() || !options_.removesExcluded || !options_.removesExcluded(scan_.excludedSaved))
             return;
@@ -99,36 +115,41 @@ private:
                           [&](ScannedEntry const& entry) { return gone.contains(directory.path + entry.name); });
     }
 
-    /// Takes what the index has for everything that looks as it did then. Directories below come first.
+    /// Takes what the index has for a directory of which everything looks as it did then. Those below come first.
     void Recognize(std::size_t at) {
         auto const& directory = scan_.directories[at];
-        auto& state = states_[at];
-        state.ids.resize(directory.entries.size());
-        auto const* const indexed = index_.Find(directory.path);
-        if (indexed == nullptr)
+        auto listing = index_.Find(directory.path);
+        if (!listing || listing->Mode() != directory.state.mode)
             return;
-        // Its own mode comes first.
-        auto known = indexed->files.begin();
-        bool isSame = known != indexed->files.end() && known->name.empty() && known->state.mode == directory.state.mode;
-        known += known != indexed->files.end() ? 1 : 0;
-        for (std::size_t i = 0; i < directory.entries.size(); ++i) {
-            auto const& entry = directory.entries[i];
-            for (; known != indexed->files.end() && ComesBefore(known->name, entry.name); ++known)
-                isSame = false;
-            if (known == indexed->files.end() || known->name != entry.name) {
-                isSame = isSame && entry.kind == Kind::Special;
+        for (auto const& entry : directory.entries) {
+            if (entry.kind == Kind::Special)
                 continue;
-            }
-            if (entry.kind == Kind::Directory)
-                isSame = isSame && !known->id.IsEmpty() && states_[entry.directory].tree == known->id;
-            else if (IsContent(entry) && known->state == entry.state)
-                state.ids[i] = known->id;
-            else
-                isSame = false;
-            ++known;
+            const auto known = listing->Next();
+            if (!known || known->name != entry.name)
+                return;
+            const bool isSame = entry.kind == Kind::Directory ? !states_[entry.directory].tree.IsEmpty() &&
+                                                                    states_[entry.directory].tree == known->GetId()
+                                                              : IsContent(entry) && known->state == entry.state;
+            if (!isSame)
+                return;
         }
-        if (isSame && known == indexed->files.end())
-            state.tree = indexed->tree;
+        if (!listing->Next())
+            states_[at].tree = listing->Tree();
+    }
+
+    /// Takes what the index has for those files of a directory that look as they did then.
+    void RecognizeFiles(std::size_t at) {
+        auto const& entries = scan_.directories[at].entries;
+        auto& ids = states_[at].ids;
+        ids.resize(entries.size());
+        auto listing = index_.Find(scan_.directories[at].path);
+        auto known = listing ? listing->Next() : std::nullopt;
+        for (std::size_t i = 0; i < entries.size() && known; ++i) {
+            while (known && ComesBefore(known->name, entries[i].name))
+                known = listing->Next();
+            if (known && known->name == entries[i].name && IsContent(entries[i]) && known->state == entries[i].state)
+                ids[i] = known->GetId();
+        }
     }
 
     /// Finds the last version's directories for all that is not known to be as it was, from the top.
@@ -140,6 +161,8 @@ private:
             std::erase_if(level, [this](std::size_t at) {
                 return !states_[at].tree.IsEmpty() && states_[at].tree == states_[at].previousTree;
             });
+            if (level.empty())
+                break;
             for (const auto at : level)
                 trees.push_back(states_[at].previousTree);
             const auto read = reader_.Read(trees);
@@ -147,6 +170,7 @@ private:
             for (const auto at : level) {
                 auto& state = states_[at];
                 state.isOpen = true;
+                RecognizeFiles(at);
                 // One that is damaged is saved anew.
                 const auto found = read.find(state.previousTree);
                 if (found == read.end())
@@ -314,31 +338,39 @@ private:
     }
 
     /// What the next save can take for granted.
-    StatIndex MakeIndex() const {
-        StatIndex index;
+    [[nodiscard]] std::string MakeIndex() const {
+        StatIndexWriter writer;
         for (std::size_t at = 0; at < states_.size(); ++at) {
-            auto const& directory = scan_.directories[at];
-            auto const& state = states_[at];
-            StatIndex::IndexedDirectory indexed{state.isStamped ? Id() : state.tree, {}};
-            indexed.files.push_back({"", {0, 0, 0, 0, directory.state.mode}, {}});
-            for (std::size_t i = 0; i < directory.entries.size(); ++i) {
-                auto const& entry = directory.entries[i];
-                if (entry.kind == Kind::Directory) {
-                    indexed.files.push_back({entry.name, {}, states_[entry.directory].tree});
-                    continue;
-                }
-                if (entry.kind == Kind::Special)
-                    continue;
-                auto const& file = state.isOpen ? state.states[i] : entry.state;
-                const bool isRacy = std::max(file.modified, file.changed) > begin_ - racyNanoseconds;
-                if (IsContent(entry) && !state.ids[i].IsEmpty() && !isRacy)
-                    indexed.files.push_back({entry.name, file, state.ids[i]});
-                else
-                    indexed.tree = Id();
-            }
-            index.Add(directory.path, std::move(indexed));
+            const auto known = states_[at].isOpen ? std::nullopt : index_.Find(scan_.directories[at].path);
+            if (known)
+                writer.Copy(*known);
+            else
+                AddTo(writer, at);
         }
-        return index;
+        return writer.Bytes();
+    }
+
+    void AddTo(StatIndexWriter& writer, std::size_t at) const {
+        auto const& directory = scan_.directories[at];
+        auto const& state = states_[at];
+        bool isWhole = !state.isStamped;
+        writer.Begin(directory.path, directory.state.mode);
+        for (std::size_t i = 0; i < directory.entries.size(); ++i) {
+            auto const& entry = directory.entries[i];
+            if (entry.kind == Kind::Directory) {
+                writer.AddFile(entry.name, {}, states_[entry.directory].tree);
+                continue;
+            }
+            if (entry.kind == Kind::Special)
+                continue;
+            auto const& file = state.states[i];
+            const bool isRacy = std::max(file.modified, file.changed) > begin_ - racyNanoseconds;
+            if (IsContent(entry) && !state.ids[i].IsEmpty() && !isRacy)
+                writer.AddFile(entry.name, file, state.ids[i]);
+            else
+                isWhole = false;
+        }
+        writer.End(isWhole ? state.tree : Id());
     }
 
     IArchive& archive_;
@@ -346,7 +378,10 @@ private:
     Progress& progress_;
     TreeReader reader_;
     std::int64_t begin_;
+    /// The index, and what it is read from.
+    std::string before_;
     StatIndex index_;
+    std::shared_future<void> indexed_;
     Scan scan_;
     std::vector<State> states_;
     Snapshot snapshot_;

@@ -2,6 +2,8 @@
 
 #include "Text.h"
 
+#include <algorithm>
+#include <array>
 #include <concepts>
 #include <cstring>
 
@@ -9,7 +11,12 @@ namespace vault {
 
 namespace {
 
-constexpr std::string_view beginning = "vault index 1\n";
+constexpr std::string_view beginning = "vault index 2\n";
+constexpr std::size_t digestSize = std::tuple_size_v<Id::Digest>;
+/// Of what every directory begins with: its size, tree and mode, and the size of its path.
+constexpr std::size_t headSize = 4 + digestSize + 4 + 4;
+/// Of what every file begins with: size, times, inode, mode, identifier, and the size of its name.
+constexpr std::size_t fileSize = 8 + 8 + 8 + 8 + 4 + digestSize + 4;
 /// Records hold at most 16 MiB.
 constexpr std::size_t pieceSize = std::size_t{8} * 1024 * 1024;
 
@@ -20,51 +27,35 @@ void Append(std::string& bytes, Number number) {
     bytes.append(raw.data(), raw.size());
 }
 
-void AppendText(std::string& bytes, std::string_view text) {
-    Append(bytes, static_cast<std::uint32_t>(text.size()));
-    bytes += text;
+std::string_view BytesOf(Id::Digest const& digest) noexcept {
+    return {reinterpret_cast<char const*>(digest.data()), digest.size()};
 }
 
 void Append(std::string& bytes, Id const& id) {
     const Id::Digest none{};
-    auto const& digest = id.GetDigest() ? *id.GetDigest() : none;
-    bytes.append(reinterpret_cast<char const*>(digest.data()), digest.size());
+    bytes += BytesOf(id.GetDigest() ? *id.GetDigest() : none);
 }
 
-/// Takes values off the front of bytes; whatever does not fit ends it for good.
-class Reader {
-public:
-    explicit Reader(std::string_view bytes) noexcept : rest_(bytes) {}
+/// Takes a number off the front of bytes that are long enough.
+template <std::integral Number>
+Number Take(std::string_view& bytes) noexcept {
+    Number number{};
+    std::memcpy(&number, bytes.data(), sizeof(Number));
+    bytes.remove_prefix(sizeof(Number));
+    return number;
+}
 
-    [[nodiscard]] bool IsAtEnd() const noexcept { return rest_.empty(); }
+std::string_view TakeText(std::string_view& bytes, std::size_t size) noexcept {
+    const auto text = bytes.substr(0, size);
+    bytes.remove_prefix(text.size());
+    return text;
+}
 
-    template <class Number>
-    Number Take() noexcept {
-        Number number{};
-        const auto bytes = Take(sizeof(Number));
-        if (bytes.size() == sizeof(Number))
-            std::memcpy(&number, bytes.data(), sizeof(Number));
-        return number;
-    }
-    std::string_view TakeText() noexcept { return Take(Take<std::uint32_t>()); }
-    Id TakeId() noexcept {
-        const auto digest = Take<Id::Digest>();
-        return digest == Id::Digest{} ? Id() : Id::FromDigest(digest);
-    }
-
-private:
-    std::string_view Take(std::size_t size) noexcept {
-        if (size > rest_.size()) {
-            rest_ = {};
-            return {};
-        }
-        const auto taken = rest_.substr(0, size);
-        rest_.remove_prefix(size);
-        return taken;
-    }
-
-    std::string_view rest_;
-};
+Id IdOf(std::string_view bytes) {
+    Id::Digest digest{};
+    std::copy(bytes.begin(), bytes.end(), digest.begin());
+    return digest == Id::Digest{} ? Id() : Id::FromDigest(digest);
+}
 
 Text RecordName(std::string const& top, std::size_t piece) {
     const auto digest = KivVcs::Helpers::ComputeEncodedSHA256Hash(top.data(), top.size());
@@ -82,49 +73,104 @@ FileState StateOf(struct stat const& status) noexcept {
             status.st_ino, status.st_mode};
 }
 
-StatIndex StatIndex::Read(std::string_view bytes) {
-    StatIndex index;
+Id StatIndex::File::GetId() const {
+    return IdOf(digest);
+}
+
+StatIndex::Listing::Listing(std::string_view block) : block_(block), rest_(block) {
+    Take<std::uint32_t>(rest_);
+    digest_ = TakeText(rest_, digestSize);
+    mode_ = Take<std::uint32_t>(rest_);
+    const auto pathSize = Take<std::uint32_t>(rest_);
+    path_ = TakeText(rest_, pathSize);
+}
+
+Id StatIndex::Listing::Tree() const {
+    return IdOf(digest_);
+}
+
+std::optional<StatIndex::File> StatIndex::Listing::Next() {
+    if (rest_.size() < fileSize)
+        return std::nullopt;
+    File file;
+    file.state.size = Take<std::uint64_t>(rest_);
+    file.state.modified = Take<std::int64_t>(rest_);
+    file.state.changed = Take<std::int64_t>(rest_);
+    file.state.inode = Take<std::uint64_t>(rest_);
+    file.state.mode = Take<std::uint32_t>(rest_);
+    file.digest = TakeText(rest_, digestSize);
+    const auto nameSize = Take<std::uint32_t>(rest_);
+    file.name = TakeText(rest_, nameSize);
+    return file;
+}
+
+StatIndex::StatIndex(std::string_view bytes) {
     if (!bytes.starts_with(beginning))
-        return index;
-    Reader reader(bytes.substr(beginning.size()));
-    while (!reader.IsAtEnd()) {
-        std::string path(reader.TakeText());
-        IndexedDirectory directory{reader.TakeId(), {}};
-        for (auto count = reader.Take<std::uint32_t>(); count > 0 && !reader.IsAtEnd(); --count) {
-            auto& file = directory.files.emplace_back();
-            file.name = reader.TakeText();
-            file.state = {reader.Take<std::uint64_t>(), reader.Take<std::int64_t>(), reader.Take<std::int64_t>(),
-                          reader.Take<std::uint64_t>(), reader.Take<std::uint32_t>()};
-            file.id = reader.TakeId();
-        }
-        index.positions_.emplace(path, index.directories_.size());
-        index.Add(std::move(path), std::move(directory));
+        return;
+    bytes.remove_prefix(beginning.size());
+    while (bytes.size() >= headSize) {
+        auto head = bytes;
+        const auto size = Take<std::uint32_t>(head);
+        if (size < headSize || size > bytes.size())
+            return;
+        const Listing listing(TakeText(bytes, size));
+        directories_.emplace(listing.Path(), listing);
     }
-    return index;
 }
 
-std::string StatIndex::Write() const {
-    std::string bytes(beginning);
-    for (auto const& [path, directory] : directories_) {
-        AppendText(bytes, path);
-        Append(bytes, directory.tree);
-        Append(bytes, static_cast<std::uint32_t>(directory.files.size()));
-        for (auto const& [name, state, id] : directory.files) {
-            AppendText(bytes, name);
-            Append(bytes, state.size);
-            Append(bytes, state.modified);
-            Append(bytes, state.changed);
-            Append(bytes, state.inode);
-            Append(bytes, state.mode);
-            Append(bytes, id);
-        }
-    }
-    return bytes;
+std::optional<StatIndex::Listing> StatIndex::Find(std::string_view path) const {
+    const auto found = directories_.find(path);
+    return found == directories_.end() ? std::nullopt : std::optional(found->second);
 }
 
-StatIndex::IndexedDirectory const* StatIndex::Find(std::string const& path) const {
-    const auto found = positions_.find(path);
-    return found == positions_.end() ? nullptr : &directories_[found->second].second;
+std::optional<bool> StatIndex::Has(Id const& top, std::string_view path) const {
+    auto tree = top;
+    for (std::size_t begin = 0; begin < path.size();) {
+        auto listing = Find(path.substr(0, begin));
+        if (!listing || tree.IsEmpty() || listing->Tree() != tree)
+            return std::nullopt;
+        const auto end = std::min(path.find('/', begin), path.size());
+        auto file = listing->Next();
+        while (file && file->name != path.substr(begin, end - begin))
+            file = listing->Next();
+        if (!file)
+            return false;
+        tree = file->state == FileState() ? file->GetId() : Id();
+        begin = end + 1;
+    }
+    return true;
+}
+
+StatIndexWriter::StatIndexWriter() : bytes_(beginning) {}
+
+void StatIndexWriter::Begin(std::string_view path, std::uint32_t mode) {
+    begin_ = bytes_.size();
+    bytes_.append(4 + digestSize, '\0');
+    Append(bytes_, mode);
+    Append(bytes_, static_cast<std::uint32_t>(path.size()));
+    bytes_ += path;
+}
+
+void StatIndexWriter::AddFile(std::string_view name, FileState const& state, Id const& id) {
+    Append(bytes_, state.size);
+    Append(bytes_, state.modified);
+    Append(bytes_, state.changed);
+    Append(bytes_, state.inode);
+    Append(bytes_, state.mode);
+    Append(bytes_, id);
+    Append(bytes_, static_cast<std::uint32_t>(name.size()));
+    bytes_ += name;
+}
+
+void StatIndexWriter::End(Id const& tree) {
+    std::string head;
+    Append(head, static_cast<std::uint32_t>(bytes_.size() - begin_));
+    Append(head, tree);
+    bytes_.replace(begin_, head.size(), head);
+}
+
+void StatIndexWriter::Copy(StatIndex::Listing const& listing) {
+    bytes_ += listing.Block();
 }
 
 std::string ReadIndex(IArchive& archive, std::string const& top) {
@@ -134,7 +180,8 @@ std::string ReadIndex(IArchive& archive, std::string const& top) {
         const auto records = archive.ReadRecords(std::span(&name, 1));
         if (records.empty() || !records.front().value)
             return bytes;
-        bytes += BytesOf(*records.front().value);
+        auto value = BytesOf(*records.front().value);
+        bytes = bytes.empty() ? std::move(value) : bytes + value;
         if (records.front().value->GetSize() < pieceSize)
             return bytes;
     }
