@@ -1,7 +1,7 @@
 #!/bin/bash
-# usage: tests/vault_history_test.sh VAULT CASE [NUMBER]
+# usage: tests/vault_history_test.sh VAULT CASE [NUMBER [SEED]]
 # Runs one of the cases below, on histories, on the program VAULT. Each case is a function; the trials take the number of
-# kills, or of pairs of trees.
+# kills, or of pairs of trees, and where these begin (a number, or "random").
 
 . "$(dirname "$0")/vault_testing.sh"
 
@@ -175,6 +175,6 @@ KilledCommands() {
     done
 }
 
-RandomTreesMerge() { python3 "$here/vault_merges.py" "$vault" "${1:-20}"; }
+RandomTreesMerge() { python3 "$here/vault_merges.py" "$vault" "${1:-20}" "${2:-1}"; }
 
 "${@:2}"

@@ -1,4 +1,4 @@
-"""usage: vault_merges.py VAULT [COUNT] [SEED]
+"""usage: vault_merges.py VAULT COUNT SEED|random
 
 Merges COUNT random pairs of directories that disagree in every way, and judges the result path by path: what only one side
 changed is taken over, what both changed alike is there once, and whatever else happens to a path is named.
@@ -86,7 +86,8 @@ def judge(base, left, right, merged, named):
         if l != b and r != b and l != r:
             if "directory" in (entry and entry[0] for entry in (l, r)):
                 continue
-            if not (b and l and r and b[0] == l[0] == r[0]):
+            is_kind_kept = b and l and r and b[0] == l[0] == r[0]
+            if not is_kind_kept or any(x != z and y != z and x != y for x, y, z in zip(l, r, b)):
                 yield f"{path!r}: {b} became {l} and {r}, unnamed, and is {m}"
                 continue
             expected = tuple(y if x == z else x for x, y, z in zip(l, r, b))
@@ -100,8 +101,8 @@ def judge(base, left, right, merged, named):
 
 
 def main():
-    count = int(sys.argv[2]) if len(sys.argv) > 2 else 300
-    seed = int(sys.argv[3]) if len(sys.argv) > 3 else random.randrange(1 << 30)
+    count = int(sys.argv[2])
+    seed = random.randrange(1 << 30) if sys.argv[3] == "random" else int(sys.argv[3])
     conflicts = 0
     for number in range(count):
         generator = random.Random(seed + number)

@@ -110,13 +110,8 @@ private:
         const auto blob = level.merged->GetLocalBlob(name);
         entry.id = blob->GetId();
         contents_.emplace(entry.id, blob);
-        const auto path = level.path + entry.name;
-        const auto renamed = versions_.renamed.find(path);
-        const auto earlierName = renamed == versions_.renamed.end()
-                                     ? entry.name
-                                     : renamed->second.substr(renamed->second.find_last_of('/') + 1);
-        const auto find = [&earlierName](Directory const& directory) {
-            auto const* const found = directory.Find(earlierName);
+        const auto find = [&entry](Directory const& directory) {
+            auto const* const found = directory.Find(entry.name);
             return found != nullptr && !found->isDirectory ? found : nullptr;
         };
         std::optional<Attributes> base;
@@ -125,7 +120,7 @@ private:
             const auto attributes = found != nullptr ? found->attributes : std::nullopt;
             base = i == 0 || (base && attributes && base->IsLike(*attributes)) ? attributes : std::nullopt;
         }
-        entry.attributes = Choose(path, entry.id, find(level.left), find(level.right), base);
+        Choose(level.path, entry, find(level.left), find(level.right), base);
         ++level.next;
     }
 
@@ -149,20 +144,33 @@ private:
         Enter(level.path + entry.name + '/', merged, std::move(origins));
     }
 
-    std::optional<Attributes> Choose(std::string const& path, Id const& id, Entry const* left, Entry const* right,
-                                     std::optional<Attributes> const& base) {
+    /// Gives an entry its attributes. Where a link stands against a file whose mode was changed, it is the entry of one side.
+    void Choose(std::string const& directory, Entry& entry, Entry const* left, Entry const* right,
+                std::optional<Attributes> const& base) {
         if (left == nullptr || right == nullptr || !left->attributes || !right->attributes) {
             auto const* const only = left != nullptr && (left->attributes || right == nullptr) ? left : right;
-            return only == nullptr ? std::nullopt : only->attributes;
+            entry.attributes = only == nullptr ? std::nullopt : only->attributes;
+            return;
         }
-        const bool isRight = left->id == right->id ? versions_.prefersRight : id == right->id;
-        auto const& side = isRight ? *right->attributes : *left->attributes;
-        auto chosen = Combine(path, *left->attributes, *right->attributes, base, isRight, left->id == right->id);
+        const auto path = directory + entry.name;
+        const bool isAsked = !versions_.settled.contains(path);
+        auto const* const source = entry.id == right->id ? right : left;
+        auto const* const preferred = isAsked ? (versions_.prefersRight ? right : left) : source;
+        const auto before = result_.conflicts.size();
+        auto chosen = Combine(path, *left->attributes, *right->attributes, base, preferred == right, isAsked);
+        if (left->id == right->id) {
+            entry.attributes = chosen;
+            return;
+        }
+        if (left->attributes->isLink != right->attributes->isLink && result_.conflicts.size() > before) {
+            entry = *preferred;
+            return;
+        }
         // A link is what its content is.
-        chosen.isLink = left->id == right->id ? chosen.isLink : side.isLink;
-        if (left->id != right->id && (id == left->id || id == right->id))
-            chosen.time = side.time;
-        return chosen;
+        chosen.isLink = source->attributes->isLink;
+        if (entry.id == source->id)
+            chosen.time = source->attributes->time;
+        entry.attributes = chosen;
     }
 
     Attributes Combine(std::string const& path, Attributes const& left, Attributes const& right,
@@ -176,7 +184,12 @@ private:
             chosen.mode = left.mode;
             chosen.isLink = left.isLink;
         } else if (!left.IsLike(right) && isAsked) {
-            result_.conflicts.push_back({path});
+            const auto wordFor = [&](Attributes const& side, Attributes const& other) {
+                return side.isLink == other.isLink ? "changed its mode"
+                       : side.isLink               ? "made it a link"
+                                                   : "changed the file's mode";
+            };
+            result_.conflicts.push_back({path, wordFor(left, right), wordFor(right, left)});
         }
         return chosen;
     }
@@ -198,7 +211,8 @@ private:
                 [](Entry const& entry, std::string const& name) { return ComesBefore(entry.name, name); });
             if (!isChanged || (at != level.entries.end() && at->name == before.name))
                 continue;
-            result_.conflicts.push_back({level.path + before.name, left == nullptr, right == nullptr});
+            const auto wordFor = [](Entry const* side) { return side == nullptr ? "removed it" : "changed its mode"; };
+            result_.conflicts.push_back({level.path + before.name, wordFor(left), wordFor(right)});
             if (versions_.prefersRight == (left == nullptr))
                 level.entries.insert(at, *only);
         }

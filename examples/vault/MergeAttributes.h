@@ -4,6 +4,9 @@
 
 #include <KivVcs/Tree.h>
 
+#include <string_view>
+#include <unordered_set>
+
 namespace vault {
 
 /// What a merge of versions starts from.
@@ -14,15 +17,16 @@ struct MergedVersions {
     std::vector<Id> bases;
     /// Whether the right side wins where both changed a mode differently.
     bool prefersRight = false;
-    /// Under which path a file was that is kept under another one.
-    std::unordered_map<std::string, std::string> renamed;
+    /// Paths about which somebody has decided already.
+    std::unordered_set<std::string> settled;
 };
 
-/// A path whose mode one side changed, while the other one changed it differently, or removed the path.
+/// A path whose mode or kind one side changed, while the other one changed it differently, or removed the path.
 struct ModeConflict {
     std::string path;
-    bool leftRemoved = false;
-    bool rightRemoved = false;
+    /// What each side did, for people.
+    std::string_view left;
+    std::string_view right;
 };
 
 /// A merged tree that is ready to be stored.

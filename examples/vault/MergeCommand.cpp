@@ -70,10 +70,6 @@ std::string WordFor(ChangeKind kind) {
     return "changed it";
 }
 
-std::string WordForMode(bool isRemoved) {
-    return isRemoved ? "removed it" : "changed its mode";
-}
-
 std::string_view WordFor(ConflictSettlement settlement) noexcept {
     switch (settlement) {
     case ConflictSettlement::Left:
@@ -117,8 +113,12 @@ public:
         for (auto const& lost : merge.lostBases)
             Warn("what both had at " + Shortened(lost) + " is not known any more");
         for (auto const& conflict : merge.conflicts) {
-            if (!IsAuxiliary(ToUtf8(conflict.path)))
-                conflicts_.push_back(conflict);
+            const auto path = ToUtf8(conflict.path);
+            if (IsAuxiliary(path))
+                continue;
+            conflicts_.push_back(conflict);
+            if (conflict.settlement != ConflictSettlement::Combined)
+                versions_.settled.insert(path);
         }
         if (merge.gaveUp || !merge.tree) {
             Describe();
@@ -154,7 +154,7 @@ public:
         }
         for (auto const& conflict : modes_)
             std::cout << Coloured("conflict ", Colour::Red) << PrintableName(conflict.path) << ": left "
-                      << WordForMode(conflict.leftRemoved) << ", right " << WordForMode(conflict.rightRemoved) << "; "
+                      << conflict.left << ", right " << conflict.right << "; "
                       << (isStopped_               ? "undecided"
                           : versions_.prefersRight ? "took right"
                                                    : "took left")
@@ -170,8 +170,8 @@ public:
                 std::string(WordFor(conflict.settlement)) + "\"}";
         for (auto const& conflict : modes_)
             (json += json.size() == 1 ? "\n" : ",\n") += "{\"path\":" + JsonText(conflict.path) + ",\"left\":\"" +
-                                                         WordForMode(conflict.leftRemoved) + "\",\"right\":\"" +
-                                                         WordForMode(conflict.rightRemoved) + "\",\"taken\":\"" +
+                                                         std::string(conflict.left) + "\",\"right\":\"" +
+                                                         std::string(conflict.right) + "\",\"taken\":\"" +
                                                          (versions_.prefersRight ? "right" : "left") + "\"}";
         return json + "\n]";
     }
