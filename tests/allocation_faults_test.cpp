@@ -29,16 +29,19 @@ bool Fails() {
 } // namespace
 
 // Inlined, they would look mismatched to the compiler.
-[[gnu::noinline]] void* operator new(std::size_t size) {
+[[gnu::noinline]] void* operator new(std::size_t size, std::nothrow_t const& /*tag*/) noexcept {
     if (Fails()) {
         allocations.hasFailed = true;
-        throw std::bad_alloc();
+        return nullptr;
     }
     void* const memory = std::malloc(size == 0 ? 1 : size);
-    if (memory == nullptr)
-        throw std::bad_alloc();
-    ++allocations.living;
+    allocations.living += memory == nullptr ? 0 : 1;
     return memory;
+}
+
+[[gnu::noinline]] void* operator new(std::size_t size) {
+    void* const memory = operator new(size, std::nothrow);
+    return memory != nullptr ? memory : throw std::bad_alloc();
 }
 
 [[gnu::noinline]] void operator delete(void* memory) noexcept {

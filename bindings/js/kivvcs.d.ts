@@ -156,7 +156,7 @@ export interface MergeOutcome {
     /**
      * "up to date": the other commit was part of the branch; "forwarded": the branch moved to it; "merged": there is a new
      * commit on the branch; "gave up": nothing has changed, since conflicts are undecided; "nothing to commit": the resolvers
-     * left nothing at all.
+     * left nothing at all; "refused": the current branch has been removed.
      */
     kind: "up to date" | "forwarded" | "merged" | "gave up" | "nothing to commit" | "refused";
     /** Those that were settled, and after a merge that gave up all others behind them. */
