@@ -210,6 +210,7 @@ async function open() {
     byId("merge").disabled = false;
     byId("merge").onclick = async () => {
         byId("merge").disabled = true;
+        byId("outcome").textContent = "";
         byId("outcome").textContent = await bringTogether().catch(tell);
         draw(...panels);
         byId("merge").disabled = false;
