@@ -105,7 +105,7 @@ TEST_F(Commits, ThePackedFormsThatAreDocumentedAreExact) {
     }
 }
 
-TEST_F(Commits, SignaturesTellSecondsIn32BitsAndTheOffsetInHoursAndMinutes) {
+TEST_F(Commits, SignaturesStoreSecondsIn32BitsAndTheOffsetInHoursAndMinutes) {
     const struct {
         std::int64_t seconds, minutes;
         const char* line;
@@ -134,7 +134,7 @@ TEST_F(Commits, KeysAreFoundWhereverTheyComeNext) {
     EXPECT_EQ(position, 11);
 }
 
-TEST_F(Commits, AreReadBackAsFarAsTheirTextTells) {
+TEST_F(Commits, AreReadBackAsFarAsTheirTextGoes) {
     const std::string root = packed.Add("tree", Entry("blob", "f", packed.Add("blob", "1")));
     const auto read = [&](std::string const& text, Id& parent) {
         return Commit::Deserialize(Id(Wide(packed.Add("commit", text))), parent, &repo, packed.Loader());

@@ -120,7 +120,7 @@ TEST(HostObjects, AreComparedByTheIdentifierThatTheyGive) {
     EXPECT_TRUE(one.GetIdPrefix() == again.GetIdPrefix() && one.GetIdPrefix() != two.GetIdPrefix());
 }
 
-/// A blob that has told its identifier, and must not be asked what it shows.
+/// A blob that was made with its identifier, and must not be asked what it shows.
 class TellingBlob final : public Blob {
 public:
     explicit TellingBlob(Id::Digest const& digest) : Blob(digest) {}
@@ -133,7 +133,7 @@ protected:
     cow_ptr<Blob> Copy() const override { return immu::make<TellingBlob>(*this); }
 };
 
-TEST(HostObjects, AreShownByTheIdentifierThatTheyHaveTold) {
+TEST(HostObjects, AreShownByTheIdentifierThatTheyWereMadeWith) {
     Repository repo(std::make_unique<MemObjectsStorage>());
     const TellingBlob telling(*Id::Parse(abcId)->GetDigest());
     Tree told;

@@ -215,7 +215,7 @@ void NearArchive::RemoveOldest() {
     std::uint64_t sum = 0;
     for (Candidate const& candidate : candidates)
         sum += candidate.info.size;
-    // A quarter more than has to go; sizes are told before compression.
+    // A quarter more than has to go; sizes are those before compression.
     double const share = static_cast<double>(taken - maximumBytes_ + maximumBytes_ / 4) / static_cast<double>(taken);
     auto const wanted = static_cast<std::uint64_t>(share * static_cast<double>(sum));
     std::vector<Id> page;

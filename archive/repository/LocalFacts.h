@@ -30,7 +30,7 @@ public:
     [[nodiscard]] std::vector<Ancestry> All() const;
     /// Whether anything is said about a commit that is not unpublished: nothing else would bring it to the archive.
     [[nodiscard]] bool TellOfPublished(IsUnpublished const& isUnpublished) const;
-    /// Drops what the archive has been told, except about commits that are still unpublished.
+    /// Drops what the archive has stored, except about commits that are still unpublished.
     void ForgetPublished(IsUnpublished const& isUnpublished);
 
 private:

@@ -30,7 +30,7 @@ struct RepositoryOptions {
     /// How long it waits after it has lost a race for the first time, at most; twice as long each further time, up to a
     /// second.
     std::chrono::milliseconds backOff{10};
-    /// Gives the commit of a merge its author and description; what it is told is the commit that is merged. May be empty.
+    /// Gives the commit of a merge its author and description; it is given the commit that is merged. May be empty.
     std::function<void(Commit& merge, Commit const& merged)> describeMerge;
 };
 
@@ -73,7 +73,7 @@ struct PublishMergingOutcome {
 /// ahead of it; root trees when they are asked for, whole, with one batch for each level; contents when they are asked for,
 /// as `ArchivedBlob` says, and never by anything in here but publishing, of what hosts have added. What has been fetched is
 /// in the storage, also of its clones, and keeps the archive alive, not the repository. Lookups by identifier answer from
-/// the storage and fetch nothing; `Load` brings in others. Counts and tables tell of what is loaded.
+/// the storage and fetch nothing; `Load` brings in others. Counts and tables show what is loaded.
 ///
 /// The archive sees nothing of what is committed here until it is published.
 ///

@@ -95,7 +95,7 @@ struct SalvageReport {
 /// and one page that is damaged loses the segments on it and the versions that are differences to these, nothing else.
 ///
 /// Branches, records and facts that cannot be read to their ends are taken from what pages show, where older ones may be
-/// left over: of several heads that which was stored last. What is missing then, `Verify` tells; `Repair` takes it from
+/// left over: of several heads that which was stored last. `Verify` names what is missing then; `Repair` takes it from
 /// another archive.
 /// @param path a file that nobody uses meanwhile
 /// @param progress may be null

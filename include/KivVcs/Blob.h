@@ -67,7 +67,7 @@ public:
 protected:
     /// For a host's class that knows the identifier of its content and gets the content when `GetData` is asked: trees
     /// hold and show such a blob as fast as any, by @p digest and as "100644 blob", without asking it. The digest stays as
-    /// long as the object lives; a copy is told again, by the host's copy constructor, and assignment does not change it.
+    /// long as the object lives, assignment included; that of a copy is what the host's copy constructor hands to this one.
     explicit Blob(Id::Digest const& digest) noexcept : Object(digest) {}
 
     /// A copy of an object of a host's class, which nobody else holds; by default a `Blob` with what `GetData` gives. The

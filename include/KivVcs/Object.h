@@ -26,7 +26,8 @@ public:
     /// Whether both objects have the same identifier, and so the same content.
     virtual bool operator==(IObject const& other) const = 0;
     virtual bool operator!=(IObject const& other) const = 0;
-    /// The identifier of the packed form. A commit asks its parent's: hosts identify long chains as they build them.
+    /// The identifier of the packed form. That of a commit asks for its parent's, one call deeper for each: a host that
+    /// overrides this for commits asks for it as it makes them.
     virtual Id GetId() const = 0;
     /// The type word: "blob", "tree" or "commit".
     [[nodiscard]] virtual KivStringT<char> GetHeader() const = 0;
@@ -51,8 +52,9 @@ protected:
 /// The base of blobs, trees and commits: caches the identifier and the packed form of the content.
 ///
 /// What is asked for is computed on first use and kept until `ResetState`; references to packed forms and data are
-/// valid until then, or until the object dies. A copy carries what is kept. It is of one state: a form asked for after
-/// the identifier is the one that the identifier was computed from, even if the content changed without `ResetState`.
+/// valid until then, or until the object dies. A copy carries what is kept. All that is kept is of one state: a packed form
+/// that is asked for after the identifier is the one that the identifier was computed from, even if the content changed
+/// without `ResetState`.
 ///
 /// Hosts may derive from the library's classes and override what they like: of such an object everything is asked of
 /// its virtual operations. Objects of exactly `Blob`, `Tree` or `Commit` are known to do as those classes do.
@@ -78,7 +80,7 @@ public:
     [[nodiscard]] virtual bool IsOfHostClass() const noexcept { return true; }
 
     /// The digest of the identifier, valid until `ResetState`; null if that would have to be asked for: of an
-    /// object of a host's class that has not told it, and of one whose identifier has not been computed yet.
+    /// object of a host's class that was made without it, and of one whose identifier has not been computed yet.
     [[nodiscard]] Id::Digest const* GetKnownDigest() const noexcept {
         if (id_.IsOwn())
             return &id_.Digest();
@@ -102,8 +104,8 @@ public:
 
 protected:
     Object() noexcept = default;
-    /// An object with a known identifier, which a state that is reset leaves as it is.
-    explicit Object(Id::Digest const& digest) noexcept { id_.Tell(Id::FromDigest(digest)); }
+    /// An object of which the host knows the identifier; `ResetState` leaves it as it is.
+    explicit Object(Id::Digest const& digest) noexcept { id_.Assign(Id::FromDigest(digest)); }
     Object(Object const& other) : IObject(other) { TakeKept(other); }
     Object(Object&& other) noexcept : IObject(other) { TakeKept(std::move(other)); }
     Object& operator=(Object const& other) {

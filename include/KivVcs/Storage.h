@@ -11,8 +11,8 @@
 
 namespace KivVcs {
 
-/// A keyed container of objects and the table of branches. It never computes content: an object is filed under the
-/// identifier that it reports when it is added, and handed back by shared reference. The order of the operations is
+/// Objects by identifier and the table of branches. It never computes content: an object is held under the
+/// identifier that it reports when it is added, and returned as the same object. The order of the operations is
 /// part of the binary interface.
 ///
 /// Threads: the `const` operations may run concurrently; everything else needs exclusive use.

@@ -171,8 +171,8 @@ struct TreeAccess {
     [[nodiscard]] static EntryTable& Entries(Tree& tree) noexcept { return tree.entries_; }
     [[nodiscard]] static EntryTable const& Entries(Tree const& tree) noexcept { return tree.entries_; }
 
-    /// What an entry becomes that adds @p object: the storage's instance. An object that only the caller holds is stored
-    /// itself, any other as a copy, unless there is one.
+    /// The storage's instance of @p object, which an entry then holds. If there is none yet, an object that only the caller
+    /// holds is stored itself, any other as a copy.
     template <class T>
     [[nodiscard]] static cow_ptr<T> Stored(IRepository& repo, cow_ptr<T> object);
 };

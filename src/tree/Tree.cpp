@@ -91,7 +91,7 @@ cow_ptr<T> Tree::SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T co
     const KivStringT<char16_t> changed = *known;
     const std::uint64_t sizeBefore = entries_.Top()->Total().packedSize;
     entries_.Set(name, stored);
-    // The way of the digest up to the entry stays as it was, as long as the whole is as long.
+    // As long as the packed form keeps its size, what the digest has passed before this entry stays valid.
     detail::DigestTrail trail = std::move(trail_);
     ResetState();
     if (entries_.Top()->Total().packedSize == sizeBefore) {

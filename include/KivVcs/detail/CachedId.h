@@ -15,7 +15,7 @@ namespace KivVcs::detail {
 ///
 /// A copy takes it along before anybody knows of which class the copy will be. It counts for an object of the kind that
 /// it is that of; for another it is never looked at, and gives way to the one that the object computes itself. One that a
-/// host has told stays with the object that it was told of, and is not taken along.
+/// host has assigned stays with its object, and is not taken along.
 class CachedId {
 public:
     CachedId() noexcept = default;
@@ -23,7 +23,7 @@ public:
     CachedId& operator=(CachedId const&) = delete;
     ~CachedId() = default;
 
-    /// Whether there is an identifier that is known to be that of a library's object, or that a host has told.
+    /// Whether there is an identifier that is known to be that of a library's object, or that a host has assigned.
     [[nodiscard]] bool IsOwn() const noexcept { return state_.Get() >= State::Own; }
     /// Whether there is one that will be, should the object be a library's.
     [[nodiscard]] bool IsCopied() const noexcept { return state_.Get() == State::Copied; }
@@ -39,10 +39,10 @@ public:
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
     /// Keeps an identifier from now on, whatever changes.
-    void Tell(Id const& id) noexcept {
+    void Assign(Id const& id) noexcept {
         digest_ = *id.GetDigest();
         KeepHash(id.Hash());
-        state_.Set(State::Told);
+        state_.Set(State::Assigned);
     }
 
     /// Says that the object with a copied identifier is a library's.
@@ -72,12 +72,12 @@ public:
     }
 
     void Reset() noexcept {
-        if (state_.Get() != State::Told)
+        if (state_.Get() != State::Assigned)
             state_.Set(State::Empty);
     }
 
 private:
-    enum class State : std::uint32_t { Empty, Writing, Copied, Hosts, Own, Told };
+    enum class State : std::uint32_t { Empty, Writing, Copied, Hosts, Own, Assigned };
     using Hash = std::array<std::byte, sizeof(std::size_t)>;
 
     void KeepHash(std::size_t hash) const noexcept { std::memcpy(hash_.data(), &hash, sizeof hash); }
