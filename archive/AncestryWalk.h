@@ -17,6 +17,7 @@ template <class LookUp>
     constexpr std::size_t maximumReserved = 4096;
     found.reserve(std::min(commits.size() + std::min(more, maximumReserved), maximumReserved));
     std::unordered_set<Id> met;
+    met.reserve(found.capacity());
     auto const meet = [&](Id const& id) {
         if (id.IsEmpty() || !met.insert(id).second)
             return false;

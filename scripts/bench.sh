@@ -4,7 +4,8 @@
 # Installs what is missing, builds the benchmarks and runs those whose names match FILTER, each workload, its contender and its
 # floor in turn, and prints one table with the medians over nine rounds; build/bench/result.json holds the numbers. --quick
 # runs a quarter of each size and less, which takes a minute; --plot adds a sixteenth and draws build/bench/performance.svg.
-# With `archive` or `vault` as FILTER it runs that beside git instead, and prints one table with the limits that it keeps to.
+# With `archive` or `vault` as FILTER it runs that beside git instead, and prints one table with the limits that it keeps to;
+# `archive` may be followed by the names of some of its rows: files, text, source, history, million, large, edits.
 # With `postgres` as FILTER it runs archives in a database beside bare transactions and archives in files.
 # --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
 # says by over 5 %; --update writes that file. docs/performance.md says what is measured.
@@ -48,11 +49,11 @@ case $mode in
 *) mode= ;;
 esac
 if [[ ${1:-} == archive ]]; then
-    [[ $# -eq 1 && ${mode:---quick} == --quick ]] || usage 1
+    [[ ${mode:---quick} == --quick ]] || usage 1
     install_packages build archive bench demo
-    build_preset bench
+    build_preset bench-static
     exec /usr/bin/python3 "$source_directory/bench/archive/compare.py" "$build_directory/bench/kivvcs_archive_bench" \
-        ${mode:+"$mode"}
+        ${mode:+"$mode"} "${@:2}"
 fi
 if [[ ${1:-} == vault ]]; then
     [[ $# -eq 1 && ${mode:---quick} == --quick ]] || usage 1

@@ -153,6 +153,28 @@ std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
     return RowOf(database, query, 0);
 }
 
+std::vector<std::optional<ObjectRow>> FindRows(Database& database, std::span<const Id> ids) {
+    constexpr std::size_t atOnce = 32;
+    static std::string const sql = [] {
+        std::string values = "(0, ?)";
+        for (std::size_t i = 1; i < atOnce; ++i)
+            values += ", (" + std::to_string(i) + ", ?)";
+        return "SELECT column1, type, segment, member FROM (VALUES " + values + ") CROSS JOIN objects ON id=column2";
+    }();
+    std::vector<std::optional<ObjectRow>> rows(ids.size());
+    std::size_t begin = 0;
+    for (; ids.size() - begin >= atOnce; begin += atOnce) {
+        Query query(database, sql.c_str());
+        for (Id const& id : ids.subspan(begin, atOnce))
+            query.With(DigestOf(id));
+        while (query.Next())
+            rows.at(begin + static_cast<std::size_t>(query.Number(0))) = RowOf(database, query, 1);
+    }
+    for (; begin < ids.size(); ++begin)
+        rows[begin] = FindRow(database, ids[begin]);
+    return rows;
+}
+
 std::vector<Id> SqliteStore::PiecesOf(SegmentReader& reader, ObjectRow const& row) {
     return ReadDigests(reader.FormAt(row.place).bytes);
 }

@@ -27,10 +27,10 @@ bool ByPlace(FoundRow const& left, FoundRow const& right) noexcept {
 std::vector<FoundRow> Locate(Database& database, std::span<const Id> ids, std::vector<Id>* missing) {
     std::vector<FoundRow> found;
     found.reserve(ids.size());
+    auto const rows = FindRows(database, ids);
     for (std::size_t i = 0; i < ids.size(); ++i) {
-        auto const row = FindRow(database, ids[i]);
-        if (row && row->type != StoredType::Piece)
-            found.push_back({i, *row});
+        if (rows[i] && rows[i]->type != StoredType::Piece)
+            found.push_back({i, *rows[i]});
         else if (missing != nullptr)
             missing->push_back(ids[i]);
     }

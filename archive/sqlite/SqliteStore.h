@@ -107,6 +107,8 @@ struct ObjectRow {
 
 /// The row of @p id; none if it is not there.
 [[nodiscard]] std::optional<ObjectRow> FindRow(Database& database, Id const& id);
+/// The rows of all of @p ids, with a statement for many of them.
+[[nodiscard]] std::vector<std::optional<ObjectRow>> FindRows(Database& database, std::span<const Id> ids);
 
 /// What is behind one `SqliteArchive`.
 class SqliteStore {

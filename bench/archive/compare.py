@@ -262,11 +262,11 @@ def large_content(directory):
     fetched = archive("fetch", store, target)
     if subprocess.run(["cmp", path, target], check=False).returncode != 0:
         sys.exit("what was fetched differs")
-    row(f"store a content of {size // 1048576} MiB: time", "", seconds(stored.seconds), None, None)
+    row(f"publish a file of {size // 1048576} MiB: time", "", seconds(stored.seconds), None, None)
     row("    memory", "64 MiB", f"{stored.memory:.1f} MiB", stored.memory / 64, 1.0)
     wal = number_of(stored.output, "wal_mib")
     row("    write-ahead log", "64 MiB", f"{wal:.1f} MiB", wal / 64, 1.0)
-    row("fetch it: time", "", seconds(fetched.seconds), None, None)
+    row("restore it: time", "", seconds(fetched.seconds), None, None)
     row("    memory", "64 MiB", f"{fetched.memory:.1f} MiB", fetched.memory / 64, 1.0)
 
 

@@ -8,12 +8,10 @@
 //   commits ARCHIVE COUNT         makes commits of one empty tree
 //   directory ARCHIVE COUNT EDITS edits one entry of a directory again and again, and prints times and growth
 //   edits ARCHIVE COUNT           publishes one change again and again, and prints the times
-//   store ARCHIVE FILE, fetch ARCHIVE FILE    streams one content in, and out
+//   store ARCHIVE FILE            publishes one large file, fetch ARCHIVE FILE restores it
 
 #include "OpenArchive.h"
 #include "Publishing.h"
-
-#include <KivVcs/SHADigest256.h>
 
 #include <algorithm>
 #include <chrono>
@@ -33,10 +31,6 @@ constexpr unsigned workers = 2;
 
 double Seconds(std::chrono::steady_clock::time_point since) {
     return std::chrono::duration<double>(std::chrono::steady_clock::now() - since).count();
-}
-
-std::string TextOf(std::span<const std::byte> bytes) {
-    return {reinterpret_cast<const char*>(bytes.data()), bytes.size()};
 }
 
 Id HeadOf(IArchive& archive) {
@@ -177,106 +171,65 @@ void PrintTimes(const char* what, std::vector<double> times) {
                 times.back() * 1e3);
 }
 
-void EditDirectory(IArchive& archive, std::size_t count, std::size_t edits) {
-    std::string data;
-    std::vector<std::size_t> positions;
-    for (std::size_t i = 0; i < count; ++i) {
-        std::string name = std::to_string(1000000 + i);
-        data += "100644 blob file" + name + ".txt" + '\0';
-        positions.push_back(data.size());
-        data += DigitsOf(Identify(ObjectType::Blob, BufferOf(name)));
-    }
-    Id head;
-    Id before;
-    std::vector<double> times;
-    std::vector<double> hashing;
-    std::uint64_t sizeAtFirst = 0;
-    std::string const author = "Ada <ada@example.org> 1700000000 +0100\n";
-    for (std::size_t edit = 0; edit <= edits; ++edit) {
-        Buffer const blob = BufferOf("edit " + std::to_string(edit));
-        Id const blobId = Identify(ObjectType::Blob, blob);
-        data.replace(positions[edit * 7919 % count], 64, DigitsOf(blobId));
-        Buffer const tree = BufferOf(data);
-        auto const hashStart = std::chrono::steady_clock::now();
-        Id const treeId = Identify(ObjectType::Tree, tree);
-        hashing.push_back(Seconds(hashStart));
-        std::string const parent = head.IsEmpty() ? "" : "parent " + DigitsOf(head) + "\n";
-        Buffer const commit = BufferOf("tree " + DigitsOf(treeId) + "\n" + parent + "author " + author + "committer " +
-                                       author + "\nedit " + std::to_string(edit) + "\n");
-        Id const id = Identify(ObjectType::Commit, commit);
-        Change change;
-        change.objects = {{blobId, ObjectType::Blob, blob, {}},
-                          {treeId, ObjectType::Tree, tree, before},
-                          {id, ObjectType::Commit, commit, {}}};
-        if (!before.IsEmpty())
-            change.relied = {before};
-        change.ancestry = {{id, head, treeId, {}}};
-        change.branches = {{u"master", head, id}};
-        auto const start = std::chrono::steady_clock::now();
-        archive.Apply(change);
-        times.push_back(Seconds(start));
-        if (edit == 0)
-            sizeAtFirst = archive.GetStatistics().bytes;
-        head = id;
-        before = treeId;
-    }
-    std::sort(hashing.begin(), hashing.end());
-    times.erase(times.begin());
-    for (double& time : times)
-        time += hashing[hashing.size() / 2];
-    PrintTimes("directory", times);
-    std::printf("hash_ms=%.3f growth=%.0f\n", hashing[hashing.size() / 2] * 1e3,
-                static_cast<double>(archive.GetStatistics().bytes - sizeAtFirst) / static_cast<double>(edits));
+/// Commits a file of that content, and publishes it. @return the seconds that took, until the disk has it
+double PublishEdit(ArchivedRepository& repository, KivStringT<char16_t> const& path, std::string const& content) {
+    auto const start = std::chrono::steady_clock::now();
+    KivVcs::Commit commit(&repository, false);
+    commit.AddBlob(&repository, path, KivVcs::Blob::CopyText(content));
+    commit.SetDescription(u"edit");
+    if (!repository.DoCommit(commit) || !repository.Publish().published)
+        throw std::runtime_error("an edit was not published");
+    return Seconds(start);
 }
 
-void Edits(IArchive& archive, int count) {
-    Publisher publisher(archive, workers);
-    for (int i = 0; i < 1000; ++i)
-        publisher.Set("d" + std::to_string(i % 20) + "/file" + std::to_string(i), "content " + std::to_string(i));
-    publisher.Commit("start");
+/// Commits and publishes files of these paths, each with its number for a content.
+void PublishFiles(ArchivedRepository& repository, std::vector<KivStringT<char16_t>> const& paths) {
+    std::vector<KivVcs::BlobAtPath> blobs;
+    for (std::size_t i = 0; i < paths.size(); ++i)
+        blobs.push_back({paths[i], KivVcs::immu::make<KivVcs::Blob>(KivVcs::Blob::CopyText(std::to_string(i)))});
+    KivVcs::Commit commit(&repository, false);
+    commit.AddBlobs(&repository, blobs);
+    if (!repository.DoCommit(commit) || !repository.Publish().published)
+        throw std::runtime_error("the files were not published");
+}
+
+void EditDirectory(std::shared_ptr<IArchive> const& archive, std::size_t count, std::size_t edits) {
+    ArchivedRepository repository(archive);
+    std::vector<KivStringT<char16_t>> paths;
+    for (std::size_t i = 0; i < count; ++i)
+        paths.push_back(KivVcs::FromUtf8("file" + std::to_string(1000000 + i) + ".txt"));
+    PublishFiles(repository, paths);
+    std::uint64_t const sizeAtFirst = archive->GetStatistics().bytes;
     std::vector<double> times;
-    for (int i = 0; i < count; ++i) {
+    std::vector<double> hashing;
+    for (std::size_t edit = 0; edit < edits; ++edit) {
+        times.push_back(PublishEdit(repository, paths[edit * 7919 % count], "edit " + std::to_string(edit)));
+        Buffer const form = repository.GetHead()->GetCommitTree()->GetRoot()->GetData();
         auto const start = std::chrono::steady_clock::now();
-        publisher.Set("d3/file3", "edited " + std::to_string(i) + std::string(2000, 'x'));
-        publisher.Commit("edit " + std::to_string(i));
-        times.push_back(Seconds(start));
+        static_cast<void>(Identify(ObjectType::Tree, form));
+        hashing.push_back(Seconds(start));
     }
+    std::sort(hashing.begin(), hashing.end());
+    PrintTimes("directory", times);
+    std::printf("hash_ms=%.3f growth=%.0f\n", hashing[hashing.size() / 2] * 1e3,
+                static_cast<double>(archive->GetStatistics().bytes - sizeAtFirst) / static_cast<double>(edits));
+}
+
+void Edits(std::shared_ptr<IArchive> const& archive, int count) {
+    ArchivedRepository repository(archive);
+    std::vector<KivStringT<char16_t>> paths;
+    for (int i = 0; i < 1000; ++i)
+        paths.push_back(KivVcs::FromUtf8("d" + std::to_string(i % 20) + "/file" + std::to_string(i)));
+    PublishFiles(repository, paths);
+    std::vector<double> times;
+    for (int i = 0; i < count; ++i)
+        times.push_back(PublishEdit(repository, u"d3/file3", "edited " + std::to_string(i) + std::string(2000, 'x')));
     PrintTimes("edits", times);
 }
 
-/// The file as a stream, so that no more of it is held than is asked for.
-class FileStream final : public KivVcs::IStream {
-public:
-    explicit FileStream(std::string const& path)
-        : file_(path, std::ios::binary), size_(std::filesystem::file_size(path)) {}
-    bool Read(void* destination, std::uint64_t size) override {
-        file_.read(static_cast<char*>(destination), static_cast<std::streamsize>(size));
-        position_ += size;
-        return static_cast<bool>(file_);
-    }
-    bool Write(const void* /*source*/, std::uint64_t /*size*/) override { return false; }
-    [[nodiscard]] std::uint64_t GetSize() const override { return size_; }
-    [[nodiscard]] std::uint64_t GetPosition() const override { return position_; }
+constexpr const char16_t* nameOfLarge = u"large";
 
-private:
-    std::ifstream file_;
-    std::uint64_t size_;
-    std::uint64_t position_ = 0;
-};
-
-void StoreFile(IArchive& archive, std::string const& path, std::string const& archivePath) {
-    KivVcs::SHADigest256 digest;
-    std::uint64_t const size = std::filesystem::file_size(path);
-    std::string const header = "blob " + std::to_string(size);
-    digest.InitData(header.c_str(), header.size() + 1);
-    std::string piece(largestWholeContent, '\0');
-    for (std::ifstream file(path, std::ios::binary); file;) {
-        file.read(piece.data(), static_cast<std::streamsize>(piece.size()));
-        digest.InitData(piece.data(), static_cast<std::size_t>(file.gcount()));
-    }
-    Id::Digest bytes{};
-    digest.FinalDigest(bytes.data());
-    Id const id = Id::FromDigest(bytes);
+void StoreLarge(std::shared_ptr<IArchive> const& archive, std::string const& path, std::string const& archivePath) {
     struct Watch final : IProgress {
         bool Report(Progress const& /*progress*/) override {
             std::error_code none;
@@ -288,27 +241,18 @@ void StoreFile(IArchive& archive, std::string const& path, std::string const& ar
         std::uint64_t longest = 0;
     } watch;
     watch.file = archivePath;
-    StreamIO stream(KivVcs::Stream(std::make_unique<FileStream>(path)));
-    bool const isStored = archive.StoreContent(id, stream, {}, &watch);
-    Change change;
-    change.records.push_back({{u"content", BufferOf(DigitsOf(id))}, false, {}});
-    archive.Apply(change);
-    std::printf("stored=%d wal_mib=%.1f\n", static_cast<int>(isStored), static_cast<double>(watch.longest) / 1048576);
+    ArchivedRepository repository(archive);
+    KivVcs::Commit commit(&repository, false);
+    auto const blob = repository.StoreFile(path, {}, &watch);
+    if (!blob || !commit.AddBlob(&repository, nameOfLarge, *blob) || !repository.DoCommit(commit) ||
+        !repository.Publish(&watch).published)
+        throw std::runtime_error("the content was not published");
+    std::printf("wal_mib=%.1f\n", static_cast<double>(watch.longest) / 1048576);
 }
 
-void FetchFile(IArchive& archive, std::string const& path) {
-    std::vector<KivStringT<char16_t>> const names{u"content"};
-    Buffer const digits = *archive.ReadRecords(names).at(0).value;
-    StreamIO content = ContentStream(archive, IdOfDigits(TextOf(*digits.LockForRead().begin())));
-    std::ofstream file(path, std::ios::binary);
-    std::string piece(largestWholeContent, '\0');
-    for (std::uint64_t rest = content.GetSize(); rest > 0;) {
-        std::uint64_t const size = std::min<std::uint64_t>(rest, piece.size());
-        if (!content.Read(piece.data(), size))
-            throw std::runtime_error("the content cannot be read");
-        file.write(piece.data(), static_cast<std::streamsize>(size));
-        rest -= size;
-    }
+void FetchLarge(std::shared_ptr<IArchive> const& archive, std::string const& path) {
+    ArchivedRepository repository(archive);
+    repository.RestoreFile(repository.GetHead()->GetBlob(nameOfLarge)->GetId(), path);
 }
 
 /// Writes the most memory that this process has had, in MiB, where it is asked for.
@@ -328,7 +272,7 @@ int Run(std::vector<std::string> const& arguments) {
     std::string const& command = arguments[0];
     if (command == "start")
         return 0;
-    auto const opened = OpenArchive(arguments[1], workers);
+    std::shared_ptr<IArchive> const opened = OpenArchive(arguments[1], workers);
     IArchive& archive = *opened;
     auto const argument = [&](std::size_t i) { return arguments.at(i + 2); };
     auto const number = [&](std::size_t i) { return std::stoi(argument(i)); };
@@ -347,13 +291,13 @@ int Run(std::vector<std::string> const& arguments) {
     } else if (command == "commits") {
         Commits(archive, number(0));
     } else if (command == "directory") {
-        EditDirectory(archive, static_cast<std::size_t>(number(0)), static_cast<std::size_t>(number(1)));
+        EditDirectory(opened, static_cast<std::size_t>(number(0)), static_cast<std::size_t>(number(1)));
     } else if (command == "edits") {
-        Edits(archive, number(0));
+        Edits(opened, number(0));
     } else if (command == "store") {
-        StoreFile(archive, argument(0), arguments[1]);
+        StoreLarge(opened, argument(0), arguments[1]);
     } else if (command == "fetch") {
-        FetchFile(archive, argument(0));
+        FetchLarge(opened, argument(0));
     } else {
         throw std::invalid_argument("there is no command " + command);
     }

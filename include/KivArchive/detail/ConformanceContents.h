@@ -42,11 +42,16 @@ inline void CheckObjects(Trial& trial, IArchive& archive) {
         trial.Expect(info.size() == 1 && info[0].type == object.type && info[0].size == object.data.GetSize(),
                      "types and sizes are reported");
     }
-    Id const unknown = Object(ObjectType::Blob, "unknown").id;
-    std::vector<Id> const asked{ids[1], unknown, ids[7]};
+    std::vector<Id> asked;
+    std::vector<Id> unknown;
+    for (std::size_t i = 0; i < 100; ++i) {
+        asked.push_back(ids[i]);
+        if (i % 3 == 0)
+            asked.push_back(unknown.emplace_back(Object(ObjectType::Blob, "unknown " + std::to_string(i)).id));
+    }
     ReadOutcome const outcome = archive.Read(asked, [](ArchivedObject const&) {});
-    trial.Expect(outcome.missing == std::vector<Id>{unknown} && outcome.damaged.empty(),
-                 "missing objects are reported");
+    trial.Expect(outcome.missing == unknown && outcome.damaged.empty() && archive.FindMissing(asked) == unknown,
+                 "missing objects are reported, in order");
 
     // Page by page in ascending order.
     std::vector<Id> listed;
