@@ -6,6 +6,7 @@
 #include "Bytes.h"
 #include "Changes.h"
 #include "Items.h"
+#include "Parallel.h"
 
 #include <algorithm>
 #include <optional>
@@ -72,19 +73,32 @@ inline std::vector<Id> ReadDigests(ByteView list) {
 
 /// Stores a content: a large one as its pieces, some at a time, and then as the list of them.
 /// @param earlierPieces those of the content that it replaces
+/// @param workers how many threads hash pieces; 0 stands for as many as there are processors
 /// @param file what failures name
 /// @param store takes items and what they rely on
 /// @return false if the content cannot be read to its end, or is not what @p id says
 template <class Store>
 [[nodiscard]] bool StoreInPieces(Id const& id, StreamIO& content, Id const& earlier,
-                                 std::vector<Id> const& earlierPieces, std::string const& file, IProgress* progress,
-                                 Store store) {
+                                 std::vector<Id> const& earlierPieces, unsigned workers, std::string const& file,
+                                 IProgress* progress, Store store) {
     std::uint64_t const size = RestOf(content);
     bool const isLarge = size > largestWholeContent;
     PieceReader pieces(content, size);
     Item whole{id, isLarge ? StoredType::LargeBlob : StoredType::Blob, size, {}, isLarge ? Id() : earlier};
     Change last;
     std::vector<Item> window;
+    Compressor unused;
+    auto const storeWindow = [&] {
+        ForEachInParallel(window.size(), workers, unused, [&window](std::size_t index, Compressor&) {
+            window[index].id = DigestOfBytes(BytesOf(window[index].data));
+        });
+        for (Item const& piece : window) {
+            AppendDigest(whole.data, piece.id);
+            last.relied.push_back(piece.id);
+        }
+        store(window, Change());
+        window.clear();
+    };
     for (std::uint64_t number = 0; !pieces.IsAtEnd(); ++number) {
         ReportProgress(progress, {"storing a content", number * largestWholeContent, size}, file);
         auto piece = pieces.Next();
@@ -94,15 +108,10 @@ template <class Store>
             whole.data = *piece;
             break;
         }
-        Id digest = DigestOfBytes(BytesOf(*piece));
-        AppendDigest(whole.data, digest);
-        last.relied.push_back(digest);
         Id const before = number < earlierPieces.size() ? earlierPieces[static_cast<std::size_t>(number)] : Id();
-        window.push_back({std::move(digest), StoredType::Piece, piece->GetSize(), *piece, before});
-        if (window.size() == piecesAtOnce || pieces.IsAtEnd()) {
-            store(window, Change());
-            window.clear();
-        }
+        window.push_back({Id(), StoredType::Piece, piece->GetSize(), *piece, before});
+        if (window.size() == piecesAtOnce || pieces.IsAtEnd())
+            storeWindow();
     }
     ReportProgress(progress, {"storing a content", size, size}, file);
     if (!(pieces.Finish() == id))

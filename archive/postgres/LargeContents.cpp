@@ -62,7 +62,7 @@ bool PostgresArchive::StoreContent(Id const& id, StreamIO& content, Id const& ea
         RestOf(content) > largestWholeContent
             ? store_->Run([&](Connection& connection) { return FindPieces(connection, earlier); })
             : std::vector<Id>();
-    return StoreInPieces(id, content, earlier, earlierPieces, store_->Shown(), progress,
+    return StoreInPieces(id, content, earlier, earlierPieces, store_->Options().workers, store_->Shown(), progress,
                          [this](std::vector<Item> const& items, Change const& change) {
                              static_cast<void>(store_->Apply(items, change));
                          });

@@ -18,7 +18,7 @@ bool SqliteArchive::StoreContent(Id const& id, StreamIO& content, Id const& earl
             earlierPieces.clear();
         }
     }
-    return StoreInPieces(id, content, earlier, earlierPieces, store_->path, progress,
+    return StoreInPieces(id, content, earlier, earlierPieces, store_->options.workers, store_->path, progress,
                          [this](std::vector<Item> const& items, Change const& change) {
                              static_cast<void>(store_->Store(items, change));
                          });

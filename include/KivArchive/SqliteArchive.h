@@ -17,7 +17,7 @@ struct SqliteOptions {
     bool create = true;
     /// How long to wait while somebody else writes.
     std::chrono::milliseconds wait{30000};
-    /// How many threads one call may use for compressing; 0 stands for as many as there are processors.
+    /// How many threads one call may use for compressing and hashing; 0 stands for as many as there are processors.
     unsigned workers = 0;
     /// About how much memory to keep stored forms in that differences refer to.
     std::uint64_t cacheBytes = std::uint64_t{32} * 1024 * 1024;
