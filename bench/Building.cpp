@@ -166,9 +166,11 @@ Round OneFileOfMany(std::int64_t count) {
     repo->DoCommit(commit);
     HashFloor floor;
     floor.AddForm(*commit.GetCommitTree()->GetRoot());
+    // One place after the other at this distance, all of them evenly spread however many are taken.
+    const auto step = static_cast<std::int64_t>(0.6180339887 * static_cast<double>(count)) | 1;
     return [=, number = std::int64_t{0}]() mutable {
         Measurement result;
-        const Path path = Numbered("file-", ++number * 7919 % count);
+        const Path path = Numbered("file-", ++number * step % count);
         const MemoryTaken taken;
         const Blob blob(SmallContent(number, 1));
         Commit next(repo.get(), false);

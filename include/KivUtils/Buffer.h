@@ -115,9 +115,9 @@ private:
     /// What a buffer points to: one block of bytes, which are its own or adopted, or a chain of pieces of blocks.
     struct Content : KivPlatform::reference_counted {
         Content(Kind what, std::uint64_t bytes, std::size_t further) noexcept
-            : kind(what), room(further & mostRoom), size(bytes) {}
+            : kind(what), room(further & maximumRoom), size(bytes) {}
 
-        static constexpr std::uint32_t mostRoom = (1U << 30U) - 1;
+        static constexpr std::uint32_t maximumRoom = (1U << 30U) - 1;
 
         Kind kind : 2;
         /// How many bytes a block can take behind those that it has.

@@ -40,7 +40,7 @@ struct Buffer::Block : Content {
     void Write(const std::byte* data, std::size_t count) noexcept {
         std::memcpy(OwnBytes() + size, data, count);
         size += count;
-        room = (room - count) & mostRoom;
+        room = (room - count) & maximumRoom;
     }
 };
 

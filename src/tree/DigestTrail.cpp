@@ -7,11 +7,12 @@ namespace KivVcs::detail {
 namespace {
 
 constexpr std::uint64_t smallestStep = 65536;
-constexpr std::uint64_t mostSteps = 14;
+constexpr std::uint64_t maximumSteps = 22;
 
 /// How far apart the states are of a form of @p size bytes.
 std::uint64_t StepOf(std::uint64_t size) noexcept {
-    return std::max(smallestStep, (size / mostSteps + IdDigest::blockSize) / IdDigest::blockSize * IdDigest::blockSize);
+    return std::max(smallestStep,
+                    (size / maximumSteps + IdDigest::blockSize) / IdDigest::blockSize * IdDigest::blockSize);
 }
 
 /// Where the leaf that holds @p name, or would, begins in what @p top packs.
@@ -60,57 +61,17 @@ private:
 
 } // namespace
 
-/// The states of one form at every step.
-struct DigestTrail::Checkpoints final : KivUtils::reference_counted {
-    std::uint64_t packedSize = 0;
-    std::vector<IdDigest::State> states;
-};
-
-/// What a tree has computed, and what it was handed: that of the tree that it was made from.
-struct DigestTrail::Trail {
-    Trail() noexcept = default;
-    Trail(Trail const& other) noexcept {
-        if (Checkpoints const* const states = other.computed.Get()) {
-            handed = cow_ptr<Checkpoints>::share(states);
-        } else {
-            handed = other.handed;
-            firstChanged = other.firstChanged;
-        }
-    }
-    Trail(Trail&& other) noexcept = default;
-    Trail& operator=(Trail const&) = delete;
-
-    cow_ptr<Checkpoints> handed;
-    /// The first entry that shows something else than it did there; empty if none does.
-    KivStringT<char16_t> firstChanged;
-    Published<Checkpoints> computed;
-};
-
-DigestTrail::DigestTrail() noexcept = default;
-DigestTrail::DigestTrail(DigestTrail const& other) = default;
-DigestTrail::DigestTrail(DigestTrail&& other) noexcept = default;
-DigestTrail& DigestTrail::operator=(DigestTrail other) noexcept {
-    trail_.Swap(other.trail_);
-    return *this;
-}
-DigestTrail::~DigestTrail() = default;
-
-void DigestTrail::Reset() noexcept {
-    trail_.Reset();
-}
-
-void DigestTrail::NoteChange(KivStringT<char16_t> const& name) noexcept {
+void DigestTrail::NoteChange(Node const& top, KivStringViewT<char16_t> name) noexcept {
     if (IsEmpty())
         return;
     // Only the tree that is being changed has this trail.
     auto& trail = const_cast<Trail&>(*trail_.Get());
-    if (Checkpoints const* const states = trail.computed.Get()) {
-        trail.handed = cow_ptr<Checkpoints>::share(states);
+    if (Checkpoints const* const own = trail.computed.Get()) {
+        trail.handed = cow_ptr<Checkpoints>::share(own);
         trail.computed.Reset();
-        trail.firstChanged = {};
+        trail.firstChanged = Trail().firstChanged;
     }
-    if (trail.firstChanged.IsEmpty() || name.Compare(trail.firstChanged) < 0)
-        trail.firstChanged = name;
+    trail.firstChanged = std::min(trail.firstChanged, OffsetOfLeaf(top, name));
 }
 
 Id DigestTrail::ComputeId(Node const& top) const {
@@ -129,7 +90,7 @@ Id DigestTrail::ComputeId(Node const& top) const {
     std::uint64_t offset = 0;
     Trail const* const trail = trail_.Get();
     if (trail != nullptr && trail->handed && trail->handed->packedSize == size) {
-        const std::uint64_t same = trail->firstChanged.IsEmpty() ? size - 1 : OffsetOfLeaf(top, trail->firstChanged);
+        const std::uint64_t same = std::min(trail->firstChanged, size - 1);
         auto const& states = trail->handed->states;
         const auto valid = std::min<std::uint64_t>((headerSize + same) / step, states.size());
         if (valid > 0) {

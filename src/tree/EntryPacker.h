@@ -165,13 +165,18 @@ template <class Take>
 void PackEntries(Node const& top, Cursor cursor, Take take) {
     const bool keepsRuns = KeepsRuns(top);
     EntryPacker packer(take);
-    for (; !cursor.AtEnd(); cursor.NextLeaf()) {
+    while (!cursor.AtEnd()) {
         Node const& leaf = cursor.Leaf();
+        cursor.NextLeaf();
         // What hosts' objects show is theirs to say, each time.
-        if (keepsRuns && leaf.Total().hosts == 0)
-            packer.AddRun(leaf);
-        else
+        if (!keepsRuns || leaf.Total().hosts != 0) {
             packer.Add(leaf);
+            continue;
+        }
+        // A run lies anywhere in memory, so that the next one is better on its way while this one is hashed.
+        if (!cursor.AtEnd())
+            cursor.Leaf().PrefetchPackedRun();
+        packer.AddRun(leaf);
     }
     packer.Flush();
 }

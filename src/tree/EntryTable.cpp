@@ -83,11 +83,6 @@ EntryTable::Place EntryTable::FindPlace(KivStringViewT<char16_t> name) const noe
     return {index, count, exists ? &node->EntryAt(index) : nullptr};
 }
 
-KivStringT<char16_t> const* EntryTable::FindName(KivStringViewT<char16_t> name) const noexcept {
-    Entry const* const entry = FindPlace(name).entry;
-    return entry == nullptr ? nullptr : &entry->name;
-}
-
 Held const* EntryTable::Find(KivStringViewT<char16_t> name) const noexcept {
     Entry const* const entry = FindPlace(name).entry;
     return entry == nullptr ? nullptr : &entry->held;

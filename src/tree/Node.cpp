@@ -193,9 +193,9 @@ void Node::Truncate(int from) noexcept {
 
 void Node::MarkStale(int index) noexcept {
     // With too many of them, another run is worth its memory.
-    constexpr int mostStale = 8;
+    constexpr int maximumStale = 8;
     staleEntries_ |= 1U << static_cast<unsigned>(index);
-    if (std::popcount(staleEntries_) > mostStale)
+    if (std::popcount(staleEntries_) > maximumStale)
         DropPackedRun();
 }
 

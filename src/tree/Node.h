@@ -111,6 +111,8 @@ public:
     /// The packed form of a leaf's entries, made on first use and kept with the leaf and its copies, except for the identifiers
     /// of the entries whose bit is set in `StaleEntries`. @pre there are no hosts' objects
     [[nodiscard]] Buffer const& PackedRun() const;
+    /// Has the processor fetch the beginning of what is kept of it.
+    void PrefetchPackedRun() const noexcept;
     [[nodiscard]] std::uint32_t StaleEntries() const noexcept { return staleEntries_; }
     /// Says that the entry @p index shows another identifier than before, and nothing else.
     void MarkStale(int index) noexcept;

@@ -82,20 +82,13 @@ cow_ptr<T> Tree::SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T co
     if (name.IsEmpty())
         return nullptr;
     cow_ptr<T> stored = StoredInstance(repo, object, own);
-    KivStringT<char16_t> const* const known = trail_.IsEmpty() ? nullptr : entries_.FindName(name);
-    if (known == nullptr) {
-        entries_.Set(name, stored);
-        ResetState();
-        return stored;
-    }
-    const KivStringT<char16_t> changed = *known;
-    const std::uint64_t sizeBefore = entries_.Top()->Total().packedSize;
+    const std::uint64_t sizeBefore = IsEmpty() ? 0 : entries_.Top()->Total().packedSize;
     entries_.Set(name, stored);
     // As long as the packed form keeps its size, what the digest has passed before this entry stays valid.
     detail::DigestTrail trail = std::move(trail_);
     ResetState();
     if (entries_.Top()->Total().packedSize == sizeBefore) {
-        trail.NoteChange(changed);
+        trail.NoteChange(*entries_.Top(), name);
         trail_ = std::move(trail);
     }
     return stored;

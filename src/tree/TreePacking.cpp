@@ -73,6 +73,18 @@ Buffer const& Node::PackedRun() const {
         .bytes;
 }
 
+void Node::PrefetchPackedRun() const noexcept {
+#if defined(__GNUC__)
+    constexpr std::size_t lineSize = 64;
+    Run const* const run = packedRun_.Get();
+    if (run == nullptr)
+        return;
+    const auto bytes = *run->bytes.LockForRead().begin();
+    for (std::size_t at = 0; at < std::min(bytes.size(), 4 * lineSize); at += lineSize)
+        __builtin_prefetch(bytes.data() + at);
+#endif
+}
+
 } // namespace detail
 
 Id Tree::ComputeId() const {

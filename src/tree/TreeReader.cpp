@@ -2,6 +2,7 @@
 #include "KivVcs/IRepository.h"
 #include "objects/PackedForm.h"
 #include "objects/PathComponents.h"
+#include "tree/EntryPacker.h"
 #include "tree/SortedEntries.h"
 
 #include <limits>
@@ -21,8 +22,20 @@ std::string_view TakeUntil(std::string_view& rest, char end) noexcept {
     return taken;
 }
 
-/// The texts that identifiers are, and how much of a packed form is taken at most.
-constexpr std::size_t idLength = 64;
+/// Takes mode and type of an entry off @p rest. @return the type
+std::string_view TakeType(std::string_view& rest) noexcept {
+    // Most are those that our own blobs have.
+    if (rest.starts_with(detail::blobWords)) {
+        rest.remove_prefix(detail::blobWords.size());
+        return "blob";
+    }
+    TakeUntil(rest, ' ');
+    return TakeUntil(rest, ' ');
+}
+
+using detail::idLength;
+
+/// How much of a packed form is taken at most.
 constexpr std::size_t longestText = std::numeric_limits<int>::max();
 
 KivStringViewT<char> ViewOf(std::string_view text) noexcept {
@@ -48,7 +61,7 @@ public:
         KivStringT<char16_t> name = String::ToStringW(ViewOf(packedName));
         if (name.IsEmpty())
             return;
-        if (KivStringViewT<char16_t>(name).Find(u"/") >= 0) {
+        if (packedName.find('/') != std::string_view::npos) {
             Gather();
             tree_.AddObjectToTree<T>(&repo, PathComponents(name), *object);
             return;
@@ -147,8 +160,7 @@ private:
             EnterWaiting();
             return FinishFrame(repo_.SyncWithStorage(immu::make<Tree>(frame.directory.Take())));
         }
-        TakeUntil(frame.rest, ' ');
-        const std::string_view type = TakeUntil(frame.rest, ' ');
+        const std::string_view type = TakeType(frame.rest);
         const std::string_view name = TakeUntil(frame.rest, '\0');
         const Id id = ReadId(ViewOf(frame.rest.substr(0, idLength)));
         frame.rest.remove_prefix(std::min(idLength, frame.rest.size()));
@@ -212,6 +224,13 @@ private:
                            [&](auto const& blob) { return blob.isRead && blob.id == id; });
     }
 
+    /// Whether a blob that has been identified is the one that was asked for.
+    [[nodiscard]] static bool IsAsNamed(WaitingBlob const& waiting) noexcept {
+        Id::Digest const* const wanted = waiting.id.GetDigest();
+        Id::Digest const* const own = waiting.blob->GetKnownDigest();
+        return wanted != nullptr && own != nullptr && *wanted == *own;
+    }
+
     /// Identifies the blobs that wait, all at once, and enters them in their order.
     void EnterWaiting() {
         for (WaitingBlob const& waiting : waiting_) {
@@ -221,7 +240,7 @@ private:
         Identify(unidentified_);
         unidentified_.clear();
         for (WaitingBlob& waiting : waiting_) {
-            if (waiting.isRead && waiting.blob->GetId() != waiting.id)
+            if (waiting.isRead && !IsAsNamed(waiting))
                 misnamedBlobs_.emplace(waiting.id, waiting.blob);
             frames_.back().directory.Add(repo_, waiting.name, std::move(waiting.blob));
         }

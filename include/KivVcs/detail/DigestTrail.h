@@ -2,6 +2,10 @@
 
 #include "KivVcs/Id.h"
 
+#include <array>
+#include <limits>
+#include <vector>
+
 namespace KivVcs::detail {
 
 class Node;
@@ -13,23 +17,41 @@ class Node;
 /// Threads: the `const` operations may run concurrently, and copies be made. Everything else needs exclusive use.
 class DigestTrail {
 public:
-    DigestTrail() noexcept;
-    DigestTrail(DigestTrail const& other);
-    DigestTrail(DigestTrail&& other) noexcept;
-    DigestTrail& operator=(DigestTrail other) noexcept;
-    ~DigestTrail();
-
-    /// Says that the entry @p name shows another object, in as many bytes.
-    void NoteChange(KivStringT<char16_t> const& name) noexcept;
-    void Reset() noexcept;
+    /// Says that the entry @p name below @p top shows another object, in as many bytes.
+    void NoteChange(Node const& top, KivStringViewT<char16_t> name) noexcept;
+    void Reset() noexcept { trail_.Reset(); }
     [[nodiscard]] bool IsEmpty() const noexcept { return trail_.Get() == nullptr; }
 
     /// The identifier of a tree of the entries below @p top, none of which show hosts' objects.
     [[nodiscard]] Id ComputeId(Node const& top) const;
 
 private:
-    struct Checkpoints;
-    struct Trail;
+    /// The states of one form at every step.
+    struct Checkpoints final : KivUtils::reference_counted {
+        std::uint64_t packedSize = 0;
+        std::vector<std::array<std::uint32_t, 8>> states;
+    };
+
+    /// What a tree has computed, and what it was handed: that of the tree that it was made from.
+    struct Trail {
+        Trail() noexcept = default;
+        Trail(Trail const& other) noexcept {
+            if (Checkpoints const* const own = other.computed.Get()) {
+                handed = cow_ptr<Checkpoints>::share(own);
+            } else {
+                handed = other.handed;
+                firstChanged = other.firstChanged;
+            }
+        }
+        Trail(Trail&& other) noexcept = default;
+        Trail& operator=(Trail const&) = delete;
+        ~Trail() = default;
+
+        cow_ptr<Checkpoints> handed;
+        /// The first byte of the form that may differ from what it was there; the largest number if none does.
+        std::uint64_t firstChanged = std::numeric_limits<std::uint64_t>::max();
+        Published<Checkpoints> computed;
+    };
 
     Published<Trail> trail_;
 };

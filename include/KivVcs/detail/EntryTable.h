@@ -30,9 +30,6 @@ public:
     /// What is held under @p name; null if nothing is. Valid until the next edit.
     [[nodiscard]] Held const* Find(KivStringViewT<char16_t> name) const noexcept;
 
-    /// The text that the entry @p name has its name in; null if there is no such entry. Valid until the next edit.
-    [[nodiscard]] KivStringT<char16_t> const* FindName(KivStringViewT<char16_t> name) const noexcept;
-
     /// Makes @p child, a blob or a tree or null, what is held of its kind under @p name; the other kind stays beside it. A
     /// new entry shares @p text, which is the name, if that is given.
     template <class T>
