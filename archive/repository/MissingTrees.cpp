@@ -28,15 +28,13 @@ void MissingTrees::Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier) {
 }
 
 void MissingTrees::Find() {
-    std::size_t listed = 0;
     while (!toAskFor_.empty()) {
         for (Id& id : archive_.FindMissing(std::exchange(toAskFor_, {})))
             missing_.insert(std::move(id));
         // Those that are added meanwhile wait for the next batch, unless an earlier version says what is new in them.
-        std::size_t const end = directories_.size();
-        for (; listed < end; ++listed)
-            if (IsMissing(directories_[listed].id) && !directories_[listed].isListed)
-                List(listed);
+        for (std::size_t const end = directories_.size(); looked_ < end; ++looked_)
+            if (IsMissing(directories_[looked_].id) && !directories_[looked_].isListed)
+                List(looked_);
     }
 }
 
@@ -61,10 +59,24 @@ void MissingTrees::List(std::size_t number) {
         directories_[next].isListed = true;
         ListFiles(next);
         ListSubdirectories(next);
+        bool const isWhole = !directories_[next].earlier;
         for (std::size_t const subdirectory : directories_[next].subdirectories)
-            if (directories_[subdirectory].earlier)
+            if (isWhole ? ListsWholeNow(subdirectory) : directories_[subdirectory].earlier != nullptr)
                 open.push_back(subdirectory);
     }
+}
+
+/// A directory whose holder brings all of it is listed whole, also if it was met before, in a later version that came back
+/// to it: what is new in it against the versions between is nothing, and these may only say what they have besides.
+/// @return whether that is to be done at once, since its turn has passed
+bool MissingTrees::ListsWholeNow(std::size_t number) {
+    NewDirectory& directory = directories_[number];
+    if (!directory.earlier)
+        return false;
+    directory.earlier = nullptr;
+    directory.isListed = false;
+    directory.files.clear();
+    return number < looked_ && IsMissing(directory.id);
 }
 
 void MissingTrees::ListFiles(std::size_t number) {

@@ -61,6 +61,7 @@ public:
 
 private:
     void List(std::size_t number);
+    [[nodiscard]] bool ListsWholeNow(std::size_t number);
     void ListFiles(std::size_t number);
     void ListSubdirectories(std::size_t number);
     std::size_t AddDirectory(NewDirectory directory);
@@ -70,6 +71,8 @@ private:
 
     IArchive& archive_;
     std::vector<NewDirectory> directories_;
+    /// How many directories have been looked at since the archive was asked about them.
+    std::size_t looked_ = 0;
     std::unordered_map<Id, std::size_t> numbers_;
     std::vector<Id> toAskFor_;
     std::unordered_set<Id> asked_;

@@ -2,6 +2,7 @@
 #include "ForwardingArchive.h"
 #include "KivArchive/ArchivedRepository.h"
 #include "KivArchive/MemArchive.h"
+#include "KivArchive/Upkeep.h"
 #include "support/Builders.h"
 
 #include <KivVcs/History.h>
@@ -131,6 +132,27 @@ TEST(ArchivedRepository, PublishesOnlyWhatIsNew) {
     EXPECT_LE(archive->relied, 4U);
     EXPECT_EQ(archive->calls - callsBefore, 2U);
     EXPECT_EQ(ProblemsOf(*archive), "");
+}
+
+/// What a version came back to is as new as what it is put on does not have it, whatever the versions between had.
+TEST(ArchivedRepository, PublishesWhatVersionsCameBackTo) {
+    auto const archive = std::make_shared<MemArchive>();
+    ArchivedRepository here(archive);
+    auto const base = CommitFiles(here, "keep=0", "base");
+    here.Publish();
+    CommitFiles(here, "d/e/b=1", "added");
+    CommitFiles(here, "d/a=1", "more");
+    CommitFiles(here, "-d/a b=1", "back");
+    ArchivedRepository there(archive);
+    CommitFiles(there, "a=1", "theirs");
+    there.Publish();
+    here.Refresh();
+    Id const published = here.GetPublishedHead(u"master");
+    here.Load({&published, 1});
+    here.MoveBranchTo(u"master", here.MergelessRebase(here.GetHead(), base, here.GetCommitFromStorage(published)));
+    EXPECT_TRUE(here.Publish().published);
+    EXPECT_TRUE(Verify(*archive, nullptr).IsSound());
+    EXPECT_EQ(FilesOf(ArchivedRepository(archive).GetHead()), "b=1 d/e/b=1 keep=0");
 }
 
 TEST(ArchivedRepository, BranchesMoveByCompareAndSwap) {
