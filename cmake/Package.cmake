@@ -39,15 +39,12 @@ set(CPACK_DEBIAN_DEVELOPMENT_DESCRIPTION "Headers of KivVcs, version control for
 
 set(CPACK_DEBIAN_VAULT_PACKAGE_NAME kivvcs-vault)
 set(CPACK_DEBIAN_VAULT_PACKAGE_SECTION vcs)
+# The program itself stands alone where it could be linked so.
 set(CPACK_COMPONENT_VAULT_DEPENDS runtime)
-if(TARGET vault)
-    get_target_property(kivvcs_vault_libraries vault LINK_LIBRARIES)
-    if(kivvcs_vault_libraries MATCHES Archive)
-        list(APPEND CPACK_COMPONENT_VAULT_DEPENDS archive-runtime)
-    endif()
-    if(kivvcs_vault_libraries MATCHES ArchivePostgres)
-        list(APPEND CPACK_COMPONENT_VAULT_DEPENDS archive-postgres-runtime)
-    endif()
+if(TARGET vault-database)
+    list(APPEND CPACK_COMPONENT_VAULT_DEPENDS archive-runtime archive-postgres-runtime)
+elseif(TARGET vault AND NOT VAULT_STATIC)
+    list(APPEND CPACK_COMPONENT_VAULT_DEPENDS archive-runtime)
 endif()
 set(CPACK_DEBIAN_VAULT_DESCRIPTION "Versions of directories in one file, the example host of KivVcs")
 

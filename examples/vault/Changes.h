@@ -2,8 +2,6 @@
 
 #include "Trees.h"
 
-#include <KivVcs/Differences.h>
-
 namespace vault {
 
 /// A path that differs between two versions.
@@ -15,12 +13,17 @@ struct PathChange {
     std::string path;
     Id oldId;
     Id newId;
+    /// A directory in which the same is different as in this one is not listed again.
+    std::string sameAs;
 };
 
 [[nodiscard]] std::string_view WordFor(PathChange::Kind kind) noexcept;
 
 /// The files that differ between two trees, the empty directories that came and went, and what else has other permission
 /// bits, ordered by path.
-[[nodiscard]] std::vector<PathChange> FindChanges(IArchive& archive, Id const& before, Id const& after);
+/// @param path only what lies there; empty for everything
+/// @throws Problem if a directory is damaged or missing
+[[nodiscard]] std::vector<PathChange> FindChanges(IArchive& archive, Id const& before, Id const& after,
+                                                  std::string_view path = {});
 
 } // namespace vault

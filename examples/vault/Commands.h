@@ -93,6 +93,7 @@ int Rebase(VaultPlace const& place, std::string const& branch, std::string const
 int Join(VaultPlace const& place, std::string const& first, std::string const& second, std::string const& root);
 
 int Verify(VaultPlace const& place, bool json);
+int Salvage(VaultPlace const& place, std::string const& damaged);
 int Repair(VaultPlace const& place, std::string const& other);
 int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions const& options);
 int Compact(VaultPlace const& place, RemovalOptions const& options);

@@ -29,28 +29,15 @@ std::string SystemReason() {
 
 std::string const unsettled = "changes while it is read";
 
-/// Reads up to @p size bytes. @return how many there were; nothing, with errno set, after a failure
-std::optional<std::uint64_t> ReadUpTo(int file, std::byte* to, std::uint64_t size) {
-    std::uint64_t done = 0;
-    while (done < size) {
-        const auto count = read(file, to + done, size - done);
-        if (count < 0 && errno != EINTR)
-            return std::nullopt;
-        if (count == 0)
-            break;
-        done += static_cast<std::uint64_t>(std::max<ssize_t>(count, 0));
-    }
-    return done;
-}
-
 /// A file as a stream of as many bytes as it had at first.
 class FileStream final : public KivVcs::IStream {
 public:
     FileStream(int file, std::uint64_t size) noexcept : file_(file), size_(size) {}
 
     bool Read(void* destination, std::uint64_t size) override {
-        const auto done =
-            size <= size_ - position_ ? ReadUpTo(file_, static_cast<std::byte*>(destination), size) : std::nullopt;
+        const auto done = size <= size_ - position_
+                              ? ReadUpTo(file_, {static_cast<std::byte*>(destination), static_cast<std::size_t>(size)})
+                              : std::nullopt;
         position_ += done.value_or(0);
         return done == size;
     }
@@ -180,8 +167,9 @@ private:
     static void ReadSmall(Descriptor const& file, Slot& slot) {
         auto& wanted = *slot.wanted;
         std::optional<std::uint64_t> done;
-        auto content = Buffer::Build(wanted.state.size,
-                                     [&](std::byte* to) { done = ReadUpTo(file.Get(), to, wanted.state.size); });
+        auto content = Buffer::Build(wanted.state.size, [&](std::byte* to) {
+            done = ReadUpTo(file.Get(), {to, static_cast<std::size_t>(wanted.state.size)});
+        });
         if (wanted.state.size > 0 && !done)
             wanted.problem = SystemReason();
         else if (done.value_or(0) != wanted.state.size)
@@ -204,8 +192,8 @@ private:
         hash.InitData(header.c_str(), header.size() + 1);
         std::vector<std::byte> piece(pieceSize);
         for (std::uint64_t done = 0; done < wanted.state.size;) {
-            const auto count =
-                ReadUpTo(file.Get(), piece.data(), std::min<std::uint64_t>(pieceSize, wanted.state.size - done));
+            const auto count = ReadUpTo(
+                file.Get(), std::span(piece).first(std::min<std::uint64_t>(pieceSize, wanted.state.size - done)));
             if (!count)
                 wanted.problem = SystemReason();
             else if (*count == 0)

@@ -20,6 +20,10 @@ struct Database {
     return name.starts_with("postgresql://") || name.starts_with("postgres://");
 }
 
+/// Starts the program that is built with databases in place of this one, unless this is it.
+/// @throws Problem if there is none
+void RequireDatabases(char** arguments);
+
 /// @param create whether to make an archive there if there is none
 /// @throws Problem if this program was built without databases, KivArchive::ArchiveError
 [[nodiscard]] Database OpenDatabase(std::string const& address, bool create, std::chrono::milliseconds wait);

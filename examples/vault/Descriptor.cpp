@@ -3,6 +3,7 @@
 #include "Names.h"
 #include "Problem.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
@@ -58,6 +59,29 @@ bool ForEachName(Descriptor const& directory, std::function<void(char const*)> c
 
 bool ReadNames(Descriptor const& directory, std::vector<std::string>& names) {
     return ForEachName(directory, [&names](char const* name) { names.emplace_back(name); });
+}
+
+std::optional<std::uint64_t> ReadUpTo(int file, std::span<std::byte> to) noexcept {
+    std::size_t done = 0;
+    while (done < to.size()) {
+        const auto count = read(file, to.data() + done, to.size() - done);
+        if (count < 0 && errno != EINTR)
+            return std::nullopt;
+        if (count == 0)
+            break;
+        done += static_cast<std::size_t>(std::max<ssize_t>(count, 0));
+    }
+    return done;
+}
+
+bool WriteAll(int file, std::span<const std::byte> bytes) noexcept {
+    while (!bytes.empty()) {
+        const auto count = write(file, bytes.data(), bytes.size());
+        if (count < 0 && errno != EINTR)
+            return false;
+        bytes = bytes.subspan(static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+    }
+    return true;
 }
 
 DirectoryOpener::DirectoryOpener(std::string const& top) : top_(open(top.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC)) {

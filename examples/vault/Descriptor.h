@@ -1,7 +1,11 @@
 #pragma once
 
+#include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <list>
+#include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <unistd.h>
@@ -48,6 +52,11 @@ private:
 [[nodiscard]] bool ForEachName(Descriptor const& directory, std::function<void(char const*)> const& receiver);
 /// Adds these names to @p names.
 [[nodiscard]] bool ReadNames(Descriptor const& directory, std::vector<std::string>& names);
+
+/// Fills @p to as far as the file goes on. @return how many bytes there were; nothing, with errno set, after a failure
+[[nodiscard]] std::optional<std::uint64_t> ReadUpTo(int file, std::span<std::byte> to) noexcept;
+/// @return false, with errno set, after a failure
+[[nodiscard]] bool WriteAll(int file, std::span<const std::byte> bytes) noexcept;
 
 /// Opens directories below a top one by their paths, of any depth and without ever following a link.
 class DirectoryOpener {

@@ -6,6 +6,7 @@
 #include "Progress.h"
 
 #include <KivArchive/ArchivedRepository.h>
+#include <KivArchive/SqliteArchive.h>
 #include <KivArchive/Upkeep.h>
 #include <algorithm>
 #include <iostream>
@@ -125,7 +126,7 @@ int ListBranches(VaultPlace const& place) {
 
 int MakeBranch(VaultPlace const& place, std::string const& name) {
     const auto branch = RequireBranchName(name);
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     const auto head = vault.Find("").id;
     if (!MoveHead(vault, {}, branch, {}, head))
         throw Problem("there is a branch " + Printable(name) + " already");
@@ -133,7 +134,7 @@ int MakeBranch(VaultPlace const& place, std::string const& name) {
 }
 
 int DeleteBranch(VaultPlace const& place, std::string const& name) {
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     const auto head = vault.RequireBranch(name);
     const auto branch = RequireUtf8(name, "a branch name");
     if (vault.CurrentBranch() == branch)
@@ -144,7 +145,7 @@ int DeleteBranch(VaultPlace const& place, std::string const& name) {
 }
 
 int Checkout(VaultPlace const& place, std::string const& name) {
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     static_cast<void>(vault.RequireBranch(name));
     KivArchive::Change change;
     change.records.push_back(Vault::MakeCurrent(RequireUtf8(name, "a branch name")));
@@ -153,7 +154,7 @@ int Checkout(VaultPlace const& place, std::string const& name) {
 }
 
 int Rebase(VaultPlace const& place, std::string const& branch, std::string const& onto) {
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     static_cast<void>(vault.RequireBranch(branch));
     static_cast<void>(vault.RequireBranch(onto));
     const auto name = RequireUtf8(branch, "a branch name");
@@ -174,7 +175,7 @@ int Rebase(VaultPlace const& place, std::string const& branch, std::string const
 
 int Join(VaultPlace const& place, std::string const& first, std::string const& second, std::string const& root) {
     const auto rootBranch = RequireBranchName(root);
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     static_cast<void>(vault.RequireBranch(first));
     static_cast<void>(vault.RequireBranch(second));
     ArchivedRepository repository(vault.SharedArchive());
@@ -187,7 +188,7 @@ int Join(VaultPlace const& place, std::string const& first, std::string const& s
 }
 
 int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions const& options) {
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     const auto version = vault.Find(revision);
     const auto below = CommitsBelow(vault, version.id);
     if (version.parent.IsEmpty() || below.empty()) {
@@ -216,7 +217,7 @@ int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions 
 int Compact(VaultPlace const& place, RemovalOptions const& options) {
     const auto size = SizeOf(place);
     {
-        Vault vault(place);
+        Vault vault(place, Vault::Access::Write);
         ArchivedRepository repository(vault.SharedArchive());
         const auto before = CountCommits(repository);
         repository.SimplifyCommitGraph(true);
@@ -238,7 +239,7 @@ int Compact(VaultPlace const& place, RemovalOptions const& options) {
 }
 
 int Collect(VaultPlace const& place, unsigned days, RemovalOptions const& options) {
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     const auto grace = std::chrono::hours(24) * days;
     const auto due = vault.Archive().ListMarked(grace, {}, SIZE_MAX).size();
     if (options.dryRun) {
@@ -333,8 +334,31 @@ int Verify(VaultPlace const& place, bool json) {
     return report.IsSound() ? 0 : findingsExitStatus;
 }
 
+int Salvage(VaultPlace const& place, std::string const& damaged) {
+    struct stat status {};
+    if (stat(place.file.c_str(), &status) == 0)
+        throw Problem(PrintableName(StoredName(place.file)) +
+                      " is there already; what is sound goes into a new vault: name it with -f");
+    const Vault vault(place, Vault::Access::Create);
+    KivArchive::SalvageReport report;
+    {
+        Progress progress("salvaging");
+        report = KivArchive::Salvage(damaged, vault.Archive(), &progress);
+    }
+    for (auto const& [name, head] : report.branches)
+        std::cout << Printable(name) << "  " << DigitsOf(head) << '\n';
+    for (auto const& [name, head] : report.lostBranches)
+        Warn("branch " + Printable(name) + " has lost its version " + DigitsOf(head));
+    for (auto const& id : report.lastCommits)
+        Warn("no branch leads to version " + DigitsOf(id));
+    std::cout << report.objects << " objects salvaged, " << report.damagedSegments << " damaged pieces and "
+              << report.lostObjects << " more objects lost\n";
+    const bool isWhole = report.lostBranches.empty() && report.damagedSegments + report.lostObjects == 0;
+    return isWhole ? 0 : findingsExitStatus;
+}
+
 int Repair(VaultPlace const& place, std::string const& other) {
-    const Vault vault(place);
+    const Vault vault(place, Vault::Access::Write);
     const Vault theirs({other, place.wait});
     KivArchive::RepairReport report;
     {

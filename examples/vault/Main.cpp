@@ -1,4 +1,5 @@
 #include "Commands.h"
+#include "Database.h"
 #include "Names.h"
 #include "Problem.h"
 #include "Text.h"
@@ -201,6 +202,11 @@ void DescribeUpkeep(CommandLine& line) {
                                   [&line] { return Repair(line.place, line.first); });
     repair->add_option("OTHER", line.first, "the other vault")->required();
 
+    auto* const salvage =
+        line.Add("salvage", "save what is sound in a vault that cannot be opened any more into a new one",
+                 [&line] { return Salvage(line.place, line.first); });
+    salvage->add_option("DAMAGED", line.first, "the damaged vault file, which is only read")->required();
+
     auto* const forget = line.Add("forget", "delete the history before a version, but for the heads of branches",
                                   [&line] { return Forget(line.place, line.first, line.removal); });
     forget->add_option("REVISION", line.first, revisionHelp)->required();
@@ -278,6 +284,8 @@ int Run(CommandLine& line, int argumentCount, char** arguments) {
     RequireCommand(line, argumentCount, arguments);
     app.parse(argumentCount, arguments);
     line.place.wait = std::chrono::seconds(line.waitSeconds);
+    if (IsDatabase(line.place.file) || IsDatabase(line.first))
+        RequireDatabases(arguments);
     const int status = line.run();
     if (!std::cout.flush())
         throw Problem("the output could not be written");

@@ -383,7 +383,7 @@ std::optional<int> TryMerge(Vault& vault, MergeOptions const& options, Author co
 
 int Merge(VaultPlace const& place, MergeOptions const& options) {
     const auto author = ParseAuthor(options.author.empty() ? DefaultAuthor() : options.author);
-    Vault vault(place);
+    Vault vault(place, Vault::Access::Write);
     for (int attempt = 0; attempt < mostAttempts; ++attempt) {
         if (const auto status = TryMerge(vault, options, author))
             return *status;

@@ -3,11 +3,10 @@
 #include "Names.h"
 #include "Problem.h"
 
+#include <array>
 #include <cstdlib>
 #include <ctime>
-#include <iomanip>
 #include <iostream>
-#include <sstream>
 #include <unistd.h>
 
 namespace vault {
@@ -26,9 +25,8 @@ std::string DescribeTime(CommitRecord const& commit) {
     const auto time = static_cast<std::time_t>(commit.time.ToTimeT(KivVcs::TimeZone::Utc));
     std::tm parts{};
     localtime_r(&time, &parts);
-    std::ostringstream text;
-    text << std::put_time(&parts, "%Y-%m-%dT%H:%M:%S%z");
-    auto described = text.str();
+    std::array<char, 64> text{};
+    std::string described(text.data(), std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%S%z", &parts));
     return described.insert(described.size() - 2, ":");
 }
 

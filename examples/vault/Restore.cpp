@@ -50,16 +50,6 @@ mode_t OrdinaryDirectoryMode() noexcept {
     return ordinaryBits & ~mask;
 }
 
-bool WriteAll(int file, std::span<const std::byte> bytes) noexcept {
-    while (!bytes.empty()) {
-        const auto count = write(file, bytes.data(), bytes.size());
-        if (count < 0 && errno != EINTR)
-            return false;
-        bytes = bytes.subspan(static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
-    }
-    return true;
-}
-
 std::array<timespec, 2> TimesOf(Attributes const& attributes) noexcept {
     constexpr std::int64_t second = 1'000'000'000;
     const auto nanoseconds = ((attributes.time % second) + second) % second;

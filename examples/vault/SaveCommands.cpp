@@ -58,6 +58,11 @@ SnapshotOptions OptionsFor(Vault const& vault, SaveOptions const& options, Id co
     return snapshot;
 }
 
+void KeepIndex(Snapshot const& snapshot) {
+    if (!snapshot.index.empty())
+        WriteIndex(snapshot.top, snapshot.index);
+}
+
 Snapshot Take(Vault const& vault, SaveOptions const& options, Id const& previous, bool readsAll) {
     TreeReader reader(vault.Archive());
     auto taking = OptionsFor(vault, options, previous, reader);
@@ -90,8 +95,7 @@ std::optional<int> TrySave(Vault& vault, SaveOptions const& options, Author cons
         throw Problem("nothing was saved: " + snapshot.problems.front(), findingsExitStatus);
     const int status = snapshot.problems.empty() ? 0 : findingsExitStatus;
     if (snapshot.tree == previous && !head.IsEmpty() && merged.IsEmpty()) {
-        if (!snapshot.change.records.empty())
-            vault.Archive().Apply(snapshot.change);
+        KeepIndex(snapshot);
         Report(snapshot);
         std::cout << "nothing has changed since " << DigitsOf(head) << '\n';
         return status;
@@ -101,6 +105,7 @@ std::optional<int> TrySave(Vault& vault, SaveOptions const& options, Author cons
     commit.AddTo(snapshot.change);
     if (!MoveHead(vault, std::move(snapshot.change), branch, head, commit.object.id))
         return std::nullopt;
+    KeepIndex(snapshot);
     Report(snapshot);
     std::cout << DigitsOf(commit.object.id) << ' ' << snapshot.files << " files, " << stored << " new objects\n";
     return status;

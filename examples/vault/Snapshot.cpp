@@ -49,10 +49,10 @@ public:
         : archive_(archive), options_(options), progress_(progress), reader_(archive), begin_(Now()) {}
 
     Snapshot Take() {
-        const auto top = RealPath(options_.scan.top);
+        snapshot_.top = RealPath(options_.scan.top);
         // The index is read while the directory is looked at.
-        indexed_ = std::async(std::launch::async, [this, &top] {
-                       before_ = ReadIndex(archive_, top);
+        indexed_ = std::async(std::launch::async, [this] {
+                       before_ = ReadIndex(snapshot_.top);
                        if (!options_.readsAll)
                            index_ = StatIndex(before_);
                    }).share();
@@ -77,7 +77,7 @@ public:
             snapshot_.files += static_cast<std::uint64_t>(
                 std::count_if(directory.entries.begin(), directory.entries.end(), IsContent));
         if (options_.stores && (isUnread || snapshot_.tree != options_.previous || before_.empty()))
-            WriteIndex(snapshot_.change, top, before_, MakeIndex());
+            snapshot_.index = MakeIndex();
         return std::move(snapshot_);
     }
 

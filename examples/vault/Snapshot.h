@@ -33,6 +33,9 @@ struct Snapshot {
     /// What keeps the state of the last version, or is left out, and why.
     std::vector<std::string> problems;
     std::vector<std::string> specials;
+    /// The directory itself, and the new `StatIndex` of it; empty if that is as before.
+    std::string top;
+    std::string index;
 };
 
 /// Reads a directory, as far as it has changed since it was read last.

@@ -1,11 +1,14 @@
 #include "StatIndex.h"
 
-#include "Text.h"
+#include "Cache.h"
+#include "Descriptor.h"
 
 #include <algorithm>
 #include <array>
 #include <concepts>
+#include <cstdio>
 #include <cstring>
+#include <fcntl.h>
 
 namespace vault {
 
@@ -17,8 +20,6 @@ constexpr std::size_t digestSize = std::tuple_size_v<Id::Digest>;
 constexpr std::size_t headSize = 4 + digestSize + 4 + 4;
 /// Of what every file begins with: size, times, inode, mode, identifier, and the size of its name.
 constexpr std::size_t fileSize = 8 + 8 + 8 + 8 + 4 + digestSize + 4;
-/// Records hold at most 16 MiB.
-constexpr std::size_t pieceSize = std::size_t{8} * 1024 * 1024;
 
 template <std::integral Number>
 void Append(std::string& bytes, Number number) {
@@ -57,9 +58,28 @@ Id IdOf(std::string_view bytes) {
     return digest == Id::Digest{} ? Id() : Id::FromDigest(digest);
 }
 
-Text RecordName(std::string const& top, std::size_t piece) {
-    const auto digest = KivVcs::Helpers::ComputeEncodedSHA256Hash(top.data(), top.size());
-    return Text(u"vault/index/") + digest + FromUtf8("/" + std::to_string(piece)).value();
+/// Tells a file that a power failure has left cut off, or with gaps, from a whole one.
+std::uint64_t Checksum(std::string_view bytes) noexcept {
+    std::uint64_t sum = bytes.size();
+    for (; bytes.size() >= sizeof(sum); bytes.remove_prefix(sizeof(sum))) {
+        std::uint64_t word = 0;
+        std::memcpy(&word, bytes.data(), sizeof(word));
+        sum = (sum ^ word) * 0x9E3779B97F4A7C15U;
+        sum ^= sum >> 32U;
+    }
+    for (const char byte : bytes)
+        sum = (sum ^ static_cast<unsigned char>(byte)) * 0x9E3779B97F4A7C15U;
+    return sum;
+}
+
+std::optional<std::string> IndexFile(std::string const& top) {
+    auto directory = CacheDirectory();
+    return directory ? std::optional(*directory + CacheName(top) + ".index") : std::nullopt;
+}
+
+bool WriteFile(std::string const& path, std::string_view bytes) {
+    Descriptor file(open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, S_IRUSR | S_IWUSR));
+    return file.IsOpen() && WriteAll(file.Get(), std::as_bytes(std::span(bytes))) && file.Close();
 }
 
 std::int64_t Nanoseconds(timespec const& time) noexcept {
@@ -173,34 +193,32 @@ void StatIndexWriter::Copy(StatIndex::Listing const& listing) {
     bytes_ += listing.Block();
 }
 
-std::string ReadIndex(IArchive& archive, std::string const& top) {
-    std::string bytes;
-    for (std::size_t piece = 0;; ++piece) {
-        const auto name = RecordName(top, piece);
-        const auto records = archive.ReadRecords(std::span(&name, 1));
-        if (records.empty() || !records.front().value)
-            return bytes;
-        auto value = BytesOf(*records.front().value);
-        bytes = bytes.empty() ? std::move(value) : bytes + value;
-        if (records.front().value->GetSize() < pieceSize)
-            return bytes;
-    }
+std::string ReadIndex(std::string const& top) {
+    const auto path = IndexFile(top);
+    const Descriptor file(path ? open(path->c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC) : -1);
+    struct stat status {};
+    // What somebody else has put there is not to be trusted.
+    if (!file.IsOpen() || fstat(file.Get(), &status) != 0 || status.st_uid != geteuid())
+        return {};
+    std::string bytes(static_cast<std::size_t>(status.st_size), '\0');
+    const auto size = ReadUpTo(file.Get(), std::as_writable_bytes(std::span(bytes)));
+    if (size != bytes.size() || bytes.size() < beginning.size() + sizeof(std::uint64_t))
+        return {};
+    auto sum = std::string_view(bytes).substr(bytes.size() - sizeof(std::uint64_t));
+    const auto expected = Take<std::uint64_t>(sum);
+    bytes.resize(bytes.size() - sizeof(expected));
+    return Checksum(bytes) == expected ? bytes : std::string();
 }
 
-void WriteIndex(KivArchive::Change& change, std::string const& top, std::string const& before,
-                std::string const& after) {
-    const auto pieceOf = [](std::string const& bytes, std::size_t piece) {
-        return std::string_view(bytes).substr(std::min(piece * pieceSize, bytes.size()), pieceSize);
-    };
-    for (std::size_t piece = 0; piece * pieceSize < std::max(before.size(), after.size()); ++piece) {
-        const auto bytes = pieceOf(after, piece);
-        if (bytes == pieceOf(before, piece))
-            continue;
-        KivArchive::RecordChange record{{RecordName(top, piece), {}}, false, {}};
-        if (!bytes.empty())
-            record.record.value = BufferOf(bytes);
-        change.records.push_back(std::move(record));
-    }
+void WriteIndex(std::string const& top, std::string const& index) {
+    const auto path = IndexFile(top);
+    if (!path)
+        return;
+    const auto temporary = *path + '-' + std::to_string(getpid());
+    auto bytes = index;
+    Append(bytes, Checksum(index));
+    if (!WriteFile(temporary, bytes) || rename(temporary.c_str(), path->c_str()) != 0)
+        unlink(temporary.c_str());
 }
 
 } // namespace vault

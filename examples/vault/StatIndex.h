@@ -20,9 +20,8 @@ struct FileState {
 
 [[nodiscard]] FileState StateOf(struct stat const& status) noexcept;
 
-/// What the last save of a directory found: the states of its files, and the identifiers that they had. Kept as a record of
-/// the archive, so that a save reads only what has changed. It is read where it lies: of most directories nothing is wanted
-/// but that they are as they were.
+/// What the last save of a directory found: the states of its files, and the identifiers that they had, so that a save reads
+/// only what has changed. It is read where it lies: of most directories nothing is wanted but that they are as they were.
 class StatIndex {
 public:
     struct File {
@@ -91,10 +90,10 @@ private:
     std::size_t begin_ = 0;
 };
 
-/// Reads the index of the directory at @p top from the records of @p archive; an empty one if there is none.
-[[nodiscard]] std::string ReadIndex(IArchive& archive, std::string const& top);
-/// Adds to @p change what replaces the index @p before by @p after.
-void WriteIndex(KivArchive::Change& change, std::string const& top, std::string const& before,
-                std::string const& after);
+/// The index of the directory at @p top, from the user's caches: whichever vault it was saved to, files that look as they
+/// did are what they were. Empty if there is none.
+[[nodiscard]] std::string ReadIndex(std::string const& top);
+/// Replaces it; where that fails, the next save only takes longer.
+void WriteIndex(std::string const& top, std::string const& index);
 
 } // namespace vault

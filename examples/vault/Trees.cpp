@@ -84,6 +84,14 @@ Entry const* Directory::Find(std::string_view name) const noexcept {
     return found != entries.end() && found->name == name ? &*found : nullptr;
 }
 
+std::array<std::string, 2> AttributePaths(std::string_view path) {
+    const auto nameAt = path.find_last_of('/') + 1;
+    const auto below = [&](bool isSpread) {
+        return std::string(path.substr(0, nameAt)) + OwnName(path.substr(nameAt), isSpread);
+    };
+    return {below(false), below(true)};
+}
+
 AttributeMap ReadAttributes(std::string_view content) {
     AttributeMap lines;
     while (TakeLine(content, lines)) {
@@ -222,8 +230,11 @@ std::string DigitsOf(Id const& id) {
     constexpr std::string_view hex = "0123456789abcdef";
     std::string digits;
     if (auto const* const digest = id.GetDigest()) {
-        for (const auto byte : *digest)
-            digits += {hex[byte >> 4U], hex[byte & 0xFU]};
+        digits.reserve(2 * digest->size());
+        for (const auto byte : *digest) {
+            digits += hex[byte >> 4U];
+            digits += hex[byte & 0xFU];
+        }
     }
     return digits;
 }

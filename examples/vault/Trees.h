@@ -2,6 +2,7 @@
 
 #include <KivArchive/IArchive.h>
 
+#include <array>
 #include <cstdint>
 #include <map>
 #include <optional>
@@ -71,6 +72,9 @@ struct Directory {
 /// The attributes in such a content by name; whatever else it has is left out.
 using AttributeMap = std::map<std::string, Attributes, std::less<>>;
 [[nodiscard]] AttributeMap ReadAttributes(std::string_view content);
+
+/// Where the attributes of the file at @p path may be in a version: in a small directory, and in a large one.
+[[nodiscard]] std::array<std::string, 2> AttributePaths(std::string_view path);
 
 /// A directory as objects: the contents of its attributes, and then its tree.
 struct PackedDirectory {

@@ -4,10 +4,12 @@
 #include "Descriptor.h"
 #include "Names.h"
 #include "OldVault.h"
+#include "Output.h"
 #include "Problem.h"
 
 #include <KivArchive/SqliteArchive.h>
 #include <algorithm>
+#include <fcntl.h>
 #include <sys/stat.h>
 
 namespace vault {
@@ -33,6 +35,19 @@ Id Before(std::string digits) {
     return {};
 }
 
+/// Says who is writing to a vault, for those who are going to wait for that.
+void TellWhoWrites(std::string const& file, std::chrono::seconds wait) {
+    // Who writes has a lock on this byte. Nothing of this process may have the file open, whose locks would go.
+    const Descriptor shared(open((file + "-shm").c_str(), O_RDONLY | O_CLOEXEC));
+    struct flock lock {};
+    lock.l_type = F_WRLCK;
+    lock.l_start = 120;
+    lock.l_len = 1;
+    if (shared.IsOpen() && fcntl(shared.Get(), F_GETLK, &lock) == 0 && lock.l_type != F_UNLCK)
+        Warn("waiting, at most " + std::to_string(wait.count()) + " s, for process " + std::to_string(lock.l_pid) +
+             ", which is writing to " + PrintableName(StoredName(file)));
+}
+
 } // namespace
 
 Vault::Vault(VaultPlace const& place, Access access)
@@ -45,11 +60,13 @@ Vault::Vault(VaultPlace const& place, Access access)
     }
     struct stat status {};
     const bool isThere = !place.file.empty() && stat(file_.c_str(), &status) == 0;
-    if (!isThere && access == Access::Existing)
+    if (!isThere && access != Access::Create)
         throw Problem("there is no vault " + PrintableName(StoredName(place.file)) + " (save makes one)");
     if (isThere && S_ISDIR(status.st_mode))
         throw Problem(PrintableName(StoredName(place.file)) + " is a directory, not a vault file");
     isMadeHere_ = !isThere;
+    if (isThere && access != Access::Read)
+        TellWhoWrites(file_, place.wait);
     if (isThere)
         UpgradeOldVault(file_, place.wait);
     KivArchive::SqliteOptions options;

@@ -31,11 +31,12 @@ struct Target {
 /// An archive in one file, or in a database, with a branch that is the current one.
 class Vault {
 public:
-    enum class Access { Existing, Create };
+    enum class Access { Read, Write, Create };
 
-    /// Opens the database, or the file, bringing one of an earlier release up to date first; or makes it.
+    /// Opens the database, or the file, bringing one of an earlier release up to date first; or makes it. Says
+    /// whom those who want to write will have to wait for.
     /// @throws Problem, KivArchive::ArchiveError
-    explicit Vault(VaultPlace const& place, Access access = Access::Existing);
+    explicit Vault(VaultPlace const& place, Access access = Access::Read);
     Vault(Vault const&) = delete;
     Vault& operator=(Vault const&) = delete;
     /// Takes a file away that was made here and has got no version.

@@ -13,6 +13,7 @@
 #include <fcntl.h>
 #include <iostream>
 #include <sys/stat.h>
+#include <unordered_set>
 
 namespace vault {
 
@@ -147,85 +148,60 @@ void WriteTextDifferences(std::vector<PathChange> const& changes, Side const& be
     }
 }
 
-/// A cursor over the columns of a text graph: which commit each line leads to next.
-class TextGraph {
-public:
-    void Draw(CommitRecord const& commit, std::string const& names) {
-        auto column = Column(commit.id);
-        if (column == lanes_.size())
-            lanes_.push_back(commit.id);
-        std::string line;
-        for (std::size_t i = 0; i < lanes_.size(); ++i)
-            line += i == column ? "* " : "| ";
-        std::cout << line << Coloured(Shortened(commit.id), Colour::Yellow)
-                  << (names.empty() ? "" : " (" + Coloured(names, Colour::Green) + ')') << "  " << DescribeTime(commit)
-                  << "  " << DescribeMessage(commit) << '\n';
-        Follow(column, commit);
-    }
-
-private:
-    [[nodiscard]] std::size_t Column(Id const& id) const {
-        return static_cast<std::size_t>(std::find(lanes_.begin(), lanes_.end(), id) - lanes_.begin());
-    }
-
-    /// Leads the line on to the parent, and branches lines off to what was merged.
-    void Follow(std::size_t column, CommitRecord const& commit) {
-        bool isJoined = commit.parent.IsEmpty();
-        if (!isJoined) {
-            const auto other = Column(commit.parent);
-            isJoined = other != lanes_.size() && other != column;
-            if (!isJoined)
-                lanes_[column] = commit.parent;
-        }
-        std::size_t added = 0;
-        for (auto const& merged : commit.merged) {
-            if (Column(merged) == lanes_.size()) {
-                lanes_.push_back(merged);
-                ++added;
-            }
-        }
-        if (added > 0 || (isJoined && column + 1 < lanes_.size()) || (isJoined && !commit.parent.IsEmpty()))
-            DrawLinks(column, added, isJoined);
-        if (isJoined)
-            lanes_.erase(lanes_.begin() + static_cast<std::ptrdiff_t>(column));
-    }
-
-    void DrawLinks(std::size_t column, std::size_t added, bool isJoined) const {
-        std::string line;
-        for (std::size_t i = 0; i < lanes_.size(); ++i)
-            line += i + added >= lanes_.size() ? "\\ "
-                    : i > column && isJoined   ? "/ "
-                    : i == column && isJoined  ? "/ "
-                                               : "| ";
-        while (line.ends_with(' '))
-            line.pop_back();
-        std::cout << line << '\n';
-    }
-
-    std::vector<Id> lanes_;
-};
-
-/// Graphviz takes what looks like an entity of HTML for one, in plain labels too.
-std::string Quoted(std::string const& text) {
-    std::string quoted = "\"";
-    for (const char c : text) {
-        if (c == '"' || c == '\\')
-            quoted += '\\';
-        quoted += c;
-        if (c == '&')
-            quoted += "amp;";
-    }
-    return quoted + '"';
+/// Along parents and what was merged: nothing that somebody did is left out.
+void ForEachCommit(IArchive& archive, Id const& head, std::optional<Text> const& changing,
+                   KivArchive::CommitReceiver const& receiver) {
+    KivArchive::CommitListOptions options;
+    options.follow = KivArchive::Follow::Reachable;
+    options.changing = changing;
+    KivArchive::ListCommits(archive, std::span(&head, 1), options, receiver, nullptr);
 }
 
-void DrawDotCommit(CommitRecord const& commit) {
-    const auto id = DigitsOf(commit.id);
-    std::cout << "  \"" << id << "\" [label=" << Quoted(Shortened(commit.id) + "  " + DescribeMessage(commit))
-              << "];\n";
-    if (!commit.parent.IsEmpty())
-        std::cout << "  \"" << id << "\" -> \"" << DigitsOf(commit.parent) << "\";\n";
-    for (auto const& merged : commit.merged)
-        std::cout << "  \"" << id << "\" -> \"" << DigitsOf(merged) << "\" [style=dashed];\n";
+/// What REVISION, REVISION:PATH or PATH asks the history of.
+std::pair<CommitRecord, std::optional<std::string>> FindHistory(Vault const& vault, std::string const& target) {
+    const auto colon = target.find(':');
+    const auto revision = target.substr(0, colon);
+    if (colon != std::string::npos)
+        return {vault.Find(revision), StoredPath(std::string_view(target).substr(colon + 1))};
+    try {
+        return {vault.Find(revision), std::nullopt};
+    } catch (Problem const& problem) {
+        if (revision.empty() || problem.ExitStatus() == findingsExitStatus)
+            throw;
+    }
+    // Not a revision: a path, then.
+    auto head = vault.Find("");
+    auto path = StoredPath(revision);
+    if (!TreeReader(vault.Archive()).Find(head.tree, path) && revision.find('/') == std::string::npos)
+        throw Problem("no such revision, and no such path in the current version: " + Printable(StoredName(revision)));
+    return {std::move(head), std::move(path)};
+}
+
+/// Those that changed what is at a path, be it only a file's mode.
+std::unordered_set<Id> CommitsChanging(IArchive& archive, CommitRecord const& head, std::string const& path) {
+    std::unordered_set<Id> changing;
+    ForEachCommit(archive, head.id, KivVcs::FromUtf8(path), [&](CommitRecord const& commit) {
+        changing.insert(commit.id);
+        return true;
+    });
+    TreeReader reader(archive);
+    const auto attributesIn = [&](Id const& tree) {
+        const auto entry = tree.IsEmpty() ? std::nullopt : reader.Find(tree, path);
+        return entry ? entry->attributes : std::nullopt;
+    };
+    for (auto const& place : AttributePaths(path)) {
+        ForEachCommit(archive, head.id, KivVcs::FromUtf8(place), [&](CommitRecord const& commit) {
+            if (changing.contains(commit.id) || commit.parent.IsEmpty())
+                return true;
+            const auto now = attributesIn(commit.tree);
+            const auto parents = KivArchive::ReadCommits(archive, std::span(&commit.parent, 1));
+            const auto before = attributesIn(parents.empty() ? Id() : parents.front().tree);
+            if (now && before && !now->IsLike(*before))
+                changing.insert(commit.id);
+            return true;
+        });
+    }
+    return changing;
 }
 
 } // namespace
@@ -239,9 +215,11 @@ int ListChanges(std::vector<PathChange> const& changes, ListingOptions const& li
         if (listing.json)
             std::cout << (i == 0 ? "\n" : ",\n") << "{\"change\":\"" << WordFor(change.kind)
                       << "\",\"path\":" << JsonText(change.path) << ",\"old\":\"" << DigitsOf(change.oldId)
-                      << "\",\"new\":\"" << DigitsOf(change.newId) << "\"}";
+                      << "\",\"new\":\"" << DigitsOf(change.newId) << '"'
+                      << (change.sameAs.empty() ? "" : ",\"as\":" + JsonText(change.sameAs)) << '}';
         else
-            std::cout << ColouredWord(change.kind) << ' ' << PrintableName(change.path) << '\n';
+            std::cout << ColouredWord(change.kind) << ' ' << PrintableName(change.path)
+                      << (change.sameAs.empty() ? "" : " (as in " + PrintableName(change.sameAs) + ')') << '\n';
     }
     if (listing.json)
         std::cout << "\n]\n";
@@ -253,52 +231,31 @@ int ListChanges(std::vector<PathChange> const& changes, ListingOptions const& li
 
 int Log(VaultPlace const& place, std::string const& target, ListingOptions const& listing) {
     Vault vault(place);
-    const auto colon = target.find(':');
-    KivArchive::CommitListOptions options;
-    std::string revision = target.substr(0, colon);
-    if (colon != std::string::npos)
-        options.changing = KivVcs::FromUtf8(StoredPath(std::string_view(target).substr(colon + 1)));
-    CommitRecord head;
-    try {
-        head = vault.Find(revision);
-    } catch (Problem const& problem) {
-        // Not a revision: a path, then.
-        if (colon != std::string::npos || revision.empty() || problem.ExitStatus() == findingsExitStatus)
-            throw;
-        head = vault.Find("");
-        TreeReader reader(vault.Archive());
-        const auto path = StoredPath(revision);
-        options.changing = KivVcs::FromUtf8(path);
-        if (!reader.Find(head.tree, path) && revision.find('/') == std::string::npos)
-            throw Problem("no such revision, and no such path in the current version: " +
-                          Printable(StoredName(revision)));
-    }
+    const auto [head, path] = FindHistory(vault, target);
+    std::optional<std::unordered_set<Id>> shownOnly;
+    if (path)
+        shownOnly = CommitsChanging(vault.Archive(), head, *path);
     std::size_t shown = 0;
     bool isCutOff = false;
     if (listing.json)
         std::cout << '[';
-    // Along parents and what was merged: nothing that somebody did is left out.
-    options.follow = KivArchive::Follow::Reachable;
-    if (listing.limit < std::numeric_limits<std::size_t>::max())
-        options.atMost = listing.limit + 1;
-    KivArchive::ListCommits(
-        vault.Archive(), std::span(&head.id, 1), options,
-        [&](CommitRecord const& commit) {
-            isCutOff = shown == listing.limit;
-            if (isCutOff)
-                return false;
-            if (listing.json)
-                std::cout << (shown == 0 ? "\n" : ",\n") << JsonCommit(commit);
-            else
-                std::cout << Coloured(DigitsOf(commit.id), Colour::Yellow) << "  " << DescribeTime(commit) << "  "
-                          << DescribeAuthor(commit) << "  " << DescribeMessage(commit) << '\n';
-            ++shown;
-            return static_cast<bool>(std::cout);
-        },
-        nullptr);
+    ForEachCommit(vault.Archive(), head.id, {}, [&](CommitRecord const& commit) {
+        if (shownOnly && !shownOnly->contains(commit.id))
+            return true;
+        isCutOff = shown == listing.limit;
+        if (isCutOff)
+            return false;
+        if (listing.json)
+            std::cout << (shown == 0 ? "\n" : ",\n") << JsonCommit(commit);
+        else
+            std::cout << Coloured(DigitsOf(commit.id), Colour::Yellow) << "  " << DescribeTime(commit) << "  "
+                      << DescribeAuthor(commit) << "  " << DescribeMessage(commit) << '\n';
+        ++shown;
+        return static_cast<bool>(std::cout);
+    });
     if (listing.json)
         std::cout << "\n]\n";
-    return 0;
+    return isCutOff ? cutOffExitStatus : 0;
 }
 
 int Show(VaultPlace const& place, std::string const& target) {
@@ -319,54 +276,10 @@ int Diff(VaultPlace const& place, DiffOptions const& options) {
     Overlay archive(vault.Archive());
     const Side before(vault, archive, options.before, {});
     const Side after(vault, archive, options.after, before.Tree());
-    auto changes = FindChanges(archive, before.Tree(), after.Tree());
-    if (!options.path.empty()) {
-        const auto path = StoredPath(options.path);
-        std::erase_if(changes, [&](PathChange const& change) {
-            return change.path != path && !change.path.starts_with(path + '/');
-        });
-    }
+    const auto changes = FindChanges(archive, before.Tree(), after.Tree(), StoredPath(options.path));
     if (!options.text)
         return ListChanges(changes, options.listing);
     WriteTextDifferences(changes, before, after);
-    return 0;
-}
-
-int Graph(VaultPlace const& place, bool isText) {
-    Vault vault(place);
-    const auto current = vault.CurrentBranch();
-    const auto branches = vault.Archive().ReadBranches();
-    std::unordered_map<Id, std::string> names;
-    std::vector<Id> heads;
-    if (!isText)
-        std::cout << "digraph vault {\n  rankdir=BT;\n  node [shape=box, style=rounded, fontname=\"sans-serif\"];\n";
-    for (auto const& [name, head] : branches) {
-        heads.push_back(head);
-        auto& shown = names[head];
-        shown += (shown.empty() ? "" : ", ") + Printable(name) + (name == current ? "*" : "");
-        if (isText)
-            continue;
-        const auto node = Quoted("branch " + Printable(name));
-        std::cout << "  " << node << " [label=" << Quoted(Printable(name))
-                  << ", shape=ellipse, style=" << (name == current ? "bold" : "solid") << "];\n";
-        std::cout << "  " << node << " -> \"" << DigitsOf(head) << "\" [style=dotted];\n";
-    }
-    TextGraph graph;
-    KivArchive::CommitListOptions options;
-    options.follow = KivArchive::Follow::Reachable;
-    KivArchive::ListCommits(
-        vault.Archive(), heads, options,
-        [&](CommitRecord const& commit) {
-            const auto name = names.find(commit.id);
-            if (isText)
-                graph.Draw(commit, name == names.end() ? "" : name->second);
-            else
-                DrawDotCommit(commit);
-            return static_cast<bool>(std::cout);
-        },
-        nullptr);
-    if (!isText)
-        std::cout << "}\n";
     return 0;
 }
 
