@@ -1,6 +1,7 @@
 #include "sqlite/Database.h"
 
 #include "Changes.h"
+#include "sqlite/Lookup.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -73,6 +74,7 @@ Database::Database(std::string const& path, Access access, std::chrono::millisec
     sqlite3_limit(handle, SQLITE_LIMIT_VDBE_OP, 25000);
     auto const milliseconds = std::clamp<std::chrono::milliseconds::rep>(wait.count(), 0, 1 << 30);
     sqlite3_busy_timeout(handle, static_cast<int>(milliseconds));
+    Lookup::Register(handle);
     Run("PRAGMA cell_size_check=ON");
     Run("PRAGMA synchronous=FULL");
 }
@@ -124,6 +126,12 @@ Query& Query::With(ByteView bytes) {
     const void* const data = bytes.empty() ? "" : static_cast<const void*>(bytes.data());
     if (int const code = sqlite3_bind_blob64(statement_, ++bound_, data, bytes.size(), SQLITE_STATIC);
         code != SQLITE_OK)
+        database_.Fail(code);
+    return *this;
+}
+
+Query& Query::WithPointer(void* pointer, const char* type) {
+    if (int const code = sqlite3_bind_pointer(statement_, ++bound_, pointer, type, nullptr); code != SQLITE_OK)
         database_.Fail(code);
     return *this;
 }

@@ -71,6 +71,8 @@ public:
     Query& With(Id::Digest const& digest) { return With(std::as_bytes(std::span(digest))); }
     /// Null becomes no bytes.
     Query& With(Id const& id);
+    /// What a function of ours finds by @p type. Must live as long as the query.
+    Query& WithPointer(void* pointer, const char* type);
 
     /// Goes to the next row. @return false behind the last one
     bool Next();
@@ -79,6 +81,7 @@ public:
     /// Makes it ready to be run once more with other parameters.
     Query& Again();
 
+    [[nodiscard]] bool IsNull(int column) const { return sqlite3_column_type(statement_, column) == SQLITE_NULL; }
     [[nodiscard]] std::int64_t Number(int column) const { return sqlite3_column_int64(statement_, column); }
     /// Valid until the next row.
     [[nodiscard]] ByteView Blob(int column) const;

@@ -1,4 +1,5 @@
 #include "Pieces.h"
+#include "sqlite/Lookup.h"
 #include "sqlite/SqliteStore.h"
 
 #include <algorithm>
@@ -154,24 +155,19 @@ std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
 }
 
 std::vector<std::optional<ObjectRow>> FindRows(Database& database, std::span<const Id> ids) {
-    constexpr std::size_t atOnce = 32;
-    static std::string const sql = [] {
-        std::string values = "(0, ?)";
-        for (std::size_t i = 1; i < atOnce; ++i)
-            values += ", (" + std::to_string(i) + ", ?)";
-        return "SELECT column1, type, segment, member FROM (VALUES " + values + ") CROSS JOIN objects ON id=column2";
-    }();
-    std::vector<std::optional<ObjectRow>> rows(ids.size());
-    std::size_t begin = 0;
-    for (; ids.size() - begin >= atOnce; begin += atOnce) {
-        Query query(database, sql.c_str());
-        for (Id const& id : ids.subspan(begin, atOnce))
-            query.With(DigestOf(id));
-        while (query.Next())
-            rows.at(begin + static_cast<std::size_t>(query.Number(0))) = RowOf(database, query, 1);
+    constexpr std::size_t few = 8;
+    std::vector<std::optional<ObjectRow>> rows;
+    rows.reserve(ids.size());
+    if (ids.size() <= few) {
+        for (Id const& id : ids)
+            rows.push_back(FindRow(database, id));
+        return rows;
     }
-    for (; begin < ids.size(); ++begin)
-        rows[begin] = FindRow(database, ids[begin]);
+    Lookup lookup(database, "SELECT type, segment, member FROM asked(?) LEFT JOIN objects ON objects.id=asked.id");
+    for (Id const& id : ids) {
+        Query const& row = lookup.At(id);
+        rows.push_back(row.IsNull(0) ? std::nullopt : std::optional(RowOf(database, row, 0)));
+    }
     return rows;
 }
 

@@ -1,5 +1,6 @@
 #include "AncestryWalk.h"
 #include "Changes.h"
+#include "sqlite/Lookup.h"
 #include "sqlite/SqliteStore.h"
 
 #include <map>
@@ -15,13 +16,14 @@ constexpr std::size_t maximumRows = 1U << 20U;
 class FactsReader {
 public:
     explicit FactsReader(Database& database)
-        : database_(database), hasContained_(database.Ask("SELECT EXISTS(SELECT 1 FROM contained)") != 0) {}
+        : database_(database), hasContained_(database.Ask("SELECT EXISTS(SELECT 1 FROM contained)") != 0),
+          lookup_(database, "SELECT parent, tree FROM asked(?) LEFT JOIN ancestry ON ancestry.id=asked.id") {}
 
     [[nodiscard]] std::optional<Ancestry> Find(Id const& id) {
-        Query query(database_, "SELECT parent, tree FROM ancestry WHERE id=?");
-        if (!query.With(DigestOf(id)).Next())
+        Query const& row = lookup_.At(id);
+        if (row.IsNull(0))
             return std::nullopt;
-        return FactsOf(id, query.OptionalIdentifier(0), query.OptionalIdentifier(1));
+        return FactsOf(id, row.OptionalIdentifier(0), row.OptionalIdentifier(1));
     }
 
     [[nodiscard]] Ancestry FactsOf(Id const& id, Id parent, Id tree) {
@@ -43,6 +45,7 @@ public:
 private:
     Database& database_;
     bool hasContained_;
+    Lookup lookup_;
 };
 
 Buffer BufferOf(ByteView bytes) {

@@ -107,7 +107,7 @@ struct ObjectRow {
 
 /// The row of @p id; none if it is not there.
 [[nodiscard]] std::optional<ObjectRow> FindRow(Database& database, Id const& id);
-/// The rows of all of @p ids, with a statement for many of them.
+/// The rows of all of @p ids, with one run of a statement if they are many.
 [[nodiscard]] std::vector<std::optional<ObjectRow>> FindRows(Database& database, std::span<const Id> ids);
 
 /// What is behind one `SqliteArchive`.
