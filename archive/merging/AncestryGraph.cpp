@@ -137,15 +137,46 @@ AncestryGraph::Above AncestryGraph::TurnLinks(std::vector<Node> const& nodes) co
 }
 
 /// In the order that `OrderCommon` gives, one that nothing before it contains is contained by none but its own cycle.
-std::vector<AncestryGraph::Node> AncestryGraph::FindBest(std::vector<Node> const& ordered) {
-    std::vector<Node> best;
+std::vector<std::vector<AncestryGraph::Node>> AncestryGraph::FindBest(std::vector<Node> const& ordered) {
+    std::vector<std::vector<Node>> best;
     for (Node const node : ordered)
         if (MarkOf(node).reachedFrom == 0) {
-            auto const cycle = CycleOf(node, ReachFromBest(node, best.size()));
-            best.push_back(*std::min_element(cycle.begin(), cycle.end(),
-                                             [this](Node one, Node other) { return CommitOf(one) < CommitOf(other); }));
+            best.push_back(CycleOf(node, ReachFromBest(node, best.size())));
+            SortById(best.back());
         }
     return best;
+}
+
+/// Those of the cycles that the sides are, or that commits of one side only contain without another one in between.
+std::vector<AncestryGraph::Node> AncestryGraph::FindArrivals(std::vector<std::vector<Node>> const& cycles,
+                                                             std::vector<Node> const& reached,
+                                                             std::span<const Node> sides) {
+    std::vector<Node> arrivals;
+    std::unordered_set<Node> inCycle;
+    for (auto const& cycle : cycles) {
+        if (cycle.size() == 1)
+            arrivals.push_back(cycle.front());
+        else
+            inCycle.insert(cycle.begin(), cycle.end());
+    }
+    auto const arrive = [&](Node node) {
+        if (inCycle.erase(node) != 0)
+            arrivals.push_back(node);
+    };
+    if (!inCycle.empty()) {
+        for (Node const side : sides)
+            arrive(side);
+        for (Node const node : reached)
+            if (MarkOf(node).sides != bothSides)
+                for (Node const link : LinksOf(node))
+                    arrive(link);
+    }
+    SortById(arrivals);
+    return arrivals;
+}
+
+void AncestryGraph::SortById(std::vector<Node>& nodes) const {
+    std::sort(nodes.begin(), nodes.end(), [this](Node one, Node other) { return CommitOf(one) < CommitOf(other); });
 }
 
 AncestryGraph::Meeting AncestryGraph::Meet(Node left, Node right) {
@@ -154,7 +185,9 @@ AncestryGraph::Meeting AncestryGraph::Meet(Node left, Node right) {
         std::vector<Node> reached = Reach(left, leftSide);
         std::vector<Node> const others = Reach(right, rightSide);
         Meeting meeting;
-        meeting.bases = FindBest(OrderCommon(reached));
+        auto const cycles = FindBest(OrderCommon(reached));
+        for (auto const& cycle : cycles)
+            meeting.bases.push_back(cycle.front());
         meeting.leftContainsRight = MarkOf(right).sides == bothSides;
         meeting.rightContainsLeft = MarkOf(left).sides == bothSides;
         // What all best ones contain leads neither to another common one nor, but in cycles, back to one of them.
@@ -168,8 +201,9 @@ AncestryGraph::Meeting AncestryGraph::Meet(Node left, Node right) {
         std::sort(unsettled.begin(), unsettled.end());
         unsettled.erase(std::unique(unsettled.begin(), unsettled.end()), unsettled.end());
         if (unsettled.empty()) {
-            std::sort(meeting.bases.begin(), meeting.bases.end(),
-                      [this](Node one, Node other) { return CommitOf(one) < CommitOf(other); });
+            SortById(meeting.bases);
+            Node const sides[] = {left, right};
+            meeting.arrivals = FindArrivals(cycles, reached, sides);
             return meeting;
         }
         Read(unsettled, batch);
@@ -191,10 +225,15 @@ std::vector<AncestryGraph::Node> AncestryGraph::FindFirstWithAll(Node side, Node
     };
     // From here on `reachedFrom` is counted from below.
     std::uint64_t all = 0;
+    std::unordered_set<Node> met;
     for (std::size_t i = 0; i < commits.size(); ++i) {
+        // What contains one of a cycle contains all of it.
+        if (met.count(commits[i]) != 0)
+            continue;
         std::uint64_t const bit = std::uint64_t{1} << i;
         all |= bit;
         std::vector<Node> open = CycleOf(commits[i], ReachFromBest(commits[i], lastBit));
+        met.insert(open.begin(), open.end());
         while (!open.empty()) {
             Node const node = open.back();
             open.pop_back();

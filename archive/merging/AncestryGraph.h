@@ -21,6 +21,9 @@ public:
     struct Meeting {
         /// The common ancestors that no other one contains, one for each cycle, ordered by identifier.
         std::vector<Node> bases;
+        /// Where the sides come to the bases: these themselves, but of a cycle all commits that a side has been at. Each side
+        /// knows of what all of them did, and nobody can say which is the latest.
+        std::vector<Node> arrivals;
         bool leftContainsRight = false;
         bool rightContainsLeft = false;
     };
@@ -78,7 +81,11 @@ private:
     void Learn(Ancestry const& facts);
     [[nodiscard]] std::vector<Node> Reach(Node from, std::uint8_t side);
     [[nodiscard]] std::vector<Node> OrderCommon(std::vector<Node> const& reached);
-    [[nodiscard]] std::vector<Node> FindBest(std::vector<Node> const& ordered);
+    /// @return the cycle of each, its smallest identifier first
+    [[nodiscard]] std::vector<std::vector<Node>> FindBest(std::vector<Node> const& ordered);
+    [[nodiscard]] std::vector<Node> FindArrivals(std::vector<std::vector<Node>> const& cycles,
+                                                 std::vector<Node> const& reached, std::span<const Node> sides);
+    void SortById(std::vector<Node>& nodes) const;
     [[nodiscard]] std::vector<Node> ReachFromBest(Node best, std::size_t number);
     /// The commits that contain @p node and are contained in it.
     /// @param reached all that it contains

@@ -93,13 +93,13 @@ BaseEntry EntryBases::Of(KivStringT<char16_t> const& name) {
 }
 
 cow_ptr<Tree> EntryBases::OnlyBase() {
-    auto const& bases = MeetingOf(sides_)->bases;
+    auto const& bases = MeetingOf(sides_)->arrivals;
     return bases.size() == 1 && !versions_.IsGone(bases.front()) ? versions_.DirectoryOf(bases.front()) : nullptr;
 }
 
 std::vector<Id> EntryBases::LostBases() {
     std::vector<Id> lost;
-    for (Node const base : MeetingOf(sides_)->bases)
+    for (Node const base : MeetingOf(sides_)->arrivals)
         if (versions_.IsGone(base))
             lost.push_back(graph_.CommitOf(base));
     return lost;
@@ -137,7 +137,7 @@ BaseEntry EntryBases::Find(Pair pair, KivStringT<char16_t> const* name, Found& f
     // Nothing, for those who come back to it.
     found.entries.emplace(pair, BaseEntry());
     ++found.depth;
-    BaseEntry base = meeting->bases.empty() ? HeldEntry() : BringTogether(pair, meeting->bases, name, found);
+    BaseEntry base = meeting->bases.empty() ? HeldEntry() : BringTogether(pair, meeting->arrivals, name, found);
     --found.depth;
     found.entries.insert_or_assign(pair, base);
     return base;

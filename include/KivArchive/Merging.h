@@ -117,6 +117,7 @@ struct TreeMerge {
 /// both sides had when they had brought the bases together is the base, if they had the same; then what is left of the
 /// bases' entries when each that another base has changed, by the same rule, is left out; then what both sides made of
 /// these. If none of that gives one entry there is no base, and the resolvers are asked unless both sides are equal.
+/// Of commits that contain each other all that a side has been at are bases.
 ///
 /// Resolvers are asked as by `KivVcs::ThreeWayMerge`, but for this: nothing vanishes without a question. A name that is a
 /// file on one side and a directory on the other is asked about if both sides changed it; an answer is followed whatever

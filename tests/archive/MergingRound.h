@@ -320,8 +320,13 @@ private:
         bool const haveOneTree = model.LeftFiles() == model.RightFiles();
         parties_[i].own.Learn(result, left);
         parties_[i].own.Learn(result, right);
-        if (model.LeftContainsRight() != model.RightContainsLeft())
-            return result == (model.LeftContainsRight() ? left : right) ? void() : NotNeeded(result, answers.asked);
+        bool const eachContainsOther = model.LeftContainsRight() && model.RightContainsLeft();
+        if (sharing_ == Sharing::Branch && eachContainsOther && result == right)
+            return; // Nothing was unpublished.
+        if (model.LeftContainsRight() != model.RightContainsLeft() &&
+            !(model.LeftContainsRight() && WasPutOnRewritten(i, left)))
+            return result == (model.LeftContainsRight() ? left : right) ? void()
+                                                                        : Fault("a version that nobody needed");
         if (haveOneTree && isOne)
             return result == std::min(left, right) ? void() : Fault("not the smaller of two equal ones");
         if (isOne)
@@ -347,10 +352,11 @@ private:
         Add(result, std::move(version));
     }
 
-    void NotNeeded(Id const& result, Paths const& asked) {
-        if (asked.empty() && versions_.count(result) != 0)
-            return Fault("a version taken that is not the latest");
-        Fault("a version that nobody needed");
+    /// Whether the head stands for a version whose parent others have rewritten.
+    [[nodiscard]] bool WasPutOnRewritten(std::size_t i, Id const& version) {
+        Ancestry const facts = Repo(i).FactsOf(Head(i)).front();
+        return std::count(facts.contains.begin(), facts.contains.end(),
+                          ContainedCommit{Containment::RewrittenFrom, version}) != 0;
     }
 
     void CheckQuestions(ModelMerge const& model, Paths const& asked) {

@@ -210,6 +210,21 @@ TEST(MergeAgain, AssumesNothingWhereABaseIsLost) {
     EXPECT_EQ(versions.Merge("onAgain", "elsewhere"), "both=0 gone=1 x/y=0") << "nothing in common is no loss";
 }
 
+/// One party has come back from "later" to "earlier", another one has gone on from there.
+TEST(MergeAgain, AsksWhereNobodyCanSayWhatIsLater) {
+    Versions versions;
+    versions.Add("root", "back=0 same=0");
+    versions.Add("earlier:root~later", "back=0 same=1");
+    versions.Add("later:earlier", "back=1 same=1");
+    versions.Add("left:earlier", "back=0 same=2");
+    versions.Add("right:later", "back=1 same=1");
+    EXPECT_EQ(versions.Merge("left", "right", ConflictChoice::Left), "back=0 same=2 | back 111");
+    EXPECT_EQ(versions.Merge("right", "left", ConflictChoice::Left), "back=1 same=2 | back 111");
+    versions.Add("both:left+right", "back=0 same=2");
+    versions.Add("on:right", "back=1 same=1 new=1");
+    EXPECT_EQ(versions.Merge("both", "on"), "back=0 new=1 same=2") << "settled";
+}
+
 TEST(MergeAgain, ContentsMayBeMergedByResolvers) {
     Versions versions;
     versions.Add("base", "text=0 file=0");
