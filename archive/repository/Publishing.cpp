@@ -96,8 +96,10 @@ bool Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content) {
 }
 
 bool Publishing::StoreDirectory(NewDirectory const& directory) {
-    Buffer const& data = directory.tree->GetData();
-    if (directory.tree->IsOfHostClass() && !(Identify(ObjectType::Tree, data) == directory.id))
+    bool const isHosts = directory.tree->IsOfHostClass();
+    // A tree keeps its form for as long as it lives, which may be long: a copy is asked instead.
+    Buffer const data = isHosts ? directory.tree->GetData() : Tree(*directory.tree).GetData();
+    if (isHosts && !(Identify(ObjectType::Tree, data) == directory.id))
         return false;
     for (NewDirectory::File const& file : directory.files)
         RelyOn(file.id);
