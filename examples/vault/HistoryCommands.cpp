@@ -334,6 +334,23 @@ int Verify(VaultPlace const& place, bool json) {
     return report.IsSound() ? 0 : findingsExitStatus;
 }
 
+namespace {
+
+/// Makes a branch at a version that has lost its own, so that it can be named and is not collected.
+void KeepReachable(Vault const& vault, Id const& id) {
+    for (auto const& branch : vault.Archive().ReadBranches()) {
+        if (branch.head == id)
+            return;
+    }
+    const auto name = "salvaged/" + Shortened(id);
+    KivArchive::Change change;
+    change.branches.push_back({RequireBranchName(name), {}, id});
+    vault.Archive().Apply(change);
+    Warn("the name of a branch is lost; it is " + name + " now");
+}
+
+} // namespace
+
 int Salvage(VaultPlace const& place, std::string const& damaged) {
     struct stat status {};
     if (stat(place.file.c_str(), &status) == 0)
@@ -350,7 +367,7 @@ int Salvage(VaultPlace const& place, std::string const& damaged) {
     for (auto const& [name, head] : report.lostBranches)
         Warn("branch " + Printable(name) + " has lost its version " + DigitsOf(head));
     for (auto const& id : report.lastCommits)
-        Warn("no branch leads to version " + DigitsOf(id));
+        KeepReachable(vault, id);
     std::cout << report.objects << " objects salvaged, " << report.damagedSegments << " damaged pieces and "
               << report.lostObjects << " more objects lost\n";
     const bool isWhole = report.lostBranches.empty() && report.damagedSegments + report.lostObjects == 0;
