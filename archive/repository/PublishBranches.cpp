@@ -3,6 +3,7 @@
 #include "repository/RepositoryState.h"
 
 #include <algorithm>
+#include <optional>
 #include <random>
 #include <set>
 #include <thread>
@@ -222,33 +223,38 @@ void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch)
 
 MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
                                                MergeResolvers const& resolvers) {
-    /// Makes a branch current as long as it lives, also one in whose place there is none any more.
-    class Current {
-    public:
-        Current(ArchivedRepository& repository, KivStringViewT<char16_t> name)
-            : repository_(repository), before_(repository.Repository::GetCurentBranch()) {
-            repository.Repository::Checkout(name);
+    KivStringT<char16_t> const before = Repository::GetCurentBranch();
+    Repository::Checkout(branch);
+    std::optional<MergeReport> report;
+    try {
+        report = MergeWithReport(theirs, resolvers);
+    } catch (...) {
+        try {
+            ReturnTo(before);
+        } catch (...) { // NOLINT(bugprone-empty-catch)
+            // Then the merged one stays current: what ended the merge is what the host has to hear of.
         }
-        Current(Current const&) = delete;
-        Current& operator=(Current const&) = delete;
-        ~Current() {
-            try {
-                auto* const storage = repository_.state_->storage;
-                bool const isMissing = !storage->BranchExist(before_) && storage->CreateBranch(before_, nullptr);
-                repository_.Repository::Checkout(before_);
-                if (isMissing)
-                    storage->RemoveBranch(before_);
-            } catch (std::bad_alloc const&) {
-                // Then the merged one stays current.
-            }
-        }
+        throw;
+    }
+    ReturnTo(before);
+    return *std::move(report);
+}
 
-    private:
-        ArchivedRepository& repository_;
-        KivStringT<char16_t> before_;
-    };
-    Current const current(*this, branch);
-    return MergeWithReport(theirs, resolvers);
+/// Makes a branch current, also one in whose place there is none any more.
+void ArchivedRepository::ReturnTo(KivStringT<char16_t> const& branch) {
+    auto* const storage = state_->storage;
+    if (storage->BranchExist(branch)) {
+        Repository::Checkout(branch);
+        return;
+    }
+    storage->CreateBranch(branch, nullptr);
+    try {
+        Repository::Checkout(branch);
+    } catch (...) {
+        storage->RemoveBranch(branch);
+        throw;
+    }
+    storage->RemoveBranch(branch);
 }
 
 } // namespace KivArchive

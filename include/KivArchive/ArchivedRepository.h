@@ -217,6 +217,7 @@ private:
     void RefreshBranch(Branch const& theirs, RefreshOutcome& outcome);
     void ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome);
     void TakePublished(KivStringT<char16_t> const& branch);
+    void ReturnTo(KivStringT<char16_t> const& branch);
     [[nodiscard]] MergeReport MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers);
     [[nodiscard]] std::optional<KivVcs::MergeResult> MergeWithoutCommit(cow_ptr<Commit> const& commit);
     void EnterLine(cow_ptr<Commit> commit);

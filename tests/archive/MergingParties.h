@@ -15,6 +15,25 @@ namespace KivArchive {
 
 using namespace KivVcs;
 
+/// What a round has found: how often questions were asked and so on, faults, and what was done.
+struct Account {
+    std::map<std::string, std::uint64_t> counts;
+    std::vector<std::string> faults;
+    std::vector<std::string> steps;
+};
+
+inline std::string ShortId(Id const& id) {
+    return Narrow(id.GetText()).substr(0, 6);
+}
+
+[[nodiscard]] inline FilesByPath FilesOf(Commit const& commit) {
+    FilesByPath files;
+    auto const root = commit.GetCommitTree()->GetRoot();
+    for (auto const& path : root->GetDeepBlobPaths())
+        files[Narrow(path)] = root->GetDeepBlob(path)->CopyToString();
+    return files;
+}
+
 /// Commits at the times that it is told, so that the same steps give the same identifiers.
 class TimedRepository : public ArchivedRepository {
 public:

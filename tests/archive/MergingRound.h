@@ -6,17 +6,6 @@
 
 namespace KivArchive {
 
-/// What a round has found: how often questions were asked and so on, faults, and what was done.
-struct Account {
-    std::map<std::string, std::uint64_t> counts;
-    std::vector<std::string> faults;
-    std::vector<std::string> steps;
-};
-
-inline std::string ShortId(Id const& id) {
-    return Narrow(id.GetText()).substr(0, 6);
-}
-
 enum class Sharing { Nothing, Archive, Branch };
 
 /// A round of some parties. The same seed and steps make the same history.
@@ -395,14 +384,6 @@ private:
         for (std::size_t i = 0; i < parties_.size(); ++i)
             heads.push_back(Head(i));
         return heads;
-    }
-
-    [[nodiscard]] static FilesByPath FilesOf(Commit const& commit) {
-        FilesByPath files;
-        auto const root = commit.GetCommitTree()->GetRoot();
-        for (auto const& path : root->GetDeepBlobPaths())
-            files[Narrow(path)] = root->GetDeepBlob(path)->CopyToString();
-        return files;
     }
 
     std::mt19937 random_;

@@ -1,6 +1,7 @@
 #include "ArchiveFiles.h"
 #include "ForwardingArchive.h"
 #include "KivArchive/ArchivedRepository.h"
+#include "KivArchive/Listings.h"
 #include "KivArchive/MemArchive.h"
 #include "KivArchive/Upkeep.h"
 #include "support/Builders.h"
@@ -474,6 +475,83 @@ TEST(ArchivedRepository, UnpublishedCommitsFollowAHeadThatWasRewritten) {
     EXPECT_EQ(FilesOf(head), "a=3 b=2 t=1");
     EXPECT_EQ(Line(head->GetParent()), "five four three") << "on the rebuilt commit, without the old ones";
     EXPECT_EQ(ProblemsOf(*archive), "");
+}
+
+TEST(ArchivedRepository, NoContentIsReadForHistoriesAndMergesWithoutConflicts) {
+    auto const archive = std::make_shared<CountingArchive>();
+    {
+        ArchivedRepository repository(archive);
+        CommitFiles(repository, "a=1 b=1 d/c=1", "base");
+        repository.CreateBranch(u"other", repository.GetHead());
+        CommitFiles(repository, "a=2 d/mine=1", "mine");
+        repository.Checkout(u"other");
+        CommitFiles(repository, "-b d/c=2", "theirs");
+        ASSERT_TRUE(repository.Publish().published);
+    }
+    ArchivedRepository repository(archive);
+    archive->contents = 0;
+    auto const merged = repository.MergeWithReport(repository.GetHead(u"other"), {TakingOurs(), MergeTexts(), {}});
+    EXPECT_EQ(merged.result, KivVcs::MergeResult::Merged);
+    EXPECT_TRUE(merged.conflicts.empty());
+    ASSERT_TRUE(repository.Publish().published);
+    Id const head = repository.GetHead()->GetId();
+    std::size_t listed = 0;
+    for (Follow const follow : {Follow::Parents, Follow::Reachable})
+        ListCommits(
+            *archive, {&head, 1}, {follow, 100, {}}, [&listed](CommitRecord const&) { return ++listed > 0; }, nullptr);
+    EXPECT_EQ(listed, 3U + 4U) << "the line, and the graph";
+    auto const after = repository.GetHead()->GetRootId();
+    EXPECT_EQ(ListDifferences(*archive, repository.GetHead()->GetParent()->GetRootId(), after, {}, nullptr)
+                  .differences.size(),
+              2U);
+    EXPECT_EQ(archive->contents, 0U);
+    EXPECT_EQ(FilesOf(repository.GetHead()), "a=2 d/c=2 d/mine=1");
+    EXPECT_GT(archive->contents, 0U) << "which is counted";
+}
+
+/// Fails when it is asked for branches, once it has been told to.
+class FailingHost : public ArchivedRepository {
+public:
+    using ArchivedRepository::ArchivedRepository;
+    bool BranchExist(KivStringViewT<char16_t> branch) override {
+        if (fails)
+            throw std::runtime_error("the host");
+        return ArchivedRepository::BranchExist(branch);
+    }
+    bool fails = false;
+};
+
+TEST(ArchivedRepository, WhatAHostThrowsBesideAMergePassesThrough) {
+    auto const archive = std::make_shared<MemArchive>();
+    FailingHost ours(archive);
+    CommitFiles(ours, "a=1", "base");
+    ASSERT_TRUE(ours.Publish().published);
+    ArchivedRepository theirs(archive);
+    CommitFiles(theirs, "a=2", "theirs");
+    ASSERT_TRUE(theirs.Publish().published);
+    CommitFiles(ours, "a=3", "ours");
+    ours.CreateBranch(u"elsewhere", nullptr);
+    ours.Checkout(u"elsewhere");
+    auto const answer = [&](bool throws) {
+        return Resolvers{[&ours, throws](auto const&, auto const&) {
+                             ours.fails = true;
+                             return throws ? throw std::runtime_error("the resolver") : KivVcs::ConflictChoice::Left;
+                         },
+                         [](auto const&, auto const&) { return KivVcs::TreeConflictChoice::Merge; }};
+    };
+    for (bool const throws : {true, false}) {
+        ours.Checkout(u"elsewhere");
+        try {
+            ours.PublishMerging(answer(throws));
+            ADD_FAILURE();
+        } catch (std::runtime_error const& error) {
+            EXPECT_STREQ(error.what(), throws ? "the resolver" : "the host");
+        }
+        ours.fails = false;
+    }
+    ours.Checkout(u"elsewhere");
+    EXPECT_EQ(ours.PublishMerging(TakingOurs()).result, PublishMergingResult::Published);
+    EXPECT_EQ(FilesOf(ours.GetHead(u"master")), "a=3");
 }
 
 TEST(ArchivedRepository, TakesTreesFromAnotherArchive) {
