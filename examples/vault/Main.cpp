@@ -236,25 +236,38 @@ std::size_t Distance(std::string_view one, std::string_view other) {
     return row.back();
 }
 
-/// @throws Problem if the first word that is no option is no command
-void RequireCommand(CommandLine& line, int argumentCount, char** arguments) {
+/// The first word that is no option of all commands; empty if there is none, or if one wants to know about all of them.
+std::string_view CommandWord(int argumentCount, char** arguments) {
     for (int i = 1; i < argumentCount; ++i) {
         const std::string_view word(arguments[i]);
-        if (word == "-f" || word == "--file" || word == "--wait") {
+        if (word == "-f" || word == "--file" || word == "--wait")
             ++i;
-            continue;
-        }
-        if (word.starts_with('-'))
-            continue;
-        std::string nearest;
-        for (auto const* const command : line.app.get_subcommands({})) {
-            if (command->get_name() == word)
-                return;
-            if (nearest.empty() || Distance(word, command->get_name()) < Distance(word, nearest))
-                nearest = command->get_name();
-        }
-        throw Problem("there is no command '" + Printable(StoredName(word)) + "'; did you mean '" + nearest + "'?");
+        else if (!word.starts_with("--file=") && !word.starts_with("--wait="))
+            return word.starts_with('-') ? std::string_view() : word;
     }
+    return {};
+}
+
+/// Describes the commands among which @p word is, or all of them: each takes a while.
+void DescribeCommands(CommandLine& line, std::string_view word) {
+    using Describe = void (*)(CommandLine&);
+    for (const Describe describe : {&DescribeViews, &DescribeFiles, &DescribeBranches, &DescribeUpkeep}) {
+        describe(line);
+        if (!line.app.get_subcommands([word](CLI::App* command) { return command->get_name() == word; }).empty())
+            return;
+    }
+}
+
+/// @throws Problem if there is no command @p word
+void RequireCommand(CommandLine const& line, std::string_view word) {
+    std::string nearest;
+    for (auto const* const command : line.app.get_subcommands({})) {
+        if (word.empty() || command->get_name() == word)
+            return;
+        if (nearest.empty() || Distance(word, command->get_name()) < Distance(word, nearest))
+            nearest = command->get_name();
+    }
+    throw Problem("there is no command '" + Printable(StoredName(word)) + "'; did you mean '" + nearest + "'?");
 }
 
 /// Directories are kept open while those in them wait.
@@ -277,11 +290,9 @@ int Run(CommandLine& line, int argumentCount, char** arguments) {
         ->capture_default_str();
     app.add_option("--wait", line.waitSeconds, "how many seconds to wait while somebody else writes")
         ->capture_default_str();
-    DescribeFiles(line);
-    DescribeViews(line);
-    DescribeBranches(line);
-    DescribeUpkeep(line);
-    RequireCommand(line, argumentCount, arguments);
+    const auto word = CommandWord(argumentCount, arguments);
+    DescribeCommands(line, word);
+    RequireCommand(line, word);
     app.parse(argumentCount, arguments);
     line.place.wait = std::chrono::seconds(line.waitSeconds);
     if (IsDatabase(line.place.file) || IsDatabase(line.first))

@@ -120,9 +120,13 @@ Id Vault::RequireBranch(std::string const& name) const {
 CommitRecord Vault::Find(std::string const& revision) const {
     const auto name = revision.empty() ? CurrentBranch() : RequireUtf8(revision, "the revision");
     Id id = HeadOf(name);
-    if (id.IsEmpty() && (revision.empty() || name == CurrentBranch()))
+    const auto isIdentifier = [&revision](std::size_t least) {
+        return revision.size() >= least && revision.size() <= 64 &&
+               revision.find_first_not_of("0123456789abcdef") == std::string::npos;
+    };
+    if (id.IsEmpty() && !isIdentifier(64) && (revision.empty() || name == CurrentBranch()))
         throw Problem("branch " + Printable(name) + " has no versions yet");
-    if (id.IsEmpty() && revision.size() <= 64 && revision.find_first_not_of("0123456789abcdef") == std::string::npos) {
+    if (id.IsEmpty() && isIdentifier(1)) {
         std::vector<Id> found;
         for (auto const& facts : archive_->ListAncestry(Before(revision), 16)) {
             if (DigitsOf(facts.commit).starts_with(revision))
