@@ -4,6 +4,8 @@
 #include "repository/RepositoryState.h"
 #include "repository/Unreadable.h"
 
+#include <algorithm>
+
 namespace KivArchive {
 
 ArchivedRepository::ArchivedRepository(std::shared_ptr<IArchive> archive, RepositoryOptions const& options)
@@ -83,7 +85,8 @@ void ArchivedRepository::RecordContained(cow_ptr<Commit> const& commit, Containm
 
 std::vector<Ancestry> ArchivedRepository::ReadAncestry(std::span<const Id> commits, Follow follow,
                                                        std::size_t more) const {
-    constexpr std::size_t batchSize = 256;
+    // As far as is asked for, since the archive walks that far for each batch.
+    std::size_t const batchSize = std::clamp<std::size_t>(more, 16, 256);
     std::unordered_map<Id, Ancestry> archived;
     auto const lookUp = [&](Id const& id) -> std::optional<Ancestry> {
         Ancestry const* const local = state_->facts.Find(id);

@@ -15,10 +15,55 @@ namespace {
 /// How often a publish is tried whose ground others have collected.
 constexpr int mostAttempts = 3;
 
-/// How many facts are looked at for a head that was rewritten.
-constexpr std::size_t mostFactsOfRewriting = 10'000;
+/// How many facts are looked at for a head that was rewritten, first and at most.
+constexpr std::size_t firstFactsOfRewriting = 40;
+constexpr std::size_t mostFactsOfRewriting = 10'240;
 
 constexpr std::chrono::milliseconds longestBackOff{1000};
+
+/// What stands for a commit on a line, and whether more facts could not say otherwise.
+struct StandIn {
+    /// Null if nothing does, or if the line goes through the commit itself.
+    Id commit;
+    bool isCertain = true;
+};
+
+/// Follows parents from @p head on to the first commit that was rewritten from @p wanted, over any number of steps.
+StandIn FindStandIn(std::vector<Ancestry> const& known, Id const& head, Id const& wanted) {
+    std::unordered_map<Id, Ancestry const*> facts;
+    for (Ancestry const& one : known)
+        facts.emplace(one.commit, &one);
+    StandIn found;
+    auto const standsForWanted = [&](Id const& commit) {
+        std::vector<Id> open{commit};
+        for (std::set<Id> met; !open.empty();) {
+            Id const id = open.back();
+            open.pop_back();
+            if (id == wanted)
+                return true;
+            auto const at = facts.find(id);
+            if (at == facts.end())
+                found.isCertain = false;
+            else if (met.insert(id).second)
+                for (ContainedCommit const& contained : at->second->contains)
+                    if (contained.how == Containment::RewrittenFrom)
+                        open.push_back(contained.id);
+        }
+        return false;
+    };
+    std::set<Id> met;
+    for (Id id = head; !id.IsEmpty() && !(id == wanted) && met.insert(id).second; id = facts.at(id)->parent) {
+        if (!facts.contains(id)) {
+            found.isCertain = false;
+            break;
+        }
+        if (standsForWanted(id)) {
+            found.commit = id;
+            break;
+        }
+    }
+    return found;
+}
 
 } // namespace
 
@@ -192,32 +237,16 @@ void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch)
     if (!fork || fork == own)
         return;
     Id const published = state_->branches.at(branch).published;
-    std::unordered_map<Id, Ancestry> facts;
-    for (Ancestry& known : state_->Archive().ReadAncestry({&published, 1}, Follow::Everything, mostFactsOfRewriting))
-        facts.try_emplace(known.commit, std::move(known));
-    auto const standsForFork = [&](Id const& commit) {
-        std::vector<Id> open{commit};
-        std::set<Id> met;
-        while (!open.empty()) {
-            Id const id = open.back();
-            open.pop_back();
-            if (id == fork->GetId())
-                return true;
-            if (auto const found = facts.find(id); found != facts.end() && met.insert(id).second)
-                for (ContainedCommit const& contained : found->second.contains)
-                    if (contained.how == Containment::RewrittenFrom)
-                        open.push_back(contained.id);
-        }
-        return false;
-    };
-    std::set<Id> met;
-    for (Id id = published; facts.contains(id) && met.insert(id).second; id = facts.at(id).parent) {
-        if (id == fork->GetId())
-            return;
-        if (standsForFork(id)) {
-            MoveBranchTo(branch, MergelessRebase(own, fork, state_->source->FetchCommit(id)));
-            return;
-        }
+    // What others have published since is mostly little.
+    std::size_t more = firstFactsOfRewriting;
+    for (;; more *= 4) {
+        auto const known = state_->Archive().ReadAncestry({&published, 1}, Follow::Everything, more);
+        auto const [standIn, isCertain] = FindStandIn(known, published, fork->GetId());
+        if (!isCertain && known.size() > more && more < mostFactsOfRewriting)
+            continue;
+        if (!standIn.IsEmpty())
+            MoveBranchTo(branch, MergelessRebase(own, fork, state_->source->FetchCommit(standIn)));
+        return;
     }
 }
 

@@ -215,21 +215,21 @@ private:
     std::mt19937 random_;
 };
 
-TEST(PostgresFaults, PartiesThatPublishAtOnceLoseNoEdit) {
-    int const rounds = CountFromEnvironment("KIVVCS_POSTGRES_ROUNDS", 10);
-    constexpr std::uint32_t count = 8;
-    static_cast<void>(theServer->MakeArchive());
-    PostgresOptions options;
-    options.schema = theServer->LastSchema();
-    std::vector<std::unique_ptr<Party>> parties;
-    for (std::uint32_t i = 0; i < count; ++i)
-        parties.push_back(std::make_unique<Party>(theServer->Address(), options, i));
-    std::atomic<unsigned> attempts{0};
-    std::atomic<unsigned> published{0};
-    for (int round = 0; round < rounds; ++round) {
+/// Parties on an archive of their own, and what they have done.
+class Team {
+public:
+    explicit Team(std::uint32_t number) {
+        static_cast<void>(theServer->MakeArchive());
+        PostgresOptions options;
+        options.schema = theServer->LastSchema();
+        for (std::uint32_t i = 0; i < size; ++i)
+            parties_.push_back(std::make_unique<Party>(theServer->Address(), options, number * size + i));
+    }
+
+    void PlayRound(int round) {
         std::vector<std::thread> threads;
-        for (auto const& party : parties)
-            threads.emplace_back([&attempts, &published, &party] {
+        for (auto const& party : parties_)
+            threads.emplace_back([this, &party] {
                 unsigned const tried = party->Play();
                 attempts += tried;
                 published += tried > 0 ? 1 : 0;
@@ -237,17 +237,47 @@ TEST(PostgresFaults, PartiesThatPublishAtOnceLoseNoEdit) {
         for (std::thread& thread : threads)
             thread.join();
         std::vector<std::string> expected;
-        for (auto const& party : parties)
+        for (auto const& party : parties_)
             for (auto const& [path, content] : party->files)
                 expected.push_back(path + "=" + content);
         std::sort(expected.begin(), expected.end());
-        for (auto const& party : parties) {
+        for (auto const& party : parties_) {
             ASSERT_EQ(party->Refreshed(), KivVcs::Joined(expected)) << "round " << round;
-            ASSERT_EQ(party->Head(), parties.front()->Head());
+            ASSERT_EQ(party->Head(), parties_.front()->Head());
         }
     }
-    std::cout << rounds << " rounds of " << count << " parties, " << published << " edits, "
-              << static_cast<double>(attempts) / std::max(1U, published.load()) << " attempts on average\n";
+
+    static constexpr std::uint32_t size = 8;
+    std::atomic<unsigned> attempts{0};
+    std::atomic<unsigned> published{0};
+
+private:
+    std::vector<std::unique_ptr<Party>> parties_;
+};
+
+TEST(PostgresFaults, PartiesThatPublishAtOnceLoseNoEdit) {
+    int const rounds = CountFromEnvironment("KIVVCS_POSTGRES_ROUNDS", 10);
+    // Several teams at once make the most of waiting.
+    constexpr int roundsOfTeam = 1000;
+    std::vector<std::unique_ptr<Team>> teams;
+    std::vector<std::thread> threads;
+    for (int first = 0; first < rounds; first += roundsOfTeam) {
+        Team& team = *teams.emplace_back(std::make_unique<Team>(static_cast<std::uint32_t>(teams.size())));
+        threads.emplace_back([&team, count = std::min(roundsOfTeam, rounds - first)] {
+            for (int round = 0; round < count && !testing::Test::HasFatalFailure(); ++round)
+                team.PlayRound(round);
+        });
+    }
+    for (std::thread& thread : threads)
+        thread.join();
+    unsigned published = 0;
+    unsigned attempts = 0;
+    for (auto const& team : teams) {
+        published += team->published;
+        attempts += team->attempts;
+    }
+    std::cout << rounds << " rounds of " << Team::size << " parties, " << published << " edits, "
+              << static_cast<double>(attempts) / std::max(1U, published) << " attempts on average\n";
 }
 
 } // namespace
