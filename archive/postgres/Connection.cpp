@@ -33,6 +33,11 @@ Connection::Connection(Address const& address, std::string const& schema, std::c
     // What others have put into schemas of the database must not be taken for what the statements mean.
     Set("SET search_path = pg_catalog");
     Set(("SET lock_timeout = " + std::to_string(wait.count())).c_str());
+    // Every statement looks rows up by their keys. Plans that are made while tables are small would read them whole for as
+    // long as the connection lasts, and planning anew takes longer than what is planned.
+    Set("SET enable_seqscan = off");
+    Set("SET plan_cache_mode = force_generic_plan");
+    Set("SET jit = off");
     PQenterPipelineMode(handle_.get());
 }
 

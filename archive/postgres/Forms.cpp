@@ -53,6 +53,13 @@ void Forms::Take(Rows const& rows) {
     answers_.push_back(rows);
 }
 
+void Forms::Take(Id const& id, Row row, std::shared_ptr<const Bytes> stored) {
+    row.stored = *stored;
+    row.storedSize = stored->size();
+    rows_.emplace(id, std::move(row));
+    owned_.push_back(std::move(stored));
+}
+
 Row const* Forms::Find(Id const& id) const {
     auto const found = rows_.find(id);
     return found == rows_.end() ? nullptr : &found->second;

@@ -38,6 +38,14 @@ public:
     /// The same, as a part of a round trip whose answer is taken then.
     static void AddTo(RoundTrip& trip, std::span<const Id> ids, std::uint64_t most);
     void Take(Rows const& rows);
+    /// A row that was read or stored before. @param stored what the row has
+    void Take(Id const& id, Row row, std::shared_ptr<const Bytes> stored);
+    /// Calls `take(id, row)` for every row.
+    template <class Take>
+    void ForEach(Take take) const {
+        for (auto const& [id, row] : rows_)
+            take(id, row);
+    }
 
     /// Null if there is no such row.
     [[nodiscard]] Row const* Find(Id const& id) const;
@@ -56,6 +64,7 @@ private:
     void Keep(Id const& id, std::shared_ptr<const Bytes> const& form);
 
     std::vector<Rows> answers_;
+    std::vector<std::shared_ptr<const Bytes>> owned_;
     std::unordered_map<Id, Row> rows_;
     std::unordered_map<Id, std::shared_ptr<const Segment>> stored_;
     std::unordered_map<Id, std::shared_ptr<const Bytes>> made_;

@@ -4,6 +4,7 @@
 #include "Parallel.h"
 
 #include <algorithm>
+#include <numeric>
 #include <unordered_set>
 
 namespace KivArchive::Postgres {
@@ -18,6 +19,8 @@ constexpr std::size_t worthwhile = 3;
 constexpr std::uint64_t windowSize = 8 * largestWholeContent;
 /// What is smaller hardly becomes smaller still.
 constexpr std::size_t worthCompressing = 64;
+/// Less is made sooner than another thread has begun.
+constexpr std::uint64_t worthSharing = 128 * 1024;
 
 void MakeDifference(Prepared& prepared, Compressor& compressor) {
     bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
@@ -41,14 +44,20 @@ void MakeStored(Prepared& prepared, Compressor& compressor) {
 
 } // namespace
 
-Preparation::Preparation(std::vector<Item> const& items, Connection& connection, unsigned workers,
-                         bool looksForPresent) {
+Preparation::Preparation(std::vector<Item> const& items, Connection& connection, RecentRows& recent, unsigned workers,
+                         bool looksForPresent)
+    : recent_(recent) {
     Select(items);
-    bool const hasEarlier = std::any_of(prepared_.begin(), prepared_.end(), [this](Prepared const& one) {
-        return !one.item->earlier.IsEmpty() && EarlierPrepared(one) == nullptr;
-    });
-    if (looksForPresent || hasEarlier)
+    if (std::accumulate(items.begin(), items.end(), std::uint64_t{0},
+                        [](std::uint64_t sum, Item const& item) { return sum + item.size; }) < worthSharing)
+        workers = 1;
+    std::vector<Id> const earlier = EarlierRows();
+    bool const hasEarlier = !earlier.empty();
+    areNew_ = hasEarlier && !looksForPresent && recent_.GiveAll(earlier, forms_);
+    if (looksForPresent || (hasEarlier && !areNew_)) {
+        forms_ = Forms();
         Ask(connection);
+    }
     ForEachInParallel(prepared_.size(), workers, connection.compressor, [this](std::size_t index, Compressor&) {
         Prepared& one = prepared_[index];
         MakeForm(one);
@@ -78,6 +87,36 @@ void Preparation::Select(std::vector<Item> const& items) {
             prepared_.emplace_back().item = &item;
 }
 
+std::vector<Id> Preparation::EarlierRows() const {
+    std::vector<Id> earlier;
+    for (Prepared const& one : prepared_)
+        if (!one.item->earlier.IsEmpty() && EarlierPrepared(one) == nullptr)
+            earlier.push_back(one.item->earlier);
+    return earlier;
+}
+
+void Preparation::KeepRead() const {
+    if (!forms_.AreWhole())
+        return;
+    forms_.ForEach([this](Id const& id, Row const& row) {
+        recent_.Keep(id, {row, std::make_shared<const Bytes>(row.stored.begin(), row.stored.end())});
+    });
+}
+
+void Preparation::KeepStored() const {
+    if (!areNew_)
+        return;
+    for (Prepared const& one : prepared_) {
+        if (one.item->type == StoredType::Commit)
+            continue;
+        Row row;
+        row.type = one.item->type;
+        row.size = one.item->size;
+        row.base = one.base;
+        recent_.Keep(one.item->id, {std::move(row), std::make_shared<const Bytes>(one.stored)});
+    }
+}
+
 void Preparation::Ask(Connection& connection) {
     std::vector<Id> ids;
     std::vector<Id> earlier;
@@ -91,6 +130,7 @@ void Preparation::Ask(Connection& connection) {
     Forms::AddTo(trip, earlier, windowSize);
     auto const answers = trip.Run();
     forms_.Take(answers[1]);
+    KeepRead();
     Rows const& rows = answers[0];
     std::unordered_set<Id> present;
     for (int i = 0; i < rows.Count(); ++i) {

@@ -3,7 +3,7 @@
 /// @file
 /// Everything that is made of what is to be stored before the transaction that stores it.
 
-#include "postgres/Forms.h"
+#include "postgres/RecentRows.h"
 #include "postgres/Store.h"
 
 namespace KivArchive::Postgres {
@@ -21,25 +21,32 @@ struct Prepared : ItemForm {
 
 class Preparation {
 public:
+    /// @param recent where earlier versions are looked for, and kept
     /// @param looksForPresent whether to ask the server which items it has; it is asked as well if there are earlier
-    /// versions
-    Preparation(std::vector<Item> const& items, Connection& connection, unsigned workers, bool looksForPresent);
+    /// versions that are not recent
+    Preparation(std::vector<Item> const& items, Connection& connection, RecentRows& recent, unsigned workers,
+                bool looksForPresent);
     Preparation(Preparation const&) = delete;
     Preparation& operator=(Preparation const&) = delete;
     ~Preparation() = default;
 
     /// What is to be stored, in ascending order of the identifiers.
     [[nodiscard]] std::vector<Prepared> const& Items() const noexcept { return prepared_; }
-    /// Whether the server was asked, so that it has none of `Items`.
+    /// Whether the server has none of `Items`: it was asked, or they are taken for new unasked.
     [[nodiscard]] bool AreNew() const noexcept { return areNew_; }
     /// The items that the server has, and those of them that are no objects there.
     [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
     [[nodiscard]] std::vector<Id> const& Removed() const noexcept { return removed_; }
     /// The rows that items are differences to and that are not among them, each once.
     [[nodiscard]] std::vector<Id> Bases() const;
+    /// Keeps what has been stored, if it was new.
+    void KeepStored() const;
 
 private:
     void Select(std::vector<Item> const& items);
+    /// The earlier versions of the items, but for those that are items themselves.
+    [[nodiscard]] std::vector<Id> EarlierRows() const;
+    void KeepRead() const;
     /// Asks which items the server has, and for the earlier versions.
     void Ask(Connection& connection);
     void MakeDifferencesToRows(Connection& connection, unsigned workers);
@@ -49,6 +56,7 @@ private:
     void FindBase(Prepared& one, Compressor& compressor);
     [[nodiscard]] std::uint64_t GenerationOf(Id const& id);
 
+    RecentRows& recent_;
     std::vector<Prepared> prepared_;
     std::unordered_map<Id, std::size_t> numbers_;
     std::vector<Id> present_;

@@ -132,10 +132,7 @@ constexpr std::string_view TemplateOf(Statement statement) {
         return "UPDATE @.objects SET type = type - 8 WHERE id = ANY($1::bytea[]) AND type >= 8";
     case Statement::CheckUsed:
         return "SELECT 1 / CASE count(*) WHEN $2::bigint THEN 1 ELSE 0 END FROM (SELECT id FROM @.objects "
-               "WHERE id = ANY($1::bytea[]) AND type < 8 ORDER BY id FOR SHARE) AS used";
-    case Statement::CheckBases:
-        return "SELECT 1 / CASE count(*) WHEN $2::bigint THEN 1 ELSE 0 END FROM (SELECT id FROM @.objects "
-               "WHERE id = ANY($1::bytea[]) ORDER BY id FOR SHARE) AS used";
+               "WHERE id = ANY($1::bytea[]) AND (type < 8 OR id = ANY($3::bytea[])) ORDER BY id FOR SHARE) AS used";
     case Statement::AddAncestry:
         return "INSERT INTO @.ancestry(id, parent, tree) SELECT * FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) "
                "ON CONFLICT DO NOTHING";
@@ -144,17 +141,16 @@ constexpr std::string_view TemplateOf(Statement statement) {
                "ON CONFLICT DO NOTHING";
     case Statement::DeleteMarks:
         return "DELETE FROM @.marks WHERE id = ANY($1::bytea[])";
-    case Statement::CheckHead:
-        return "SELECT 1 / count(*) FROM (SELECT name FROM @.branches WHERE name = $1::bytea AND head = $2::bytea "
-               "FOR UPDATE) AS expected";
     case Statement::CheckNoHead:
         return "SELECT 1 / CASE count(*) WHEN 0 THEN 1 ELSE 0 END FROM @.branches WHERE name = $1::bytea";
     case Statement::MoveBranch:
-        return "UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea";
+        return "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
+               "RETURNING name) SELECT 1 / count(*) FROM moved";
     case Statement::MakeBranch:
         return "INSERT INTO @.branches(name, head) VALUES($1::bytea, $2::bytea)";
     case Statement::RemoveBranch:
-        return "DELETE FROM @.branches WHERE name = $1::bytea AND head = $2::bytea";
+        return "WITH removed AS (DELETE FROM @.branches WHERE name = $1::bytea AND head = $2::bytea RETURNING name) "
+               "SELECT 1 / count(*) FROM removed";
     case Statement::CheckRecord:
         return "SELECT 1 / count(*) FROM (SELECT name FROM @.records WHERE name = $1::bytea AND value = $2::bytea "
                "FOR UPDATE) AS expected";

@@ -6,6 +6,7 @@
 #include "Items.h"
 #include "KivArchive/PostgresArchive.h"
 #include "postgres/Connection.h"
+#include "postgres/RecentRows.h"
 
 #include <mutex>
 
@@ -105,6 +106,7 @@ private:
     bool isFirstConnection_ = true;
     std::mutex mutex_;
     std::vector<std::unique_ptr<Connection>> idle_;
+    RecentRows recent_;
 };
 
 /// Makes the tables if there are none and that is wanted, and makes sure that they are ours.

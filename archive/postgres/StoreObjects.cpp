@@ -12,8 +12,16 @@ namespace {
 /// How much one statement brings.
 constexpr std::size_t statementSize = 8 * largestWholeContent;
 
+bool IsBefore(Id const& left, Id const& right) {
+    return DigestOf(left) < DigestOf(right);
+}
+
+bool Contains(std::vector<Id> const& sorted, Id const& id) {
+    return std::binary_search(sorted.begin(), sorted.end(), id, IsBefore);
+}
+
 void SortUnique(std::vector<Id>& ids) {
-    std::sort(ids.begin(), ids.end(), [](Id const& left, Id const& right) { return DigestOf(left) < DigestOf(right); });
+    std::sort(ids.begin(), ids.end(), IsBefore);
     ids.erase(std::unique(ids.begin(), ids.end()), ids.end());
 }
 
@@ -93,11 +101,7 @@ private:
             items.push_back(one.item->id);
         if (preparation_.AreNew()) {
             SortUnique(items);
-            std::erase_if(used_, [&items](Id const& id) {
-                return std::binary_search(items.begin(), items.end(), id, [](Id const& left, Id const& right) {
-                    return DigestOf(left) < DigestOf(right);
-                });
-            });
+            std::erase_if(used_, [&items](Id const& id) { return Contains(items, id); });
         } else {
             // Others may have stored some, or somebody may have removed them.
             used_.insert(used_.end(), items.begin(), items.end());
@@ -105,12 +109,16 @@ private:
         SortUnique(used_);
         if (!preparation_.Removed().empty())
             trip_.Add(Statement::BringBack, Parameters().With(preparation_.Removed()));
-        if (std::vector<Id> const bases = preparation_.Bases(); !bases.empty())
-            trip_.Add(Statement::CheckBases, Parameters().With(bases).With(std::uint64_t{bases.size()}));
-        if (used_.empty())
-            return;
-        trip_.Add(Statement::CheckUsed, Parameters().With(used_).With(std::uint64_t{used_.size()}));
-        trip_.Add(Statement::DeleteMarks, Parameters().With(used_));
+        std::vector<Id> bases = preparation_.Bases();
+        std::vector<Id> held = used_;
+        held.insert(held.end(), bases.begin(), bases.end());
+        SortUnique(held);
+        // Bases need not be objects, but for those that are used as well.
+        std::erase_if(bases, [this](Id const& id) { return Contains(used_, id); });
+        if (!held.empty())
+            trip_.Add(Statement::CheckUsed, Parameters().With(held).With(std::uint64_t{held.size()}).With(bases));
+        if (!used_.empty())
+            trip_.Add(Statement::DeleteMarks, Parameters().With(used_));
     }
 
     void AddAncestry() {
@@ -160,7 +168,6 @@ private:
         for (BranchMove const& move : change_.branches) {
             Bytes const name = BytesOfName(move.name);
             if (!move.expected.IsEmpty()) {
-                trip_.Add(Statement::CheckHead, Parameters().With(name).With(move.expected));
                 if (move.head.IsEmpty())
                     trip_.Add(Statement::RemoveBranch, Parameters().With(name).With(move.expected));
                 else
@@ -254,9 +261,11 @@ ChangeOutcome Store::Apply(std::vector<Item> const& items, Change const& change)
     Attempts attempts(options_, false);
     for (;;) {
         auto const outcome = Run([&](Connection& connection) -> std::optional<ChangeOutcome> {
-            Preparation const preparation(items, connection, options_.workers, looksForPresent);
-            if (Storing(connection, preparation, change, token).Run())
+            Preparation const preparation(items, connection, recent_, options_.workers, looksForPresent);
+            if (Storing(connection, preparation, change, token).Run()) {
+                preparation.KeepStored();
                 return ChangeOutcome{true, {}, {}};
+            }
             ChangeOutcome reason = FindReason(connection, change, needed, Shown());
             if (!reason.applied)
                 return reason;

@@ -6,6 +6,9 @@ namespace KivArchive {
 
 namespace {
 
+constexpr std::size_t maximumUnasked = 16;
+constexpr std::uint64_t largestUnasked = 64 * 1024;
+
 /// The null identifier for null.
 template <class T>
 Id IdOf(cow_ptr<T> const& object) {
@@ -27,7 +30,12 @@ void MissingTrees::Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier) {
         List(number);
 }
 
-void MissingTrees::Find() {
+void MissingTrees::Find(bool isNew) {
+    if (isNew && AreFewAndSmall()) {
+        missing_.insert(toAskFor_.begin(), toAskFor_.end());
+        toAskFor_.clear();
+        return;
+    }
     while (!toAskFor_.empty()) {
         for (Id& id : archive_.FindMissing(std::exchange(toAskFor_, {})))
             missing_.insert(std::move(id));
@@ -36,6 +44,17 @@ void MissingTrees::Find() {
             if (IsMissing(directories_[looked_].id) && !directories_[looked_].isListed)
                 List(looked_);
     }
+}
+
+/// Whether it costs less to store all of it than to ask for it first.
+bool MissingTrees::AreFewAndSmall() const {
+    return toAskFor_.size() <= maximumUnasked &&
+           std::all_of(directories_.begin(), directories_.end(), [](NewDirectory const& directory) {
+               return directory.isListed && !directory.tree->IsOfHostClass() &&
+                      std::all_of(directory.files.begin(), directory.files.end(), [](NewDirectory::File const& file) {
+                          return !file.blob->IsOfHostClass() && file.blob->GetData().GetSize() <= largestUnasked;
+                      });
+           });
 }
 
 std::size_t MissingTrees::AddDirectory(NewDirectory directory) {

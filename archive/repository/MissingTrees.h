@@ -50,7 +50,8 @@ public:
     /// @throws ArchiveError of kind `Unrepresentable`, as everything here
     void Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier);
     /// Asks the archive about all that was added.
-    void Find();
+    /// @param isNew whether a few small things that differ from earlier versions are taken for missing unasked
+    void Find(bool isNew);
 
     [[nodiscard]] bool IsMissing(Id const& id) const { return missing_.contains(id); }
     /// The number of a directory that was looked for.
@@ -60,6 +61,7 @@ public:
     [[noreturn]] void Refuse(std::size_t directory, KivStringViewT<char16_t> name, const char* why) const;
 
 private:
+    [[nodiscard]] bool AreFewAndSmall() const;
     void List(std::size_t number);
     [[nodiscard]] bool ListsWholeNow(std::size_t number);
     void ListFiles(std::size_t number);

@@ -163,7 +163,7 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
     if (pending.moves.empty() && records.empty() && !state.facts.TellOfPublished(isUnpublished))
         return {true, {}, {}};
     auto const commits = MissingCommits(*state.storage, state.facts, state.Archive(), asksForAll).Find(pending.heads);
-    Publishing publishing(state.Archive(), *state.storage, state.facts, progress);
+    Publishing publishing(state.Archive(), *state.storage, state.facts, asksForAll, progress);
     publishing.Store(commits);
     // Everything that could fail comes before the branches move.
     std::vector<Id> published;

@@ -36,7 +36,11 @@ void Publishing::StoreTogether(std::span<cow_ptr<Commit> const> commits) {
         if (cow_ptr<Tree> root = HeldRootOf(*commit))
             trees.Add(std::move(root), parent ? HeldRootOf(*parent) : nullptr);
     }
-    trees.Find();
+    // What was merged or rewritten is made of what is there.
+    bool const areNew = !asksForAll_ && std::none_of(commits.begin(), commits.end(), [this](auto const& commit) {
+        return facts_.Find(commit->GetId()) != nullptr;
+    });
+    trees.Find(areNew);
     for (auto const& commit : commits) {
         if (cow_ptr<Tree> const root = HeldRootOf(*commit); root && trees.IsMissing(root->GetId()))
             StoreTree(trees, trees.NumberOf(root->GetId()));

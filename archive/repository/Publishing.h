@@ -16,8 +16,10 @@ using KivVcs::Commit;
 /// Stores what the archive lacks, children first, in changes of a bounded size of which the last one moves the branches.
 class Publishing {
 public:
-    Publishing(IArchive& archive, KivVcs::IObjectsStorage const& storage, LocalFacts const& facts, IProgress* progress)
-        : archive_(archive), storage_(storage), facts_(facts), progress_(progress) {}
+    /// @param asksForAll whether to ask the archive also for what is most likely new
+    Publishing(IArchive& archive, KivVcs::IObjectsStorage const& storage, LocalFacts const& facts, bool asksForAll,
+               IProgress* progress)
+        : archive_(archive), storage_(storage), facts_(facts), asksForAll_(asksForAll), progress_(progress) {}
 
     /// Stores commits with all that they bring. @param commits those that are missing, each behind what it names
     void Store(std::vector<cow_ptr<Commit>> const& commits);
@@ -41,6 +43,7 @@ private:
     IArchive& archive_;
     KivVcs::IObjectsStorage const& storage_;
     LocalFacts const& facts_;
+    bool asksForAll_;
     IProgress* progress_;
     Change change_;
     std::uint64_t size_ = 0;
