@@ -1,5 +1,6 @@
 #include "postgres/Statements.h"
 
+#include <algorithm>
 #include <string_view>
 
 namespace KivArchive::Postgres {
@@ -10,194 +11,162 @@ namespace {
 // content. A check that does not hold divides by zero, which ends the transaction on the server: so all of it goes in one
 // round trip, whether it comes to its end or not. What is looked up row by row is fenced by OFFSET 0: joined, small tables would
 // be read whole for each step.
-constexpr std::string_view TemplateOf(Statement statement) {
-    switch (statement) {
-    case Statement::Begin:
-        return "BEGIN ISOLATION LEVEL READ COMMITTED";
-    case Statement::Commit:
-        return "COMMIT";
-    case Statement::Rollback:
-        return "ROLLBACK";
+struct Template {
+    Statement statement;
+    std::string_view text;
+};
 
-    case Statement::ReadColumns:
-        return "SELECT CAST(table_name AS text), CAST(column_name AS text), CAST(data_type AS text) "
-               "FROM information_schema.columns WHERE table_schema = $1 ORDER BY table_name, ordinal_position";
-    case Statement::ReadFormat:
-        return "SELECT CAST(max(version) AS bigint) FROM @.format";
+constexpr std::array<Template, statementCount> templates{{
+    {Statement::Begin, "BEGIN ISOLATION LEVEL READ COMMITTED"},
+    {Statement::Commit, "COMMIT"},
+    {Statement::Rollback, "ROLLBACK"},
+    {Statement::ReadColumns,
+     "SELECT CAST(table_name AS text), CAST(column_name AS text), CAST(data_type AS text) "
+     "FROM information_schema.columns WHERE table_schema = $1 ORDER BY table_name, ordinal_position"},
+    {Statement::ReadFormat, "SELECT CAST(max(version) AS bigint) FROM @.format"},
+    {Statement::MakeSchema, "CREATE SCHEMA IF NOT EXISTS @"},
+    {Statement::MakeAncestry,
+     "CREATE TABLE IF NOT EXISTS @.ancestry(id bytea PRIMARY KEY, parent bytea NOT NULL, tree bytea NOT "
+     "NULL)"},
+    {Statement::MakeAttempts, "CREATE TABLE IF NOT EXISTS @.attempts(token bytea PRIMARY KEY, time bigint NOT NULL)"},
+    {Statement::MakeBranches, "CREATE TABLE IF NOT EXISTS @.branches(name bytea PRIMARY KEY, head bytea NOT NULL)"},
+    {Statement::MakeContained, "CREATE TABLE IF NOT EXISTS @.contained(id bytea, how smallint, other bytea, "
+                               "PRIMARY KEY(id, how, other))"},
+    {Statement::MakeFormat, "CREATE TABLE IF NOT EXISTS @.format(version smallint PRIMARY KEY)"},
+    {Statement::MakeMarks, "CREATE TABLE IF NOT EXISTS @.marks(id bytea PRIMARY KEY, time bigint NOT NULL)"},
+    {Statement::MakeObjects, "CREATE TABLE IF NOT EXISTS @.objects(id bytea PRIMARY KEY, type smallint NOT NULL, "
+                             "size bigint NOT NULL, base bytea NOT NULL, form bytea NOT NULL)"},
+    {Statement::MakeIndexOfBases, "CREATE INDEX IF NOT EXISTS objects_by_base ON @.objects(base)"},
+    {Statement::MakeRecords, "CREATE TABLE IF NOT EXISTS @.records(name bytea PRIMARY KEY, value bytea NOT NULL)"},
+    {Statement::AddFormat, "INSERT INTO @.format(version) VALUES(1) ON CONFLICT DO NOTHING"},
+    {Statement::FindObjects,
+     "SELECT id, CAST(type AS bigint), size FROM @.objects WHERE id = ANY($1::bytea[]) AND type < 8"},
+    {Statement::FindRows, "SELECT id, CAST(type AS bigint) FROM @.objects WHERE id = ANY($1::bytea[])"},
+    // Rows, and all that they are differences to; without their forms if these are too much for one answer.
+    {Statement::ReadRows,
+     "WITH RECURSIVE wanted(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.base FROM wanted w "
+     "CROSS JOIN LATERAL (SELECT base FROM @.objects WHERE id = w.id AND base <> '\\x' OFFSET 0) l), "
+     "found AS (SELECT o.id, o.type, o.size, o.base, o.form, "
+     "sum(octet_length(o.form)) OVER () AS total FROM wanted w CROSS JOIN LATERAL "
+     "(SELECT id, type, size, base, form FROM @.objects WHERE id = w.id OFFSET 0) o) "
+     "SELECT id, CAST(type AS bigint), size, base, CAST(octet_length(form) AS bigint), "
+     "CASE WHEN total <= $2::bigint THEN form END FROM found"},
+    {Statement::ListObjects,
+     "SELECT id, CAST(type AS bigint), size FROM @.objects WHERE id > $1::bytea AND type <> 3 AND type < 8 "
+     "ORDER BY id LIMIT $2::bigint"},
+    {Statement::ReadBranches, "SELECT name, head FROM @.branches"},
+    {Statement::ReadHeads, "SELECT name, head FROM @.branches WHERE name = ANY($1::bytea[])"},
+    {Statement::ReadRecords, "SELECT name, value FROM @.records WHERE name = ANY($1::bytea[])"},
+    {Statement::ListRecords, "SELECT name FROM @.records"},
+    {Statement::ListMarked,
+     "SELECT m.id FROM @.marks m JOIN @.objects o ON o.id = m.id "
+     "WHERE m.time <= CAST(extract(epoch FROM now()) AS bigint) - $1::bigint AND m.id > $2::bytea "
+     "AND o.type <> 3 AND o.type < 8 ORDER BY m.id LIMIT $3::bigint"},
+    {Statement::WalkParents,
+     "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
+     "LATERAL "
+     "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' OFFSET 0) l), "
+     "near AS (SELECT id FROM walk LIMIT $2::bigint) "
+     "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
+     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+     "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true"},
+    {Statement::WalkReachable,
+     "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
+     "LATERAL "
+     "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
+     "SELECT other FROM @.contained WHERE id = w.id AND how = 0 OFFSET 0) l), "
+     "near AS (SELECT id FROM walk LIMIT $2::bigint) "
+     "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
+     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+     "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true"},
+    {Statement::WalkEverything,
+     "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
+     "LATERAL "
+     "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
+     "SELECT other FROM @.contained WHERE id = w.id OFFSET 0) l), "
+     "near AS (SELECT id FROM walk LIMIT $2::bigint) "
+     "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
+     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+     "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true"},
+    {Statement::ListAncestry,
+     "SELECT a.id, a.parent, a.tree, CAST(c.how AS bigint), c.other "
+     "FROM (SELECT id, parent, tree FROM @.ancestry WHERE id > $1::bytea ORDER BY id LIMIT $2::bigint) a "
+     "LEFT JOIN @.contained c ON c.id = a.id ORDER BY a.id"},
+    {Statement::CountObjects,
+     "SELECT CAST(type AS bigint), count(*), CAST(sum(octet_length(form)) AS bigint) FROM @.objects "
+     "GROUP BY type"},
+    {Statement::CountRows,
+     "SELECT (SELECT count(*) FROM @.ancestry), (SELECT count(*) FROM @.branches), "
+     "(SELECT count(*) FROM @.records), (SELECT count(*) FROM @.marks m JOIN @.objects o ON o.id = m.id "
+     "WHERE o.type <> 3 AND o.type < 8)"},
+    {Statement::RememberAttempt,
+     "INSERT INTO @.attempts(token, time) VALUES($1::bytea, CAST(extract(epoch FROM now()) AS bigint))"},
+    {Statement::ForgetAttempts,
+     "DELETE FROM @.attempts WHERE time < CAST(extract(epoch FROM now()) AS bigint) - $1::bigint"},
+    {Statement::AddObjects, "INSERT INTO @.objects(id, type, size, base, form) "
+                            "SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[]) "
+                            "ON CONFLICT DO NOTHING"},
+    {Statement::AddNewObjects,
+     "INSERT INTO @.objects(id, type, size, base, form) "
+     "SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[])"},
+    {Statement::BringBack, "UPDATE @.objects SET type = type - 8 WHERE id = ANY($1::bytea[]) AND type >= 8"},
+    {Statement::CheckUsed,
+     "SELECT 1 / CASE count(*) WHEN $2::bigint THEN 1 ELSE 0 END FROM (SELECT id FROM @.objects "
+     "WHERE id = ANY($1::bytea[]) AND (type < 8 OR id = ANY($3::bytea[])) ORDER BY id FOR SHARE) AS used"},
+    {Statement::AddAncestry,
+     "INSERT INTO @.ancestry(id, parent, tree) SELECT * FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) "
+     "ON CONFLICT DO NOTHING"},
+    {Statement::AddContained,
+     "INSERT INTO @.contained(id, how, other) SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bytea[]) "
+     "ON CONFLICT DO NOTHING"},
+    {Statement::DeleteMarks, "DELETE FROM @.marks WHERE id = ANY($1::bytea[])"},
+    {Statement::CheckNoHead,
+     "SELECT 1 / CASE count(*) WHEN 0 THEN 1 ELSE 0 END FROM @.branches WHERE name = $1::bytea"},
+    {Statement::MoveBranch,
+     "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
+     "RETURNING name) SELECT 1 / count(*) FROM moved"},
+    {Statement::MakeBranch, "INSERT INTO @.branches(name, head) VALUES($1::bytea, $2::bytea)"},
+    {Statement::RemoveBranch,
+     "WITH removed AS (DELETE FROM @.branches WHERE name = $1::bytea AND head = $2::bytea RETURNING name) "
+     "SELECT 1 / count(*) FROM removed"},
+    {Statement::CheckRecord,
+     "SELECT 1 / count(*) FROM (SELECT name FROM @.records WHERE name = $1::bytea AND value = $2::bytea "
+     "FOR UPDATE) AS expected"},
+    {Statement::CheckNoRecord,
+     "SELECT 1 / CASE count(*) WHEN 0 THEN 1 ELSE 0 END FROM @.records WHERE name = $1::bytea"},
+    {Statement::ChangeRecord, "UPDATE @.records SET value = $2::bytea WHERE name = $1::bytea"},
+    {Statement::MakeRecord, "INSERT INTO @.records(name, value) VALUES($1::bytea, $2::bytea)"},
+    {Statement::AddRecord, "INSERT INTO @.records(name, value) VALUES($1::bytea, $2::bytea) ON CONFLICT DO NOTHING"},
+    {Statement::RemoveRecord, "DELETE FROM @.records WHERE name = $1::bytea"},
+    {Statement::LockRows,
+     "SELECT id, CAST(type AS bigint) FROM @.objects WHERE id = ANY($1::bytea[]) ORDER BY id FOR UPDATE"},
+    {Statement::AddMarks,
+     "INSERT INTO @.marks(id, time) SELECT id, CAST(extract(epoch FROM now()) AS bigint) FROM @.objects "
+     "WHERE id = ANY($1::bytea[]) AND type < 8 ON CONFLICT DO NOTHING"},
+    {Statement::FindMarked, "SELECT id FROM @.marks WHERE id = ANY($1::bytea[]) "
+                            "AND time <= CAST(extract(epoch FROM now()) AS bigint) - $2::bigint"},
+    {Statement::MarkForNow, "INSERT INTO @.marks(id, time) SELECT id, 0 FROM @.objects WHERE id = ANY($1::bytea[]) "
+                            "ON CONFLICT(id) DO UPDATE SET time = 0"},
+    {Statement::FindBases, "SELECT DISTINCT base FROM @.objects WHERE base = ANY($1::bytea[])"},
+    {Statement::KeepAsBases, "UPDATE @.objects SET type = type + 8 WHERE id = ANY($1::bytea[]) AND type < 8"},
+    {Statement::RemoveRows, "DELETE FROM @.objects WHERE id = ANY($1::bytea[])"},
+    {Statement::FindUnusedBases,
+     "SELECT m.id, CAST(octet_length(o.form) AS bigint) FROM @.marks m JOIN @.objects o ON o.id = m.id "
+     "WHERE o.type >= 8 AND NOT EXISTS (SELECT 1 FROM @.objects d WHERE d.base = m.id) LIMIT $1::bigint"},
+    {Statement::ListPieces, "SELECT id FROM @.objects WHERE type = 3 AND id > $1::bytea ORDER BY id LIMIT $2::bigint"},
+    {Statement::ReadPieceLists,
+     "SELECT id, form FROM @.objects WHERE type = 4 AND id > $1::bytea ORDER BY id LIMIT $2::bigint"},
+}};
 
-    case Statement::MakeSchema:
-        return "CREATE SCHEMA IF NOT EXISTS @";
-    case Statement::MakeAncestry:
-        return "CREATE TABLE IF NOT EXISTS @.ancestry(id bytea PRIMARY KEY, parent bytea NOT NULL, tree bytea NOT "
-               "NULL)";
-    case Statement::MakeAttempts:
-        return "CREATE TABLE IF NOT EXISTS @.attempts(token bytea PRIMARY KEY, time bigint NOT NULL)";
-    case Statement::MakeBranches:
-        return "CREATE TABLE IF NOT EXISTS @.branches(name bytea PRIMARY KEY, head bytea NOT NULL)";
-    case Statement::MakeContained:
-        return "CREATE TABLE IF NOT EXISTS @.contained(id bytea, how smallint, other bytea, "
-               "PRIMARY KEY(id, how, other))";
-    case Statement::MakeFormat:
-        return "CREATE TABLE IF NOT EXISTS @.format(version smallint PRIMARY KEY)";
-    case Statement::MakeMarks:
-        return "CREATE TABLE IF NOT EXISTS @.marks(id bytea PRIMARY KEY, time bigint NOT NULL)";
-    case Statement::MakeObjects:
-        return "CREATE TABLE IF NOT EXISTS @.objects(id bytea PRIMARY KEY, type smallint NOT NULL, "
-               "size bigint NOT NULL, base bytea NOT NULL, form bytea NOT NULL)";
-    case Statement::MakeIndexOfBases:
-        return "CREATE INDEX IF NOT EXISTS objects_by_base ON @.objects(base)";
-    case Statement::MakeRecords:
-        return "CREATE TABLE IF NOT EXISTS @.records(name bytea PRIMARY KEY, value bytea NOT NULL)";
-    case Statement::AddFormat:
-        return "INSERT INTO @.format(version) VALUES(1) ON CONFLICT DO NOTHING";
-
-    case Statement::FindObjects:
-        return "SELECT id, CAST(type AS bigint), size FROM @.objects WHERE id = ANY($1::bytea[]) AND type < 8";
-    case Statement::FindRows:
-        return "SELECT id, CAST(type AS bigint) FROM @.objects WHERE id = ANY($1::bytea[])";
-    case Statement::ReadRows:
-        // Rows, and all that they are differences to; without their forms if these are too much for one answer.
-        return "WITH RECURSIVE wanted(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.base FROM wanted w "
-               "CROSS JOIN LATERAL (SELECT base FROM @.objects WHERE id = w.id AND base <> '\\x' OFFSET 0) l), "
-               "found AS (SELECT o.id, o.type, o.size, o.base, o.form, "
-               "sum(octet_length(o.form)) OVER () AS total FROM wanted w CROSS JOIN LATERAL "
-               "(SELECT id, type, size, base, form FROM @.objects WHERE id = w.id OFFSET 0) o) "
-               "SELECT id, CAST(type AS bigint), size, base, CAST(octet_length(form) AS bigint), "
-               "CASE WHEN total <= $2::bigint THEN form END FROM found";
-    case Statement::ListObjects:
-        return "SELECT id, CAST(type AS bigint), size FROM @.objects WHERE id > $1::bytea AND type <> 3 AND type < 8 "
-               "ORDER BY id LIMIT $2::bigint";
-    case Statement::ReadBranches:
-        return "SELECT name, head FROM @.branches";
-    case Statement::ReadHeads:
-        return "SELECT name, head FROM @.branches WHERE name = ANY($1::bytea[])";
-    case Statement::ReadRecords:
-        return "SELECT name, value FROM @.records WHERE name = ANY($1::bytea[])";
-    case Statement::ListRecords:
-        return "SELECT name FROM @.records";
-    case Statement::ListMarked:
-        return "SELECT m.id FROM @.marks m JOIN @.objects o ON o.id = m.id "
-               "WHERE m.time <= CAST(extract(epoch FROM now()) AS bigint) - $1::bigint AND m.id > $2::bytea "
-               "AND o.type <> 3 AND o.type < 8 ORDER BY m.id LIMIT $3::bigint";
-    case Statement::WalkParents:
-        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
-               "LATERAL "
-               "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' OFFSET 0) l), "
-               "near AS (SELECT id FROM walk LIMIT $2::bigint) "
-               "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-               "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
-               "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true";
-    case Statement::WalkReachable:
-        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
-               "LATERAL "
-               "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
-               "SELECT other FROM @.contained WHERE id = w.id AND how = 0 OFFSET 0) l), "
-               "near AS (SELECT id FROM walk LIMIT $2::bigint) "
-               "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-               "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
-               "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true";
-    case Statement::WalkEverything:
-        return "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
-               "LATERAL "
-               "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
-               "SELECT other FROM @.contained WHERE id = w.id OFFSET 0) l), "
-               "near AS (SELECT id FROM walk LIMIT $2::bigint) "
-               "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-               "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
-               "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true";
-    case Statement::ListAncestry:
-        return "SELECT a.id, a.parent, a.tree, CAST(c.how AS bigint), c.other "
-               "FROM (SELECT id, parent, tree FROM @.ancestry WHERE id > $1::bytea ORDER BY id LIMIT $2::bigint) a "
-               "LEFT JOIN @.contained c ON c.id = a.id ORDER BY a.id";
-    case Statement::CountObjects:
-        return "SELECT CAST(type AS bigint), count(*), CAST(sum(octet_length(form)) AS bigint) FROM @.objects "
-               "GROUP BY type";
-    case Statement::CountRows:
-        return "SELECT (SELECT count(*) FROM @.ancestry), (SELECT count(*) FROM @.branches), "
-               "(SELECT count(*) FROM @.records), (SELECT count(*) FROM @.marks m JOIN @.objects o ON o.id = m.id "
-               "WHERE o.type <> 3 AND o.type < 8)";
-
-    case Statement::RememberAttempt:
-        return "INSERT INTO @.attempts(token, time) VALUES($1::bytea, CAST(extract(epoch FROM now()) AS bigint))";
-    case Statement::ForgetAttempts:
-        return "DELETE FROM @.attempts WHERE time < CAST(extract(epoch FROM now()) AS bigint) - $1::bigint";
-    case Statement::AddObjects:
-        return "INSERT INTO @.objects(id, type, size, base, form) "
-               "SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[]) "
-               "ON CONFLICT DO NOTHING";
-    case Statement::AddNewObjects:
-        return "INSERT INTO @.objects(id, type, size, base, form) "
-               "SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[])";
-    case Statement::BringBack:
-        return "UPDATE @.objects SET type = type - 8 WHERE id = ANY($1::bytea[]) AND type >= 8";
-    case Statement::CheckUsed:
-        return "SELECT 1 / CASE count(*) WHEN $2::bigint THEN 1 ELSE 0 END FROM (SELECT id FROM @.objects "
-               "WHERE id = ANY($1::bytea[]) AND (type < 8 OR id = ANY($3::bytea[])) ORDER BY id FOR SHARE) AS used";
-    case Statement::AddAncestry:
-        return "INSERT INTO @.ancestry(id, parent, tree) SELECT * FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) "
-               "ON CONFLICT DO NOTHING";
-    case Statement::AddContained:
-        return "INSERT INTO @.contained(id, how, other) SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bytea[]) "
-               "ON CONFLICT DO NOTHING";
-    case Statement::DeleteMarks:
-        return "DELETE FROM @.marks WHERE id = ANY($1::bytea[])";
-    case Statement::CheckNoHead:
-        return "SELECT 1 / CASE count(*) WHEN 0 THEN 1 ELSE 0 END FROM @.branches WHERE name = $1::bytea";
-    case Statement::MoveBranch:
-        return "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
-               "RETURNING name) SELECT 1 / count(*) FROM moved";
-    case Statement::MakeBranch:
-        return "INSERT INTO @.branches(name, head) VALUES($1::bytea, $2::bytea)";
-    case Statement::RemoveBranch:
-        return "WITH removed AS (DELETE FROM @.branches WHERE name = $1::bytea AND head = $2::bytea RETURNING name) "
-               "SELECT 1 / count(*) FROM removed";
-    case Statement::CheckRecord:
-        return "SELECT 1 / count(*) FROM (SELECT name FROM @.records WHERE name = $1::bytea AND value = $2::bytea "
-               "FOR UPDATE) AS expected";
-    case Statement::CheckNoRecord:
-        return "SELECT 1 / CASE count(*) WHEN 0 THEN 1 ELSE 0 END FROM @.records WHERE name = $1::bytea";
-    case Statement::ChangeRecord:
-        return "UPDATE @.records SET value = $2::bytea WHERE name = $1::bytea";
-    case Statement::MakeRecord:
-        return "INSERT INTO @.records(name, value) VALUES($1::bytea, $2::bytea)";
-    case Statement::AddRecord:
-        return "INSERT INTO @.records(name, value) VALUES($1::bytea, $2::bytea) ON CONFLICT DO NOTHING";
-    case Statement::RemoveRecord:
-        return "DELETE FROM @.records WHERE name = $1::bytea";
-
-    case Statement::LockRows:
-        return "SELECT id, CAST(type AS bigint) FROM @.objects WHERE id = ANY($1::bytea[]) ORDER BY id FOR UPDATE";
-    case Statement::AddMarks:
-        return "INSERT INTO @.marks(id, time) SELECT id, CAST(extract(epoch FROM now()) AS bigint) FROM @.objects "
-               "WHERE id = ANY($1::bytea[]) AND type < 8 ON CONFLICT DO NOTHING";
-    case Statement::FindMarked:
-        return "SELECT id FROM @.marks WHERE id = ANY($1::bytea[]) "
-               "AND time <= CAST(extract(epoch FROM now()) AS bigint) - $2::bigint";
-    case Statement::MarkForNow:
-        return "INSERT INTO @.marks(id, time) SELECT id, 0 FROM @.objects WHERE id = ANY($1::bytea[]) "
-               "ON CONFLICT(id) DO UPDATE SET time = 0";
-    case Statement::FindBases:
-        return "SELECT DISTINCT base FROM @.objects WHERE base = ANY($1::bytea[])";
-    case Statement::KeepAsBases:
-        return "UPDATE @.objects SET type = type + 8 WHERE id = ANY($1::bytea[]) AND type < 8";
-    case Statement::RemoveRows:
-        return "DELETE FROM @.objects WHERE id = ANY($1::bytea[])";
-    case Statement::FindUnusedBases:
-        return "SELECT m.id, CAST(octet_length(o.form) AS bigint) FROM @.marks m JOIN @.objects o ON o.id = m.id "
-               "WHERE o.type >= 8 AND NOT EXISTS (SELECT 1 FROM @.objects d WHERE d.base = m.id) LIMIT $1::bigint";
-    case Statement::ListPieces:
-        return "SELECT id FROM @.objects WHERE type = 3 AND id > $1::bytea ORDER BY id LIMIT $2::bigint";
-    case Statement::ReadPieceLists:
-        return "SELECT id, form FROM @.objects WHERE type = 4 AND id > $1::bytea ORDER BY id LIMIT $2::bigint";
-    }
-    return {};
-}
+static_assert(std::all_of(templates.begin(), templates.end(), [next = std::size_t{0}](Template const& one) mutable {
+    return static_cast<std::size_t>(one.statement) == next++;
+}));
 
 } // namespace
 
 std::string TextOf(Statement statement, std::string const& schema) {
     std::string text;
-    for (char const character : TemplateOf(statement))
+    for (char const character : templates.at(static_cast<std::size_t>(statement)).text)
         if (character == '@')
             text += schema;
         else
