@@ -6,6 +6,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <cstdlib>
 #include <functional>
 #include <iostream>
 #include <map>
@@ -319,7 +320,9 @@ int main(int argumentCount, char** arguments) {
     try {
         vault::CommandLine line;
         try {
-            return vault::Run(line, argumentCount, arguments);
+            // What describes the commands ends with the process.
+            std::exit(
+                vault::Run(line, argumentCount, arguments)); // NOLINT(concurrency-mt-unsafe): no other thread is left
         } catch (CLI::Success const& success) {
             return line.app.exit(success);
         }
