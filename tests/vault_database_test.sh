@@ -81,7 +81,7 @@ transcript() (
         run show grown:missing
         run sync "$VAULT_FILE"
     }
-    commands | sed -E 's/[0-9a-f]{64}/ID/g; s/\b[0-9a-f]{12}\b/ID/g; s/[0-9-]{10}T[0-9:]{8}/TIME/g; s/[0-9]+ bytes/SOME bytes/;
+    commands | sed -E 's/[0-9a-f]{64}/ID/g; s/\b[0-9a-f]{12}\b/ID/g; s/[0-9-]{10}T[0-9:]{8}/TIME/g; s/[0-9]+ (bytes|new objects)/SOME \1/;
         s/[1-9][0-9]* left/SOME left/'
 )
 

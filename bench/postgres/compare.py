@@ -92,7 +92,6 @@ def own_branches(parent):
 def one_branch(parent):
     edits = 10 if QUICK else 50
     with Database(parent, "merging") as address:
-        run("kivvcs_team_bench", "edits", address, "first", 0)
         attempts = sum(together("merging", address, edits)) / (CLIENTS * edits)
         files = int(run("kivvcs_team_bench", "files", address))
     row(f"{CLIENTS} processes on one branch: attempts", "1", f"{attempts:.2f}", attempts, 4)
