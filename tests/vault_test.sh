@@ -108,7 +108,7 @@ BadInputGetsOneLineAndChangesNothing() {
     refused 'one line' save d -m $'two\nlines'
     refused 'not UTF-8' save d -m $'\xff'
     refused 'no such revision' show nowhere
-    refused 'ambiguous revision' show "$("$vault" log | cut -c 1 | sort | uniq -d | head -n 1)"
+    refused 'no such revision' show "$("$vault" log | head -c 3)"
     refused 'no such file' show master:g
     refused 'already' branch master
     refused 'neither' branch a:b
@@ -152,12 +152,14 @@ DamageIsLocalAndRepaired() {
 
 # 1,024 files, in ten levels that hold the next one twice.
 RepeatedDirectoriesAreListedOnce() {
+    local e
     write d/f x
     for _ in $(seq 10); do mkdir e && cp -a d e/a && cp -a d e/b && rm -r d && mv e d; done
     "$vault" save d >out
-    mkdir e && "$vault" diff master e >out
+    # A directory is meant also where its name begins an identifier.
+    e=$("$vault" log | head -c 4) && mkdir "$e" && "$vault" diff master "$e" >out
     equal "$(wc -l <out) $(grep -c 'as in' out)" "11 10"
-    equal "$("$vault" diff master e a/a | wc -l)" 9
+    equal "$("$vault" diff master "$e" a/a | wc -l)" 9
 }
 
 OldVaultsAreBroughtUpToDate() {

@@ -21,7 +21,9 @@ ROUNDS = 1 if QUICK else 5
 TREE = "/usr/include"
 PEAK = os.path.join(tempfile.gettempdir(), f"archive-bench-peak-{os.getpid()}")
 ENVIRONMENT = dict(os.environ, GIT_CONFIG_GLOBAL="/dev/null", GIT_CONFIG_SYSTEM="/dev/null", GIT_AUTHOR_NAME="Ada",
-                   GIT_AUTHOR_EMAIL="ada@example.org", GIT_COMMITTER_NAME="Ada", GIT_COMMITTER_EMAIL="ada@example.org")
+                   GIT_AUTHOR_EMAIL="ada@example.org", GIT_COMMITTER_NAME="Ada", GIT_COMMITTER_EMAIL="ada@example.org",
+                   # It would go on in the background while files are moved.
+                   GIT_CONFIG_COUNT="1", GIT_CONFIG_KEY_0="gc.auto", GIT_CONFIG_VALUE_0="0")
 
 
 class Run:

@@ -18,7 +18,7 @@ namespace vault {
 
 namespace {
 
-constexpr auto revisionHelp = "a branch, an identifier, or the beginning of one";
+constexpr auto revisionHelp = "a branch, an identifier, or the beginning of one (4 digits or more)";
 constexpr auto targetHelp = "a version, or with :PATH a file or directory of it";
 constexpr auto authorHelp = "'Name <mail>'; by default the user who runs this";
 

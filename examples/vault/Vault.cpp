@@ -21,6 +21,9 @@ namespace {
 constexpr char16_t const* firstBranch = u"master";
 Text const currentBranchRecord = u"vault/branch";
 
+/// Of an identifier's beginning; shorter ones are rather names, of directories or of branches that are not there.
+constexpr std::size_t leastDigits = 4;
+
 /// The greatest identifier before all that begin with @p digits; null if there is none.
 Id Before(std::string digits) {
     digits.resize(64, '0');
@@ -126,7 +129,7 @@ CommitRecord Vault::Find(std::string const& revision) const {
     };
     if (id.IsEmpty() && !isIdentifier(64) && (revision.empty() || name == CurrentBranch()))
         throw Problem("branch " + Printable(name) + " has no versions yet");
-    if (id.IsEmpty() && isIdentifier(1)) {
+    if (id.IsEmpty() && isIdentifier(leastDigits)) {
         std::vector<Id> found;
         for (auto const& facts : archive_->ListAncestry(Before(revision), 16)) {
             if (DigitsOf(facts.commit).starts_with(revision))

@@ -56,8 +56,8 @@ public:
     /// @throws Problem if there is no such branch
     [[nodiscard]] Id RequireBranch(std::string const& name) const;
 
-    /// The commit that is the head of a branch of that name, or whose identifier it is, or begins; the head of the current
-    /// branch if @p revision is empty.
+    /// The commit that is the head of a branch of that name, or whose identifier it is, or begins with at least four
+    /// digits; the head of the current branch if @p revision is empty.
     /// @throws Problem if there is none, more than one, or it is damaged
     [[nodiscard]] CommitRecord Find(std::string const& revision) const;
     /// What REVISION or REVISION:PATH leads to. @throws Problem

@@ -69,17 +69,13 @@ void ShowCommit(CommitRecord const& commit) {
 class Side {
 public:
     Side(Vault& vault, Overlay& archive, std::string const& what, Id const& previous) : archive_(archive) {
+        // A directory may have a name that begins an identifier.
         struct stat status {};
-        bool isRevision = true;
-        try {
+        const bool isDirectory = stat(what.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+        if (!isDirectory || !vault.HeadOf(KivVcs::FromUtf8(what)).IsEmpty()) {
             tree_ = vault.Find(what).tree;
-        } catch (Problem const&) {
-            isRevision = false;
-            if (stat(what.c_str(), &status) != 0 || !S_ISDIR(status.st_mode))
-                throw;
-        }
-        if (isRevision)
             return;
+        }
         directory_ = what;
         SnapshotOptions options;
         options.scan.top = what;

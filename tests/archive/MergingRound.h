@@ -317,7 +317,9 @@ private:
             return result == (model.LeftContainsRight() ? left : right) ? void()
                                                                         : Fault("a version that nobody needed");
         if (haveOneTree && isOne)
-            return result == std::min(left, right) ? void() : Fault("not the smaller of two equal ones");
+            return result == std::min(left, right) || (result == right && GaveWayRewritten(i, left))
+                       ? void()
+                       : Fault("not the smaller of two equal ones");
         if (isOne)
             return Fault("a side taken for the result");
         ++account_.counts["merges"];
@@ -346,6 +348,16 @@ private:
         Ancestry const facts = Repo(i).FactsOf(Head(i)).front();
         return std::count(facts.contains.begin(), facts.contains.end(),
                           ContainedCommit{Containment::RewrittenFrom, version}) != 0;
+    }
+
+    /// Whether a version was put on a rewritten one, and that then gave way to another one with its tree.
+    [[nodiscard]] bool GaveWayRewritten(std::size_t i, Id const& version) {
+        Ancestry const facts = Repo(i).FactsOf(Head(i)).front();
+        return std::any_of(facts.contains.begin(), facts.contains.end(), [&](ContainedCommit const& each) {
+            auto const below = Repo(i).FactsOf(each.id);
+            return !below.empty() && std::count(below.front().contains.begin(), below.front().contains.end(),
+                                                ContainedCommit{Containment::RewrittenFrom, version}) != 0;
+        });
     }
 
     void CheckQuestions(ModelMerge const& model, Paths const& asked) {
