@@ -22,9 +22,10 @@ template <class LookUp>
         if (id.IsEmpty() || !met.insert(id).second)
             return false;
         auto facts = lookUp(id);
-        if (facts)
-            found.push_back(*std::move(facts));
-        return static_cast<bool>(facts);
+        if (!facts)
+            return false;
+        found.push_back(*std::move(facts));
+        return true;
     };
     for (Id const& commit : commits)
         if (met.count(commit) == 0)

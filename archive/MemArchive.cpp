@@ -226,6 +226,7 @@ std::vector<Record> MemArchive::ReadRecords(std::span<const KivStringT<char16_t>
         if (auto const record = state_->records.find(name); record != state_->records.end())
             found.insert(*record);
     std::vector<Record> records;
+    records.reserve(found.size());
     for (auto const& [name, value] : found)
         records.push_back({name, value});
     return records;

@@ -230,6 +230,7 @@ private:
 
     [[nodiscard]] std::unordered_set<Id> Missing(std::vector<Pair> const& pairs) {
         std::vector<Id> ids;
+        ids.reserve(pairs.size());
         for (Pair const& pair : pairs)
             ids.push_back(pair.id);
         auto const missing = to_.FindMissing(ids);
@@ -342,6 +343,7 @@ std::uint64_t CopyAncestry(IArchive& from, IArchive& to, IProgress* progress) {
         ReportProgress(progress, {"copying ancestry", copied, 0}, {});
         auto const page = from.ListAncestry(after, batchSize);
         std::vector<Id> ids;
+        ids.reserve(page.size());
         for (Ancestry const& facts : page)
             ids.push_back(facts.commit);
         std::unordered_map<Id, std::size_t> known;

@@ -89,6 +89,7 @@ private:
 
     void VerifyAncestry(std::vector<Ancestry> const& stated) {
         std::vector<Id> commits;
+        commits.reserve(stated.size());
         for (Ancestry const& facts : stated)
             commits.push_back(facts.commit);
         auto known = archive_.ReadAncestry(commits, Follow::Parents, 0);

@@ -39,7 +39,7 @@ std::uint64_t HourNow() {
 
 KivStringT<char16_t> NameOfUses(std::size_t number) {
     char16_t const name[] = {u'u', u's', u'e', u's', u'/', static_cast<char16_t>(u'a' + number), u'\0'};
-    return KivStringT<char16_t>(name);
+    return {name};
 }
 
 KivStringT<char16_t> NameOfRecord(KivStringT<char16_t> const& name) {
@@ -48,7 +48,7 @@ KivStringT<char16_t> NameOfRecord(KivStringT<char16_t> const& name) {
     return NameOfBytes(bytes);
 }
 
-const KivStringT<char16_t> nameOfBranches(u"branches");
+constexpr char16_t const* nameOfBranches = u"branches";
 
 Buffer BufferOf(Bytes const& bytes) {
     Buffer buffer;
@@ -216,7 +216,8 @@ void NearArchive::RemoveOldest() {
     for (Candidate const& candidate : candidates)
         sum += candidate.info.size;
     // A quarter more than has to go; sizes are those before compression.
-    double const share = static_cast<double>(taken - maximumBytes_ + maximumBytes_ / 4) / static_cast<double>(taken);
+    std::uint64_t const excess = taken - (maximumBytes_ - maximumBytes_ / 4);
+    double const share = static_cast<double>(excess) / static_cast<double>(taken);
     auto const wanted = static_cast<std::uint64_t>(share * static_cast<double>(sum));
     std::vector<Id> page;
     Uses kept;
@@ -312,12 +313,13 @@ void NearArchive::KeepBranches(std::vector<Branch> const& branches) {
 
 std::vector<Branch> NearArchive::ReadBranches() {
     std::vector<Branch> branches;
-    for (Record const& record : archive_->ReadRecords({&nameOfBranches, 1})) {
+    KivStringT<char16_t> const name(nameOfBranches);
+    for (Record const& record : archive_->ReadRecords({&name, 1})) {
         Buffer const value = Joined(*record.value);
         try {
             for (ByteReader reader(BytesOf(value)); !reader.Rest().empty();) {
-                KivStringT<char16_t> name = NameOfBytes(reader.Take(reader.TakeNumber()));
-                branches.push_back({std::move(name), Id::FromDigest(TakeDigest(reader))});
+                KivStringT<char16_t> branch = NameOfBytes(reader.Take(reader.TakeNumber()));
+                branches.push_back({std::move(branch), Id::FromDigest(TakeDigest(reader))});
             }
         } catch (Malformed const&) {
             break;

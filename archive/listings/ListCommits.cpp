@@ -219,7 +219,7 @@ void ListCommits(IArchive& archive, std::span<const Id> heads, CommitListOptions
         order = std::make_unique<GraphOrder>(archive, begins, options.follow);
     constexpr std::size_t fewAtFirst = 50;
     std::uint64_t given = 0;
-    std::size_t batchSize = static_cast<std::size_t>(std::min<std::uint64_t>(
+    auto batchSize = static_cast<std::size_t>(std::min<std::uint64_t>(
         options.atMost, options.atMost < std::numeric_limits<std::uint64_t>::max() ? listedAtOnce : fewAtFirst));
     for (auto batch = order->Next(batchSize); !batch.empty(); batch = order->Next(batchSize)) {
         ReportProgress(progress, {"listing versions", given, 0}, {});

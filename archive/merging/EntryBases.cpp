@@ -124,6 +124,7 @@ BaseEntry EntryBases::CommonEntry(std::vector<Node> const& versions, KivStringT<
     return common;
 }
 
+// NOLINTNEXTLINE(misc-no-recursion): no deeper than `deepest`
 BaseEntry EntryBases::Find(Pair pair, KivStringT<char16_t> const* name, Found& found) {
     auto const known = found.entries.find(pair);
     if (known != found.entries.end())
@@ -143,6 +144,7 @@ BaseEntry EntryBases::Find(Pair pair, KivStringT<char16_t> const* name, Found& f
     return base;
 }
 
+// NOLINTNEXTLINE(misc-no-recursion): no deeper than `deepest`
 BaseEntry EntryBases::BringTogether(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
                                     Found& found) {
     for (Node const base : bases)
@@ -162,15 +164,18 @@ BaseEntry EntryBases::BringTogether(Pair pair, std::vector<Node> const& bases, K
 }
 
 /// Whether one of @p bases has changed what @p base has of the entry.
+// NOLINTNEXTLINE(misc-no-recursion): no deeper than `deepest`
 bool EntryBases::IsChangedBy(Node base, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
                              Found& found) {
     HeldEntry const entry = EntryAt(base, name);
-    return std::any_of(bases.begin(), bases.end(), [&](Node other) {
+    for (Node const other : bases) {
         if (EntryAt(other, name) == entry)
-            return false;
+            continue;
         BaseEntry const before = Find(Ordered(base, other), name, found);
-        return before && *before == entry;
-    });
+        if (before && *before == entry)
+            return true;
+    }
+    return false;
 }
 
 /// What both sides had when each had brought the bases together.

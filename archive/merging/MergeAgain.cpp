@@ -70,7 +70,7 @@ private:
             return Take(right, name);
         if (base && *base == right)
             return Take(left, name);
-        if (base && base->file && (left.IsNothing() || right.IsNothing()))
+        if (name != nullptr && base && base->file && (left.IsNothing() || right.IsNothing()))
             return Take(questions_.AskAboutEntry(*name, left, right, base), name);
         if (name != nullptr)
             Enter(*name);

@@ -64,7 +64,7 @@ bool ForEachPiece(StreamIO& stream, const char* step, IProgress* progress, Take 
 class NewFile {
 public:
     explicit NewFile(std::string const& path) : path_(path) {
-        std::remove(path.c_str());
+        (void)std::remove(path.c_str());
         file_ = std::fopen(path.c_str(), "wbx");
         if (file_ == nullptr)
             Fail();
@@ -73,9 +73,9 @@ public:
     NewFile& operator=(NewFile const&) = delete;
     ~NewFile() {
         if (file_ != nullptr)
-            std::fclose(file_);
+            (void)std::fclose(file_);
         if (!isKept_)
-            std::remove(path_.c_str());
+            (void)std::remove(path_.c_str());
     }
 
     void Write(std::span<const std::byte> bytes) {

@@ -80,6 +80,7 @@ std::vector<cow_ptr<Commit>> MissingCommits::InOrder(std::vector<cow_ptr<Commit>
     std::unordered_set<Id> entered;
     std::unordered_set<Id> done;
     std::vector<std::pair<Id, bool>> open;
+    open.reserve(heads.size());
     for (auto const& head : heads)
         open.emplace_back(head->GetId(), false);
     while (!open.empty()) {

@@ -7,7 +7,7 @@ namespace KivArchive {
 namespace {
 
 constexpr std::size_t maximumUnasked = 16;
-constexpr std::uint64_t largestUnasked = 64 * 1024;
+constexpr std::uint64_t largestUnasked = std::uint64_t{64} * 1024;
 
 /// The null identifier for null.
 template <class T>

@@ -29,7 +29,7 @@ enum class ObjectType : std::uint8_t { Blob, Tree, Commit };
 
 /// Contents up to this many bytes are stored and given whole; larger ones are streamed. Trees and commits are always
 /// whole.
-inline constexpr std::uint64_t largestWholeContent = 1024 * 1024;
+inline constexpr std::uint64_t largestWholeContent = std::uint64_t{1024} * 1024;
 
 /// An object to be stored.
 struct NewObject {

@@ -23,7 +23,7 @@
 
 namespace KivArchive {
 
-inline constexpr std::uint64_t largestText = 64 * 1024 * 1024;
+inline constexpr std::uint64_t largestText = std::uint64_t{64} * 1024 * 1024;
 
 /// Lines that were replaced by others, removed (nothing on the new side), or added (nothing on the old side). Lines are
 /// counted from 0; the ends are those behind the last.

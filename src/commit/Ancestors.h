@@ -27,6 +27,7 @@ public:
         commit_ = commit_->Parent();
         return *this;
     }
+    // NOLINTNEXTLINE(cert-dcl21-cpp): as iterators of the standard do
     AncestorIterator operator++(int) {
         AncestorIterator before = *this;
         ++*this;

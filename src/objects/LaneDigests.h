@@ -7,13 +7,11 @@ namespace KivVcs {
 /// Gives the data to hash one after the other, and takes the digests of their packed forms.
 class DigestCustomer {
 public:
+    virtual ~DigestCustomer() = default;
     /// Fills in the next ones; false if there are none.
     virtual bool Next(detail::DataToHash& next) = 0;
     /// Later ones may be ready before.
     virtual void Take(detail::DataToHash const& hashed, Id::Digest const& digest) noexcept = 0;
-
-protected:
-    ~DigestCustomer() = default;
 };
 
 /// Digests what @p customer gives, as many forms beside each other as the processor takes fastest: the next one begins

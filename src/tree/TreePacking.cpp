@@ -6,7 +6,6 @@ namespace KivVcs {
 namespace {
 
 using detail::Entry;
-using detail::Held;
 using detail::Node;
 
 /// Smaller packed forms are put together to be hashed beside others.

@@ -107,7 +107,7 @@ public:
 
 private:
     struct Frame {
-        Frame(Id const& treeId, Buffer form) : id(treeId), data(std::move(form)), rest(TextOf(data)) {}
+        Frame(Id treeId, Buffer form) : id(std::move(treeId)), data(std::move(form)), rest(TextOf(data)) {}
 
         Id id;
         Buffer data;
