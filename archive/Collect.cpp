@@ -98,67 +98,81 @@ private:
     std::uint64_t count_ = 0;
 };
 
-/// Removes objects, those that name others before these. Others may come to use some meanwhile, which unmarks them: they
-/// and all that they reach stay.
-class Removal {
+/// Objects in an order in which those that name others come before these.
+class TopDown {
 public:
-    Removal(IArchive& archive, Walk& kept, CollectOptions const& options, IProgress* progress,
-            std::vector<Id> const& doomed)
-        : archive_(archive), kept_(kept), options_(options), progress_(progress) {
-        for (Id const& id : doomed)
+    TopDown(IArchive& archive, std::vector<Id> const& ids) : archive_(archive) {
+        for (Id const& id : ids)
             namedBy_.emplace(id, 0);
-        for (std::size_t begin = 0; begin < doomed.size(); begin += batchSize) {
-            std::span<const Id> const batch(doomed.data() + begin, std::min(batchSize, doomed.size() - begin));
+        for (std::size_t begin = 0; begin < ids.size(); begin += batchSize) {
+            std::span<const Id> const batch(ids.data() + begin, std::min(batchSize, ids.size() - begin));
             for (auto const& [id, links] : LinksOf(batch))
                 for (Id const& link : links)
                     ++namedBy_.at(link);
         }
-        for (Id const& id : doomed)
+        for (Id const& id : ids)
             if (namedBy_.at(id) == 0)
                 ready_.push_back(id);
     }
 
-    /// @return how many have been removed
-    std::uint64_t Run() {
+    [[nodiscard]] std::size_t Size() const noexcept { return namedBy_.size(); }
+
+    /// The next @p count of them, or as many as there are: named by nothing but what is given before or with them.
+    [[nodiscard]] std::vector<Id> Next(std::size_t count) {
+        std::vector<Id> next;
+        while (!ready_.empty() && next.size() < count) {
+            std::vector<Id> batch;
+            for (; !ready_.empty() && next.size() + batch.size() < count && batch.size() < batchSize;
+                 ready_.pop_front())
+                batch.push_back(ready_.front());
+            for (auto const& [id, links] : LinksOf(batch))
+                for (Id const& link : links)
+                    if (--namedBy_.at(link) == 0)
+                        ready_.push_back(link);
+            next.insert(next.end(), batch.begin(), batch.end());
+        }
+        return next;
+    }
+
+private:
+    /// Those of the objects that each of @p ids names.
+    [[nodiscard]] std::unordered_map<Id, std::vector<Id>> LinksOf(std::span<const Id> ids) {
+        std::unordered_map<Id, std::vector<Id>> found;
+        archive_.Read(ids, [&](ArchivedObject const& object) {
+            std::vector<Link> links;
+            static_cast<void>(ReadLinks(object.type, object.data, links));
+            auto& named = found[object.id];
+            for (Link const& link : links)
+                if (namedBy_.count(link.id) != 0)
+                    named.push_back(link.id);
+        });
+        return found;
+    }
+
+    IArchive& archive_;
+    std::unordered_map<Id, std::size_t> namedBy_;
+    std::deque<Id> ready_;
+};
+
+/// Removes objects, those that name others before these. Others may come to use some meanwhile, which unmarks them: they
+/// and all that they reach stay.
+class Removal {
+public:
+    Removal(IArchive& archive, Walk& kept, CollectOptions const& options, IProgress* progress)
+        : archive_(archive), kept_(kept), options_(options), progress_(progress) {}
+
+    /// @return how many of @p doomed have been removed
+    std::uint64_t Run(std::vector<Id> const& doomed) {
+        TopDown order(archive_, doomed);
         std::uint64_t removed = 0;
-        for (std::vector<Id> slice = NextSlice(); !slice.empty(); slice = NextSlice()) {
-            ReportProgress(progress_, {"removing objects", removed, namedBy_.size()}, {});
+        for (auto slice = order.Next(options_.slice); !slice.empty(); slice = order.Next(options_.slice)) {
+            ReportProgress(progress_, {"removing objects", removed, order.Size()}, {});
             removed += Remove(std::move(slice));
         }
         return removed;
     }
 
 private:
-    /// Those of the doomed that each of @p ids names.
-    [[nodiscard]] std::unordered_map<Id, std::vector<Id>> LinksOf(std::span<const Id> ids) {
-        std::unordered_map<Id, std::vector<Id>> found;
-        archive_.Read(ids, [&](ArchivedObject const& object) {
-            std::vector<Link> links;
-            static_cast<void>(ReadLinks(object.type, object.data, links));
-            auto& doomed = found[object.id];
-            for (Link const& link : links)
-                if (namedBy_.count(link.id) != 0)
-                    doomed.push_back(link.id);
-        });
-        return found;
-    }
-
-    /// The next objects that nothing names but what is removed before or with them.
-    [[nodiscard]] std::vector<Id> NextSlice() {
-        std::vector<Id> slice;
-        while (!ready_.empty() && slice.size() < options_.slice) {
-            std::vector<Id> batch;
-            for (; !ready_.empty() && slice.size() + batch.size() < options_.slice; ready_.pop_front())
-                batch.push_back(ready_.front());
-            for (auto const& [id, links] : LinksOf(batch))
-                for (Id const& link : links)
-                    if (--namedBy_.at(link) == 0)
-                        ready_.push_back(link);
-            slice.insert(slice.end(), batch.begin(), batch.end());
-        }
-        return slice;
-    }
-
     std::size_t Remove(std::vector<Id> slice) {
         for (;;) {
             std::erase_if(slice, [this](Id const& id) { return kept_.HasReached(id); });
@@ -175,8 +189,6 @@ private:
     Walk& kept_;
     CollectOptions const& options_;
     IProgress* progress_;
-    std::unordered_map<Id, std::size_t> namedBy_;
-    std::deque<Id> ready_;
 };
 
 template <class Call>
@@ -220,6 +232,9 @@ CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgres
         if (marked.count(id) == 0)
             newlyMarked.push_back(id);
     }
+    // What is marked alone, without what names it, could not be removed.
+    if (newlyMarked.size() > options.mostMarked)
+        newlyMarked = TopDown(archive, newlyMarked).Next(options.mostMarked);
     InPages(unmarked, [&](std::span<const Id> page) { archive.Unmark(page); });
     InPages(newlyMarked, [&](std::span<const Id> page) { archive.Mark(page); });
     report.unmarked = unmarked.size();
@@ -231,7 +246,7 @@ CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgres
     for (Id const& id : due)
         if (!walk.HasReached(id))
             doomed.push_back(id);
-    report.removed = Removal(archive, walk, options, progress, doomed).Run();
+    report.removed = Removal(archive, walk, options, progress).Run(doomed);
     while (std::uint64_t const rest = archive.Compact(options.sliceBytes))
         ReportProgress(progress, {"giving space back", 0, rest}, {});
     return report;

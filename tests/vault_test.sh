@@ -150,6 +150,25 @@ DamageIsLocalAndRepaired() {
     "$vault" -f saved.db restore master whole && same d whole
 }
 
+# Where 2 MiB are left, which what is to go would fill several times if it were all marked, logged or moved at once.
+CollectsWithLittleRoom() {
+    local free
+    mkdir small
+    mount -t tmpfs -o size=40m none small 2>err || { echo "Skipped, for no file system can be mounted here: $(cat err)" && exit 77; }
+    export VAULT_FILE=small/vault.db
+    write d/kept kept
+    "$vault" save d >out && "$vault" branch side && "$vault" checkout side
+    head -c 12000000 /dev/urandom | split -a 5 -b 1000 - d/small && head -c 3000000 /dev/urandom >d/large
+    "$vault" save d >out && "$vault" checkout master && "$vault" branch --delete side
+    free=$(df --output=avail -B1 small | tail -n 1)
+    head -c $((free - 2 * 1024 * 1024)) /dev/zero >small/full
+    matches "$("$vault" collect --days 0 --yes)" '^12[0-9]{3} objects removed, 0 more wait'
+    [ "$(df --output=avail -B1 small | tail -n 1)" -gt 16000000 ] || fail "no room was given back: $(ls -l small)"
+    [ "$(stat -c %s small/vault.db)" -lt 100000 ] || fail "the file is still large: $(ls -l small)"
+    matches "$("$vault" verify)" '^verified 4 objects'
+    equal "$("$vault" show master:kept)" kept
+}
+
 # 1,024 files, in ten levels that hold the next one twice.
 RepeatedDirectoriesAreListedOnce() {
     local e

@@ -30,10 +30,30 @@ void ReleasePieces(Connection& connection, FormCache& cache, ObjectRow const& ro
     }
 }
 
+/// While it is there, what a connection writes is brought from the log into the file early, so that the log stays short:
+/// whoever collects may have little room left.
+class ShortLog {
+public:
+    explicit ShortLog(Database& database) : database_(database) { Write(longest); }
+    ShortLog(ShortLog const&) = delete;
+    ShortLog& operator=(ShortLog const&) = delete;
+    ~ShortLog() { Write(ordinary); }
+
+private:
+    static constexpr int longest = 64;
+    /// As SQLite has it unless told otherwise.
+    static constexpr int ordinary = 1000;
+
+    void Write(int pages) const noexcept { sqlite3_wal_autocheckpoint(database_.Handle(), pages); }
+
+    Database& database_;
+};
+
 } // namespace
 
 void SqliteArchive::Mark(std::span<const Id> ids) {
     SqliteStore::Lease const connection(*store_);
+    ShortLog const log(connection->database);
     std::scoped_lock const turn(store_->writing);
     Transaction transaction(connection->database, Transaction::Kind::Write);
     std::int64_t const now = SecondsNow();
@@ -45,6 +65,7 @@ void SqliteArchive::Mark(std::span<const Id> ids) {
 
 void SqliteArchive::Unmark(std::span<const Id> ids) {
     SqliteStore::Lease const connection(*store_);
+    ShortLog const log(connection->database);
     std::scoped_lock const turn(store_->writing);
     Transaction transaction(connection->database, Transaction::Kind::Write);
     for (Id const& id : ids)
@@ -68,6 +89,7 @@ std::vector<Id> SqliteArchive::ListMarked(std::chrono::seconds grace, Id const& 
 std::vector<Id> SqliteArchive::Remove(std::span<const Id> ids, std::chrono::seconds grace) {
     SqliteStore::Lease const connection(*store_);
     Database& database = connection->database;
+    ShortLog const log(database);
     std::scoped_lock const turn(store_->writing);
     Transaction transaction(database, Transaction::Kind::Write);
     std::int64_t const latest = SecondsNow() - static_cast<std::int64_t>(grace.count());
@@ -90,6 +112,7 @@ std::vector<Id> SqliteArchive::Remove(std::span<const Id> ids, std::chrono::seco
 std::uint64_t SqliteArchive::Compact(std::uint64_t bytes) {
     SqliteStore::Lease const connection(*store_);
     Database& database = connection->database;
+    ShortLog const log(database);
     std::uint64_t done = 0;
     for (auto segment = FirstSparse(database); segment && done < bytes; segment = FirstSparse(database))
         done += ClearSegment(*connection, *store_, *segment);

@@ -12,6 +12,7 @@
 #include <iostream>
 #include <set>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 
 namespace vault {
 
@@ -25,15 +26,32 @@ constexpr char16_t const* forgetMark = u":forget";
 constexpr std::string_view otherPrefix = "other/";
 constexpr std::size_t factsAtOnce = 10'000;
 
-/// Removes what no branch has reached for some time; what is to go at once is marked first.
-KivArchive::CollectReport CollectUnreached(IArchive& archive, std::chrono::seconds grace) {
+/// What may be written before anything is given back, by what is left on the disk.
+KivArchive::CollectOptions CollectingWithin(std::string const& file) {
     KivArchive::CollectOptions options;
-    options.grace = grace;
+    struct statvfs disk {};
+    if (IsDatabase(file) || statvfs(file.c_str(), &disk) != 0)
+        return options;
+    const std::uint64_t room = std::uint64_t{disk.f_bavail} * disk.f_frsize;
+    options.slice = std::clamp<std::uint64_t>(room / 16'384, 50, options.slice);
+    options.sliceBytes = std::clamp<std::uint64_t>(room / 8, 64'000, options.sliceBytes);
+    options.mostMarked = std::max<std::uint64_t>(room / 256, 1000);
+    return options;
+}
+
+/// Removes what no branch has reached for some time; what is to go at once is marked first.
+KivArchive::CollectReport CollectUnreached(Vault const& vault, std::chrono::seconds grace) {
     Progress progress("collecting");
-    auto report = KivArchive::Collect(archive, options, &progress);
-    if (grace == std::chrono::seconds(0) && report.marked > 0)
-        report = KivArchive::Collect(archive, options, &progress);
-    return report;
+    std::uint64_t removed = 0;
+    for (bool isAllMarked = grace != std::chrono::seconds(0);;) {
+        auto options = CollectingWithin(vault.File());
+        options.grace = grace;
+        auto report = KivArchive::Collect(vault.Archive(), options, &progress);
+        report.removed = removed += report.removed;
+        if (isAllMarked || report.marked == 0)
+            return report;
+        isAllMarked = report.marked < options.mostMarked;
+    }
 }
 
 std::uint64_t SizeOf(VaultPlace const& place) {
@@ -209,7 +227,7 @@ int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions 
         ForgetBelow(repository, repository.GetCommitFromStorage(version.id));
         Publish(repository);
     }
-    CollectUnreached(vault.Archive(), std::chrono::seconds(0));
+    CollectUnreached(vault, std::chrono::seconds(0));
     std::cout << count << " forgotten\n";
     return 0;
 }
@@ -230,7 +248,7 @@ int Compact(VaultPlace const& place, RemovalOptions const& options) {
         if (gone > 0 && !Confirm("Drop " + count + '?', options.yes))
             return 0;
         Publish(repository);
-        CollectUnreached(vault.Archive(), std::chrono::seconds(0));
+        CollectUnreached(vault, std::chrono::seconds(0));
     }
     // A file gives back what it can when it is closed.
     const auto left = SizeOf(place);
@@ -248,7 +266,7 @@ int Collect(VaultPlace const& place, unsigned days, RemovalOptions const& option
     }
     if (!Confirm("Remove what nothing has needed for " + std::to_string(days) + " days?", options.yes))
         return 0;
-    const auto report = CollectUnreached(vault.Archive(), grace);
+    const auto report = CollectUnreached(vault, grace);
     std::cout << report.removed << " objects removed, " << report.marked << " more wait, " << report.reached
               << " are needed\n";
     return 0;

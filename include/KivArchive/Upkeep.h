@@ -65,6 +65,9 @@ struct CollectOptions {
     /// One transaction removes at most so many objects, or gives back about so many bytes at most.
     std::size_t slice = 1000;
     std::uint64_t sliceBytes = std::uint64_t{4} * 1024 * 1024;
+    /// One call marks at most so many objects, those that name others first. For archives that have little room: a mark
+    /// takes some 60 bytes, and is what makes room in a later call.
+    std::size_t mostMarked = SIZE_MAX;
 };
 
 struct CollectReport {

@@ -106,6 +106,29 @@ TEST_P(ArchiveUpkeep, CollectRemovesWhatNothingReachesAfterItsTime) {
     EXPECT_EQ(ProblemsOf(*archive), "");
 }
 
+TEST_P(ArchiveUpkeep, CollectGoesOnInPortions) {
+    auto const archive = Make();
+    SmallHost host(*archive, 3);
+    host.Publish();
+    Id const first = host.Head();
+    for (int i = 0; i < 5; ++i)
+        host.Publish();
+    MoveHead(*archive, host.Head(), first);
+    CollectOptions options;
+    options.grace = noGrace;
+    options.mostMarked = 2;
+    std::uint64_t marked = 0;
+    std::uint64_t removed = 0;
+    for (CollectReport report{0, 1, 0, 0}; report.marked > 0; marked = report.marked, removed += report.removed) {
+        report = Collect(*archive, options, nullptr);
+        EXPECT_LE(report.marked, 2U);
+        EXPECT_EQ(report.removed, marked) << "what names them was marked before or with them";
+    }
+    EXPECT_GT(removed, 10U);
+    EXPECT_EQ(archive->GetStatistics().commits, 1U);
+    EXPECT_EQ(ProblemsOf(*archive), "");
+}
+
 TEST_P(ArchiveUpkeep, CollectKeepsWhatWasMergedAndEndsAtDamage) {
     auto const archive = Make();
     NewObject const tree = Object(ObjectType::Tree, "");
