@@ -11,7 +11,7 @@ namespace KivArchive {
 struct Item {
     Id id;
     StoredType type = StoredType::Blob;
-    /// The size of the data that it is, or stands for.
+    /// The size of `data`, or of the content that `data` lists the pieces of.
     std::uint64_t size = 0;
     Buffer data;
     Id earlier;
@@ -26,7 +26,7 @@ struct ItemForm {
     ByteView form;
 };
 
-/// Makes the form of an item; its member is one of a shared frame.
+/// Makes the form of an item, as that of a member that shares a frame.
 void MakeForm(ItemForm& made);
 
 } // namespace KivArchive

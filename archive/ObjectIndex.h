@@ -9,7 +9,7 @@
 
 namespace KivArchive {
 
-/// How many objects are asked for at once where all of them are gone through.
+/// How many objects are asked for at once where all of them are visited.
 inline constexpr std::size_t pageSize = 4096;
 
 class ObjectIndex {
@@ -37,7 +37,7 @@ public:
     }
 
 private:
-    /// Whatever is kept together is looked at once for each of these.
+    /// Many, since an archive looks at whatever it keeps together once for each of these batches.
     static constexpr std::size_t listedAtOnce = std::size_t{1} << 16U;
 
     std::vector<Id::Digest> digests_;

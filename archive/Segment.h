@@ -71,7 +71,7 @@ public:
     void Verify() const;
 
     [[nodiscard]] std::uint64_t Number() const noexcept { return number_; }
-    /// A number that is another one for every form.
+    /// A number that differs between forms.
     [[nodiscard]] std::uint64_t Check() const noexcept { return check_; }
     [[nodiscard]] std::uint64_t FormSize() const noexcept { return form_.size(); }
     [[nodiscard]] std::span<const Member> Members() const noexcept { return members_; }
@@ -79,7 +79,7 @@ public:
     [[nodiscard]] Member const& At(std::uint64_t member) const;
     /// Where the base of a member that is a difference is.
     [[nodiscard]] Place BaseOf(Member const& member) const;
-    /// What all shared members' forms are, one after the other. @throws Malformed
+    /// The forms of all shared members, one after the other. @throws Malformed
     [[nodiscard]] Bytes DecompressShared(Compressor& compressor) const;
 
 private:

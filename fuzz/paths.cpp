@@ -72,13 +72,12 @@ void Compare(World const& older, World const& newer) {
     Require(newer.tree->GetDeepBlobDiffs(older.tree) == differing, "exactly what differs is listed");
 }
 
-void Run(Input input) {
-    const auto repository = MakeRepository();
+/// One version that is edited, and one before it.
+struct Versions {
     World world;
     World older;
-    while (!input.IsUsedUp()) {
-        const char operation = "+-<>==+!"[input.Byte() % 8];
-        const Text written = ReadPath(input);
+
+    void Do(Repository& repository, char operation, Text const& written) {
         const auto components = Helpers::SplitVcsPath(written);
         Tree* const tree = world.tree.write();
         const auto found = tree->GetDeepObject(written);
@@ -91,11 +90,11 @@ void Run(Input input) {
         }
         if (operation == '+' && !isBelowBlob && !tree->GetDeepTree(components)) {
             const char content = "012"[written.GetLength() % 3];
-            const auto blob = tree->AddBlob(repository.get(), written, MakeBlob(content));
+            const auto blob = tree->AddBlob(&repository, written, MakeBlob(content));
             Require(blob && tree->GetDeepBlob(path) == blob, "what was added is found");
             world.blobs[path] = content;
         } else if (operation == '-') {
-            Require(tree->RemoveObject(repository.get(), written) == (found != nullptr), "what is there is removed");
+            Require(tree->RemoveObject(&repository, written) == (found != nullptr), "what is there is removed");
             Require(!tree->GetDeepObject(path), "what was removed is not found");
             if (found)
                 world.Remove(path);
@@ -106,8 +105,8 @@ void Run(Input input) {
         } else if (operation == '>') {
             std::swap(world, older);
         } else if (operation == '=' && !isBelowBlob && !world.blobs.contains(path) && world.blobs.size() < 20) {
-            const World added = older.blobs.empty() ? MakeMany(*repository) : older;
-            Require(tree->AddTree(repository.get(), written, *added.tree) != nullptr, "a tree is added");
+            const World added = older.blobs.empty() ? MakeMany(repository) : older;
+            Require(tree->AddTree(&repository, written, *added.tree) != nullptr, "a tree is added");
             world.Remove(path);
             for (auto const& [below, content] : added.blobs)
                 world.blobs[Joined(path, below)] = content;
@@ -115,12 +114,21 @@ void Run(Input input) {
             Require(!found || *tree->GetIdByPath(path) == found->GetId(), "identifiers are found by path");
         }
     }
-    for (World const* each : {&world, &older}) {
+};
+
+void Run(Input input) {
+    const auto repository = MakeRepository();
+    Versions versions;
+    while (!input.IsUsedUp()) {
+        const char operation = "+-<>==+!"[input.Byte() % 8];
+        versions.Do(*repository, operation, ReadPath(input));
+    }
+    for (World const* each : {&versions.world, &versions.older}) {
         each->Check();
         const auto stored = repository->SyncWithStorage(each->tree);
         Require(stored->GetDeepBlobPaths() == each->tree->GetDeepBlobPaths(), "equal identifiers mean equal content");
     }
-    Compare(older, world);
+    Compare(versions.older, versions.world);
     // Versions in between would take most of the time.
     repository->UpdateStorage();
     RequireConsistency(*repository->GetStorage());

@@ -11,6 +11,11 @@ constexpr std::int64_t ticksPerMinute = 600'000'000;
 
 class Commits : public testing::Test {
 protected:
+    /// What is read of a packed form with that text.
+    cow_ptr<Commit> Read(std::string const& text, Id& parent) {
+        return Commit::Deserialize(Id(Wide(packed.Add("commit", text))), parent, &repo, packed.Loader());
+    }
+
     RecordingRepository repo{std::make_unique<MemObjectsStorage>()};
     Packed packed;
 };
@@ -136,9 +141,6 @@ TEST_F(Commits, KeysAreFoundWhereverTheyComeNext) {
 
 TEST_F(Commits, AreReadBackAsFarAsTheirTextGoes) {
     const std::string root = packed.Add("tree", Entry("blob", "f", packed.Add("blob", "1")));
-    const auto read = [&](std::string const& text, Id& parent) {
-        return Commit::Deserialize(Id(Wide(packed.Add("commit", text))), parent, &repo, packed.Loader());
-    };
     const struct {
         std::string lines;
         const char *name, *email;
@@ -154,7 +156,7 @@ TEST_F(Commits, AreReadBackAsFarAsTheirTextGoes) {
         {"author <a> 99999999999999999999 +0000", "", "", 0, 0, "", ""}};
     for (auto const& [lines, name, email, seconds, minutes, description, parent] : cases) {
         Id parentId(u"former");
-        const auto commit = read("tree " + root + "\n" + lines, parentId);
+        const auto commit = Read("tree " + root + "\n" + lines, parentId);
         ASSERT_TRUE(commit) << lines;
         EXPECT_EQ(Narrow(parentId.GetText()), parent) << lines;
         EXPECT_EQ(Narrow(commit->GetAuthorName()), name) << lines;
@@ -166,22 +168,24 @@ TEST_F(Commits, AreReadBackAsFarAsTheirTextGoes) {
         EXPECT_EQ(repo.GetTreeCount(), 1U);
     }
     Id parentId(u"former");
-    EXPECT_FALSE(read("", parentId) || read("author A <a> 5 +0030\n\n\n", parentId));
+    EXPECT_FALSE(Read("", parentId) || Read("author A <a> 5 +0030\n\n\n", parentId));
     EXPECT_FALSE(Commit::Deserialize(Id(u"x"), parentId, &repo, nullptr));
     EXPECT_FALSE(Commit::Deserialize(Id(), parentId, &repo, packed.Loader()));
     EXPECT_EQ(Narrow(parentId.GetText()), "former");
+}
 
-    // The head lends its tree where none is named, and is the parent until the caller links the real one.
+TEST_F(Commits, ThatAreReadHaveTheHeadAsParentAndItsTreeWhereNoneIsNamed) {
+    Id parentId;
     Commit head(nullptr, false);
     head.AddBlob(&repo, u"h", MakeBlob("2"));
     const auto stored = repo.DoCommit(head);
     const int loads = packed.loads;
     EXPECT_TRUE(Commit::Deserialize(stored->GetId(), parentId, &repo, packed.Loader()) == stored);
     EXPECT_EQ(packed.loads, loads);
-    const auto onHead = read("tree \n", parentId);
+    const auto onHead = Read("tree \n", parentId);
     EXPECT_TRUE(onHead->GetParent() == stored &&
                 onHead->GetCommitTree()->GetRoot() == stored->GetCommitTree()->GetRoot());
-    EXPECT_FALSE(read("tree " + std::string(64, 'f') + "\n", parentId)->GetCommitTree());
+    EXPECT_FALSE(Read("tree " + std::string(64, 'f') + "\n", parentId)->GetCommitTree());
 }
 
 TEST_F(Commits, AnAmendTakesThePlaceOfItsParent) {

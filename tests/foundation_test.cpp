@@ -102,25 +102,27 @@ std::string ContentOf(Buffer const& buffer) {
     return content;
 }
 
-TEST(Buffer, BehavesLikeATextWhateverIsShared) {
-    std::mt19937 random(20);
-    const auto below = [&random](std::size_t limit) { return random() % limit; };
-    std::string pool(140'000, '\0');
-    for (char& byte : pool)
-        byte = static_cast<char>(random());
-    std::array<Buffer, 4> buffers;
-    std::array<std::string, 4> models;
-    for (int step = 0; step < 3000; ++step) {
-        Buffer& buffer = buffers[below(4)];
-        std::string& model = models[static_cast<std::size_t>(&buffer - buffers.data())];
-        const std::size_t other = below(4);
+/// Buffers that share what they are made of, each beside a text that it should equal.
+class RandomBuffers : public testing::Test {
+protected:
+    static constexpr std::size_t largestPiece = 70'000;
+
+    RandomBuffers() : pool(2 * largestPiece, '\0') {
+        for (char& byte : pool)
+            byte = static_cast<char>(random());
+    }
+
+    std::size_t Below(std::size_t limit) { return random() % limit; }
+
+    void Change(Buffer& buffer, std::string& model) {
+        const std::size_t other = Below(4);
         const std::string source = models[other];
-        const std::size_t offset = below(source.size() + 2);
-        const std::size_t size = below(source.size() + 2);
-        switch (below(6)) {
+        const std::size_t offset = Below(source.size() + 2);
+        const std::size_t size = Below(source.size() + 2);
+        switch (Below(6)) {
         case 0: {
-            const std::size_t sizes[] = {1, 40, 511, 512, 5000, 70'000};
-            const auto bytes = pool.substr(below(70'000), 1 + below(sizes[below(6)]));
+            const std::size_t sizes[] = {1, 40, 511, 512, 5000, largestPiece};
+            const auto bytes = pool.substr(Below(largestPiece), 1 + Below(sizes[Below(6)]));
             buffer.Append(bytes.data(), bytes.size(), 2);
             model += bytes + bytes;
             break;
@@ -131,7 +133,7 @@ TEST(Buffer, BehavesLikeATextWhateverIsShared) {
             break;
         case 2:
             if (const auto chunks = buffer.LockForRead(); chunks.size() != 0) {
-                const auto own = *(chunks.begin() + below(chunks.size()));
+                const auto own = *(chunks.begin() + Below(chunks.size()));
                 model.append(std::string(reinterpret_cast<const char*>(own.data()), own.size()));
                 buffer.Append(own.data(), own.size());
             }
@@ -143,16 +145,28 @@ TEST(Buffer, BehavesLikeATextWhateverIsShared) {
             break;
         }
         case 4:
-            model = pool.substr(below(70'000), below(2) == 0 ? 500 : 20'000);
+            model = pool.substr(Below(largestPiece), Below(2) == 0 ? 500 : 20'000);
             buffer = Buffer::Adopt(std::string(model));
             break;
         default:
             buffer = buffers[other];
             model = source;
         }
-        if (model.size() > 200'000) {
-            buffer = Buffer(3);
-            model.assign(3, '\0');
+    }
+
+    std::mt19937 random{20};
+    std::string pool;
+    std::array<Buffer, 4> buffers;
+    std::array<std::string, 4> models;
+};
+
+TEST_F(RandomBuffers, BehaveLikeTextsWhateverTheyShare) {
+    for (int step = 0; step < 3000; ++step) {
+        const std::size_t changed = Below(4);
+        ASSERT_NO_FATAL_FAILURE(Change(buffers[changed], models[changed]));
+        if (models[changed].size() > 200'000) {
+            buffers[changed] = Buffer(3);
+            models[changed].assign(3, '\0');
         }
         for (std::size_t index = 0; index < buffers.size(); ++index)
             ASSERT_TRUE(buffers[index].GetSize() == models[index].size() && ContentOf(buffers[index]) == models[index]);

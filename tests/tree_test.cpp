@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <numeric>
 #include <random>
 
 namespace KivVcs {
@@ -46,17 +47,30 @@ struct Version {
 
 class RandomTrees : public testing::TestWithParam<int> {
 protected:
+    static constexpr int largest = 4000;
+
     int Below(int limit) { return static_cast<int>(random() % static_cast<unsigned>(limit)); }
 
-    std::mt19937 random{static_cast<unsigned>(GetParam())};
-    Version now;
-    std::vector<Version> former{now};
-};
+    /// Some neighbours in any order.
+    std::vector<int> PickNumbers(int from, int count) {
+        std::vector<int> numbers(static_cast<std::size_t>(count));
+        std::iota(numbers.begin(), numbers.end(), from);
+        const int order = Below(3);
+        if (order == 1)
+            std::reverse(numbers.begin(), numbers.end());
+        else if (order == 2)
+            std::shuffle(numbers.begin(), numbers.end(), random);
+        return numbers;
+    }
 
-TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
-    Repository repo(std::make_unique<MemObjectsStorage>());
-    const auto edit = [&](int number, bool add) {
-        std::string digits = std::to_string(number);
+    void Put(std::string const& name, std::string const& content) {
+        now.model.blobs[name] = content;
+        now.tree.write()->AddBlob(&repo, Wide(name), MakeBlob(content));
+    }
+
+    /// Adds or removes a blob, a subtree or both.
+    void Edit(int number, bool add) {
+        const std::string digits = std::to_string(number);
         const std::string name = "n" + std::string(5 - digits.size(), '0') + digits;
         if (!add) {
             const bool removed = now.model.blobs.erase(name) + now.model.trees.erase(name) > 0;
@@ -65,46 +79,46 @@ TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
         }
         const std::string content = std::to_string(Below(3));
         const int kind = Below(8);
-        if (kind != 0) {
-            now.model.blobs[name] = content;
-            now.tree.write()->AddBlob(&repo, Wide(name), MakeBlob(content));
-        }
+        if (kind != 0)
+            Put(name, content);
         if (kind <= 1) {
             now.model.trees[name].blobs = {{"f", content}};
             now.tree.write()->AddTree(&repo, Wide(name), *MakeTree(repo, "f=" + content));
         }
-    };
-    constexpr int largest = 4000;
+    }
+
+    /// Gives a few blobs other contents, which leave the packed form as long as it is.
+    void EditContents(int round) {
+        for (int few = Below(12); few > 0 && !now.model.blobs.empty(); --few) {
+            const auto picked = std::next(now.model.blobs.begin(), Below(static_cast<int>(now.model.blobs.size())));
+            Put(std::string(picked->first), std::to_string(round));
+            if (few % 3 == 0) {
+                ASSERT_EQ(IdText(*now.tree), IdOf(now.model)) << round;
+            }
+        }
+    }
+
+    std::mt19937 random{static_cast<unsigned>(GetParam())};
+    Repository repo{std::make_unique<MemObjectsStorage>()};
+    Version now;
+    std::vector<Version> former{now};
+};
+
+TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
     for (int round = 0; round < 40; ++round) {
         const int from = round == 0 ? 0 : Below(largest);
         const int count = round == 0 ? largest : Below(largest - from) + 1;
-        std::vector<int> numbers;
-        for (int index = 0; index < count; ++index)
-            numbers.push_back(from + index);
-        const int order = Below(3);
-        if (order == 1)
-            std::reverse(numbers.begin(), numbers.end());
-        else if (order == 2)
-            std::shuffle(numbers.begin(), numbers.end(), random);
+        const std::vector<int> numbers = PickNumbers(from, count);
         // Some keep a few entries, so that sparse leaves are left behind; some add to what an erasure left.
         const bool add = round == 0 || Below(5) < 2;
         const int kept = Below(2) * (Below(9) + 2);
         for (int number : numbers) {
             if (kept == 0 || Below(kept) != 0) {
-                ASSERT_NO_FATAL_FAILURE(edit(number, add));
+                ASSERT_NO_FATAL_FAILURE(Edit(number, add));
             }
         }
         ASSERT_NO_FATAL_FAILURE(now.Check()) << round;
-        // The packed form stays as long as it is.
-        for (int few = Below(12); few > 0 && !now.model.blobs.empty(); --few) {
-            auto const& name =
-                std::next(now.model.blobs.begin(), Below(static_cast<int>(now.model.blobs.size())))->first;
-            now.model.blobs[name] = std::to_string(round);
-            now.tree.write()->AddBlob(&repo, Wide(name), MakeBlob(std::to_string(round)));
-            if (few % 3 == 0) {
-                ASSERT_EQ(IdText(*now.tree), IdOf(now.model)) << round;
-            }
-        }
+        ASSERT_NO_FATAL_FAILURE(EditContents(round));
         ASSERT_NO_FATAL_FAILURE(now.CheckAgainst(former[random() % former.size()])) << round;
         if (Below(3) == 0)
             former.push_back(now);

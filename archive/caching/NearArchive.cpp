@@ -76,7 +76,7 @@ NearArchive::~NearArchive() {
     try {
         SaveUses();
     } catch (...) {
-        // Then these are taken for older than they are.
+        // These uses count as older than they are then.
         return;
     }
 }
@@ -103,7 +103,7 @@ std::vector<Id> NearArchive::Read(std::span<const Id> ids, ObjectReceiver const&
             }
         });
     });
-    // A receiver's own failure of an archive is not the near one's.
+    // What the receiver throws, which may be a failure of another archive, is no failure of this one.
     if (!isRead && thrown)
         std::rethrow_exception(thrown);
     if (!outcome.damaged.empty())

@@ -82,7 +82,7 @@ public:
         if (next_.IsEmpty() || count == 0)
             return {};
         auto line = archive_.ReadAncestry({&next_, 1}, Follow::Parents, count - 1);
-        // What only the first one shows: a commit without facts ends the line.
+        // A head without facts is listed all the same; further down, a commit without facts ends the line.
         if (line.empty() && isFirst_)
             line.push_back({next_, {}, {}, {}});
         isFirst_ = false;
@@ -139,7 +139,7 @@ private:
     }
 
     bool Advance() {
-        // What was rebased there and back leads to itself, and is begun anywhere.
+        // Commits that were rebased there and back lead to each other: the first of them that is left comes first.
         for (; ready_.empty() && firstLeft_ < facts_.size(); ++firstLeft_)
             if (!isGiven_[firstLeft_])
                 ready_.push_back(firstLeft_);
@@ -165,7 +165,7 @@ private:
     std::size_t given_ = 0;
 };
 
-/// Leaves those in which @p path is not what it is in their parent.
+/// Keeps those in which @p path is not what it is in their parent.
 void KeepChanging(IArchive& archive, KivStringT<char16_t> const& path, std::vector<Ancestry>& commits) {
     std::unordered_map<Id, Id> trees;
     std::vector<Id> parents;

@@ -29,7 +29,7 @@ private:
     std::unordered_map<Id, std::string> data_;
 };
 
-/// Throws that a tree is none that is ours to show. @throws ArchiveError of kind `Unrepresentable`
+/// Throws because a tree cannot be shown. @throws ArchiveError of kind `Unrepresentable`
 [[noreturn]] void ThrowUnrepresentableTree(Id const& id);
 
 } // namespace KivArchive

@@ -93,7 +93,7 @@ void ArchivedStorage::AddCommit(cow_ptr<Commit> commit) {
     if (cow_ptr<Commit> const living = objects_.GetCommit(id)) {
         if (!hidden_.contains(id))
             return;
-        // What was deleted makes room for what the host brings.
+        // A deleted object gives way to the one that the host brings.
         objects_.DeleteCommit(living);
         --hiddenCount_;
     }

@@ -53,7 +53,7 @@ std::vector<Ancestry> LocalFacts::All() const {
     all.reserve(entries_.size());
     auto const isDigest = [](Id const& known) { return known.IsEmpty() || known.GetDigest() != nullptr; };
     for (auto const& [id, entry] : entries_) {
-        // Nothing else is known to an archive.
+        // An archive knows objects by digests only.
         if (!isDigest(id) || !isDigest(entry.facts.parent) || !isDigest(entry.facts.tree))
             continue;
         all.push_back(entry.facts);
@@ -62,7 +62,7 @@ std::vector<Ancestry> LocalFacts::All() const {
     return all;
 }
 
-bool LocalFacts::TellOfPublished(IsUnpublished const& isUnpublished) const {
+bool LocalFacts::HasFactsOfPublished(IsUnpublished const& isUnpublished) const {
     return std::any_of(entries_.begin(), entries_.end(),
                        [&isUnpublished](auto const& entry) { return !isUnpublished(entry.first); });
 }

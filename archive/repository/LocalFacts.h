@@ -24,12 +24,12 @@ public:
     /// Adds the facts of @p commit, of its ancestors and of what these have merged, as far as they are unpublished.
     void AddLine(CommitHandle commit, IsUnpublished const& isUnpublished);
 
-    /// Null if nothing but its parent and its tree is to be said of the commit.
+    /// The facts of a commit; null if there are none but its parent and its tree.
     [[nodiscard]] Ancestry const* Find(Id const& id) const;
     [[nodiscard]] std::span<const CommitHandle> MergedBy(Id const& id) const;
     [[nodiscard]] std::vector<Ancestry> All() const;
-    /// Whether anything is said about a commit that is not unpublished: nothing else would bring it to the archive.
-    [[nodiscard]] bool TellOfPublished(IsUnpublished const& isUnpublished) const;
+    /// Whether there are facts of published commits: publishing commits would not bring these to the archive.
+    [[nodiscard]] bool HasFactsOfPublished(IsUnpublished const& isUnpublished) const;
     /// Drops what the archive has stored, except about commits that are still unpublished.
     void ForgetPublished(IsUnpublished const& isUnpublished);
 
@@ -37,7 +37,7 @@ private:
     struct Entry {
         Ancestry facts;
         std::vector<CommitHandle> merged;
-        /// Whether what is unpublished below it has been added, too: it may have become known for what it merged.
+        /// Whether `AddLine` was called for it. An entry may have been made by `Add` before.
         bool hasLine = false;
     };
 

@@ -8,7 +8,8 @@ namespace {
 
 /// How many commits of one line are asked about at once.
 constexpr std::size_t maximumAskedOfLine = 1000;
-/// A few that a host has just made are taken for missing unasked: to store what is there costs less than to ask.
+/// Up to so many commits that a host has just made are taken for missing unasked: storing what is there already costs less
+/// than asking.
 constexpr std::size_t maximumUnasked = 8;
 
 } // namespace

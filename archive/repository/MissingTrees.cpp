@@ -23,7 +23,7 @@ void MissingTrees::Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier) {
     directory.tree = std::move(root);
     directory.earlier = std::move(earlier);
     CheckEntry(NewDirectory::none, {}, *directory.tree, "tree", "40000");
-    // What differs from an earlier version is few, and most of it new.
+    // Few entries differ from an earlier version, and most of them are new.
     bool const isListed = static_cast<bool>(directory.earlier);
     std::size_t const number = AddDirectory(std::move(directory));
     if (isListed)
@@ -85,9 +85,9 @@ void MissingTrees::List(std::size_t number) {
     }
 }
 
-/// A directory whose holder brings all of it is listed whole, also if it was met before, in a later version that came back
-/// to it: what is new in it against the versions between is nothing, and these may only say what they have besides.
-/// @return whether that is to be done at once, since its turn has passed
+/// Lists a directory whole that is below one that is listed whole, also if it was added before, to be compared with the one
+/// that it replaces in another version: that comparison leaves out what both have, which the archive may lack.
+/// @return whether that has to be done at once, since `Find` has passed it
 bool MissingTrees::ListsWholeNow(std::size_t number) {
     NewDirectory& directory = directories_[number];
     if (!directory.earlier)

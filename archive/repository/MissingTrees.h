@@ -41,7 +41,7 @@ struct NewDirectory {
 };
 
 /// Looks for what the archive lacks of trees, from the top: a directory that is there is not entered. One batch for each
-/// level below what is new; what differs from an earlier version is asked for at once.
+/// level below what is new; what differs from an earlier version is asked for in one batch.
 class MissingTrees {
 public:
     explicit MissingTrees(IArchive& archive) : archive_(archive) {}

@@ -12,7 +12,7 @@ namespace KivArchive {
 
 namespace {
 
-/// How often a publish is tried whose ground others have collected.
+/// How often publishing is tried if others collect meanwhile what it relies on.
 constexpr int mostAttempts = 3;
 
 /// How many facts are looked at for a head that was rewritten, first and at most.
@@ -21,7 +21,7 @@ constexpr std::size_t mostFactsOfRewriting = 10'240;
 
 constexpr std::chrono::milliseconds longestBackOff{1000};
 
-/// What stands for a commit on a line, and whether more facts could not say otherwise.
+/// The commit that stands for another one on a line, and whether reading more facts could not change that.
 struct StandIn {
     /// Null if nothing does, or if the line goes through the commit itself.
     Id commit;
@@ -160,7 +160,7 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
     Moves pending = PendingMoves(branches);
     State& state = *state_;
     auto const isUnpublished = [&state](Id const& id) { return state.storage->MayBeUnpublished(id); };
-    if (pending.moves.empty() && records.empty() && !state.facts.TellOfPublished(isUnpublished))
+    if (pending.moves.empty() && records.empty() && !state.facts.HasFactsOfPublished(isUnpublished))
         return {true, {}, {}};
     auto const commits = MissingCommits(*state.storage, state.facts, state.Archive(), asksForAll).Find(pending.heads);
     Publishing publishing(state.Archive(), *state.storage, state.facts, asksForAll, progress);
@@ -237,7 +237,7 @@ void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch)
     if (!fork || fork == own)
         return;
     Id const published = state_->branches.at(branch).published;
-    // What others have published since is mostly little.
+    // Most of the time others have published little since then.
     std::size_t more = firstFactsOfRewriting;
     for (;; more *= 4) {
         auto const known = state_->Archive().ReadAncestry({&published, 1}, Follow::Everything, more);
@@ -261,7 +261,7 @@ MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, 
         try {
             ReturnTo(before);
         } catch (...) { // NOLINT(bugprone-empty-catch)
-            // Then the merged one stays current: what ended the merge is what the host has to hear of.
+            // The merged branch stays current then: the host has to hear what ended the merge.
         }
         throw;
     }
@@ -269,7 +269,7 @@ MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, 
     return *std::move(report);
 }
 
-/// Makes a branch current, also one in whose place there is none any more.
+/// Makes a branch current, also if it has been removed.
 void ArchivedRepository::ReturnTo(KivStringT<char16_t> const& branch) {
     auto* const storage = state_->storage;
     if (storage->BranchExist(branch)) {

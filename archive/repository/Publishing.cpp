@@ -79,7 +79,7 @@ void Publishing::StoreFiles(MissingTrees const& trees, std::size_t directory) {
 bool Publishing::StoreFile(NewDirectory::File const& file) {
     auto const* const archived =
         file.blob->IsOfHostClass() ? dynamic_cast<ArchivedBlob const*>(file.blob.get()) : nullptr;
-    // Another archive's, then: this one does not have it.
+    // It is in another archive: this one lacks it.
     if (archived != nullptr && archived->GetSize() > largestWholeContent)
         return StoreLarge(file, archived->OpenContent());
     Buffer const data = archived != nullptr ? archived->ReadContent() : file.blob->GetData();
@@ -101,7 +101,7 @@ bool Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content) {
 
 bool Publishing::StoreDirectory(NewDirectory const& directory) {
     bool const isHosts = directory.tree->IsOfHostClass();
-    // A tree keeps its form for as long as it lives, which may be long: a copy is asked instead.
+    // A tree keeps its packed form as long as it lives, which may be long. So a copy is asked for it.
     Buffer const data = isHosts ? directory.tree->GetData() : Tree(*directory.tree).GetData();
     if (isHosts && !(Identify(ObjectType::Tree, data) == directory.id))
         return false;

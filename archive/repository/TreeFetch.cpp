@@ -20,7 +20,7 @@ public:
         AddBlobs();
         for (auto const& [id, tree] : fetch.living_)
             staging_.AddTreeToStorage(tree);
-        // Reading gives none without entries.
+        // `Deserialize` gives no tree without entries.
         for (auto const& [id, form] : fetch.forms_)
             if (form.entries.empty())
                 staging_.AddTreeToStorage(KivVcs::immu::make<Tree>());
@@ -28,7 +28,7 @@ public:
 
     [[nodiscard]] cow_ptr<Tree> Make(Id const& root) {
         cow_ptr<Tree> tree = Tree::Deserialize(root, &staging_, [this](Id const& id) { return OpenForm(id); });
-        // The last word on whether everything has been understood.
+        // Only the identifier says whether everything was understood.
         if (!tree || !(tree->GetId() == root))
             ThrowUnreadable(Failure::Unrepresentable, "directory", root);
         return tree;

@@ -237,7 +237,8 @@ cow_ptr<CommitTree> Commit::GetTree(KivStringViewT<char16_t> path) const {
 }
 
 void Commit::KeepText() const {
-    // Of what is known of a state, the rest is made while it still can be.
+    // An identifier stays when the root is replaced. The packed form that is asked for later must be the one that it was
+    // computed from, and can only be made now.
     if (IsIdentified())
         static_cast<void>(GetPackedData());
 }

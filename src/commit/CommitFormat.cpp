@@ -21,7 +21,7 @@ TimeDelta BiasFromOffset(KivStringT<char16_t> const& offset) {
     return TimeDelta(hours * sign * ticksPerHour + minutes * sign * ticksPerMinute);
 }
 
-/// What the line of an author stores.
+/// What an author's line says.
 struct Signature {
     explicit Signature(KivStringT<char> const& line) {
         const int emailStart = line.Find("<");
@@ -117,7 +117,8 @@ Id Commit::ComputeId() const {
     IdentifyAncestors();
     if (data_.Get() != nullptr)
         return ComputePackedId();
-    // The text is not kept: it is asked for far less often than the identifier, and every commit of a history has one.
+    // The text is not kept: every commit of a history would have one, and texts are asked for far less often than
+    // identifiers.
     const KivStringT<char> text = TextOf(*this, HasParent());
     const auto size = static_cast<std::size_t>(text.GetLength());
     IdDigest digest("commit", size);

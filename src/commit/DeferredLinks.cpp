@@ -59,7 +59,7 @@ public:
     }
 
 private:
-    // As large as what the platform waits on directly.
+    // Of the size that platforms can wait on without a table of their own.
     enum class State : std::int32_t { NotFetched, Fetching, Held };
 
     /// The turn of the one thread that fetches. The others wait, and the next one tries again if it fails.

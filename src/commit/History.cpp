@@ -35,7 +35,7 @@ cow_ptr<Commit> NewestChange(cow_ptr<Commit> commit, KivStringViewT<char16_t> pa
 
 History History::Changing(KivStringViewT<char16_t> path) const {
     History result = *this;
-    // Of a path without components there is only one spelling from here on.
+    // Every spelling of the path without components becomes the empty text, which `IdAt` looks for.
     result.path_ = Helpers::SplitVcsPath(path).empty() ? KivStringT<char16_t>() : path.ToString();
     return result;
 }
@@ -60,7 +60,7 @@ History::Iterator::Iterator(cow_ptr<Commit> head, optional<KivStringT<char16_t>>
 History::Iterator& History::Iterator::operator++() {
     cow_ptr<Commit> next;
     if (left_ > 1) {
-        next = cow_ptr<Commit>(commit_->GetParent());
+        next = commit_->GetParent();
         if (path_)
             next = NewestChange(std::move(next), *path_);
     }
@@ -70,7 +70,7 @@ History::Iterator& History::Iterator::operator++() {
 }
 
 Differences DifferencesFromParent(Commit const& commit, DifferenceOptions const& options) {
-    auto const& parent = commit.GetParent();
+    const auto parent = commit.GetParent();
     return {parent ? parent->GetCommitTree() : cow_ptr<CommitTree>(), commit.GetCommitTree(), options};
 }
 

@@ -8,13 +8,13 @@
 namespace KivVcs {
 
 CommonBaseIndex::CommonBaseIndex(std::vector<cow_ptr<Commit>> const& heads) {
-    if (!AddNodes(heads)) {
-        nodes_.clear();
+    if (!AddJunctions(heads)) {
+        junctions_.clear();
         return;
     }
     for (auto const& head : heads) {
         if (head)
-            LinkPath(*head);
+            LinkLine(*head);
     }
 }
 
@@ -22,59 +22,59 @@ CommonBaseIndex::CommonBaseIndex(std::vector<cow_ptr<Commit>> const& heads) {
 /// one of these or a head itself, since an identifier determines the identifiers of all ancestors: ways that meet stay
 /// together.
 /// @return false if there are two objects of one identifier: which of them is a base depends on who asks.
-bool CommonBaseIndex::AddNodes(std::vector<cow_ptr<Commit>> const& heads) {
+bool CommonBaseIndex::AddJunctions(std::vector<cow_ptr<Commit>> const& heads) {
     CommitSet visited;
     for (auto const& head : heads) {
         if (!head)
             continue;
-        nodes_.try_emplace(head.get());
+        junctions_.try_emplace(head.get());
         for (Commit const& commit : Ancestors(head.get())) {
             Commit const* const met = visited.Insert(commit);
             if (met == nullptr)
                 continue;
             if (met != &commit)
                 return false;
-            nodes_.try_emplace(met);
+            junctions_.try_emplace(met);
             break;
         }
     }
     return true;
 }
 
-void CommonBaseIndex::LinkPath(Commit const& head) {
-    std::vector<Node*> path;
+void CommonBaseIndex::LinkLine(Commit const& head) {
+    std::vector<Junction*> line;
     for (Commit const& commit : Ancestors(&head)) {
-        const auto found = nodes_.find(&commit);
-        if (found == nodes_.end())
+        const auto found = junctions_.find(&commit);
+        if (found == junctions_.end())
             continue;
-        Node& node = found->second;
-        if (!path.empty())
-            path.back()->below = &node;
-        if (node.depth > 0)
+        Junction& junction = found->second;
+        if (!line.empty())
+            line.back()->below = &junction;
+        if (junction.depth > 0)
             break;
-        node.commit = &commit;
-        path.push_back(&node);
+        junction.commit = &commit;
+        line.push_back(&junction);
     }
-    std::reverse(path.begin(), path.end());
-    for (Node* const node : path) {
-        Node const* const below = node->below;
-        node->depth = below == nullptr ? 1 : below->depth + 1;
+    std::reverse(line.begin(), line.end());
+    for (Junction* const junction : line) {
+        Junction const* const below = junction->below;
+        junction->depth = below == nullptr ? 1 : below->depth + 1;
         if (below == nullptr)
-            node->jump = node;
+            junction->jump = junction;
         else if (below->depth - below->jump->depth == below->jump->depth - below->jump->jump->depth)
-            node->jump = below->jump->jump;
+            junction->jump = below->jump->jump;
         else
-            node->jump = below;
+            junction->jump = below;
     }
 }
 
 optional<Commit const*> CommonBaseIndex::Find(Commit const& first, Commit const& second) const {
-    const auto foundFirst = nodes_.find(&first);
-    const auto foundSecond = nodes_.find(&second);
-    if (foundFirst == nodes_.end() || foundSecond == nodes_.end())
+    const auto foundFirst = junctions_.find(&first);
+    const auto foundSecond = junctions_.find(&second);
+    if (foundFirst == junctions_.end() || foundSecond == junctions_.end())
         return {};
-    Node const* deeper = &foundFirst->second;
-    Node const* other = &foundSecond->second;
+    Junction const* deeper = &foundFirst->second;
+    Junction const* other = &foundSecond->second;
     if (deeper->depth < other->depth)
         std::swap(deeper, other);
     while (deeper->depth > other->depth)

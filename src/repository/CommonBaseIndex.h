@@ -23,21 +23,21 @@ public:
 
 private:
     /// A head, or a commit at which the ways down from two heads meet.
-    struct Node {
+    struct Junction {
         Commit const* commit = nullptr;
-        /// The nearest node on the way down; null for the last one.
-        Node const* below = nullptr;
-        /// A node further down, such that any depth is reached in a logarithmic number of steps; itself for the last
+        /// The nearest junction on the way down; null for the last one.
+        Junction const* below = nullptr;
+        /// One further down, such that any depth is reached in a logarithmic number of steps; itself for the last
         /// one.
-        Node const* jump = nullptr;
-        /// The number of nodes on the way down, this one included; 0 until the node is linked.
+        Junction const* jump = nullptr;
+        /// The number of junctions on the way down, this one included; 0 until it is linked.
         std::size_t depth = 0;
     };
 
-    bool AddNodes(std::vector<cow_ptr<Commit>> const& heads);
-    void LinkPath(Commit const& head);
+    bool AddJunctions(std::vector<cow_ptr<Commit>> const& heads);
+    void LinkLine(Commit const& head);
 
-    std::unordered_map<Commit const*, Node> nodes_;
+    std::unordered_map<Commit const*, Junction> junctions_;
 };
 
 } // namespace KivVcs

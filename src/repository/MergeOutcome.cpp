@@ -55,7 +55,8 @@ public:
     [[nodiscard]] bool GaveUp() const noexcept { return gaveUp_; }
     [[nodiscard]] bool ChoseNoTree() const noexcept { return choseNoTree_; }
 
-    /// Everything recorded, and of @p all what lies neither there nor below a directory that was settled as a whole.
+    /// Everything recorded, followed by those of @p all that are not recorded and not below a directory that was settled as
+    /// a whole.
     [[nodiscard]] std::vector<MergeConflict> TakeWithTheRestOf(std::vector<MergeConflict> all) {
         PathList known;
         for (auto const& conflict : conflicts_)
@@ -112,7 +113,7 @@ private:
     bool choseNoTree_ = false;
 };
 
-/// Without a moved branch only: what kept it where it was.
+/// Why a merge has not moved the branch.
 MergeOutcome WhyNot(ConflictRecorder& recorder, MergeTrees trees) {
     if (recorder.GaveUp())
         return {MergeResult::GaveUp, recorder.TakeWithTheRestOf(FindConflicts(std::move(trees)))};

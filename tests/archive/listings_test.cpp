@@ -198,31 +198,16 @@ TEST_F(Listings, OfGraphsShowNoCommitBeforeOneThatLeadsToIt) {
     EXPECT_EQ(shown.size(), archive_.ReadAncestry(heads, Follow::Reachable, 10000).size() + 1);
 }
 
-TEST_F(Listings, GoOnBehindDamageAndEndWhereTheyAreTold) {
+TEST_F(Listings, OfHistoriesGoOnBehindDamage) {
     NewObject const noCommit =
         Object(ObjectType::Commit, "tree \nauthor A <a> 1 +0000\ncommitter B <b> 1 +0000\n\nx\n");
     NewCommit const root = Commit({}, {}, "root");
-    NewObject const deepest = Object(ObjectType::Tree, "");
-    Change change;
-    change.objects = {noCommit, root.object, deepest};
     Id const gone = Object(ObjectType::Commit, "gone").id;
+    Change change;
+    change.objects = {noCommit, root.object};
     change.ancestry = {
         {gone, noCommit.id, {}, {}}, {noCommit.id, root.object.id, {}, {}}, {root.object.id, {}, {}, {}}};
-    // Two ways down from each, so that there are 2^60 places: with no file in any, and with one.
-    NewObject const file = Object(ObjectType::Tree, TreeOf({{"f", gone}}));
-    for (NewObject tree : {deepest, file}) {
-        change.objects.push_back(tree);
-        for (int i = 0; i < 60; ++i) {
-            std::string const digits = DigitsOf(tree.id);
-            tree = Object(ObjectType::Tree, "40000 tree a" + std::string(1, '\0') + digits + "40000 tree b" +
-                                                std::string(1, '\0') + digits);
-            change.objects.push_back(tree);
-        }
-    }
-    NewObject const unordered = Object(ObjectType::Tree, TreeOf({{"b", gone}, {"a", gone}}));
-    change.objects.push_back(unordered);
     archive_.Apply(change);
-
     std::vector<CommitState> states;
     ListCommits(
         archive_, std::vector<Id>{gone}, {},
@@ -235,12 +220,37 @@ TEST_F(Listings, GoOnBehindDamageAndEndWhereTheyAreTold) {
               (std::vector<CommitState>{CommitState::Missing, CommitState::Unrepresentable, CommitState::Sound}));
     std::vector<Id> const twice{root.object.id, noCommit.id, root.object.id};
     EXPECT_EQ(ReadCommits(archive_, twice)[2].description, Text(u"root"));
+}
 
-    Id const empty = change.objects[63].id;
-    Id const full = change.objects[124].id;
-    EXPECT_TRUE(ListFiles(archive_, empty, 100, nullptr).isComplete);
-    EXPECT_TRUE(ListDifferences(archive_, {}, empty, {}, nullptr).differences.empty());
-    FileList const files = ListFiles(archive_, full, 100, nullptr);
+/// Sixty directories, each of which names the one before twice, so that there are 2^60 ways down to @p innermost, which
+/// comes first.
+std::vector<NewObject> DoubledDirectories(NewObject const& innermost) {
+    std::vector<NewObject> directories{innermost};
+    for (int i = 0; i < 60; ++i) {
+        std::string const digits = DigitsOf(directories.back().id);
+        directories.push_back(Object(ObjectType::Tree, "40000 tree a" + std::string(1, '\0') + digits + "40000 tree b" +
+                                                           std::string(1, '\0') + digits));
+    }
+    return directories;
+}
+
+TEST_F(Listings, OfDirectoriesEndWhereTheyAreToldAndSayWhatCannotBeRead) {
+    Id const gone = Object(ObjectType::Blob, "gone").id;
+    std::vector<NewObject> const empty = DoubledDirectories(Object(ObjectType::Tree, ""));
+    std::vector<NewObject> const full = DoubledDirectories(Object(ObjectType::Tree, TreeOf({{"f", gone}})));
+    NewObject const unordered = Object(ObjectType::Tree, TreeOf({{"b", gone}, {"a", gone}}));
+    NewCommit const commit = Commit({}, {}, "no directory");
+    Change change;
+    change.objects = empty;
+    change.objects.insert(change.objects.end(), full.begin(), full.end());
+    change.objects.push_back(unordered);
+    change.objects.push_back(commit.object);
+    change.ancestry = {commit.facts};
+    archive_.Apply(change);
+
+    EXPECT_TRUE(ListFiles(archive_, empty.back().id, 100, nullptr).isComplete);
+    EXPECT_TRUE(ListDifferences(archive_, {}, empty.back().id, {}, nullptr).differences.empty());
+    FileList const files = ListFiles(archive_, full.back().id, 100, nullptr);
     EXPECT_TRUE(files.files.size() == 100 && !files.isComplete);
     auto const failureOf = [&](Id const& tree) {
         try {
@@ -251,8 +261,8 @@ TEST_F(Listings, GoOnBehindDamageAndEndWhereTheyAreTold) {
     };
     EXPECT_EQ(failureOf(unordered.id), Failure::Unrepresentable);
     EXPECT_EQ(failureOf(Object(ObjectType::Tree, TreeOf({{"x", gone}})).id), Failure::Collected);
-    EXPECT_EQ(failureOf(root.object.id), Failure::Damaged);
-    EXPECT_EQ(failureOf(full), std::nullopt);
+    EXPECT_EQ(failureOf(commit.object.id), Failure::Damaged);
+    EXPECT_EQ(failureOf(full.back().id), std::nullopt);
 }
 
 } // namespace

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <csignal>
-#include <set>
 #include <sqlite3.h>
 #include <sys/wait.h>
 #include <thread>
@@ -264,70 +263,6 @@ TEST(SqliteArchive, TellsDamageAndGivesWhatIsSound) {
                 partial, static_cast<unsigned long long>(given));
     EXPECT_GT(refused, 0);
     EXPECT_GT(partial, 0);
-}
-
-/// The identifiers of all objects.
-std::set<std::string> ObjectsOf(IArchive& archive) {
-    std::set<std::string> ids;
-    for (ObjectInfo const& info : archive.ListObjects({}, 1U << 20U))
-        ids.insert(DigitsOf(info.id));
-    return ids;
-}
-
-TEST(SqliteArchive, SalvageLosesWhatIsOnADamagedPageAndNothingElse) {
-    TemporaryDirectory const directory;
-    std::string const path = directory.Path("damaged");
-    Id head;
-    std::set<std::string> all;
-    {
-        SqliteArchive archive(directory.Path("archive"));
-        SmallHost host(archive, 1);
-        for (int i = 0; i < 9; ++i)
-            ASSERT_TRUE(host.Publish());
-        Change change;
-        change.records.push_back({{u"settings", BufferOf(std::string(5000, 'x'))}, false, {}});
-        archive.Apply(change);
-        head = host.Head();
-        all = ObjectsOf(archive);
-        // While it is open, most is in the log.
-        WriteFile(path, ReadFile(directory.Path("archive")));
-        WriteFile(path + "-wal", ReadFile(directory.Path("archive-wal")));
-        MemArchive salvaged;
-        Salvage(path, salvaged, nullptr);
-        EXPECT_EQ(ObjectsOf(salvaged), all);
-        EXPECT_EQ(HeadOf(salvaged), head);
-    }
-    std::string const sound = ReadFile(directory.Path("archive"));
-    constexpr std::size_t page = 4096;
-    // In the order in which tables are made.
-    constexpr std::size_t pageOfBranches = 3;
-    int whole = 0;
-    std::size_t lost = 0;
-    int tried = 0;
-    for (std::size_t begin = 0; begin < sound.size(); begin += page) {
-        bool const isTable = sound[begin] == 13 || sound[begin] == 0;
-        if (isTable && begin / page % 16 != 3)
-            continue;
-        std::string bytes = sound;
-        std::fill_n(bytes.begin() + static_cast<std::ptrdiff_t>(begin), page, '\xA5');
-        WriteFile(path, bytes);
-        MemArchive salvaged;
-        SalvageReport const report = Salvage(path, salvaged, nullptr);
-        EXPECT_TRUE(Verify(salvaged, nullptr).damaged.empty());
-        std::size_t const found = ObjectsOf(salvaged).size();
-        EXPECT_TRUE(isTable || found == all.size()) << "page " << begin / page + 1 << " loses objects";
-        bool const hasHead = salvaged.FindMissing({&head, 1}).empty();
-        EXPECT_TRUE(!hasHead || (HeadOf(salvaged) == head || begin == pageOfBranches * page));
-        EXPECT_TRUE(!hasHead || report.lastCommits == std::vector<Id>{head});
-        EXPECT_TRUE(salvaged.ListRecords().size() == 1 || begin > 0);
-        whole += found == all.size() ? 1 : 0;
-        lost += all.size() - found;
-        ++tried;
-    }
-    std::printf("%d damaged pages: nothing lost by %d, %.1f of %zu objects by each of the others\n", tried, whole,
-                static_cast<double>(lost) / std::max(1, tried - whole), all.size());
-    EXPECT_GT(whole, 7);
-    EXPECT_LT(whole, tried);
 }
 
 /// Publishes, synchronizes and collects until it is killed, and reports every head that it has published.

@@ -9,14 +9,11 @@
 
 namespace KivArchive::Conformance {
 
-inline void CheckObjects(Trial& trial, IArchive& archive) {
-    trial.Expect(archive.FindMissing({}).empty() && archive.Describe({}).empty() && ReadAll(archive, {}).empty(),
-                 "empty batches give nothing");
+/// Objects of every type and of many sizes: four blobs, four others, and many small blobs.
+inline std::vector<NewObject> SomeObjects() {
     std::vector<NewObject> objects{Object(ObjectType::Blob, ""), Object(ObjectType::Blob, "hello"),
                                    Object(ObjectType::Blob, SomeNoise(1, largestWholeContent)),
                                    Object(ObjectType::Blob, SomeText(2, 300000))};
-    trial.Expect(DigitsOf(objects[1].id) == "8aec4e4876f854f688d0ebfc8f37598f38e5fd6903cccc850ca36591175aeb60",
-                 "identifiers are digests of packed forms");
     std::vector<std::pair<std::string, Id>> files;
     for (int i = 0; i < 20000; ++i)
         files.emplace_back("file" + std::to_string(100000 + i), objects[static_cast<std::size_t>(i) % 4].id);
@@ -26,6 +23,36 @@ inline void CheckObjects(Trial& trial, IArchive& archive) {
     objects.push_back(Commit(objects[4].id, {}, "First\n\nwith more").object);
     for (std::uint32_t i = 0; i < 500; ++i)
         objects.push_back(Object(ObjectType::Blob, SomeText(100 + i, i * 17)));
+    return objects;
+}
+
+/// Page by page, in ascending order, and counted. @param ids all that are there
+inline void CheckListing(Trial& trial, IArchive& archive, std::vector<Id> ids) {
+    std::vector<Id> listed;
+    for (Id after;;) {
+        auto const page = archive.ListObjects(after, 100);
+        for (ObjectInfo const& info : page)
+            listed.push_back(info.id);
+        if (page.size() < 100)
+            break;
+        after = listed.back();
+    }
+    std::sort(ids.begin(), ids.end(),
+              [](Id const& left, Id const& right) { return *left.GetDigest() < *right.GetDigest(); });
+    ids.erase(std::unique(ids.begin(), ids.end()), ids.end());
+    trial.Expect(listed == ids, "all objects are listed in ascending order");
+    auto const statistics = archive.GetStatistics();
+    trial.Expect(statistics.blobs + statistics.trees + statistics.commits == ids.size() && statistics.commits == 1 &&
+                     statistics.trees == 3,
+                 "objects are counted by type");
+}
+
+inline void CheckObjects(Trial& trial, IArchive& archive) {
+    trial.Expect(archive.FindMissing({}).empty() && archive.Describe({}).empty() && ReadAll(archive, {}).empty(),
+                 "empty batches give nothing");
+    std::vector<NewObject> const objects = SomeObjects();
+    trial.Expect(DigitsOf(objects[1].id) == "8aec4e4876f854f688d0ebfc8f37598f38e5fd6903cccc850ca36591175aeb60",
+                 "identifiers are digests of packed forms");
     std::vector<Id> ids;
     for (NewObject const& object : objects)
         ids.push_back(object.id);
@@ -52,25 +79,7 @@ inline void CheckObjects(Trial& trial, IArchive& archive) {
     ReadOutcome const outcome = archive.Read(asked, [](ArchivedObject const&) {});
     trial.Expect(outcome.missing == unknown && outcome.damaged.empty() && archive.FindMissing(asked) == unknown,
                  "missing objects are reported, in order");
-
-    // Page by page in ascending order.
-    std::vector<Id> listed;
-    for (Id after;;) {
-        auto const page = archive.ListObjects(after, 100);
-        for (ObjectInfo const& info : page)
-            listed.push_back(info.id);
-        if (page.size() < 100)
-            break;
-        after = listed.back();
-    }
-    std::sort(ids.begin(), ids.end(),
-              [](Id const& left, Id const& right) { return *left.GetDigest() < *right.GetDigest(); });
-    ids.erase(std::unique(ids.begin(), ids.end()), ids.end());
-    trial.Expect(listed == ids, "all objects are listed in ascending order");
-    auto const statistics = archive.GetStatistics();
-    trial.Expect(statistics.blobs + statistics.trees + statistics.commits == ids.size() && statistics.commits == 1 &&
-                     statistics.trees == 3,
-                 "objects are counted by type");
+    CheckListing(trial, archive, std::move(ids));
 }
 
 /// Many versions of one path, each one change apart, stored one by one and all at once.
