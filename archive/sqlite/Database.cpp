@@ -103,6 +103,14 @@ std::int64_t Database::Ask(const char* sql) {
     return query.Next() ? query.Number(0) : 0;
 }
 
+std::optional<std::uint32_t> Database::VersionRead() const noexcept {
+    std::uint32_t version = 0;
+    bool const isRead = sqlite3_txn_state(handle_.get(), "main") == SQLITE_TXN_READ;
+    if (!isRead || sqlite3_file_control(handle_.get(), "main", SQLITE_FCNTL_DATA_VERSION, &version) != SQLITE_OK)
+        return std::nullopt;
+    return version;
+}
+
 sqlite3_stmt* Database::Prepared(const char* sql) {
     auto& statement = statements_[sql];
     if (statement == nullptr) {
@@ -213,7 +221,7 @@ Transaction::~Transaction() {
 }
 
 void Transaction::Commit() {
-    database_.Run("COMMIT");
+    Query(database_, "COMMIT").Run();
     isOpen_ = false;
 }
 

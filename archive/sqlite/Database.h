@@ -33,6 +33,10 @@ public:
     /// The first column of the only row of a statement.
     [[nodiscard]] std::int64_t Ask(const char* sql);
 
+    /// A number that is another one for every version of the file, if a transaction reads and does not write; none
+    /// otherwise.
+    [[nodiscard]] std::optional<std::uint32_t> VersionRead() const noexcept;
+
     /// Throws what the failure @p code means. @param code as SQLite gave it
     [[noreturn]] void Fail(int code) const;
 
@@ -126,7 +130,7 @@ public:
     enum class Kind : std::uint8_t { Read, Write };
 
     Transaction(Database& database, Kind kind) : database_(database) {
-        database.Run(kind == Kind::Read ? "BEGIN" : "BEGIN IMMEDIATE");
+        Query(database, kind == Kind::Read ? "BEGIN" : "BEGIN IMMEDIATE").Run();
     }
     Transaction(Transaction const&) = delete;
     Transaction& operator=(Transaction const&) = delete;

@@ -9,6 +9,8 @@ namespace KivArchive {
 namespace {
 
 constexpr std::uint64_t maximumHeldSegments = std::uint64_t{8} * 1024 * 1024;
+/// As much as that a connection keeps for the next call.
+constexpr std::uint64_t maximumKeptSegments = std::uint64_t{512} * 1024;
 /// The flag under which the cache keeps what the members of a segment share, beside the check of its form: that changes
 /// when members are removed.
 constexpr std::uint64_t sharedFlag = std::uint64_t{1} << 63U;
@@ -17,22 +19,25 @@ constexpr std::size_t maximumSteps = 64;
 
 } // namespace
 
-std::shared_ptr<const Bytes> FormCache::Find(Place const& place) {
+std::shared_ptr<const Bytes> FormCache::Find(Place const& place, Trust trust) {
     std::scoped_lock const lock(mutex_);
-    auto const found = entries_.find(place);
+    auto found = entries_.find({place, Trust::Verified});
+    if (found == entries_.end() && trust == Trust::Unverified)
+        found = entries_.find({place, trust});
     if (found == entries_.end())
         return nullptr;
     newestFirst_.splice(newestFirst_.begin(), newestFirst_, found->second);
     return found->second->form;
 }
 
-void FormCache::Keep(Place const& place, std::shared_ptr<const Bytes> const& form) {
+void FormCache::Keep(Place const& place, Trust trust, std::shared_ptr<const Bytes> const& form) {
     std::scoped_lock const lock(mutex_);
-    if (form->size() > budget_ || entries_.count(place) != 0)
+    Key const key{place, trust};
+    if (form->size() > budget_ || entries_.count(key) != 0)
         return;
-    newestFirst_.push_front({place, form});
+    newestFirst_.push_front({key, form});
     try {
-        entries_.emplace(place, newestFirst_.begin());
+        entries_.emplace(key, newestFirst_.begin());
     } catch (...) {
         newestFirst_.pop_front();
         throw;
@@ -40,9 +45,44 @@ void FormCache::Keep(Place const& place, std::shared_ptr<const Bytes> const& for
     size_ += form->size();
     while (size_ > budget_) {
         size_ -= newestFirst_.back().form->size();
-        entries_.erase(newestFirst_.back().place);
+        entries_.erase(newestFirst_.back().key);
         newestFirst_.pop_back();
     }
+}
+
+void FormCache::Clear() noexcept {
+    std::scoped_lock const lock(mutex_);
+    entries_.clear();
+    newestFirst_.clear();
+    size_ = 0;
+}
+
+std::shared_ptr<const Segment> HeldSegments::Find(std::uint64_t number) const {
+    auto const found = segments_.find(number);
+    return found == segments_.end() ? nullptr : found->second;
+}
+
+void HeldSegments::Hold(std::shared_ptr<const Segment> const& segment) {
+    if (size_ + segment->FormSize() > maximumHeldSegments) {
+        segments_.clear();
+        size_ = 0;
+    }
+    segments_.emplace(segment->Number(), segment);
+    size_ += segment->FormSize();
+}
+
+FormReader::FormReader(Connection& connection, FormCache& cache)
+    : SegmentReader(connection.compressor, cache), connection_(connection),
+      forms_(connection.database, "segments", "form"), version_(connection.database.VersionRead()) {
+    if (version_ && version_ == connection.heldVersion)
+        std::swap(held_, connection.held);
+}
+
+FormReader::~FormReader() {
+    if (!version_ || held_.GetSize() > maximumKeptSegments)
+        return;
+    connection_.held = std::move(held_);
+    connection_.heldVersion = version_;
 }
 
 Bytes FormReader::Load(std::uint64_t number) {
@@ -52,32 +92,23 @@ Bytes FormReader::Load(std::uint64_t number) {
     return *std::move(form);
 }
 
-std::shared_ptr<const Segment> SegmentReader::UnverifiedSegmentAt(std::uint64_t number) {
-    auto const found = segments_.find(number);
-    if (found != segments_.end())
-        return found->second;
-    auto segment = std::make_shared<const Segment>(number, Load(number), Segment::Verified::Later);
-    if (held_ + segment->FormSize() > maximumHeldSegments) {
-        segments_.clear();
-        held_ = 0;
+std::shared_ptr<const Segment> SegmentReader::SegmentAt(std::uint64_t number, Trust trust) {
+    auto segment = held_.Find(number);
+    if (segment == nullptr) {
+        segment = std::make_shared<const Segment>(number, Load(number), Segment::Verified::Later);
+        held_.Hold(segment);
     }
-    segments_.emplace(number, segment);
-    held_ += segment->FormSize();
+    if (trust == Trust::Verified)
+        segment->Verify();
     return segment;
 }
 
-std::shared_ptr<const Segment> SegmentReader::SegmentAt(std::uint64_t number) {
-    auto segment = UnverifiedSegmentAt(number);
-    segment->Verify();
-    return segment;
-}
-
-Form SegmentReader::SharedForm(Segment const& segment, Member const& member) {
+Form SegmentReader::SharedForm(Segment const& segment, Member const& member, Trust trust) {
     Place const place{segment.Number(), sharedFlag | segment.Check()};
-    std::shared_ptr<const Bytes> shared = cache_.Find(place);
+    std::shared_ptr<const Bytes> shared = cache_.Find(place, trust);
     if (shared == nullptr) {
         shared = std::make_shared<const Bytes>(segment.DecompressShared(compressor_));
-        cache_.Keep(place, shared);
+        cache_.Keep(place, trust, shared);
     }
     if (member.sharedOffset > shared->size() || member.formSize > shared->size() - member.sharedOffset)
         throw Malformed();
@@ -87,22 +118,7 @@ Form SegmentReader::SharedForm(Segment const& segment, Member const& member) {
             shared->size()};
 }
 
-Form SegmentReader::FormAt(Place place) {
-    static_cast<void>(SegmentAt(place.segment));
-    return UnverifiedFormAt(place);
-}
-
-Form SegmentReader::UnverifiedFormAt(Place place) {
-    auto segment = UnverifiedSegmentAt(place.segment);
-    Member const& member = segment->At(place.member);
-    if (member.encoding == Encoding::Plain)
-        return {segment, member.own, segment->FormSize()};
-    // What others are made of must be what was stored.
-    segment->Verify();
-    return member.encoding == Encoding::Shared ? SharedForm(*segment, member) : DifferentForm(place);
-}
-
-Form SegmentReader::DifferentForm(Place place) {
+Form SegmentReader::FormAt(Place place, Trust trust) {
     struct Step {
         std::shared_ptr<const Segment> segment;
         Member const& member;
@@ -112,13 +128,13 @@ Form SegmentReader::DifferentForm(Place place) {
     std::vector<Step> steps;
     Form form;
     while (form.owner == nullptr) {
-        auto segment = SegmentAt(place.segment);
+        auto segment = SegmentAt(place.segment, trust);
         Member const& member = segment->At(place.member);
         if (member.encoding == Encoding::Plain) {
             form = {segment, member.own, segment->FormSize()};
         } else if (member.encoding == Encoding::Shared) {
-            form = SharedForm(*segment, member);
-        } else if (auto const known = cache_.Find(place)) {
+            form = SharedForm(*segment, member, trust);
+        } else if (auto const known = cache_.Find(place, trust)) {
             form = {known, *known, known->size()};
         } else {
             Place const base = segment->BaseOf(member);
@@ -132,7 +148,7 @@ Form SegmentReader::DifferentForm(Place place) {
         Step const& step = steps.back();
         auto const made = std::make_shared<const Bytes>(
             ApplyDifference(compressor_, form.bytes, step.member.own, static_cast<std::size_t>(step.member.formSize)));
-        cache_.Keep(step.place, made);
+        cache_.Keep(step.place, trust, made);
         form = {made, *made, made->size()};
     }
     return form;
@@ -155,10 +171,9 @@ std::optional<ObjectRow> FindRow(Database& database, Id const& id) {
 }
 
 std::vector<std::optional<ObjectRow>> FindRows(Database& database, std::span<const Id> ids) {
-    constexpr std::size_t few = 8;
     std::vector<std::optional<ObjectRow>> rows;
     rows.reserve(ids.size());
-    if (ids.size() <= few) {
+    if (ids.size() <= worthLookup) {
         for (Id const& id : ids)
             rows.push_back(FindRow(database, id));
         return rows;

@@ -7,6 +7,9 @@
 
 namespace KivArchive {
 
+/// From how many identifiers on a lookup takes less time than what planning its statement takes.
+inline constexpr std::size_t worthLookup = 32;
+
 /// Looks up one identifier after the other with one run of a statement, which takes about half of what a run for each of
 /// them does; the next one may depend on what the one before has led to. Within one transaction.
 class Lookup {

@@ -44,13 +44,13 @@ Found ReadOne(FormReader& reader, Id const& id, ObjectRow const& row) {
     bool isOfType = false;
     bool const isSound = IsSound([&] {
         bool const isLarge = row.type == StoredType::LargeBlob;
-        auto const segment =
-            isLarge ? reader.SegmentAt(row.place.segment) : reader.UnverifiedSegmentAt(row.place.segment);
+        // A large content is not read here, so that nothing else shows what is wrong.
+        auto const segment = reader.SegmentAt(row.place.segment, isLarge ? Trust::Verified : Trust::Unverified);
         Member const& member = segment->At(row.place.member);
         isOfType = member.type == row.type;
         found.isCompact = member.isCompact;
         found.size = member.size;
-        form = isLarge ? Form{std::make_shared<int>(), {}, 0} : reader.UnverifiedFormAt(row.place);
+        form = isLarge ? Form{std::make_shared<int>(), {}, 0} : reader.FormAt(row.place, Trust::Unverified);
     });
     if (isSound && isOfType)
         found.form = std::move(form);
@@ -146,6 +146,7 @@ ReadOutcome SqliteArchive::Read(std::span<const Id> ids, ObjectReceiver const& r
         }
         for (Found& found : window) {
             if (!HandOver(found, receiver)) {
+                store_->cache.Clear();
                 // What has been collected since it was located is not damaged.
                 bool const isThere = FindRow(connection->database, *found.id).has_value();
                 (isThere ? outcome.damaged : outcome.missing).push_back(*found.id);
@@ -173,7 +174,7 @@ std::optional<Buffer> SqliteArchive::ReadContent(Id const& id, std::uint64_t off
     FormReader reader(*connection, store_->cache);
     bool const isSound = IsSound([&] {
         if (row->type == StoredType::Blob) {
-            Form const form = reader.FormAt(row->place);
+            Form const form = reader.FormAt(row->place, Trust::Unverified);
             if (!(Identify(ObjectType::Blob, form.bytes) == id))
                 throw Malformed();
             append(form.bytes, 0);
@@ -186,15 +187,17 @@ std::optional<Buffer> SqliteArchive::ReadContent(Id const& id, std::uint64_t off
             auto const place = FindRow(connection->database, digest);
             if (!place)
                 throw Malformed();
-            Form const form = reader.FormAt(place->place);
+            Form const form = reader.FormAt(place->place, Trust::Unverified);
             if (!(DigestOfBytes(form.bytes) == digest))
                 throw Malformed();
             append(form.bytes, piece * largestWholeContent);
         }
     });
     transaction.Commit();
-    if (!isSound)
+    if (!isSound) {
+        store_->cache.Clear();
         store_->ThrowDamaged("A content");
+    }
     return content;
 }
 

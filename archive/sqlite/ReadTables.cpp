@@ -15,13 +15,17 @@ constexpr std::size_t maximumRows = 1U << 20U;
 /// Reads facts within one transaction.
 class FactsReader {
 public:
-    explicit FactsReader(Database& database)
-        : database_(database), hasContained_(database.Ask("SELECT EXISTS(SELECT 1 FROM contained)") != 0),
-          lookup_(database, "SELECT parent, tree FROM asked(?) LEFT JOIN ancestry ON ancestry.id=asked.id") {}
+    /// @param count of how many commits the facts are wanted, at most
+    FactsReader(Database& database, std::size_t count) : database_(database), areMany_(count > worthLookup) {
+        if (areMany_)
+            hasContained_ = database.Ask("SELECT EXISTS(SELECT 1 FROM contained)") != 0;
+    }
 
     [[nodiscard]] std::optional<Ancestry> Find(Id const& id) {
-        Query const& row = lookup_.At(id);
-        if (row.IsNull(0))
+        if (areMany_)
+            return FindAmongMany(id);
+        Query row(database_, "SELECT parent, tree FROM ancestry WHERE id=?");
+        if (!row.With(DigestOf(id)).Next())
             return std::nullopt;
         return FactsOf(id, row.OptionalIdentifier(0), row.OptionalIdentifier(1));
     }
@@ -43,9 +47,19 @@ public:
     }
 
 private:
+    [[nodiscard]] std::optional<Ancestry> FindAmongMany(Id const& id) {
+        if (!lookup_)
+            lookup_.emplace(database_, "SELECT parent, tree FROM asked(?) LEFT JOIN ancestry ON ancestry.id=asked.id");
+        Query const& row = lookup_->At(id);
+        if (row.IsNull(0))
+            return std::nullopt;
+        return FactsOf(id, row.OptionalIdentifier(0), row.OptionalIdentifier(1));
+    }
+
     Database& database_;
-    bool hasContained_;
-    Lookup lookup_;
+    bool areMany_;
+    bool hasContained_ = true;
+    std::optional<Lookup> lookup_;
 };
 
 Buffer BufferOf(ByteView bytes) {
@@ -103,7 +117,7 @@ std::vector<KivStringT<char16_t>> SqliteArchive::ListRecords() {
 std::vector<Ancestry> SqliteArchive::ReadAncestry(std::span<const Id> commits, Follow follow, std::size_t more) {
     SqliteStore::Lease const connection(*store_);
     Transaction transaction(connection->database, Transaction::Kind::Read);
-    FactsReader reader(connection->database);
+    FactsReader reader(connection->database, std::max(commits.size(), more));
     auto walked = WalkAncestry(commits, follow, more, [&](Id const& id) { return reader.Find(id); });
     transaction.Commit();
     return walked;
@@ -112,7 +126,7 @@ std::vector<Ancestry> SqliteArchive::ReadAncestry(std::span<const Id> commits, F
 std::vector<Ancestry> SqliteArchive::ListAncestry(Id const& after, std::size_t limit) {
     SqliteStore::Lease const connection(*store_);
     Transaction transaction(connection->database, Transaction::Kind::Read);
-    FactsReader reader(connection->database);
+    FactsReader reader(connection->database, limit);
     std::vector<Ancestry> listed;
     Query query(connection->database, "SELECT id, parent, tree FROM ancestry WHERE id>? ORDER BY id LIMIT ?");
     query.With(after).With(LimitOf(limit));

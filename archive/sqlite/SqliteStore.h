@@ -21,19 +21,28 @@ struct Form {
     std::uint64_t held = 0;
 };
 
+/// How far what segments give is trusted.
+enum class Trust : std::uint8_t {
+    Verified,   ///< It is what was stored: the segments that it comes from have been hashed.
+    Unverified, ///< Whoever reads it compares it with its identifier, which costs less than hashing whole segments.
+};
+
 /// The forms that were made last, up to a number of bytes, for those that are differences to them. Any number of
 /// threads may use it.
 class FormCache {
 public:
     explicit FormCache(std::uint64_t budget) noexcept : budget_(budget) {}
 
-    /// Null if it is not there.
-    [[nodiscard]] std::shared_ptr<const Bytes> Find(Place const& place);
-    void Keep(Place const& place, std::shared_ptr<const Bytes> const& form);
+    /// What is verified serves everybody. Null if it is not there.
+    [[nodiscard]] std::shared_ptr<const Bytes> Find(Place const& place, Trust trust);
+    void Keep(Place const& place, Trust trust, std::shared_ptr<const Bytes> const& form);
+    /// Drops everything, of which something was not what was stored.
+    void Clear() noexcept;
 
 private:
+    using Key = std::pair<Place, Trust>;
     struct Entry {
-        Place place;
+        Key key;
         std::shared_ptr<const Bytes> form;
     };
 
@@ -41,7 +50,20 @@ private:
     std::uint64_t budget_;
     std::uint64_t size_ = 0;
     std::list<Entry> newestFirst_;
-    std::map<Place, std::list<Entry>::iterator> entries_;
+    std::map<Key, std::list<Entry>::iterator> entries_;
+};
+
+/// Segments that have been read, by number.
+class HeldSegments {
+public:
+    /// Null if it is not there.
+    [[nodiscard]] std::shared_ptr<const Segment> Find(std::uint64_t number) const;
+    void Hold(std::shared_ptr<const Segment> const& segment);
+    [[nodiscard]] std::uint64_t GetSize() const noexcept { return size_; }
+
+private:
+    std::map<std::uint64_t, std::shared_ptr<const Segment>> segments_;
+    std::uint64_t size_ = 0;
 };
 
 struct Connection {
@@ -50,6 +72,9 @@ struct Connection {
 
     Database database;
     Compressor compressor;
+    /// What was read last, for the next call if the file is still at that version.
+    HeldSegments held;
+    std::optional<std::uint32_t> heldVersion;
 };
 
 /// Reads stored forms out of segments, wherever these come from.
@@ -60,13 +85,9 @@ public:
     virtual ~SegmentReader() = default;
 
     /// @throws Malformed if there is no such segment
-    [[nodiscard]] std::shared_ptr<const Segment> SegmentAt(std::uint64_t number);
-    /// The same for those who compare what they get with its identifier: not verified.
-    [[nodiscard]] std::shared_ptr<const Segment> UnverifiedSegmentAt(std::uint64_t number);
+    [[nodiscard]] std::shared_ptr<const Segment> SegmentAt(std::uint64_t number, Trust trust = Trust::Verified);
     /// The stored form of a member, whatever it is a difference to. @throws Malformed
-    [[nodiscard]] Form FormAt(Place place);
-    /// The same for those who compare what they get with its identifier.
-    [[nodiscard]] Form UnverifiedFormAt(Place place);
+    [[nodiscard]] Form FormAt(Place place, Trust trust = Trust::Verified);
 
 protected:
     SegmentReader(Compressor& compressor, FormCache& cache) : compressor_(compressor), cache_(cache) {}
@@ -74,26 +95,29 @@ protected:
     /// The form of a segment. @throws Malformed if there is no such segment
     [[nodiscard]] virtual Bytes Load(std::uint64_t number) = 0;
 
+    HeldSegments held_;
+
 private:
-    [[nodiscard]] Form SharedForm(Segment const& segment, Member const& member);
-    [[nodiscard]] Form DifferentForm(Place place);
+    [[nodiscard]] Form SharedForm(Segment const& segment, Member const& member, Trust trust);
 
     Compressor& compressor_;
     FormCache& cache_;
-    std::map<std::uint64_t, std::shared_ptr<const Segment>> segments_;
-    std::uint64_t held_ = 0;
 };
 
 /// Reads the segments of a database within one transaction.
 class FormReader final : public SegmentReader {
 public:
-    FormReader(Connection& connection, FormCache& cache)
-        : SegmentReader(connection.compressor, cache), forms_(connection.database, "segments", "form") {}
+    FormReader(Connection& connection, FormCache& cache);
+    FormReader(FormReader const&) = delete;
+    FormReader& operator=(FormReader const&) = delete;
+    ~FormReader() override;
 
 private:
     Bytes Load(std::uint64_t number) override;
 
+    Connection& connection_;
     RowBlobs forms_;
+    std::optional<std::uint32_t> version_;
 };
 
 /// What the table of objects stores.

@@ -265,6 +265,33 @@ TEST(SqliteArchive, TellsDamageAndGivesWhatIsSound) {
     EXPECT_GT(partial, 0);
 }
 
+TEST(SqliteArchive, ReadsWhatIsPutRightWhileItIsOpen) {
+    TemporaryDirectory const directory;
+    std::string const path = MakeArchive(directory.Path("archive"), 6);
+    WriteFile(directory.Path("sound"), ReadFile(path));
+    SqliteArchive archive(path);
+    std::vector<Id> ids;
+    for (ObjectInfo const& info : archive.ListObjects({}, 1000))
+        ids.push_back(info.id);
+    std::size_t given = 0;
+    auto const countDamaged = [&] {
+        given = 0;
+        return archive.Read(ids, [&given](ArchivedObject const& /*object*/) { ++given; }).damaged.size();
+    };
+    // In what one version of the text inserts, and the next ones are made of.
+    RunSql(path, "UPDATE segments SET form=CAST(substr(form, 1, instr(form, x'65646974') - 1) || x'65636974' || "
+                 "substr(form, instr(form, x'65646974') + 4) AS BLOB) WHERE instr(form, x'65646974')>0");
+    std::size_t const damaged = countDamaged();
+    EXPECT_GT(damaged, 0U);
+    EXPECT_EQ(given + damaged, ids.size());
+    EXPECT_GT(given, damaged) << "what is beside it in its segment is sound";
+    RunSql(path, "ATTACH '" + directory.Path("sound") +
+                     "' AS sound; UPDATE segments SET form=(SELECT form FROM sound.segments AS one WHERE "
+                     "one.number=segments.number)");
+    EXPECT_EQ(countDamaged(), 0U);
+    EXPECT_EQ(given, ids.size());
+}
+
 /// Publishes, synchronizes and collects until it is killed, and reports every head that it has published.
 [[noreturn]] void PublishForever(std::string const& path, std::uint32_t seed, int told) {
     try {
