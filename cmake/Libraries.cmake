@@ -21,4 +21,9 @@ function(kivvcs_add_library target)
         VERSION ${PROJECT_VERSION}
         # Before 1.0 every minor version may change the binary interface.
         SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR})
+    # Companions find what they stand on beside themselves, wherever they are installed: a program that calls nothing of it
+    # does not say where it is.
+    if(UNIX AND NOT APPLE AND NOT arg_ALIAS STREQUAL KivVcs)
+        set_target_properties(${target} PROPERTIES INSTALL_RPATH "$ORIGIN")
+    endif()
 endfunction()

@@ -20,7 +20,7 @@ using KivVcs::cow_ptr;
 using KivVcs::Resolvers;
 
 struct RepositoryOptions {
-    /// The most bytes of contents that are kept for those who read them again, and that streams hold; what was not used
+    /// At most so many bytes of contents are kept for those who read them again, and held by streams; what was not used
     /// for the longest time goes first. Contents that a blob keeps, since its `GetData` was called, are not counted.
     std::uint64_t contentBytes = std::uint64_t{64} * 1024 * 1024;
     /// On how many threads `ReadContents` reads; 0 stands for as many as there are processors.

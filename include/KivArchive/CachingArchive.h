@@ -10,8 +10,8 @@
 namespace KivArchive {
 
 struct CachingOptions {
-    /// The most bytes that the near archive may take; what was not used for the longest time goes first. A little more
-    /// may be taken until that is noticed.
+    /// The near archive takes at most so many bytes, and a little more until that is noticed; what was not used for the
+    /// longest time goes first.
     std::uint64_t maximumBytes = std::uint64_t{1024} * 1024 * 1024;
     /// How long the far archive is not asked again after it could not be reached.
     std::chrono::milliseconds pause{2000};

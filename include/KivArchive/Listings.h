@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What people are shown of an archive: histories, graphs, files and differences, as plain records that are read from
+/// What people are shown of an archive: histories, graphs, files and differences, as plain values that are read from
 /// packed forms without making commits, trees or contents.
 
 #include "KivArchive/IArchive.h"
@@ -54,7 +54,7 @@ using CommitReceiver = std::function<bool(CommitRecord const&)>;
 /// history. The null identifier leads nowhere.
 ///
 /// One call of the archive for the facts and one for the texts of up to 500 commits, and if `changing` is set one
-/// more for each component of the path. Holds 500 records; of a graph 200 bytes for each commit reached.
+/// more for each component of the path. Holds 500 of them; of a graph 200 bytes for each commit reached.
 /// @param progress may be null
 /// @throws ArchiveError; of kind `Damaged` or `Collected` for a tree that `changing` needs
 KIVARCHIVE_EXPORT void ListCommits(IArchive& archive, std::span<const Id> heads, CommitListOptions const& options,

@@ -3,7 +3,7 @@
 /// @file
 /// Texts compared and merged line by line.
 ///
-/// A line ends behind its line feed, so that line ends of either kind are part of their line and kept; only the last line
+/// A line ends after its line feed, so that line ends of either kind are part of their line and kept; only the last line
 /// may lack one. A content that has a zero byte, or more bytes than allowed, is no text.
 ///
 /// Threads: any number of calls may run concurrently.
@@ -26,7 +26,7 @@ namespace KivArchive {
 inline constexpr std::uint64_t largestText = std::uint64_t{64} * 1024 * 1024;
 
 /// Lines that were replaced by others, removed (nothing on the new side), or added (nothing on the old side). Lines are
-/// counted from 0; the ends are those behind the last.
+/// counted from 0; the ends are one past the last.
 struct LineChange {
     std::size_t oldBegin = 0;
     std::size_t oldEnd = 0;
@@ -52,7 +52,7 @@ struct TextDifferences {
                                                               std::uint64_t maximumBytes = largestText);
 
 struct UnifiedTextOptions {
-    /// Behind "---" and "+++".
+    /// What follows "---" and "+++".
     KivVcs::KivStringT<char> oldLabel = "old";
     KivVcs::KivStringT<char> newLabel = "new";
     /// How many equal lines are shown around changes.

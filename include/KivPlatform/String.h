@@ -69,7 +69,7 @@ public:
         requires std::same_as<C, char16_t>
     KivStringT(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
 
-    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does. Behind a
+    /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does. After a
     /// percent sign, "s" takes NUL-terminated text (null counts as empty), ".*s" a length and text, "d", "u" and "lu" any
     /// integer; a width ("5d", "02d") pads with blanks or zeros; two percent signs write one. A directive without an
     /// argument writes nothing.

@@ -57,7 +57,7 @@ public:
     [[nodiscard]] Memory::BufferChunks GetChunks() const { return GetData().LockForRead(); }
     [[nodiscard]] StreamIO OpenStream() const { return StreamIO(MemStream::CreateOnCopy(GetData())); }
 
-    /// Reads a blob from its packed form: everything behind the header's zero byte, whatever size the header states.
+    /// Reads a blob from its packed form: everything after the header's zero byte, whatever size the header states.
     /// Large chunks of a stream on a buffer are shared, not copied.
     /// @return null if the stream is not valid, cannot be read, or its header does not begin with "blob".
     static cow_ptr<Blob> Deserialize(StreamIO& stream);

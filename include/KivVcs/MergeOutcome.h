@@ -29,7 +29,7 @@ enum class MergeResult : std::int32_t {
 struct MergeOutcome {
     MergeResult result = MergeResult::NothingToCommit;
     /// Every conflict that a resolver settled, in the order of asking; after a merge that gave up also all that are left,
-    /// undecided, behind them.
+    /// undecided, after them.
     std::vector<MergeConflict> conflicts;
 
     /// Whether the current branch has the commit's changes now.
