@@ -15,7 +15,7 @@ chmod o+x "$work"
 address=$("$server" start "$work/server" fsync=off)
 trap '"$server" stop "$work/server"; chmod -R u+rwx "$work" 2>/dev/null; rm -rf "$work"' EXIT
 export HOME=$work/home
-unset XDG_CACHE_HOME
+unset XDG_CACHE_HOME XDG_STATE_HOME
 
 # Every command once or more, with what it writes; what differs each time is blotted out.
 transcript() (
@@ -92,6 +92,34 @@ DatabasesTakeTheSameCommandsAsFiles() {
     equal "$(grep -c '^\$' in_file)" 43
     equal "$(stat -c %a home/.cache/vault)" 700
     [ "$(find home/.cache/vault -name '*.db' -size +4k | wc -l)" -ge 1 ] || fail "nothing is in the cache"
+}
+
+TwoUsersOfADatabaseHaveCurrentBranchesOfTheirOwn() {
+    export VAULT_FILE=$address
+    write d/file content
+    "$vault" save d -m first >/dev/null
+    "$vault" branch side
+    HOME=$work/ben "$vault" checkout side
+    matches "$(HOME=$work/ben "$vault" branch)" '^[*] side'
+    matches "$("$vault" branch)" '^[*] master'
+}
+
+ReadersGoOnWithWhatWasSeenWhileTheServerIsAway() {
+    export VAULT_FILE=$address
+    write d/file content
+    "$vault" save d -m first >/dev/null
+    seen() { "$vault" log && "$vault" show master:file; }
+    seen >before
+    "$server" crash "$work/server"
+    seen >meanwhile 2>said
+    diff before meanwhile || fail "not what was seen before"
+    equal "$(grep -c 'the database is away' said)" 2
+    refused "cannot be reached" save d -m second
+    refused "cannot be reached" branch other
+    refused "cannot be reached" -f "${address/\/postgres?host/\/other?host}" log
+    "$server" restart "$work/server"
+    seen 2>said >/dev/null
+    equal "$(cat said)" ""
 }
 
 "$2"

@@ -235,7 +235,7 @@ std::vector<Id> PostgresArchive::ListMarked(std::chrono::seconds grace, Id const
 std::vector<Id> PostgresArchive::Remove(std::span<const Id> ids, std::chrono::seconds grace) {
     if (ids.empty())
         return {};
-    Token const token = MakeToken();
+    Token const token = store_->MakeToken();
     return store_->Run([&](Connection& connection) {
         Removing removing(connection, ids, grace, &token);
         std::vector<Id> kept;

@@ -180,11 +180,10 @@ std::optional<Refused> RoundTrip::Take(Sent const& sent, std::vector<Rows>& resu
     return refused;
 }
 
-std::vector<Rows> RoundTrip::Run() {
+std::optional<Refused> RoundTrip::Exchange(std::vector<Rows>& results) {
     connection_.Require(PQpipelineSync(connection_.handle_.get()));
     ++connection_.roundTrips_;
     connection_.Flush();
-    std::vector<Rows> results;
     std::optional<Refused> failure;
     for (Sent const& sent : sent_)
         if (auto refused = Take(sent, results))
@@ -198,14 +197,19 @@ std::vector<Rows> RoundTrip::Run() {
     preparing_.reset();
     count_ = 0;
     connection_.isSound_ = true;
-    if (failure) {
-        if (PQtransactionStatus(connection_.handle_.get()) == PQTRANS_INERROR) {
-            Add(Statement::Rollback);
-            Run();
-        }
-        throw Refused(*failure);
+    return failure;
+}
+
+std::vector<Rows> RoundTrip::Run() {
+    std::vector<Rows> results;
+    auto const failure = Exchange(results);
+    if (!failure)
+        return results;
+    if (PQtransactionStatus(connection_.handle_.get()) == PQTRANS_INERROR) {
+        Add(Statement::Rollback);
+        static_cast<void>(Exchange(results));
     }
-    return results;
+    throw Refused(*failure);
 }
 
 } // namespace KivArchive::Postgres

@@ -117,6 +117,8 @@ private:
     };
 
     void Prepare(Statement statement);
+    /// Sends what was added, and takes what it gives. @return the failure, if there was one
+    [[nodiscard]] std::optional<Refused> Exchange(std::vector<Rows>& results);
     /// Takes the results of one that was sent. @return a failure; none as well if an earlier one has left it out
     [[nodiscard]] std::optional<Refused> Take(Sent const& sent, std::vector<Rows>& results);
 

@@ -53,11 +53,16 @@ void Forms::Take(Rows const& rows) {
     answers_.push_back(rows);
 }
 
-void Forms::Take(Id const& id, Row row, std::shared_ptr<const Bytes> stored) {
-    row.stored = *stored;
-    row.storedSize = stored->size();
-    rows_.emplace(id, std::move(row));
-    owned_.push_back(std::move(stored));
+void Forms::Take(Id const& id, WholeRow const& whole) {
+    whole_.emplace(id, whole);
+}
+
+std::vector<Id> Forms::Ids() const {
+    std::vector<Id> ids;
+    ids.reserve(rows_.size());
+    for (auto const& [id, row] : rows_)
+        ids.push_back(id);
+    return ids;
 }
 
 Row const* Forms::Find(Id const& id) const {
@@ -93,7 +98,16 @@ Member const& Forms::MemberOf(Id const& id) {
     return StoredAt(id)->At(0);
 }
 
+Version Forms::VersionOf(Id const& id) {
+    if (auto const whole = whole_.find(id); whole != whole_.end())
+        return whole->second.version;
+    Member const& member = MemberOf(id);
+    return {member.type, Find(id)->base, member.generation, member.formSize};
+}
+
 Form Forms::FormOf(Id const& id, Compressor& compressor) {
+    if (auto const whole = whole_.find(id); whole != whole_.end())
+        return {whole->second.form, *whole->second.form};
     // Down to a form that is no difference or that is known, and back up.
     std::vector<Id> steps;
     Form form;

@@ -29,6 +29,21 @@ struct Row {
     ByteView stored;
 };
 
+/// What is to be known of a version for the next one to be a difference to it.
+struct Version {
+    StoredType type = StoredType::Blob;
+    Id base;
+    std::uint64_t generation = 0;
+    std::uint64_t formSize = 0;
+};
+
+/// A row with its form, which is no difference any more. Rows never change; whether the server still has one is for the
+/// server to say.
+struct WholeRow {
+    Version version;
+    std::shared_ptr<const Bytes> form;
+};
+
 /// Rows that were read together. Used by one thread at a time.
 class Forms {
 public:
@@ -38,24 +53,23 @@ public:
     /// The same, as a part of a round trip whose answer is taken then.
     static void AddTo(RoundTrip& trip, std::span<const Id> ids, std::uint64_t most);
     void Take(Rows const& rows);
-    /// A row that was read or stored before. @param stored what the row has
-    void Take(Id const& id, Row row, std::shared_ptr<const Bytes> stored);
-    /// Calls `take(id, row)` for every row.
-    template <class Take>
-    void ForEach(Take take) const {
-        for (auto const& [id, row] : rows_)
-            take(id, row);
-    }
+    /// A row that was read or stored before.
+    void Take(Id const& id, WholeRow const& whole);
+    [[nodiscard]] bool IsTaken(Id const& id) const { return whole_.count(id) != 0; }
+    /// Every row that was read.
+    [[nodiscard]] std::vector<Id> Ids() const;
 
-    /// Null if there is no such row.
+    /// Null if no such row was read.
     [[nodiscard]] Row const* Find(Id const& id) const;
     /// Whether the stored forms are there, too.
     [[nodiscard]] bool AreWhole() const noexcept { return areWhole_; }
     /// How much is stored for @p id and what it is a difference to.
     [[nodiscard]] std::uint64_t StoredSizeOf(Id const& id) const;
 
-    /// How the form of @p id is stored. @throws Malformed
+    /// How the form of @p id, which must have been read, is stored. @throws Malformed
     [[nodiscard]] Member const& MemberOf(Id const& id);
+    /// @throws Malformed
+    [[nodiscard]] Version VersionOf(Id const& id);
     /// The form itself. @throws Malformed
     [[nodiscard]] Form FormOf(Id const& id, Compressor& compressor);
 
@@ -64,8 +78,8 @@ private:
     void Keep(Id const& id, std::shared_ptr<const Bytes> const& form);
 
     std::vector<Rows> answers_;
-    std::vector<std::shared_ptr<const Bytes>> owned_;
     std::unordered_map<Id, Row> rows_;
+    std::unordered_map<Id, WholeRow> whole_;
     std::unordered_map<Id, std::shared_ptr<const Segment>> stored_;
     std::unordered_map<Id, std::shared_ptr<const Bytes>> made_;
     std::uint64_t madeSize_ = 0;

@@ -19,8 +19,17 @@ constexpr std::size_t worthwhile = 3;
 constexpr std::uint64_t windowSize = 8 * largestWholeContent;
 /// What is smaller hardly becomes smaller still.
 constexpr std::size_t worthCompressing = 64;
+/// Who changes more at once will hardly go on with the same.
+constexpr std::size_t mostRowsKept = 256;
 /// Less is made sooner than another thread has begun.
-constexpr std::uint64_t worthSharing = 128 * 1024;
+constexpr std::uint64_t worthSharing = std::uint64_t{128} * 1024;
+/// Of what is smaller, a difference saves less than a row takes beside its form.
+constexpr std::uint64_t worthDiffering = 512;
+
+/// Whether it is stored as a difference, if that makes it much smaller.
+bool IsToDiffer(Item const& item) {
+    return !item.earlier.IsEmpty() && item.size >= worthDiffering;
+}
 
 void MakeDifference(Prepared& prepared, Compressor& compressor) {
     bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
@@ -53,7 +62,9 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
         workers = 1;
     std::vector<Id> const earlier = EarlierRows();
     bool const hasEarlier = !earlier.empty();
-    areNew_ = hasEarlier && !looksForPresent && recent_.GiveAll(earlier, forms_);
+    bool const isEdit =
+        std::any_of(items.begin(), items.end(), [](Item const& item) { return !item.earlier.IsEmpty(); });
+    areNew_ = isEdit && !looksForPresent && recent_.GiveAll(earlier, forms_);
     if (looksForPresent || (hasEarlier && !areNew_)) {
         forms_ = Forms();
         Ask(connection);
@@ -90,30 +101,36 @@ void Preparation::Select(std::vector<Item> const& items) {
 std::vector<Id> Preparation::EarlierRows() const {
     std::vector<Id> earlier;
     for (Prepared const& one : prepared_)
-        if (!one.item->earlier.IsEmpty() && EarlierPrepared(one) == nullptr)
+        if (IsToDiffer(*one.item) && EarlierPrepared(one) == nullptr)
             earlier.push_back(one.item->earlier);
     return earlier;
 }
 
-void Preparation::KeepRead() const {
-    if (!forms_.AreWhole())
+void Preparation::KeepRead(Compressor& compressor) {
+    std::vector<Id> const ids = forms_.Ids();
+    if (!forms_.AreWhole() || ids.size() > mostRowsKept)
         return;
-    forms_.ForEach([this](Id const& id, Row const& row) {
-        recent_.Keep(id, {row, std::make_shared<const Bytes>(row.stored.begin(), row.stored.end())});
-    });
+    for (Id const& id : ids)
+        try {
+            Version version = forms_.VersionOf(id);
+            ByteView const form = forms_.FormOf(id, compressor).bytes;
+            recent_.Keep(id, {std::move(version), std::make_shared<const Bytes>(form.begin(), form.end())});
+        } catch (Malformed const&) {
+            // What is damaged is no base.
+            continue;
+        }
 }
 
-void Preparation::KeepStored() const {
+void Preparation::KeepStored() {
     if (!areNew_)
         return;
-    for (Prepared const& one : prepared_) {
-        if (one.item->type == StoredType::Commit)
+    for (Prepared& one : prepared_) {
+        if (one.item->type == StoredType::Commit || one.item->size < worthDiffering)
             continue;
-        Row row;
-        row.type = one.item->type;
-        row.size = one.item->size;
-        row.base = one.base;
-        recent_.Keep(one.item->id, {std::move(row), std::make_shared<const Bytes>(one.stored)});
+        Version version{one.item->type, one.base, one.member.generation, one.member.formSize};
+        auto form = std::make_shared<const Bytes>(one.member.isCompact ? std::move(one.compact)
+                                                                       : Bytes(one.form.begin(), one.form.end()));
+        recent_.Keep(one.item->id, {std::move(version), std::move(form)});
     }
 }
 
@@ -122,7 +139,7 @@ void Preparation::Ask(Connection& connection) {
     std::vector<Id> earlier;
     for (Prepared const& one : prepared_) {
         ids.push_back(one.item->id);
-        if (!one.item->earlier.IsEmpty())
+        if (IsToDiffer(*one.item))
             earlier.push_back(one.item->earlier);
     }
     RoundTrip trip(connection);
@@ -130,7 +147,7 @@ void Preparation::Ask(Connection& connection) {
     Forms::AddTo(trip, earlier, windowSize);
     auto const answers = trip.Run();
     forms_.Take(answers[1]);
-    KeepRead();
+    KeepRead(connection.compressor);
     Rows const& rows = answers[0];
     std::unordered_set<Id> present;
     for (int i = 0; i < rows.Count(); ++i) {
@@ -148,39 +165,42 @@ void Preparation::Ask(Connection& connection) {
 }
 
 Prepared const* Preparation::EarlierPrepared(Prepared const& one) const {
-    auto const found = numbers_.find(one.item->earlier);
+    auto const found = IsToDiffer(*one.item) ? numbers_.find(one.item->earlier) : numbers_.end();
     if (found == numbers_.end() || &prepared_[found->second] >= &one)
         return nullptr;
     return &prepared_[found->second];
 }
 
-std::uint64_t Preparation::GenerationOf(Id const& id) {
+Version Preparation::VersionOf(Id const& id) {
     auto const found = numbers_.find(id);
-    return found != numbers_.end() ? prepared_[found->second].member.generation : forms_.MemberOf(id).generation;
+    if (found == numbers_.end())
+        return forms_.VersionOf(id);
+    Prepared const& one = prepared_[found->second];
+    return {one.member.type, one.base, one.member.generation, one.member.formSize};
 }
 
 void Preparation::FindBase(Prepared& one, Compressor& compressor) {
     // What is damaged, or was too much to be fetched, is no base.
     try {
         Id at = one.item->earlier;
-        std::uint64_t const generation = 1 + GenerationOf(at);
+        Version version = VersionOf(at);
+        std::uint64_t const generation = 1 + version.generation;
         // Version v is a difference to version v & (v - 1), so that no version is more than log2(v) steps from one that
         // is whole.
         std::uint64_t const wanted = generation & (generation - 1);
-        for (std::uint64_t before = generation; GenerationOf(at) > wanted;) {
-            if (GenerationOf(at) >= before)
+        while (version.generation > wanted) {
+            std::uint64_t const after = version.generation;
+            at = version.base;
+            version = VersionOf(at);
+            if (version.generation >= after)
                 throw Malformed();
-            before = GenerationOf(at);
-            auto const prepared = numbers_.find(at);
-            at = prepared != numbers_.end() ? prepared_[prepared->second].base : forms_.Find(at)->base;
         }
-        auto const prepared = numbers_.find(at);
-        Member const& member = prepared != numbers_.end() ? prepared_[prepared->second].member : forms_.MemberOf(at);
-        if (member.type != one.item->type || member.formSize > largestDifferenced)
+        if (version.type != one.item->type || version.formSize > largestDifferenced)
             return;
+        auto const prepared = numbers_.find(at);
         one.baseForm = prepared != numbers_.end() ? Form{std::make_shared<int>(), prepared_[prepared->second].form}
                                                   : forms_.FormOf(at, compressor);
-        one.base = at;
+        one.base = std::move(at);
         one.generation = generation;
     } catch (Malformed const&) {
         one.baseForm = {};
@@ -198,7 +218,7 @@ void Preparation::MakeDifferencesToRows(Connection& connection, unsigned workers
     std::vector<std::size_t> window;
     if (forms_.AreWhole()) {
         for (std::size_t i = 0; i < prepared_.size(); ++i)
-            if (!prepared_[i].item->earlier.IsEmpty() && EarlierPrepared(prepared_[i]) == nullptr)
+            if (IsToDiffer(*prepared_[i].item) && EarlierPrepared(prepared_[i]) == nullptr)
                 window.push_back(i);
         MakeDifferences(window, workers, connection.compressor);
         return;
@@ -216,7 +236,8 @@ void Preparation::MakeDifferencesToRows(Connection& connection, unsigned workers
     };
     for (std::size_t i = 0; i < prepared_.size(); ++i) {
         Id const& earlier = prepared_[i].item->earlier;
-        if (earlier.IsEmpty() || EarlierPrepared(prepared_[i]) != nullptr || sizes.Find(earlier) == nullptr)
+        if (!IsToDiffer(*prepared_[i].item) || EarlierPrepared(prepared_[i]) != nullptr ||
+            sizes.Find(earlier) == nullptr)
             continue;
         window.push_back(i);
         ids.push_back(earlier);
@@ -228,13 +249,24 @@ void Preparation::MakeDifferencesToRows(Connection& connection, unsigned workers
         close();
 }
 
-std::vector<Id> Preparation::Bases() const {
-    std::unordered_set<Id> own;
+std::vector<Id> Preparation::Bases(std::unordered_set<Id> const& inherited) const {
+    std::unordered_map<Id, Prepared const*> own;
     for (Prepared const& one : prepared_)
-        own.insert(one.item->id);
+        own.emplace(one.item->id, &one);
+    // What an earlier version is a difference to stays for as long as that does.
+    auto const isInherited = [&](Prepared const& one) {
+        Id const* earlier = &one.item->earlier;
+        for (std::size_t steps = 0; steps < prepared_.size(); ++steps) {
+            auto const found = own.find(*earlier);
+            if (found == own.end())
+                break;
+            earlier = &found->second->item->earlier;
+        }
+        return inherited.count(*earlier) != 0;
+    };
     std::unordered_set<Id> bases;
     for (Prepared const& one : prepared_)
-        if (!one.base.IsEmpty() && own.count(one.base) == 0)
+        if (!one.base.IsEmpty() && own.count(one.base) == 0 && (inherited.empty() || !isInherited(one)))
             bases.insert(one.base);
     return {bases.begin(), bases.end()};
 }

@@ -6,6 +6,8 @@
 #include "postgres/RecentRows.h"
 #include "postgres/Store.h"
 
+#include <unordered_set>
+
 namespace KivArchive::Postgres {
 
 /// An item on its way into a row.
@@ -38,15 +40,17 @@ public:
     [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
     [[nodiscard]] std::vector<Id> const& Removed() const noexcept { return removed_; }
     /// The rows that items are differences to and that are not among them, each once.
-    [[nodiscard]] std::vector<Id> Bases() const;
-    /// Keeps what has been stored, if it was new.
-    void KeepStored() const;
+    /// @param inherited earlier versions whose bases need not be named
+    [[nodiscard]] std::vector<Id> Bases(std::unordered_set<Id> const& inherited) const;
+    /// Keeps what has been stored, if it was new, and takes the forms of the items for that.
+    void KeepStored();
 
 private:
     void Select(std::vector<Item> const& items);
     /// The earlier versions of the items, but for those that are items themselves.
     [[nodiscard]] std::vector<Id> EarlierRows() const;
-    void KeepRead() const;
+    /// Keeps what was read, with its forms.
+    void KeepRead(Compressor& compressor);
     /// Asks which items the server has, and for the earlier versions.
     void Ask(Connection& connection);
     void MakeDifferencesToRows(Connection& connection, unsigned workers);
@@ -54,7 +58,8 @@ private:
     /// The version before, if it is among those prepared and comes before @p one.
     [[nodiscard]] Prepared const* EarlierPrepared(Prepared const& one) const;
     void FindBase(Prepared& one, Compressor& compressor);
-    [[nodiscard]] std::uint64_t GenerationOf(Id const& id);
+    /// Of an item or of a row that was read. @throws Malformed
+    [[nodiscard]] Version VersionOf(Id const& id);
 
     RecentRows& recent_;
     std::vector<Prepared> prepared_;

@@ -90,6 +90,7 @@ std::vector<Record> PostgresArchive::ReadRecords(std::span<const KivStringT<char
     if (names.empty())
         return {};
     std::vector<Bytes> bytes;
+    bytes.reserve(names.size());
     for (auto const& name : names)
         bytes.push_back(BytesOfName(name));
     Rows const rows = Ask(*store_, Statement::ReadRecords, Parameters().With(bytes));
@@ -106,6 +107,7 @@ std::vector<Record> PostgresArchive::ReadRecords(std::span<const KivStringT<char
 std::vector<KivStringT<char16_t>> PostgresArchive::ListRecords() {
     Rows const rows = Ask(*store_, Statement::ListRecords);
     std::vector<KivStringT<char16_t>> names;
+    names.reserve(static_cast<std::size_t>(rows.Count()));
     for (int i = 0; i < rows.Count(); ++i)
         names.push_back(NameOfBytes(rows.Value(i, 0)));
     std::sort(names.begin(), names.end());

@@ -6,18 +6,18 @@ namespace KivArchive::Postgres {
 
 namespace {
 
-constexpr std::uint64_t maximumBytes = std::uint64_t{4} * 1024 * 1024;
-constexpr std::uint64_t largestRow = maximumBytes / 16;
+constexpr std::uint64_t maximumBytes = std::uint64_t{2} * 1024 * 1024;
+constexpr std::uint64_t largestRow = maximumBytes / 8;
 /// What a row takes beside its form, about.
 constexpr std::uint64_t rowSize = 256;
 
 } // namespace
 
-void RecentRows::Keep(Id const& id, RecentRow row) {
-    if (row.stored->size() > largestRow)
+void RecentRows::Keep(Id const& id, WholeRow row) {
+    if (row.form->size() > largestRow)
         return;
     std::scoped_lock const lock(mutex_);
-    std::uint64_t const size = row.stored->size() + rowSize;
+    std::uint64_t const size = row.form->size() + rowSize;
     if (size_ + size > maximumBytes) {
         before_ = std::exchange(current_, {});
         size_ = 0;
@@ -26,25 +26,25 @@ void RecentRows::Keep(Id const& id, RecentRow row) {
         size_ += size;
 }
 
-RecentRow const* RecentRows::Find(Id const& id) {
+WholeRow const* RecentRows::Find(Id const& id) {
     if (auto const found = current_.find(id); found != current_.end())
         return &found->second;
     auto const found = before_.find(id);
     if (found == before_.end())
         return nullptr;
-    size_ += found->second.stored->size() + rowSize;
+    size_ += found->second.form->size() + rowSize;
     return &current_.insert_or_assign(id, found->second).first->second;
 }
 
 bool RecentRows::GiveAll(std::span<const Id> ids, Forms& forms) {
     std::scoped_lock const lock(mutex_);
     for (Id const& id : ids)
-        for (Id at = id; !at.IsEmpty() && forms.Find(at) == nullptr;) {
-            RecentRow const* const recent = Find(at);
+        for (Id at = id; !at.IsEmpty() && !forms.IsTaken(at);) {
+            WholeRow const* const recent = Find(at);
             if (recent == nullptr)
                 return false;
-            forms.Take(at, recent->row, recent->stored);
-            at = recent->row.base;
+            forms.Take(at, *recent);
+            at = recent->version.base;
         }
     return true;
 }

@@ -9,28 +9,22 @@
 
 namespace KivArchive::Postgres {
 
-/// A row with its stored form. Rows never change; whether the server still has one is for the server to say.
-struct RecentRow {
-    Row row;
-    std::shared_ptr<const Bytes> stored;
-};
-
 /// Rows that were read or stored a short time ago, so that a series of small edits need not fetch what it has just stored.
 /// Any number of threads may use it.
 class RecentRows {
 public:
-    void Keep(Id const& id, RecentRow row);
+    void Keep(Id const& id, WholeRow row);
     /// Gives @p forms the rows of @p ids with all that they are differences to.
     /// @return false, giving some of them, if one is not here
     [[nodiscard]] bool GiveAll(std::span<const Id> ids, Forms& forms);
 
 private:
-    [[nodiscard]] RecentRow const* Find(Id const& id);
+    [[nodiscard]] WholeRow const* Find(Id const& id);
 
     std::mutex mutex_;
     /// What was used since the others were `current_`; they go when it is full.
-    std::unordered_map<Id, RecentRow> current_;
-    std::unordered_map<Id, RecentRow> before_;
+    std::unordered_map<Id, WholeRow> current_;
+    std::unordered_map<Id, WholeRow> before_;
     std::uint64_t size_ = 0;
 };
 

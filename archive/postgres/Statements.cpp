@@ -26,8 +26,8 @@ constexpr std::array<Template, statementCount> templates{{
     {Statement::ReadFormat, "SELECT CAST(max(version) AS bigint) FROM @.format"},
     {Statement::MakeSchema, "CREATE SCHEMA IF NOT EXISTS @"},
     {Statement::MakeAncestry,
-     "CREATE TABLE IF NOT EXISTS @.ancestry(id bytea PRIMARY KEY, parent bytea NOT NULL, tree bytea NOT "
-     "NULL)"},
+     "CREATE TABLE IF NOT EXISTS @.ancestry(id bytea PRIMARY KEY, parent bytea NOT NULL, tree bytea NOT NULL, "
+     "token bytea NOT NULL)"},
     {Statement::MakeAttempts, "CREATE TABLE IF NOT EXISTS @.attempts(token bytea PRIMARY KEY, time bigint NOT NULL)"},
     {Statement::MakeBranches, "CREATE TABLE IF NOT EXISTS @.branches(name bytea PRIMARY KEY, head bytea NOT NULL)"},
     {Statement::MakeContained, "CREATE TABLE IF NOT EXISTS @.contained(id bytea, how smallint, other bytea, "
@@ -36,7 +36,7 @@ constexpr std::array<Template, statementCount> templates{{
     {Statement::MakeMarks, "CREATE TABLE IF NOT EXISTS @.marks(id bytea PRIMARY KEY, time bigint NOT NULL)"},
     {Statement::MakeObjects, "CREATE TABLE IF NOT EXISTS @.objects(id bytea PRIMARY KEY, type smallint NOT NULL, "
                              "size bigint NOT NULL, base bytea NOT NULL, form bytea NOT NULL)"},
-    {Statement::MakeIndexOfBases, "CREATE INDEX IF NOT EXISTS objects_by_base ON @.objects(base)"},
+    {Statement::MakeIndexOfBases, "CREATE INDEX IF NOT EXISTS objects_by_base ON @.objects(base) WHERE base <> '\\x'"},
     {Statement::MakeRecords, "CREATE TABLE IF NOT EXISTS @.records(name bytea PRIMARY KEY, value bytea NOT NULL)"},
     {Statement::AddFormat, "INSERT INTO @.format(version) VALUES(1) ON CONFLICT DO NOTHING"},
     {Statement::FindObjects,
@@ -114,7 +114,8 @@ constexpr std::array<Template, statementCount> templates{{
      "SELECT 1 / CASE count(*) WHEN $2::bigint THEN 1 ELSE 0 END FROM (SELECT id FROM @.objects "
      "WHERE id = ANY($1::bytea[]) AND (type < 8 OR id = ANY($3::bytea[])) ORDER BY id FOR SHARE) AS used"},
     {Statement::AddAncestry,
-     "INSERT INTO @.ancestry(id, parent, tree) SELECT * FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) "
+     "INSERT INTO @.ancestry(id, parent, tree, token) "
+     "SELECT id, parent, tree, '\\x' FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) AS facts(id, parent, tree) "
      "ON CONFLICT DO NOTHING"},
     {Statement::AddContained,
      "INSERT INTO @.contained(id, how, other) SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bytea[]) "
@@ -125,6 +126,15 @@ constexpr std::array<Template, statementCount> templates{{
     {Statement::MoveBranch,
      "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
      "RETURNING name) SELECT 1 / count(*) FROM moved"},
+    // The branch is looked at first: who has lost the race stores nothing.
+    {Statement::MoveBranchToNew,
+     "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
+     "RETURNING name), brought AS (INSERT INTO @.objects(id, type, size, base, form) "
+     "SELECT * FROM unnest($4::bytea[], $5::smallint[], $6::bigint[], $7::bytea[], $8::bytea[])), "
+     "facts AS (INSERT INTO @.ancestry(id, parent, tree, token) "
+     "SELECT * FROM unnest($9::bytea[], $10::bytea[], $11::bytea[], $12::bytea[])) "
+     "SELECT 1 / count(*) FROM moved"},
+    {Statement::FindAttempt, "SELECT id FROM @.ancestry WHERE id = $1::bytea AND token = $2::bytea"},
     {Statement::MakeBranch, "INSERT INTO @.branches(name, head) VALUES($1::bytea, $2::bytea)"},
     {Statement::RemoveBranch,
      "WITH removed AS (DELETE FROM @.branches WHERE name = $1::bytea AND head = $2::bytea RETURNING name) "
@@ -147,12 +157,13 @@ constexpr std::array<Template, statementCount> templates{{
                             "AND time <= CAST(extract(epoch FROM now()) AS bigint) - $2::bigint"},
     {Statement::MarkForNow, "INSERT INTO @.marks(id, time) SELECT id, 0 FROM @.objects WHERE id = ANY($1::bytea[]) "
                             "ON CONFLICT(id) DO UPDATE SET time = 0"},
-    {Statement::FindBases, "SELECT DISTINCT base FROM @.objects WHERE base = ANY($1::bytea[])"},
+    {Statement::FindBases, "SELECT DISTINCT base FROM @.objects WHERE base = ANY($1::bytea[]) AND base <> '\\x'"},
     {Statement::KeepAsBases, "UPDATE @.objects SET type = type + 8 WHERE id = ANY($1::bytea[]) AND type < 8"},
     {Statement::RemoveRows, "DELETE FROM @.objects WHERE id = ANY($1::bytea[])"},
     {Statement::FindUnusedBases,
      "SELECT m.id, CAST(octet_length(o.form) AS bigint) FROM @.marks m JOIN @.objects o ON o.id = m.id "
-     "WHERE o.type >= 8 AND NOT EXISTS (SELECT 1 FROM @.objects d WHERE d.base = m.id) LIMIT $1::bigint"},
+     "WHERE o.type >= 8 AND NOT EXISTS (SELECT 1 FROM @.objects d WHERE d.base = m.id AND d.base <> '\\x') "
+     "LIMIT $1::bigint"},
     {Statement::ListPieces, "SELECT id FROM @.objects WHERE type = 3 AND id > $1::bytea ORDER BY id LIMIT $2::bigint"},
     {Statement::ReadPieceLists,
      "SELECT id, form FROM @.objects WHERE type = 4 AND id > $1::bytea ORDER BY id LIMIT $2::bigint"},

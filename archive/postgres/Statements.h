@@ -55,6 +55,8 @@ enum class Statement : std::uint8_t {
     DeleteMarks,
     CheckNoHead,
     MoveBranch,
+    MoveBranchToNew,
+    FindAttempt,
     MakeBranch,
     RemoveBranch,
     CheckRecord,

@@ -1,6 +1,7 @@
 #include "postgres/Store.h"
 
 #include <algorithm>
+#include <cstring>
 #include <random>
 #include <thread>
 
@@ -60,6 +61,12 @@ const char* SentenceOf(Failure kind) {
     }
 }
 
+/// What a store's tokens begin with, which no other store's do.
+std::uint64_t MakeBeginningOfTokens() {
+    std::random_device random;
+    return std::uniform_int_distribution<std::uint64_t>()(random);
+}
+
 } // namespace
 
 bool Attempts::WaitAfterLoss() {
@@ -84,9 +91,17 @@ bool Attempts::Wait(std::chrono::milliseconds atMost) {
 }
 
 Store::Store(std::string const& address, PostgresOptions const& options)
-    : address_(address), options_(options), schema_(Quoted(options.schema)) {
+    : address_(address), options_(options), schema_(Quoted(options.schema)), tokens_(MakeBeginningOfTokens()) {
     idle_.reserve(maximumIdle);
-    Run([this](Connection& connection) { EnsureSchema(connection, *this); });
+    if (!options.connectsLater)
+        Open();
+}
+
+void Store::Open() {
+    std::scoped_lock const lock(opening_);
+    if (!isFirstConnection_)
+        return;
+    RunOpened([this](Connection& connection) { EnsureSchema(connection, *this); });
     isFirstConnection_ = false;
 }
 
@@ -120,6 +135,13 @@ bool Store::IsConflict(Refused const& refused) noexcept {
     return refused.code.starts_with("40");
 }
 
+Token Store::MakeToken() noexcept {
+    std::array const words{tokens_, ++tokenCount_};
+    Token token{};
+    std::memcpy(token.data(), words.data(), token.size());
+    return token;
+}
+
 void Store::ThrowUnreachable(ConnectionLost const& lost) const {
     throw ArchiveError(Failure::Unavailable, Shown(),
                        "The database " + Shown() + " cannot be reached: " + lost.sentence + ".");
@@ -132,14 +154,6 @@ void Store::ThrowRefused(Refused const& refused) const {
 
 void Store::ThrowDamaged(std::string const& what) const {
     throw ArchiveError(Failure::Damaged, Shown(), what + " is damaged in " + Shown() + ".");
-}
-
-Token MakeToken() {
-    std::random_device random;
-    Token token{};
-    for (std::byte& byte : token)
-        byte = static_cast<std::byte>(random() & 0xFFU);
-    return token;
 }
 
 bool IsRepeated(Refused const& refused, std::size_t positionOfToken) noexcept {

@@ -48,22 +48,9 @@ public:
     /// transactions. So @p work may have been done before, if it changes something.
     template <class Work>
     auto Run(Work work) {
-        Attempts attempts(options_, isFirstConnection_);
-        for (;;) {
-            try {
-                Lease const connection(*this);
-                return work(*connection);
-            } catch (ConnectionLost const& lost) {
-                DropConnections();
-                if (!attempts.WaitAfterLoss())
-                    ThrowUnreachable(lost);
-            } catch (Refused const& refused) {
-                if (!IsConflict(refused) || !attempts.WaitAfterConflict())
-                    ThrowRefused(refused);
-            } catch (Malformed const&) {
-                ThrowDamaged("Something");
-            }
-        }
+        if (isFirstConnection_)
+            Open();
+        return RunOpened(work);
     }
 
     /// Stores @p items with the rest of @p change, which has no objects of its own.
@@ -73,6 +60,8 @@ public:
     [[nodiscard]] PostgresOptions const& Options() const noexcept { return options_; }
     [[nodiscard]] std::uint64_t RoundTrips() const noexcept { return roundTrips_; }
     [[nodiscard]] std::string const& Schema() const noexcept { return schema_; }
+    /// Another one each time, here and anywhere.
+    [[nodiscard]] Token MakeToken() noexcept;
 
     [[noreturn]] void ThrowDamaged(std::string const& what) const;
     [[noreturn]] void ThrowRefused(Refused const& refused) const;
@@ -93,6 +82,28 @@ private:
         std::unique_ptr<Connection> connection_;
     };
 
+    template <class Work>
+    auto RunOpened(Work work) {
+        Attempts attempts(options_, isFirstConnection_);
+        for (;;) {
+            try {
+                Lease const connection(*this);
+                return work(*connection);
+            } catch (ConnectionLost const& lost) {
+                DropConnections();
+                if (!attempts.WaitAfterLoss())
+                    ThrowUnreachable(lost);
+            } catch (Refused const& refused) {
+                if (!IsConflict(refused) || !attempts.WaitAfterConflict())
+                    ThrowRefused(refused);
+            } catch (Malformed const&) {
+                ThrowDamaged("Something");
+            }
+        }
+    }
+
+    /// Makes sure of the tables.
+    void Open();
     [[nodiscard]] std::unique_ptr<Connection> Take();
     void GiveBack(std::unique_ptr<Connection> connection) noexcept;
     void DropConnections() noexcept;
@@ -103,7 +114,11 @@ private:
     PostgresOptions options_;
     std::string schema_;
     std::atomic<std::uint64_t> roundTrips_{0};
-    bool isFirstConnection_ = true;
+    std::uint64_t tokens_;
+    std::atomic<std::uint64_t> tokenCount_{0};
+    /// Until the tables have been looked at.
+    std::atomic<bool> isFirstConnection_{true};
+    std::mutex opening_;
     std::mutex mutex_;
     std::vector<std::unique_ptr<Connection>> idle_;
     RecentRows recent_;
@@ -111,8 +126,6 @@ private:
 
 /// Makes the tables if there are none and that is wanted, and makes sure that they are ours.
 void EnsureSchema(Connection& connection, Store const& store);
-
-[[nodiscard]] Token MakeToken();
 
 /// Whether a refused transaction had been committed by an earlier attempt: its token is there.
 [[nodiscard]] bool IsRepeated(Refused const& refused, std::size_t positionOfToken) noexcept;

@@ -11,6 +11,8 @@ namespace {
 
 /// How much one statement brings.
 constexpr std::size_t statementSize = 8 * largestWholeContent;
+/// A branch is held while a change of one statement is stored.
+constexpr std::size_t mostItemsOfShort = 64;
 
 bool IsBefore(Id const& left, Id const& right) {
     return DigestOf(left) < DigestOf(right);
@@ -25,22 +27,97 @@ void SortUnique(std::vector<Id>& ids) {
     ids.erase(std::unique(ids.begin(), ids.end()), ids.end());
 }
 
+/// The bytes that stand for an identifier; none for null.
+ByteView BytesOfId(Id const& id) {
+    return id.IsEmpty() ? ByteView() : std::as_bytes(std::span(DigestOf(id)));
+}
+
+/// Items as the columns of rows.
+struct ObjectColumns {
+    std::vector<ByteView> ids;
+    std::vector<std::int16_t> types;
+    std::vector<std::int64_t> sizes;
+    std::vector<ByteView> bases;
+    std::vector<ByteView> forms;
+    std::size_t size = 0;
+
+    void Add(Prepared const& one) {
+        ids.push_back(BytesOfId(one.item->id));
+        types.push_back(static_cast<std::int16_t>(one.item->type));
+        sizes.push_back(static_cast<std::int64_t>(one.item->size));
+        bases.push_back(BytesOfId(one.base));
+        forms.emplace_back(one.stored);
+        size += one.stored.size();
+    }
+    void AddTo(Parameters& parameters) const { parameters.With(ids).With(types).With(sizes).With(bases).With(forms); }
+};
+
+/// The facts of a change likewise.
+struct FactColumns {
+    explicit FactColumns(Change const& change) {
+        for (Ancestry const& facts : change.ancestry) {
+            commits.push_back(BytesOfId(facts.commit));
+            parents.push_back(BytesOfId(facts.parent));
+            trees.push_back(BytesOfId(facts.tree));
+            for (ContainedCommit const& other : facts.contains) {
+                containing.push_back(BytesOfId(facts.commit));
+                hows.push_back(static_cast<std::int16_t>(other.how));
+                contained.push_back(BytesOfId(other.id));
+            }
+        }
+    }
+
+    std::vector<ByteView> commits;
+    std::vector<ByteView> parents;
+    std::vector<ByteView> trees;
+    std::vector<ByteView> containing;
+    std::vector<std::int16_t> hows;
+    std::vector<ByteView> contained;
+};
+
+/// What a change uses without storing it anew, which must not be removed before the end of the transaction.
+struct Uses {
+    Uses(Preparation const& preparation, Change const& change) : used(change.relied) {
+        for (BranchMove const& move : change.branches)
+            if (!move.head.IsEmpty())
+                used.push_back(move.head);
+        used.insert(used.end(), preparation.Present().begin(), preparation.Present().end());
+        std::vector<Id> items;
+        for (Prepared const& one : preparation.Items())
+            items.push_back(one.item->id);
+        if (preparation.AreNew()) {
+            SortUnique(items);
+            std::erase_if(used, [&items](Id const& id) { return Contains(items, id); });
+        } else {
+            // Others may have stored some, or somebody may have removed them.
+            used.insert(used.end(), items.begin(), items.end());
+        }
+        SortUnique(used);
+        bases = preparation.Bases({change.inherited.begin(), change.inherited.end()});
+        held = used;
+        held.insert(held.end(), bases.begin(), bases.end());
+        SortUnique(held);
+        // Bases need not be objects, but for those that are used as well.
+        std::erase_if(bases, [this](Id const& id) { return Contains(used, id); });
+    }
+
+    std::vector<Id> used;
+    /// Used as bases only.
+    std::vector<Id> bases;
+    std::vector<Id> held;
+};
+
 /// The transaction that stores a change, in one round trip.
 class Storing {
 public:
-    Storing(Connection& connection, Preparation const& preparation, Change const& change, Token const& token)
-        : trip_(connection), preparation_(preparation), change_(change) {
-        trip_.Add(Statement::Begin);
-        if (NeedsToken()) {
-            tokenPosition_ = trip_.Add(Statement::RememberAttempt, Parameters().With(ByteView(token)));
-            hasToken_ = true;
-        }
-        AddObjects();
-        CheckObjects();
-        AddAncestry();
-        ChangeRecords();
-        MoveBranches();
-        trip_.Add(Statement::Commit);
+    /// @param mayBeShort whether new objects on top of a branch may be taken for what nobody else knows
+    Storing(Connection& connection, Preparation const& preparation, Change const& change, Token const& token,
+            bool mayBeShort)
+        : trip_(connection), preparation_(preparation), change_(change), uses_(preparation, change), facts_(change) {
+        if (mayBeShort && IsShort())
+            StoreInOneStatement(token);
+        else
+            StoreInOrder(token);
     }
 
     /// @return whether it has been committed; if not, something is not as expected
@@ -59,89 +136,84 @@ public:
         }
     }
 
-    /// What is used without being stored anew.
-    [[nodiscard]] std::vector<Id> const& Used() const noexcept { return used_; }
-
 private:
+    /// Whether it is a little that is new, on top of one branch, and uses nothing but what that branch keeps.
+    [[nodiscard]] bool IsShort() const {
+        if (change_.branches.size() != 1 || !change_.records.empty() || !uses_.held.empty() || !preparation_.AreNew() ||
+            !facts_.contained.empty() || preparation_.Items().size() > mostItemsOfShort)
+            return false;
+        BranchMove const& move = change_.branches.front();
+        std::unordered_set<Id> commits;
+        bool const areDistinct =
+            std::all_of(change_.ancestry.begin(), change_.ancestry.end(),
+                        [&commits](Ancestry const& facts) { return commits.insert(facts.commit).second; });
+        return !move.expected.IsEmpty() && areDistinct && commits.count(move.head) != 0;
+    }
+
+    void StoreInOneStatement(Token const& token) {
+        BranchMove const& move = change_.branches.front();
+        ObjectColumns columns;
+        for (Prepared const& one : preparation_.Items())
+            columns.Add(one);
+        // Who comes again finds it with the new head's facts, which are stored by nobody else.
+        std::vector<ByteView> tokens;
+        for (Ancestry const& facts : change_.ancestry)
+            tokens.push_back(facts.commit == move.head ? ByteView(token) : ByteView());
+        Parameters parameters;
+        parameters.With(BytesOfName(move.name)).With(move.expected).With(move.head);
+        columns.AddTo(parameters);
+        parameters.With(facts_.commits).With(facts_.parents).With(facts_.trees).With(tokens);
+        trip_.Add(Statement::MoveBranchToNew, parameters);
+    }
+
+    void StoreInOrder(Token const& token) {
+        trip_.Add(Statement::Begin);
+        if (NeedsToken()) {
+            tokenPosition_ = trip_.Add(Statement::RememberAttempt, Parameters().With(ByteView(token)));
+            hasToken_ = true;
+        }
+        AddObjects();
+        CheckObjects();
+        AddAncestry();
+        ChangeRecords();
+        MoveBranches();
+        trip_.Add(Statement::Commit);
+    }
+
     /// What only adds can be done twice.
     [[nodiscard]] bool NeedsToken() const noexcept { return !change_.branches.empty() || !change_.records.empty(); }
 
     void AddObjects() {
         std::vector<Prepared> const& items = preparation_.Items();
         for (std::size_t next = 0; next < items.size();) {
-            std::vector<Id> ids;
-            std::vector<std::int16_t> types;
-            std::vector<std::int64_t> sizes;
-            std::vector<Id> bases;
-            std::vector<ByteView> forms;
-            for (std::size_t size = 0; next < items.size() && size < statementSize; ++next) {
-                Prepared const& one = items[next];
-                ids.push_back(one.item->id);
-                types.push_back(static_cast<std::int16_t>(one.item->type));
-                sizes.push_back(static_cast<std::int64_t>(one.item->size));
-                bases.push_back(one.base);
-                forms.emplace_back(one.stored);
-                size += one.stored.size();
-            }
-            trip_.Add(preparation_.AreNew() ? Statement::AddNewObjects : Statement::AddObjects,
-                      Parameters().With(ids).With(types).With(sizes).With(bases).With(forms));
+            ObjectColumns columns;
+            for (; next < items.size() && columns.size < statementSize; ++next)
+                columns.Add(items[next]);
+            Parameters parameters;
+            columns.AddTo(parameters);
+            trip_.Add(preparation_.AreNew() ? Statement::AddNewObjects : Statement::AddObjects, parameters);
         }
     }
 
     /// Holds what is used and what is a base until the end of the transaction, so that nobody removes it. Marks are
     /// looked at behind that.
     void CheckObjects() {
-        used_ = change_.relied;
-        for (BranchMove const& move : change_.branches)
-            if (!move.head.IsEmpty())
-                used_.push_back(move.head);
-        used_.insert(used_.end(), preparation_.Present().begin(), preparation_.Present().end());
-        std::vector<Id> items;
-        for (Prepared const& one : preparation_.Items())
-            items.push_back(one.item->id);
-        if (preparation_.AreNew()) {
-            SortUnique(items);
-            std::erase_if(used_, [&items](Id const& id) { return Contains(items, id); });
-        } else {
-            // Others may have stored some, or somebody may have removed them.
-            used_.insert(used_.end(), items.begin(), items.end());
-        }
-        SortUnique(used_);
         if (!preparation_.Removed().empty())
             trip_.Add(Statement::BringBack, Parameters().With(preparation_.Removed()));
-        std::vector<Id> bases = preparation_.Bases();
-        std::vector<Id> held = used_;
-        held.insert(held.end(), bases.begin(), bases.end());
-        SortUnique(held);
-        // Bases need not be objects, but for those that are used as well.
-        std::erase_if(bases, [this](Id const& id) { return Contains(used_, id); });
-        if (!held.empty())
-            trip_.Add(Statement::CheckUsed, Parameters().With(held).With(std::uint64_t{held.size()}).With(bases));
-        if (!used_.empty())
-            trip_.Add(Statement::DeleteMarks, Parameters().With(used_));
+        if (!uses_.held.empty())
+            trip_.Add(Statement::CheckUsed,
+                      Parameters().With(uses_.held).With(std::uint64_t{uses_.held.size()}).With(uses_.bases));
+        if (!uses_.used.empty())
+            trip_.Add(Statement::DeleteMarks, Parameters().With(uses_.used));
     }
 
     void AddAncestry() {
-        std::vector<Id> commits;
-        std::vector<Id> parents;
-        std::vector<Id> trees;
-        std::vector<Id> containing;
-        std::vector<std::int16_t> hows;
-        std::vector<Id> contained;
-        for (Ancestry const& facts : change_.ancestry) {
-            commits.push_back(facts.commit);
-            parents.push_back(facts.parent);
-            trees.push_back(facts.tree);
-            for (ContainedCommit const& other : facts.contains) {
-                containing.push_back(facts.commit);
-                hows.push_back(static_cast<std::int16_t>(other.how));
-                contained.push_back(other.id);
-            }
-        }
-        if (!commits.empty())
-            trip_.Add(Statement::AddAncestry, Parameters().With(commits).With(parents).With(trees));
-        if (!contained.empty())
-            trip_.Add(Statement::AddContained, Parameters().With(containing).With(hows).With(contained));
+        if (!facts_.commits.empty())
+            trip_.Add(Statement::AddAncestry,
+                      Parameters().With(facts_.commits).With(facts_.parents).With(facts_.trees));
+        if (!facts_.contained.empty())
+            trip_.Add(Statement::AddContained,
+                      Parameters().With(facts_.containing).With(facts_.hows).With(facts_.contained));
     }
 
     void ChangeRecords() {
@@ -183,9 +255,10 @@ private:
     RoundTrip trip_;
     Preparation const& preparation_;
     Change const& change_;
+    Uses uses_;
+    FactColumns facts_;
     bool hasToken_ = false;
     std::size_t tokenPosition_ = 0;
-    std::vector<Id> used_;
 };
 
 /// Compares branches and records with what @p change expects.
@@ -209,11 +282,18 @@ ChangeOutcome Compare(Change const& change, Rows const& branches, Rows const& re
     return outcome;
 }
 
-/// Why a change could not be stored: an outcome that is not applied if a race is lost.
+struct FoundReason {
+    /// An earlier attempt has stored it, whose answer was lost.
+    bool isStored = false;
+    ChangeOutcome outcome;
+};
+
+/// Why a change could not be stored: an outcome that is not applied if a race is lost; one that is if there is no reason.
 /// @param needed what it relies on without bringing it
-/// @throws ArchiveError of kind `Collected` if some of that is not there
-ChangeOutcome FindReason(Connection& connection, Change const& change, std::vector<Id> const& needed,
-                         std::string const& shown) {
+/// @param token what it has left behind if it is there already
+/// @throws ArchiveError of kind `Collected` if some of what it needs is not there
+FoundReason FindReason(Connection& connection, Change const& change, std::vector<Id> const& needed, Token const& token,
+                       std::string const& shown) {
     std::vector<Bytes> branches;
     for (BranchMove const& move : change.branches)
         branches.push_back(BytesOfName(move.name));
@@ -224,11 +304,15 @@ ChangeOutcome FindReason(Connection& connection, Change const& change, std::vect
     trip.Add(Statement::ReadHeads, Parameters().With(branches));
     trip.Add(Statement::ReadRecords, Parameters().With(records));
     trip.Add(Statement::FindRows, Parameters().With(needed));
+    if (!change.branches.empty())
+        trip.Add(Statement::FindAttempt, Parameters().With(change.branches.front().head).With(ByteView(token)));
     auto const answers = trip.Run();
 
+    if (!change.branches.empty() && answers[3].Count() != 0)
+        return {true, {true, {}, {}}};
     ChangeOutcome outcome = Compare(change, answers[0], answers[1]);
     if (!outcome.applied)
-        return outcome;
+        return {false, std::move(outcome)};
     std::unordered_set<Id> present;
     for (int i = 0; i < answers[2].Count(); ++i)
         if (!RowOf(answers[2].Number(i, 1)).isRemoved)
@@ -236,7 +320,7 @@ ChangeOutcome FindReason(Connection& connection, Change const& change, std::vect
     for (Id const& id : needed)
         if (present.count(id) == 0)
             ThrowCollected(id, shown);
-    return outcome;
+    return {false, std::move(outcome)};
 }
 
 /// What @p change relies on without bringing it.
@@ -261,14 +345,14 @@ ChangeOutcome Store::Apply(std::vector<Item> const& items, Change const& change)
     Attempts attempts(options_, false);
     for (;;) {
         auto const outcome = Run([&](Connection& connection) -> std::optional<ChangeOutcome> {
-            Preparation const preparation(items, connection, recent_, options_.workers, looksForPresent);
-            if (Storing(connection, preparation, change, token).Run()) {
+            Preparation preparation(items, connection, recent_, options_.workers, looksForPresent);
+            if (Storing(connection, preparation, change, token, !looksForPresent).Run()) {
                 preparation.KeepStored();
                 return ChangeOutcome{true, {}, {}};
             }
-            ChangeOutcome reason = FindReason(connection, change, needed, Shown());
-            if (!reason.applied)
-                return reason;
+            FoundReason reason = FindReason(connection, change, needed, token, Shown());
+            if (reason.isStored || !reason.outcome.applied)
+                return std::move(reason.outcome);
             // Others have stored or removed the same meanwhile.
             return std::nullopt;
         });

@@ -163,7 +163,7 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
     if (pending.moves.empty() && records.empty() && !state.facts.HasFactsOfPublished(isUnpublished))
         return {true, {}, {}};
     auto const commits = MissingCommits(*state.storage, state.facts, state.Archive(), asksForAll).Find(pending.heads);
-    Publishing publishing(state.Archive(), *state.storage, state.facts, asksForAll, progress);
+    Publishing publishing(state.Archive(), *state.storage, state.facts, pending.moves, asksForAll, progress);
     publishing.Store(commits);
     // Everything that could fail comes before the branches move.
     std::vector<Id> published;
@@ -171,7 +171,7 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
         published.push_back(commit->GetId());
     for (BranchMove const& move : pending.moves)
         state.branches.try_emplace(move.name);
-    ChangeOutcome outcome = publishing.Finish(pending.moves, records);
+    ChangeOutcome outcome = publishing.Finish(records);
     if (!outcome.applied)
         return {false, std::move(outcome.movedBranches), std::move(outcome.changedRecords)};
     state.storage->SetPublished(published);

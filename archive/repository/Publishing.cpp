@@ -18,6 +18,14 @@ constexpr const char* notItself = "is not what its identifier says";
 
 } // namespace
 
+Publishing::Publishing(IArchive& archive, KivVcs::IObjectsStorage const& storage, LocalFacts const& facts,
+                       std::vector<BranchMove> const& moves, bool asksForAll, IProgress* progress)
+    : archive_(archive), storage_(storage), facts_(facts), moves_(moves), asksForAll_(asksForAll), progress_(progress) {
+    for (BranchMove const& move : moves)
+        if (!move.expected.IsEmpty())
+            expected_.insert(move.expected);
+}
+
 void Publishing::Store(std::vector<cow_ptr<Commit>> const& commits) {
     for (std::size_t begin = 0; begin < commits.size(); begin += commitsTogether)
         StoreTogether({commits.data() + begin, std::min(commitsTogether, commits.size() - begin)});
@@ -41,11 +49,22 @@ void Publishing::StoreTogether(std::span<cow_ptr<Commit> const> commits) {
         return facts_.Find(commit->GetId()) != nullptr;
     });
     trees.Find(areNew);
+    isOnExpected_ = isOnExpected_ && AreOnExpectedHeads(commits);
     for (auto const& commit : commits) {
         if (cow_ptr<Tree> const root = HeldRootOf(*commit); root && trees.IsMissing(root->GetId()))
             StoreTree(trees, trees.NumberOf(root->GetId()));
         StoreCommit(*commit);
     }
+}
+
+/// Whether each of them is on top of an expected head, or of another one that comes before it or is in this change.
+bool Publishing::AreOnExpectedHeads(std::span<cow_ptr<Commit> const> commits) const {
+    std::unordered_set<Id> met;
+    return std::all_of(commits.begin(), commits.end(), [&](cow_ptr<Commit> const& commit) {
+        Id const parent = commit->GetParentId();
+        met.insert(commit->GetId());
+        return expected_.contains(parent) || met.contains(parent) || inChange_.contains(parent);
+    });
 }
 
 void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
@@ -111,8 +130,11 @@ bool Publishing::StoreDirectory(NewDirectory const& directory) {
                                               : directory.tree->GetLocalSubtreePaths())
         if (cow_ptr<Tree> const subtree = directory.tree->GetLocalTree(name))
             RelyOn(subtree->GetId());
+    for (NewDirectory::File const& file : directory.files)
+        if (isOnExpected_ && !file.earlier.IsEmpty())
+            earlierFiles_.push_back(file.earlier);
     if (directory.earlier)
-        RelyOn(directory.earlier->GetId());
+        RelyOnEarlier(directory.earlier->GetId());
     Add({directory.id, ObjectType::Tree, data, directory.earlier ? directory.earlier->GetId() : Id()});
     return true;
 }
@@ -140,7 +162,14 @@ void Publishing::StoreCommit(Commit const& commit) {
 
 void Publishing::RelyOn(Id const& id) {
     if (!inChange_.contains(id) && relied_.insert(id).second)
-        change_.relied.push_back(id);
+        (expected_.contains(id) ? change_.inherited : change_.relied).push_back(id);
+}
+
+void Publishing::RelyOnEarlier(Id const& id) {
+    if (!isOnExpected_)
+        RelyOn(id);
+    else if (!inChange_.contains(id) && relied_.insert(id).second)
+        change_.inherited.push_back(id);
 }
 
 void Publishing::Add(NewObject object) {
@@ -155,18 +184,24 @@ void Publishing::Add(NewObject object) {
 
 void Publishing::Flush() {
     ReportProgress(progress_, {"publishing", storedCount_, 0}, {});
+    // No branch is moved yet, so that none keeps anything.
+    change_.relied.insert(change_.relied.end(), change_.inherited.begin(), change_.inherited.end());
+    change_.inherited.clear();
     archive_.Apply(change_);
     change_ = {};
+    isOnExpected_ = false;
+    earlierFiles_.clear();
     size_ = 0;
     inChange_.clear();
     relied_.clear();
 }
 
-ChangeOutcome Publishing::Finish(std::vector<BranchMove> moves, std::vector<RecordChange> const& records) {
+ChangeOutcome Publishing::Finish(std::vector<RecordChange> const& records) {
     ReportProgress(progress_, {"publishing", storedCount_, storedCount_}, {});
     for (Ancestry& facts : facts_.All())
         change_.ancestry.push_back(std::move(facts));
-    change_.branches = std::move(moves);
+    change_.branches = moves_;
+    change_.inherited.insert(change_.inherited.end(), earlierFiles_.begin(), earlierFiles_.end());
     change_.records = records;
     return archive_.Apply(change_);
 }

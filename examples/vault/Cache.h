@@ -12,4 +12,10 @@ namespace vault {
 /// A name for what is kept there of @p subject, which the name does not show.
 [[nodiscard]] std::string CacheName(std::string const& subject);
 
+/// What the user has noted about @p subject on this machine, at most 4 KiB, which stays when caches are emptied; nothing
+/// if there is nothing.
+[[nodiscard]] std::optional<std::string> ReadNote(std::string const& subject);
+/// Replaces it. @throws Problem if there is no place for it
+void WriteNote(std::string const& subject, std::string const& note);
+
 } // namespace vault

@@ -1,6 +1,7 @@
 #include "Database.h"
 
 #include "Cache.h"
+#include "Output.h"
 
 #include <KivArchive/CachingArchive.h>
 #include <KivArchive/PostgresArchive.h>
@@ -24,19 +25,40 @@ std::shared_ptr<KivArchive::IArchive> OpenCache(std::string const& address) {
     }
 }
 
+/// The database behind the cache, which in the end says if it has been away.
+std::shared_ptr<KivArchive::IArchive> OpenCached(std::shared_ptr<KivArchive::IArchive> cache,
+                                                 std::shared_ptr<KivArchive::IArchive> database,
+                                                 KivArchive::CachingOptions const& options) {
+    const auto cached = std::make_shared<KivArchive::CachingArchive>(std::move(cache), std::move(database), options);
+    return {cached.get(), [cached](KivArchive::IArchive* /*same*/) {
+                if (cached->IsAway())
+                    Warn("the database is away; this is what was seen of it before");
+            }};
+}
+
 } // namespace
 
 void RequireDatabases(char** /*arguments*/) {}
 
-Database OpenDatabase(std::string const& address, bool create, std::chrono::milliseconds wait) {
+Database OpenDatabase(std::string const& address, Vault::Access access, std::chrono::milliseconds wait) {
     KivArchive::PostgresOptions options;
-    options.create = create;
+    options.create = access == Vault::Access::Create;
     options.wait = wait;
-    Database database{std::make_shared<KivArchive::PostgresArchive>(address, options), nullptr};
     auto cache = OpenCache(address);
-    database.cached = cache == nullptr
-                          ? database.stored
-                          : std::make_shared<KivArchive::CachingArchive>(std::move(cache), database.stored);
+    Database database;
+    KivArchive::CachingOptions caching;
+    try {
+        database.stored = std::make_shared<KivArchive::PostgresArchive>(address, options);
+    } catch (KivArchive::ArchiveError const& error) {
+        const bool wasSeen = cache != nullptr && !cache->ListRecords().empty();
+        if (access != Vault::Access::Read || !wasSeen || error.GetKind() != KivArchive::Failure::Unavailable)
+            throw;
+        options.connectsLater = true;
+        database.stored = std::make_shared<KivArchive::PostgresArchive>(address, options);
+        // For as long as a command takes.
+        caching.pause = std::chrono::hours(1);
+    }
+    database.cached = cache == nullptr ? database.stored : OpenCached(std::move(cache), database.stored, caching);
     return database;
 }
 

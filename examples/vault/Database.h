@@ -1,5 +1,7 @@
 #pragma once
 
+#include "Vault.h"
+
 #include <KivArchive/IArchive.h>
 #include <chrono>
 #include <memory>
@@ -24,8 +26,9 @@ struct Database {
 /// @throws Problem if there is none
 void RequireDatabases(char** arguments);
 
-/// @param create whether to make an archive there if there is none
+/// @param access `Create` makes an archive there if there is none; `Read` goes on with the cache while the database cannot
+/// be reached, and says so in the end
 /// @throws Problem if this program was built without databases, KivArchive::ArchiveError
-[[nodiscard]] Database OpenDatabase(std::string const& address, bool create, std::chrono::milliseconds wait);
+[[nodiscard]] Database OpenDatabase(std::string const& address, Vault::Access access, std::chrono::milliseconds wait);
 
 } // namespace vault

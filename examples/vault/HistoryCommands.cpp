@@ -165,9 +165,7 @@ int DeleteBranch(VaultPlace const& place, std::string const& name) {
 int Checkout(VaultPlace const& place, std::string const& name) {
     Vault vault(place, Vault::Access::Write);
     static_cast<void>(vault.RequireBranch(name));
-    KivArchive::Change change;
-    change.records.push_back(Vault::MakeCurrent(RequireUtf8(name, "a branch name")));
-    vault.Archive().Apply(change);
+    vault.Checkout(RequireUtf8(name, "a branch name"));
     return 0;
 }
 

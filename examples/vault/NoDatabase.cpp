@@ -12,7 +12,7 @@ constexpr std::string_view notThere = "this vault was built without databases";
 
 } // namespace
 
-Database OpenDatabase(std::string const& /*address*/, bool /*create*/, std::chrono::milliseconds /*wait*/) {
+Database OpenDatabase(std::string const& /*address*/, Vault::Access /*access*/, std::chrono::milliseconds /*wait*/) {
     throw Problem(std::string(notThere));
 }
 

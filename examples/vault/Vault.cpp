@@ -1,5 +1,6 @@
 #include "Vault.h"
 
+#include "Cache.h"
 #include "Database.h"
 #include "Descriptor.h"
 #include "Names.h"
@@ -56,7 +57,7 @@ void TellWhoWrites(std::string const& file, std::chrono::seconds wait) {
 Vault::Vault(VaultPlace const& place, Access access)
     : file_(IsDatabase(place.file) ? place.file : RealPath(place.file)) {
     if (IsDatabase(file_)) {
-        auto database = OpenDatabase(file_, access == Access::Create, place.wait);
+        auto database = OpenDatabase(file_, access, place.wait);
         archive_ = std::move(database.cached);
         stored_ = std::move(database.stored);
         return;
@@ -95,6 +96,10 @@ Vault::~Vault() {
 }
 
 Text Vault::CurrentBranch() const {
+    if (IsDatabase(file_)) {
+        const auto note = ReadNote(file_);
+        return note ? RequireUtf8(*note, "the current branch") : Text(firstBranch);
+    }
     const auto records = archive_->ReadRecords(std::span(&currentBranchRecord, 1));
     if (records.empty() || !records.front().value)
         return firstBranch;
@@ -103,6 +108,16 @@ Text Vault::CurrentBranch() const {
 
 KivArchive::RecordChange Vault::MakeCurrent(Text const& name) {
     return {{currentBranchRecord, BufferOf(ToUtf8(name))}, false, {}};
+}
+
+void Vault::Checkout(Text const& name) {
+    if (IsDatabase(file_)) {
+        WriteNote(file_, ToUtf8(name));
+        return;
+    }
+    KivArchive::Change change;
+    change.records.push_back(MakeCurrent(name));
+    archive_->Apply(change);
 }
 
 Id Vault::HeadOf(Text const& branch) const {

@@ -49,8 +49,10 @@ public:
     [[nodiscard]] std::shared_ptr<IArchive> SharedArchive() const noexcept { return archive_; }
 
     [[nodiscard]] Text CurrentBranch() const;
-    /// What makes @p name the current branch.
+    /// What makes @p name the current branch of a file.
     [[nodiscard]] static KivArchive::RecordChange MakeCurrent(Text const& name);
+    /// Makes @p name the current branch; in a database, which is others' too, for this user on this machine only.
+    void Checkout(Text const& name);
     /// The head of a branch; null if there is none.
     [[nodiscard]] Id HeadOf(Text const& branch) const;
     /// @throws Problem if there is no such branch

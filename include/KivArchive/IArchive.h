@@ -148,6 +148,9 @@ struct Change {
     std::vector<Ancestry> ancestry;
     std::vector<BranchMove> branches;
     std::vector<RecordChange> records;
+    /// Earlier versions and what would be relied on, if they are reached from a head that `branches` expects or from what
+    /// is relied on: these keep them, so that an archive need not look at them.
+    std::vector<Id> inherited = {};
 };
 
 /// How a transaction ended.

@@ -17,6 +17,9 @@ class Store;
 struct PostgresOptions {
     /// Whether to make the tables if there are none, which takes a role that may.
     bool create = true;
+    /// Whether the first call connects in the constructor's place, and throws what that would have thrown: for hosts that go
+    /// on with a cache while the server is away.
+    bool connectsLater = false;
     /// The schema that holds the tables; each holds one archive.
     std::string schema = "kivarchive";
     /// How long to wait for the server's next answer, and to try again where transactions get into each other's way.
@@ -47,7 +50,7 @@ public:
     /// encrypted. No sentence of a failure shows the password
     /// @throws ArchiveError of kind `Foreign` or `NewerFormat` if there is something else in the schema, of kind
     /// `Unavailable` if the server cannot be reached, or if there is no archive and none is to be made; of kind
-    /// `ReadOnly` if the role may not make one
+    /// `ReadOnly` if the role may not make one. None of that while `PostgresOptions::connectsLater`
     explicit PostgresArchive(std::string const& address, PostgresOptions const& options = {});
     PostgresArchive(PostgresArchive const&) = delete;
     PostgresArchive& operator=(PostgresArchive const&) = delete;

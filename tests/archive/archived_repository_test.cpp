@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <thread>
+#include <unordered_set>
 
 /// Versions of repositories over archives: published, fetched again, and brought together.
 
@@ -47,10 +48,16 @@ TEST(ArchivedRepository, PublishesOnlyWhatIsNew) {
     archive->stored = archive->relied = archive->calls = 0;
     ArchivedRepository other(archive);
     CommitFiles(other, "d3/f13=new", "one edit");
+    auto const before = other.GetHead()->GetParent();
+    auto const root = before->GetCommitTree()->GetRoot();
+    std::unordered_set<Id> const kept{before->GetId(), root->GetId(), root->GetLocalTree(u"d3")->GetId(),
+                                      root->GetDeepBlob(u"d3/f13")->GetId()};
     std::size_t const callsBefore = archive->calls;
     EXPECT_TRUE(other.Publish().published);
     EXPECT_EQ(archive->stored, 4U);
-    EXPECT_LE(archive->relied, 4U);
+    EXPECT_EQ(archive->relied, 0U);
+    EXPECT_EQ(std::unordered_set<Id>(archive->inherited.begin(), archive->inherited.end()), kept)
+        << "what the branch keeps";
     EXPECT_EQ(archive->calls - callsBefore, 1U);
     EXPECT_EQ(ProblemsOf(*archive), "");
 }

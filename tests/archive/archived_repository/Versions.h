@@ -38,6 +38,7 @@ public:
     ChangeOutcome Apply(Change const& change) override {
         stored += change.objects.size();
         relied += change.relied.size();
+        inherited = change.inherited;
         return ForwardingArchive::Apply(change);
     }
 
@@ -45,6 +46,7 @@ public:
     std::size_t contents = 0;
     std::size_t stored = 0;
     std::size_t relied = 0;
+    std::vector<Id> inherited;
 
 protected:
     IArchive& Reach() override { return ++calls, far_; }

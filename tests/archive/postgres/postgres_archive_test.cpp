@@ -60,7 +60,7 @@ TEST(PostgresArchive, TakesFewRoundTrips) {
             CommitFile(repository, "d1/sub/f1", std::to_string(i));
             trips();
             EXPECT_TRUE(repository.Publish().published);
-            EXPECT_LE(trips(), 6U) << "one edit";
+            EXPECT_LE(trips(), i == 0 ? 6U : 1U) << "one edit";
         }
     }
     trips();
@@ -88,6 +88,20 @@ TEST(PostgresArchive, LooksUpChangesWhoseAnswersAreLost) {
         EXPECT_TRUE(host.Publish()) << "the race was not lost to oneself";
     }
     EXPECT_EQ(archive.ReadAncestry({&host.Head(), 1}, Follow::Parents, 9).size(), 4U);
+    // So are small edits, each of which is one statement.
+    ArchivedRepository repository(std::shared_ptr<IArchive>(&archive, [](IArchive*) {}));
+    for (int i = 0; i < 4; ++i) {
+        CommitFile(repository, "file", std::to_string(i));
+        if (i > 0)
+            proxy.LoseNextAnswer();
+        std::uint64_t const before = archive.GetRoundTrips();
+        EXPECT_TRUE(repository.Publish().published);
+        EXPECT_LE(archive.GetRoundTrips() - before, 4U) << "sent, sent again, looked up";
+    }
+    EXPECT_EQ(archive.ReadAncestry({&host.Head(), 1}, Follow::Parents, 9).size(), 4U);
+    Id const head = repository.GetHead()->GetId();
+    EXPECT_EQ(archive.ReadAncestry({&head, 1}, Follow::Parents, 9).size(), 8U);
+    EXPECT_EQ(HeadOf(archive), head);
     NewObject const blob = Object(ObjectType::Blob, "to be removed");
     Change change;
     change.objects = {blob};
