@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <map>
 #include <random>
 #include <set>
 
@@ -89,6 +90,77 @@ TEST(HostRepositories, FindTheirTablesAsTheyWereAfterAddingWhatIsThere) {
         storage.AddBlob(immu::make<Blob>(blob));
         ASSERT_TRUE(order() == before && storage.GetBlobs().bucket_count() == buckets) << number;
     }
+}
+
+/// Reports one of a few identifiers, most of which are no digests, or nobody's.
+class Impostor : public Blob {
+public:
+    explicit Impostor(int number) : number_(number) {}
+    Id GetId() const override { return number_ == 0 ? Id() : Id(Wide("impostor " + std::to_string(number_))); }
+
+private:
+    int number_;
+};
+
+TEST(HostRepositories, FindTheSameInTheirStoragesWheneverTheyAskForATable) {
+    std::mt19937 random(11);
+    std::vector<cow_ptr<Commit>> all;
+    for (int number = 0; number < 400; ++number) {
+        all.push_back(immu::make<Commit>());
+        all.back().write()->SetDescription(Wide(std::to_string(number)));
+    }
+    for (int round = 0; round < 60; ++round) {
+        std::unique_ptr<IObjectsStorage> storage = std::make_unique<MemObjectsStorage>();
+        std::map<Id, Commit const*> expected;
+        // A table is asked for late, early, or never.
+        IObjectsStorage::CommitTable const* table = nullptr;
+        const auto showing = random() % 1500;
+        const auto spread = 10 + random() % 390;
+        for (std::mt19937::result_type step = 0; step < 1000; ++step) {
+            auto const& commit = all[random() % spread];
+            if (random() % 3 != 0) {
+                storage->AddCommit(commit);
+                expected.emplace(commit->GetId(), commit.get());
+            } else {
+                storage->DeleteCommit(commit);
+                expected.erase(commit->GetId());
+            }
+            if (step == showing) {
+                table = &storage->GetCommits();
+                // A clone of what is shown, and what is shown of a clone, before and after changes.
+                storage = random() % 2 == 0 ? storage->Clone() : std::move(storage);
+                table = &storage->GetCommits();
+            }
+            ASSERT_EQ(storage->GetCommitCount(), expected.size());
+            ASSERT_TRUE(table == nullptr || table->size() == expected.size());
+            auto const& other = all[random() % spread];
+            const auto known = expected.find(other->GetId());
+            ASSERT_EQ(storage->GetCommit(other->GetId()).get(), known == expected.end() ? nullptr : known->second);
+        }
+        const auto clone = storage->Clone();
+        for (auto const& commit : all) {
+            const std::uint32_t holders = expected.contains(commit->GetId()) ? 3 : 1;
+            ASSERT_TRUE(commit.use_count() == holders && (holders == 1) == !clone->GetCommit(commit->GetId()));
+        }
+        for (auto const& [id, commit] : clone->GetCommits())
+            ASSERT_TRUE(commit.use_count() == 3 && expected.at(id) == commit.get() && storage->GetCommit(id) == commit);
+        // Nothing but the storages holds what nobody else does.
+        storage->AddCommit(immu::make<Commit>());
+        storage->PurgeUnusedObjects();
+        ASSERT_EQ(storage->GetCommitCount(), expected.size());
+    }
+    for (auto const& commit : all)
+        EXPECT_EQ(commit.use_count(), 1U);
+
+    MemObjectsStorage storage;
+    const auto blob = immu::make<Blob>(MakeBlob("blob"));
+    storage.AddBlob(blob);
+    for (int number : {1, 0, 2, 1})
+        storage.AddBlob(immu::make<Impostor>(number));
+    EXPECT_TRUE(storage.GetBlobCount() == 4 && storage.GetBlob(Id()) && storage.GetBlob(Impostor(2).GetId()));
+    EXPECT_TRUE(storage.GetBlob(blob->GetId()) == blob && !storage.GetBlob(Impostor(3).GetId()));
+    storage.PurgeUnusedObjects();
+    EXPECT_TRUE(storage.GetBlobs().size() == 1 && storage.GetBlobs().begin()->second == blob);
 }
 
 std::multiset<std::string> NamesOf(IObjectsStorage const& storage, cow_ptr<Commit> const& head, bool scanning) {

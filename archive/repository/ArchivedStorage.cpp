@@ -168,7 +168,7 @@ void ArchivedStorage::PurgeUnusedObjects() {
 void ArchivedStorage::CountHidden() noexcept {
     hiddenCount_ = 0;
     for (Id const& id : hidden_)
-        hiddenCount_ += objects_.GetCommits().contains(id) ? 1 : 0;
+        hiddenCount_ += objects_.GetCommit(id) ? 1 : 0;
 }
 
 bool ArchivedStorage::BranchExist(KivStringViewT<char16_t> name) const {

@@ -20,6 +20,14 @@ public:
     reference_counted& operator=(reference_counted const&) noexcept { return *this; }
 
     void add_reference() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
+    /// The same for an object that may be new. Nobody else has a reference to one that has none, so that it takes no atomic
+    /// exchange.
+    void add_first_reference() const noexcept {
+        if (references_.load(std::memory_order_relaxed) == 0)
+            references_.store(1, std::memory_order_relaxed);
+        else
+            add_reference();
+    }
 
     /// True if that was the last reference; everything done through the other references happened before.
     [[nodiscard]] bool drop_reference() const noexcept {
@@ -49,14 +57,17 @@ public:
     /// Shares @p object, which may be new or have other handles; null gives null.
     explicit counted_ptr(T* object) noexcept : object_(object) {
         if (object_ != nullptr)
-            object_->add_reference();
+            object_->add_first_reference();
     }
     /// Takes over the share of a handle of a derived class.
     template <class Derived>
         requires(!std::is_same_v<Derived, T> && std::is_convertible_v<Derived*, T*>)
     counted_ptr(counted_ptr<Derived, Delete> other) noexcept : object_(other.detach()) {}
 
-    counted_ptr(counted_ptr const& other) noexcept : counted_ptr(other.object_) {}
+    counted_ptr(counted_ptr const& other) noexcept : object_(other.object_) {
+        if (object_ != nullptr)
+            object_->add_reference();
+    }
     counted_ptr(counted_ptr&& other) noexcept : object_(std::exchange(other.object_, nullptr)) {}
     counted_ptr& operator=(counted_ptr const& other) noexcept {
         counted_ptr(other).swap(*this);

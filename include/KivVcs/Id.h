@@ -5,6 +5,7 @@
 
 #include "KivVcs/Foundation.h"
 #include "KivVcs/detail/Published.h"
+#include "KivVcs/detail/PublishedWord.h"
 
 #include <array>
 #include <compare>
@@ -16,10 +17,6 @@
 #include <utility>
 
 namespace KivVcs {
-
-namespace detail {
-class CachedId;
-} // namespace detail
 
 /// The identifier of an object: the hexadecimal text of the SHA-256 digest of its packed form, 64 lowercase digits. The
 /// empty text is the null identifier: no object.
@@ -37,19 +34,22 @@ public:
     /// The identifier with the given text, whatever it is. @throws std::bad_alloc
     explicit Id(KivStringT<char16_t> const& text);
     /// The identifier whose text stands for @p digest.
-    [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return {digest, HashOf(digest)}; }
+    [[nodiscard]] static Id FromDigest(Digest const& digest) noexcept { return Id(digest); }
 
     /// The identifier that 64 hexadecimal digits, of either case, spell; nothing for any other text.
     [[nodiscard]] static optional<Id> Parse(std::string_view digits) noexcept;
 
-    Id(Id const& other) noexcept = default;
+    Id(Id const& other) noexcept : digest_(other.digest_), text_(other.text_), isDigest_(other.isDigest_) {
+        hash_.Set(other.hash_.Get());
+    }
     Id(Id&& other) noexcept
-        : digest_(other.digest_), hash_(std::exchange(other.hash_, hashOfNull)), text_(std::move(other.text_)),
-          isDigest_(std::exchange(other.isDigest_, false)) {}
+        : digest_(other.digest_), text_(std::move(other.text_)), isDigest_(std::exchange(other.isDigest_, false)) {
+        hash_.Set(other.hash_.Take());
+    }
     Id& operator=(Id other) noexcept {
         digest_ = other.digest_;
-        std::swap(hash_, other.hash_);
-        std::swap(isDigest_, other.isDigest_);
+        hash_.Set(other.hash_.Get());
+        isDigest_ = other.isDigest_;
         text_.Swap(other.text_);
         return *this;
     }
@@ -62,15 +62,18 @@ public:
     [[nodiscard]] bool IsEmpty() const noexcept { return !isDigest_ && text_.Get() == nullptr; }
 
     /// A hash over a sample of the text, the same on every platform that has 64-bit `std::size_t`.
-    [[nodiscard]] std::size_t Hash() const noexcept { return hash_; }
+    [[nodiscard]] std::size_t Hash() const noexcept {
+        const std::size_t known = hash_.Get();
+        return known != 0 ? known : ComputeHash();
+    }
 
     /// The digest that the text stands for; null if it is not 64 lowercase hexadecimal digits.
     [[nodiscard]] Digest const* GetDigest() const noexcept { return isDigest_ ? &digest_ : nullptr; }
 
     friend bool operator==(Id const& left, Id const& right) noexcept {
-        if (left.hash_ != right.hash_ || left.isDigest_ != right.isDigest_)
-            return false;
         // A text that stands for a digest is always kept as one, so that the two kinds never have the same text.
+        if (left.isDigest_ != right.isDigest_)
+            return false;
         return left.isDigest_ ? left.digest_ == right.digest_ : HaveSameText(left, right);
     }
 
@@ -78,9 +81,7 @@ public:
     friend std::strong_ordering operator<=>(Id const& left, Id const& right) noexcept { return Compare(left, right); }
 
 private:
-    friend class detail::CachedId;
-
-    Id(Digest const& digest, std::size_t hash) noexcept : digest_(digest), hash_(hash), isDigest_(true) {}
+    explicit Id(Digest const& digest) noexcept : digest_(digest), isDigest_(true) {}
 
     /// Spelled out only when somebody asks for it, since a repository holds an identifier for every object.
     struct Text final : KivUtils::reference_counted {
@@ -89,14 +90,15 @@ private:
         KivStringT<char16_t> text;
     };
 
-    static constexpr auto hashOfNull = static_cast<std::size_t>(0x42c52834b230ef45U);
-
-    static std::size_t HashOf(Digest const& digest) noexcept;
+    template <class Use>
+    auto WithUnits(Use const& use) const noexcept;
+    std::size_t ComputeHash() const noexcept;
     static bool HaveSameText(Id const& left, Id const& right) noexcept;
     static std::strong_ordering Compare(Id const& left, Id const& right) noexcept;
 
     Digest digest_{};
-    std::size_t hash_ = hashOfNull;
+    /// 0 until somebody asks for it: the library's own tables do not.
+    detail::PublishedWord<std::size_t> hash_;
     detail::Published<Text> text_;
     bool isDigest_ = false;
 };

@@ -4,6 +4,7 @@
 /// Where the objects of a repository live.
 
 #include "KivVcs/Commit.h"
+#include "KivVcs/detail/ObjectTable.h"
 
 #include <initializer_list>
 #include <set>
@@ -89,6 +90,8 @@ public:
     [[nodiscard]] std::uint64_t GetCommitCount() const override;
     [[nodiscard]] std::uint64_t GetTreeCount() const override;
     [[nodiscard]] std::uint64_t GetBlobCount() const override;
+    /// A table of objects is made when it is asked for first, and kept up to date from then on: looking up and adding take
+    /// longer, and more memory. @throws std::bad_alloc
     [[nodiscard]] CommitTable const& GetCommits() const override;
     [[nodiscard]] TreeTable const& GetTrees() const override;
     [[nodiscard]] BlobTable const& GetBlobs() const override;
@@ -113,9 +116,9 @@ private:
     bool AddBranch(KivStringViewT<char16_t> name, cow_ptr<Commit> head);
     void FileName(NamesByHead::node_type entry, ReferenceTable::value_type const& branch) noexcept;
 
-    CommitTable commits_;
-    TreeTable trees_;
-    BlobTable blobs_;
+    detail::ObjectTable<Commit> commits_;
+    detail::ObjectTable<Tree> trees_;
+    detail::ObjectTable<Blob> blobs_;
     ReferenceTable references_;
     NamesByHead namesByHead_;
 };

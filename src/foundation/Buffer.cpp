@@ -240,11 +240,19 @@ void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t siz
     size = std::min(size, other.GetSize() - std::min(offset, other.GetSize()));
     if (size == 0)
         return;
-    const Buffer source(other);
-    if (!content_ && size == source.GetSize()) {
-        *this = source;
-        return;
+    if (!content_) {
+        // The other buffer is another one then, and keeps what it shows meanwhile.
+        if (size == other.GetSize()) {
+            *this = other;
+            return;
+        }
+        if (other.content_->kind != Kind::Chain) {
+            auto* block = static_cast<Block*>(other.content_.get());
+            return AppendPiece(block,
+                               block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));
+        }
     }
+    const Buffer source(other);
     if (source.content_->kind != Kind::Chain) {
         auto* block = static_cast<Block*>(source.content_.get());
         AppendPiece(block, block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));

@@ -51,6 +51,15 @@ std::strong_ordering CompareUnits(Left const& left, Right const& right) noexcept
 
 } // namespace
 
+/// Calls @p use with the code units of the text, without making a text of a digest, which may fail.
+template <class Use>
+auto Id::WithUnits(Use const& use) const noexcept {
+    if (isDigest_)
+        return use(DigestDigits{digest_});
+    Text const* const text = text_.Get();
+    return use(text == nullptr ? KivStringViewT<char16_t>() : KivStringViewT<char16_t>(text->text));
+}
+
 Id::Id(Buffer const& packed) {
     SHADigest256 digest;
     for (auto const& chunk : packed.LockForRead())
@@ -68,11 +77,12 @@ Id::Id(KivStringT<char16_t> const& text) {
         return;
     }
     static_cast<void>(text_.GetOrMake([&text] { return Text(text); }));
-    hash_ = SampledHash(KivStringViewT<char16_t>(text));
 }
 
-std::size_t Id::HashOf(Digest const& digest) noexcept {
-    return SampledHash(DigestDigits{digest});
+std::size_t Id::ComputeHash() const noexcept {
+    const std::size_t hash = WithUnits([](auto const& units) { return SampledHash(units); });
+    hash_.Publish(hash);
+    return hash;
 }
 
 KivStringT<char16_t> const& Id::GetText() const {
@@ -99,15 +109,8 @@ optional<Id> Id::Parse(std::string_view digits) noexcept {
 std::strong_ordering Id::Compare(Id const& left, Id const& right) noexcept {
     if (left.isDigest_ && right.isDigest_)
         return std::memcmp(left.digest_.data(), right.digest_.data(), left.digest_.size()) <=> 0;
-    // Without making a text of a digest, which may fail.
-    const auto withUnits = [](Id const& id, auto const& use) {
-        if (id.isDigest_)
-            return use(DigestDigits{id.digest_});
-        Text const* const text = id.text_.Get();
-        return use(text == nullptr ? KivStringViewT<char16_t>() : KivStringViewT<char16_t>(text->text));
-    };
-    return withUnits(left, [&](auto const& mine) {
-        return withUnits(right, [&](auto const& theirs) { return CompareUnits(mine, theirs); });
+    return left.WithUnits([&](auto const& mine) {
+        return right.WithUnits([&](auto const& theirs) { return CompareUnits(mine, theirs); });
     });
 }
 

@@ -2,27 +2,6 @@
 
 namespace KivVcs {
 
-namespace {
-
-template <class Table, class Key>
-typename Table::mapped_type FindIn(Table const& table, Key const& key) {
-    const auto found = table.find(key);
-    return found == table.end() ? nullptr : found->second;
-}
-
-template <class T>
-void AddTo(std::unordered_map<Id, cow_ptr<T>>& table, cow_ptr<T> object) {
-    Id id = object->GetId();
-    // Where most buckets are free, the bucket alone shows that an object is new, as most that are asked for are; otherwise
-    // that takes a visit to a neighbour somewhere in memory. What is there already must not make the table grow, which
-    // would change its order.
-    if (table.size() >= table.bucket_count() / 2 && !table.contains(id))
-        table.rehash(2 * table.bucket_count());
-    table.try_emplace(std::move(id), std::move(object));
-}
-
-} // namespace
-
 IObjectsStorage::~IObjectsStorage() = default;
 
 MemObjectsStorage::MemObjectsStorage() : MemObjectsStorage({u"master"}) {}
@@ -46,51 +25,51 @@ std::unique_ptr<IObjectsStorage> MemObjectsStorage::Clone() const {
 }
 
 cow_ptr<Commit> MemObjectsStorage::GetCommit(Id const& id) const {
-    return FindIn(commits_, id);
+    return commits_.Find(id);
 }
 
 cow_ptr<Tree> MemObjectsStorage::GetTree(Id const& id) const {
-    return FindIn(trees_, id);
+    return trees_.Find(id);
 }
 
 cow_ptr<Blob> MemObjectsStorage::GetBlob(Id const& id) const {
-    return FindIn(blobs_, id);
+    return blobs_.Find(id);
 }
 
 void MemObjectsStorage::AddCommit(cow_ptr<Commit> commit) {
-    AddTo(commits_, std::move(commit));
+    commits_.Add(std::move(commit));
 }
 
 void MemObjectsStorage::AddTree(cow_ptr<Tree> tree) {
-    AddTo(trees_, std::move(tree));
+    trees_.Add(std::move(tree));
 }
 
 void MemObjectsStorage::AddBlob(cow_ptr<Blob> blob) {
-    AddTo(blobs_, std::move(blob));
+    blobs_.Add(std::move(blob));
 }
 
 std::uint64_t MemObjectsStorage::GetCommitCount() const {
-    return commits_.size();
+    return commits_.Size();
 }
 
 std::uint64_t MemObjectsStorage::GetTreeCount() const {
-    return trees_.size();
+    return trees_.Size();
 }
 
 std::uint64_t MemObjectsStorage::GetBlobCount() const {
-    return blobs_.size();
+    return blobs_.Size();
 }
 
 IObjectsStorage::CommitTable const& MemObjectsStorage::GetCommits() const {
-    return commits_;
+    return commits_.Show();
 }
 
 IObjectsStorage::TreeTable const& MemObjectsStorage::GetTrees() const {
-    return trees_;
+    return trees_.Show();
 }
 
 IObjectsStorage::BlobTable const& MemObjectsStorage::GetBlobs() const {
-    return blobs_;
+    return blobs_.Show();
 }
 
 IObjectsStorage::ReferenceTable const& MemObjectsStorage::GetRefs() const {
@@ -102,7 +81,7 @@ void MemObjectsStorage::DeleteCommit(cow_ptr<Commit> commit) {
         return;
     const Id id = commit->GetId();
     if (GetCommit(id))
-        commits_.erase(id);
+        commits_.Remove(id);
 }
 
 bool MemObjectsStorage::BranchExist(KivStringViewT<char16_t> name) const {
@@ -151,7 +130,8 @@ void MemObjectsStorage::FileName(NamesByHead::node_type entry, ReferenceTable::v
 }
 
 cow_ptr<Commit> MemObjectsStorage::GetHead(KivStringViewT<char16_t> name) const {
-    return FindIn(references_, name);
+    const auto branch = references_.find(name);
+    return branch == references_.end() ? nullptr : branch->second;
 }
 
 std::vector<KivStringT<char16_t>> MemObjectsStorage::GetCommitBranches(cow_ptr<Commit> commit) const {

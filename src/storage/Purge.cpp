@@ -26,9 +26,7 @@ void AddHeld(Blob const&, std::vector<cow_ptr<Blob>>&) noexcept {}
 template <class T>
 class TablePurge {
 public:
-    using Table = std::unordered_map<Id, cow_ptr<T>>;
-
-    explicit TablePurge(Table& table) noexcept : table_(table) {}
+    explicit TablePurge(detail::ObjectTable<T>& table) noexcept : table_(table) {}
 
     void Run() {
         do {
@@ -41,10 +39,9 @@ private:
     /// Follows at once what an object that dies has held, wherever the sweep may have passed it already, so that the list
     /// of these stays short.
     void Sweep() {
-        for (next_ = table_.begin(); next_ != table_.end();) {
-            const auto entry = next_++;
-            if (entry->second.use_count() == 1)
-                LetDie(TakeOut(entry));
+        walk_ = table_.Begin();
+        while (cow_ptr<T> unused = table_.TakeNextUnused(walk_)) {
+            LetDie(std::move(unused));
             while (!held_.empty())
                 ReleaseLastHeld();
         }
@@ -56,7 +53,7 @@ private:
         cow_ptr<T> object = std::move(held_.back());
         held_.pop_back();
         if (object.use_count() == 2)
-            TakeOutIfStored(object);
+            TakeOutIfStored(*object);
         if (object.use_count() == 1)
             LetDie(std::move(object));
     }
@@ -72,26 +69,16 @@ private:
         }
     }
 
-    void TakeOutIfStored(cow_ptr<T> const& object) {
+    void TakeOutIfStored(T const& object) {
         try {
-            const auto entry = table_.find(object->GetId());
-            if (entry != table_.end() && entry->second == object)
-                TakeOut(entry);
+            static_cast<void>(table_.TakeOut(object, walk_));
         } catch (std::bad_alloc const&) {
             hasMissed_ = true;
         }
     }
 
-    cow_ptr<T> TakeOut(typename Table::iterator entry) {
-        if (entry == next_)
-            ++next_;
-        cow_ptr<T> object = std::move(entry->second);
-        table_.erase(entry);
-        return object;
-    }
-
-    Table& table_;
-    typename Table::iterator next_;
+    detail::ObjectTable<T>& table_;
+    typename detail::ObjectTable<T>::Walk walk_;
     std::vector<cow_ptr<T>> held_;
     bool hasMissed_ = false;
 };

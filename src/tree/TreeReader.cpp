@@ -216,7 +216,10 @@ private:
         waiting_.push_back(std::move(blob));
     }
 
-    [[nodiscard]] static std::uint64_t HashBit(Id const& id) noexcept { return std::uint64_t{1} << (id.Hash() % 64); }
+    [[nodiscard]] static std::uint64_t HashBit(Id const& id) noexcept {
+        Id::Digest const* const digest = id.GetDigest();
+        return std::uint64_t{1} << (digest == nullptr ? 0 : digest->back() % 64);
+    }
 
     [[nodiscard]] bool IsWaiting(Id const& id) const {
         return (waitingHashes_ & HashBit(id)) != 0 &&

@@ -3,10 +3,7 @@
 #include "KivVcs/Id.h"
 #include "KivVcs/detail/PublishedWord.h"
 
-#include <array>
-#include <cstddef>
 #include <cstdint>
-#include <cstring>
 
 namespace KivVcs::detail {
 
@@ -31,17 +28,12 @@ public:
     [[nodiscard]] bool IsHosts() const noexcept { return state_.Get() == State::Hosts; }
 
     /// The identifier, and its digest. @pre there is one
-    [[nodiscard]] Id Get() const noexcept {
-        std::size_t hash = 0;
-        std::memcpy(&hash, hash_.data(), sizeof hash);
-        return {digest_, hash};
-    }
+    [[nodiscard]] Id Get() const noexcept { return Id::FromDigest(digest_); }
     [[nodiscard]] Id::Digest const& Digest() const noexcept { return digest_; }
 
     /// Keeps an identifier from now on, whatever changes.
     void Assign(Id const& id) noexcept {
         digest_ = *id.GetDigest();
-        KeepHash(id.Hash());
         state_.Set(State::Assigned);
     }
 
@@ -58,7 +50,6 @@ public:
             !state_.Replace(known, State::Writing))
             return;
         digest_ = *id.GetDigest();
-        KeepHash(id.Hash());
         state_.Publish(isHosts ? State::Hosts : State::Own);
     }
 
@@ -67,7 +58,6 @@ public:
         if (isHosts ? !other.IsHosts() : !other.IsOwn() && !other.IsCopied())
             return;
         digest_ = other.digest_;
-        hash_ = other.hash_;
         state_.Set(isHosts ? State::Hosts : State::Copied);
     }
 
@@ -78,14 +68,10 @@ public:
 
 private:
     enum class State : std::uint32_t { Empty, Writing, Copied, Hosts, Own, Assigned };
-    using Hash = std::array<std::byte, sizeof(std::size_t)>;
-
-    void KeepHash(std::size_t hash) const noexcept { std::memcpy(hash_.data(), &hash, sizeof hash); }
 
     // Nothing here is aligned to more than four bytes, so that an object has all of it right behind its use count.
     PublishedWord<State> state_;
     mutable Id::Digest digest_{};
-    mutable Hash hash_{};
 };
 
 } // namespace KivVcs::detail
