@@ -1,3 +1,4 @@
+#include "Changes.h"
 #include "Questions.h"
 
 #include <algorithm>
@@ -42,16 +43,18 @@ PathList DifferingNames(cow_ptr<Tree> const& left, cow_ptr<Tree> const& right) {
 class Merging {
 public:
     Merging(IRepository& repo, MergeSources const& sources, MergeSide const& left, MergeSide const& right,
-            MergeResolvers const& resolvers)
-        : repo_(repo), bases_(sources, left, right),
+            MergeResolvers const& resolvers, IProgress* progress)
+        : repo_(repo), progress_(progress), bases_(sources, left, right),
           questions_(repo, sources, resolvers, {left.tree, bases_.OnlyBase(), right.tree}) {}
 
     [[nodiscard]] TreeMerge Run(cow_ptr<Tree> const& left, cow_ptr<Tree> const& right) {
         TreeMerge merge;
         merge.lostBases = bases_.LostBases();
         MergeDirectory(EntryOf(left), EntryOf(right), nullptr);
-        while (!levels_.empty())
-            Proceed();
+        for (std::uint64_t merged = 0; !levels_.empty();) {
+            ReportProgress(progress_, {"merging directories", merged, 0}, {});
+            merged += Proceed() ? 1U : 0U;
+        }
         merge.gaveUp = questions_.GaveUp();
         merge.conflicts = questions_.TakeConflicts();
         if (!merge.gaveUp)
@@ -148,24 +151,28 @@ private:
     }
 
     /// Merges the next directory of the innermost level, or ends that level if there is none left.
-    void Proceed() {
+    /// @return whether one was left
+    bool Proceed() {
         Level& level = levels_.back();
         if (level.next < level.directories.size()) {
             auto const& name = level.directories[level.next++];
-            return MergeDirectory(EntryIn(level.left, name), EntryIn(level.right, name), &name);
+            MergeDirectory(EntryIn(level.left, name), EntryIn(level.right, name), &name);
+            return true;
         }
         Level const done = std::move(level);
         levels_.pop_back();
         if (levels_.empty()) {
             top_ = done.result;
-            return;
+            return false;
         }
         Leave();
         Level& above = levels_.back();
         Take(done.IsKept() ? EntryOf(done.result) : HeldEntry(), &above.directories[above.next - 1]);
+        return false;
     }
 
     IRepository& repo_;
+    IProgress* progress_;
     EntryBases bases_;
     Questions questions_;
     std::vector<Level> levels_;
@@ -175,8 +182,8 @@ private:
 } // namespace
 
 TreeMerge MergeAgain(IRepository& repo, MergeSources const& sources, MergeSide const& left, MergeSide const& right,
-                     MergeResolvers const& resolvers) {
-    return Merging(repo, sources, left, right, resolvers).Run(left.tree, right.tree);
+                     MergeResolvers const& resolvers, IProgress* progress) {
+    return Merging(repo, sources, left, right, resolvers, progress).Run(left.tree, right.tree);
 }
 
 } // namespace KivArchive

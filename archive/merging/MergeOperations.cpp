@@ -1,3 +1,4 @@
+#include "Changes.h"
 #include "merging/AncestryGraph.h"
 #include "repository/RepositoryState.h"
 
@@ -20,15 +21,16 @@ void ArchivedRepository::EnterLine(cow_ptr<Commit> commit) {
         SyncWithStorage(commit);
 }
 
-AncestryReader ArchivedRepository::FactsReader() const {
-    return [this](std::span<const Id> commits, std::size_t more) {
+AncestryReader ArchivedRepository::FactsReader(IProgress* progress) const {
+    return [this, progress](std::span<const Id> commits, std::size_t more) {
+        ReportProgress(progress, {"looking where histories meet", 0, 0}, {});
         return ReadAncestry(commits, Follow::Everything, more);
     };
 }
 
-MergeSources ArchivedRepository::SourcesOfMerge() {
+MergeSources ArchivedRepository::SourcesOfMerge(IProgress* progress) {
     MergeSources sources;
-    sources.ancestry = FactsReader();
+    sources.ancestry = FactsReader(progress);
     sources.tree = [this](Id const& id) -> cow_ptr<Tree> {
         if (auto known = GetTreeFromStorage(id))
             return known;
@@ -48,7 +50,7 @@ MergeSources ArchivedRepository::SourcesOfMerge() {
 }
 
 /// What can be done without a new commit; nothing if that cannot be.
-std::optional<MergeResult> ArchivedRepository::MergeWithoutCommit(cow_ptr<Commit> const& commit) {
+std::optional<MergeResult> ArchivedRepository::MergeWithoutCommit(cow_ptr<Commit> const& commit, IProgress* progress) {
     if (!commit)
         return MergeResult::NothingToCommit;
     auto const forward = [&] {
@@ -62,7 +64,7 @@ std::optional<MergeResult> ArchivedRepository::MergeWithoutCommit(cow_ptr<Commit
     if (headId == commitId)
         return MergeResult::UpToDate;
     EnterLine(commit);
-    AncestryGraph graph(FactsReader());
+    AncestryGraph graph(FactsReader(progress));
     auto const meeting = graph.Meet(graph.Enter(headId), graph.Enter(commitId));
     bool const bothContain = meeting.leftContainsRight && meeting.rightContainsLeft;
     if (!bothContain && meeting.leftContainsRight)
@@ -79,7 +81,7 @@ std::optional<MergeResult> ArchivedRepository::MergeWithoutCommit(cow_ptr<Commit
 }
 
 bool ArchivedRepository::FastForwardMerge(cow_ptr<Commit> commit) {
-    auto const result = MergeWithoutCommit(commit);
+    auto const result = MergeWithoutCommit(commit, nullptr);
     return result && *result <= MergeResult::Forwarded;
 }
 
@@ -91,19 +93,21 @@ bool ArchivedRepository::Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) 
     return Merge3WayWithReport(commit, {std::move(resolvers), {}, {}}).Succeeded();
 }
 
-MergeReport ArchivedRepository::MergeWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers) {
-    if (auto const result = MergeWithoutCommit(commit))
+MergeReport ArchivedRepository::MergeWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers,
+                                                IProgress* progress) {
+    if (auto const result = MergeWithoutCommit(commit, progress))
         return {*result, {}, {}};
-    return Merge3WayWithReport(commit, resolvers);
+    return Merge3WayWithReport(commit, resolvers, progress);
 }
 
-MergeReport ArchivedRepository::Merge3WayWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers) {
+MergeReport ArchivedRepository::Merge3WayWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers,
+                                                    IProgress* progress) {
     cow_ptr<Commit> const head = GetHead();
     if (!commit || !head)
         return {};
     EnterLine(commit);
-    TreeMerge merge = MergeAgain(*this, SourcesOfMerge(), {head->GetId(), RootTreeOf(*head)},
-                                 {commit->GetId(), RootTreeOf(*commit)}, resolvers);
+    TreeMerge merge = MergeAgain(*this, SourcesOfMerge(progress), {head->GetId(), RootTreeOf(*head)},
+                                 {commit->GetId(), RootTreeOf(*commit)}, resolvers, progress);
     MergeReport report{MergeResult::NothingToCommit, std::move(merge.conflicts), std::move(merge.lostBases)};
     if (merge.gaveUp)
         report.result = MergeResult::GaveUp;

@@ -56,6 +56,11 @@ HeldEntry const& Chosen(ConflictSettlement settlement, HeldEntry const& left, He
     return settlement == ConflictSettlement::Right ? right : left;
 }
 
+/// Nobody can take a base that is not there.
+ConflictSettlement WhereThereIs(BaseEntry const& base, ConflictSettlement settlement) noexcept {
+    return settlement == ConflictSettlement::Root && !base ? ConflictSettlement::Undecided : settlement;
+}
+
 bool IsOneName(KivStringT<char16_t> const& name) {
     auto const components = KivVcs::Helpers::SplitVcsPath(name);
     return components.size() == 1 && components.front() == KivStringViewT<char16_t>(name);
@@ -142,17 +147,7 @@ std::optional<Questions::KindAnswer> Questions::AskForKind(HeldEntry const& left
 
 ConflictSettlement Questions::AskForChoice(BaseEntry const& base) {
     auto const& ask = resolvers_.choices.blobResolver;
-    switch (gaveUp_ || !ask ? ConflictChoice::Undecided : ask(path_, trees_)) {
-    case ConflictChoice::Left:
-        return ConflictSettlement::Left;
-    case ConflictChoice::Right:
-        return ConflictSettlement::Right;
-    case ConflictChoice::Undecided:
-        return ConflictSettlement::Undecided;
-    case ConflictChoice::Root:
-        break;
-    }
-    return base ? ConflictSettlement::Root : ConflictSettlement::Undecided;
+    return WhereThereIs(base, SettlementOf(gaveUp_ || !ask ? ConflictChoice::Undecided : ask(path_, trees_)));
 }
 
 TreeConflictChoice Questions::AskAboutDirectory(HeldEntry const& left, HeldEntry const& right, BaseEntry const& base) {
@@ -160,19 +155,12 @@ TreeConflictChoice Questions::AskAboutDirectory(HeldEntry const& left, HeldEntry
     if (gaveUp_)
         return TreeConflictChoice::Merge;
     TreeConflictChoice const choice = ask ? ask(path_, trees_) : TreeConflictChoice::Undecided;
-    bool const takesBase = choice == TreeConflictChoice::Root;
-    if (choice == TreeConflictChoice::Undecided || (takesBase && !base)) {
-        Note(left, right, base, true, ConflictSettlement::Undecided);
+    auto const answer = SettlementOf(choice);
+    if (!answer)
         return TreeConflictChoice::Merge;
-    }
-    if (takesBase || choice == TreeConflictChoice::Left || choice == TreeConflictChoice::Right) {
-        Note(left, right, base, true,
-             takesBase                            ? ConflictSettlement::Root
-             : choice == TreeConflictChoice::Left ? ConflictSettlement::Left
-                                                  : ConflictSettlement::Right);
-        return choice;
-    }
-    return TreeConflictChoice::Merge;
+    ConflictSettlement const settlement = WhereThereIs(base, *answer);
+    Note(left, right, base, true, settlement);
+    return settlement == ConflictSettlement::Undecided ? TreeConflictChoice::Merge : choice;
 }
 
 /// Where there is not exactly one base, the root that resolvers are shown gets the base of what they are asked about.

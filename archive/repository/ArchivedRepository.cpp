@@ -88,11 +88,25 @@ std::vector<Ancestry> ArchivedRepository::ReadAncestry(std::span<const Id> commi
     // As far as is asked for, since the archive walks that far for each batch.
     std::size_t const batchSize = std::clamp<std::size_t>(more, 16, 256);
     std::unordered_map<Id, Ancestry> archived;
+    std::unordered_set<Id> asked;
+    auto const ask = [&](Id const& id) {
+        // What was made here goes along: of one after the other the archive would say that it does not know it.
+        std::vector<Id> line{id};
+        for (cow_ptr<Commit> held = state_->storage->GetCommit(id);
+             held && line.size() < batchSize && state_->storage->MayBeUnpublished(line.back());) {
+            held = held->GetHeldParent();
+            if (held)
+                line.push_back(held->GetId());
+        }
+        asked.insert(line.begin(), line.end());
+        for (Ancestry& facts : state_->Archive().ReadAncestry(line, follow, batchSize))
+            archived.try_emplace(facts.commit, std::move(facts));
+    };
     auto const lookUp = [&](Id const& id) -> std::optional<Ancestry> {
         Ancestry const* const local = state_->facts.Find(id);
-        if (archived.find(id) == archived.end() && !(local != nullptr && state_->storage->MayBeUnpublished(id)))
-            for (Ancestry& facts : state_->Archive().ReadAncestry({&id, 1}, follow, batchSize))
-                archived.try_emplace(facts.commit, std::move(facts));
+        bool const isOnlyHere = local != nullptr && state_->storage->MayBeUnpublished(id);
+        if (archived.find(id) == archived.end() && !isOnlyHere && !asked.contains(id))
+            ask(id);
         std::optional<Ancestry> known;
         if (auto const found = archived.find(id); found != archived.end())
             known = found->second;

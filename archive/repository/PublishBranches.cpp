@@ -198,7 +198,7 @@ PublishMergingOutcome ArchivedRepository::PublishMerging(MergeResolvers const& r
         ++outcome.attempts;
         RefreshOutcome const refreshed = Refresh(progress);
         for (auto const& branch : refreshed.diverged) {
-            outcome.merges.push_back(MergeDiverged(branch, resolvers));
+            outcome.merges.push_back(MergeDiverged(branch, resolvers, progress));
             if (!outcome.merges.back().Succeeded()) {
                 outcome.result = PublishMergingResult::GaveUp;
                 outcome.branch = branch;
@@ -216,13 +216,14 @@ PublishMergingOutcome ArchivedRepository::PublishMerging(MergeResolvers const& r
     return outcome;
 }
 
-MergeReport ArchivedRepository::MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers) {
+MergeReport ArchivedRepository::MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers,
+                                              IProgress* progress) {
     RebaseOntoRewritten(branch);
     KnownBranch& known = state_->branches.at(branch);
     MergeReport report;
     report.result = KivVcs::MergeResult::UpToDate;
     if (!IsContained(known.published, state_->storage->GetHead(branch)))
-        report = MergePublished(branch, state_->source->FetchCommit(known.published), resolvers);
+        report = MergePublished(branch, state_->source->FetchCommit(known.published), resolvers, progress);
     if (report.Succeeded())
         known.taken = known.published;
     return report;
@@ -251,12 +252,12 @@ void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch)
 }
 
 MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
-                                               MergeResolvers const& resolvers) {
+                                               MergeResolvers const& resolvers, IProgress* progress) {
     KivStringT<char16_t> const before = Repository::GetCurentBranch();
     Repository::Checkout(branch);
     std::optional<MergeReport> report;
     try {
-        report = MergeWithReport(theirs, resolvers);
+        report = MergeWithReport(theirs, resolvers, progress);
     } catch (...) {
         try {
             ReturnTo(before);

@@ -184,8 +184,11 @@ public:
     bool Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) override;
 
     /// `Merge` and `Merge3Way` with all resolvers, and with an account of what was done.
-    MergeReport MergeWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers);
-    MergeReport Merge3WayWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers);
+    /// @param progress may be null; nothing has been committed if it asks to stop
+    MergeReport MergeWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers,
+                                IProgress* progress = nullptr);
+    MergeReport Merge3WayWithReport(cow_ptr<Commit> const& commit, MergeResolvers const& resolvers,
+                                    IProgress* progress = nullptr);
 
 protected:
     /// Notes that @p rebuilt stands for @p old on a rewritten history, for the archive to know once it is published.
@@ -193,7 +196,7 @@ protected:
 
     /// Merges what others have published on @p branch into it, for `PublishMerging`, with `MergeWithReport`.
     [[nodiscard]] virtual MergeReport MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
-                                                     MergeResolvers const& resolvers);
+                                                     MergeResolvers const& resolvers, IProgress* progress);
 
     /// Notes that @p commit contains @p contained, for the archive to know once @p commit is published. What was merged is
     /// kept until then, and published along.
@@ -218,11 +221,13 @@ private:
     void ForgetRemoved(std::vector<Branch> const& theirs, RefreshOutcome& outcome);
     void TakePublished(KivStringT<char16_t> const& branch);
     void ReturnTo(KivStringT<char16_t> const& branch);
-    [[nodiscard]] MergeReport MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers);
-    [[nodiscard]] std::optional<KivVcs::MergeResult> MergeWithoutCommit(cow_ptr<Commit> const& commit);
+    [[nodiscard]] MergeReport MergeDiverged(KivStringT<char16_t> const& branch, MergeResolvers const& resolvers,
+                                            IProgress* progress);
+    [[nodiscard]] std::optional<KivVcs::MergeResult> MergeWithoutCommit(cow_ptr<Commit> const& commit,
+                                                                        IProgress* progress);
     void EnterLine(cow_ptr<Commit> commit);
-    [[nodiscard]] AncestryReader FactsReader() const;
-    [[nodiscard]] MergeSources SourcesOfMerge();
+    [[nodiscard]] AncestryReader FactsReader(IProgress* progress) const;
+    [[nodiscard]] MergeSources SourcesOfMerge(IProgress* progress);
     [[nodiscard]] bool CommitMerge(cow_ptr<Commit> const& head, cow_ptr<Commit> const& commit,
                                    cow_ptr<KivVcs::Tree> tree);
     void RebaseOntoRewritten(KivStringT<char16_t> const& branch);

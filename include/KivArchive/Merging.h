@@ -129,10 +129,11 @@ struct TreeMerge {
 /// for only to give them to a content resolver.
 /// @complexity proportional to the entries that differ and to the directories that hold them, times the number of bases;
 /// at most some hundred steps for an entry that many bases disagree about
+/// @param progress may be null; asked for each directory that is merged
 /// @throws what the sources, resolvers and @p repo throw
 [[nodiscard]] KIVARCHIVE_EXPORT TreeMerge MergeAgain(KivVcs::IRepository& repo, MergeSources const& sources,
                                                      MergeSide const& left, MergeSide const& right,
-                                                     MergeResolvers const& resolvers);
+                                                     MergeResolvers const& resolvers, IProgress* progress = nullptr);
 
 /// What a merge of a repository over an archive did.
 struct MergeReport {

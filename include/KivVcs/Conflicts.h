@@ -22,6 +22,11 @@ enum class ConflictSettlement : std::int32_t {
     Combined = 4,
 };
 
+/// How a resolver's answer settles what it was asked about.
+[[nodiscard]] KIVVCS_EXPORT ConflictSettlement SettlementOf(ConflictChoice choice) noexcept;
+/// The same for a directory; nothing if it is merged entry by entry, which settles nothing by itself.
+[[nodiscard]] KIVVCS_EXPORT optional<ConflictSettlement> SettlementOf(TreeConflictChoice choice) noexcept;
+
 /// A path that both sides changed differently.
 struct MergeConflict {
     /// Empty for the whole tree.

@@ -102,6 +102,36 @@ private:
 
 } // namespace
 
+ConflictSettlement SettlementOf(ConflictChoice choice) noexcept {
+    switch (choice) {
+    case ConflictChoice::Left:
+        return ConflictSettlement::Left;
+    case ConflictChoice::Right:
+        return ConflictSettlement::Right;
+    case ConflictChoice::Undecided:
+        return ConflictSettlement::Undecided;
+    case ConflictChoice::Root:
+        break;
+    }
+    return ConflictSettlement::Root;
+}
+
+optional<ConflictSettlement> SettlementOf(TreeConflictChoice choice) noexcept {
+    switch (choice) {
+    case TreeConflictChoice::Left:
+        return ConflictSettlement::Left;
+    case TreeConflictChoice::Right:
+        return ConflictSettlement::Right;
+    case TreeConflictChoice::Root:
+        return ConflictSettlement::Root;
+    case TreeConflictChoice::Undecided:
+        return ConflictSettlement::Undecided;
+    case TreeConflictChoice::Merge:
+        break;
+    }
+    return {};
+}
+
 MergeConflict DescribeConflict(Path path, MergeTrees const& trees, bool isDirectory, ConflictSettlement settlement) {
     const Held root = HeldBy(trees.root, path, isDirectory);
     const Held left = HeldBy(trees.left, path, isDirectory);

@@ -11,36 +11,6 @@ namespace {
 
 using Path = array_view<KivStringViewT<char16_t> const>;
 
-ConflictSettlement SettlementOf(ConflictChoice choice) noexcept {
-    switch (choice) {
-    case ConflictChoice::Left:
-        return ConflictSettlement::Left;
-    case ConflictChoice::Right:
-        return ConflictSettlement::Right;
-    case ConflictChoice::Undecided:
-        return ConflictSettlement::Undecided;
-    case ConflictChoice::Root:
-        break;
-    }
-    return ConflictSettlement::Root;
-}
-
-optional<ConflictSettlement> SettlementOf(TreeConflictChoice choice) noexcept {
-    switch (choice) {
-    case TreeConflictChoice::Left:
-        return ConflictSettlement::Left;
-    case TreeConflictChoice::Right:
-        return ConflictSettlement::Right;
-    case TreeConflictChoice::Root:
-        return ConflictSettlement::Root;
-    case TreeConflictChoice::Undecided:
-        return ConflictSettlement::Undecided;
-    case TreeConflictChoice::Merge:
-        break;
-    }
-    return {};
-}
-
 /// Stands between a merge and the host's resolvers, and keeps what was asked and answered.
 class ConflictRecorder {
 public:

@@ -230,5 +230,36 @@ TEST(ArchivedRepository, NoContentIsReadForHistoriesAndMergesWithoutConflicts) {
     EXPECT_GT(archive->contents, 0U) << "which is counted";
 }
 
+TEST(ArchivedRepository, MergesOfWhatIsUnpublishedAskLittleAndCanBeStopped) {
+    auto const archive = std::make_shared<CountingArchive>();
+    ArchivedRepository ours(archive);
+    CommitFiles(ours, "a=0 d/b=0", "base");
+    ASSERT_TRUE(ours.Publish().published);
+    ArchivedRepository theirs(archive);
+    CommitFiles(theirs, "d/b=1", "theirs");
+    ASSERT_TRUE(theirs.Publish().published);
+    for (int i = 1; i <= 500; ++i)
+        CommitFiles(ours, "a=" + std::to_string(i) + " d/c=1", std::to_string(i));
+    ours.Load(std::vector<Id>{theirs.GetHead()->GetId()});
+    auto const commit = ours.GetStorage()->GetCommit(theirs.GetHead()->GetId());
+    auto const head = ours.GetHead();
+    struct Stop final : IProgress {
+        bool Report(Progress const&) override { return left-- > 0; }
+        int left = 0;
+    } stop;
+    int stopped = 0;
+    MergeReport report;
+    for (report.result = KivVcs::MergeResult::Refused; !report.Succeeded(); ++stopped) {
+        EXPECT_TRUE(ours.GetHead() == head && stopped < 100);
+        stop.left = stopped;
+        archive->calls = 0;
+        auto const failure = FailureOf([&] { report = ours.MergeWithReport(commit, {TakingOurs(), {}, {}}, &stop); });
+        EXPECT_EQ(failure.value_or(Failure::Cancelled), Failure::Cancelled);
+    }
+    EXPECT_GT(stopped, 3) << "before each directory, and while histories are looked at";
+    EXPECT_LT(archive->calls, 30U) << "as for a commit each it would be more than a thousand";
+    EXPECT_EQ(FilesOf(ours.GetHead()), "a=500 d/b=1 d/c=1");
+}
+
 } // namespace
 } // namespace KivArchive
