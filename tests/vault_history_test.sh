@@ -27,6 +27,9 @@ MergesAskThePolicyAboutEveryConflict() {
     ends 1 'nothing was changed' merge side
     equal "$(sed -n 's/^conflict \([^:]*\):.*undecided/\1/p' out | sort -u | xargs)" "added both gone kind turned"
     equal "$("$vault" branch)" "$before"
+    ends 1 'nothing was changed' merge side --json
+    equal "$(python3 -c 'import json; a = json.load(open("out")); print(a["result"], *sorted({c["path"] + ":" + c["taken"] for c in a["conflicts"]}))')" \
+        'stopped added:undecided both:undecided gone:undecided kind:undecided turned:undecided'
     local -A expected=(
         [left]='added:ours both:ours gone:ours kind:ours left:ours right:theirs turned:ours'
         [right]='added:theirs both:theirs kind/of:theirs left:ours right:theirs turned/into:theirs'

@@ -59,6 +59,7 @@ SavesAndRestoresWhatADirectoryHolds() {
     equal "$("$vault" log a.txt | wc -l) $("$vault" log master:dir/deep.txt --json | grep -c '"id"')" "2 2"
     write d/a.txt 'changed again'
     matches "$("$vault" diff master d a.txt --text)" '^-changed' '^\+changed again'
+    equal "$("$vault" diff d)" 'changed a.txt'
     "$vault" verify >out
     rm -r d && mkdir d
     "$vault" save d -m emptied >out
@@ -227,6 +228,25 @@ ManySaveAtOnce() {
     wait
     equal "$("$vault" log | wc -l)" 8
     "$vault" verify >out
+    # Who waits says for whom; who only reads does not wait.
+    (echo 'BEGIN IMMEDIATE;' && while [ -e d2 ]; do sleep 0.05; done) | sqlite3 vault.db &
+    until ! sqlite3 vault.db 'BEGIN IMMEDIATE; ROLLBACK' 2>err; do sleep 0.05; done
+    ends 2 "^vault: waiting, at most 1 s, for process $(pgrep -P $$ -x sqlite3), which is writing to .*/vault.db" --wait 1 save d1
+    matches "$(cat err)" 'in use by somebody else'
+    ends 0 '^$' log
+    rm -r d2 && wait
+}
+
+NestingHasAnEnd() {
+    write d/f x
+    "$vault" save d >out
+    python3 -c 'import os; os.chdir("d"); [(os.mkdir("n" * 255), os.chdir("n" * 255)) for _ in range(300)]'
+    refused 'nested too deep, nothing was saved: n' save d
+    equal "$("$vault" log | wc -l)" 1
+    # What is nested as deep as can be is restored alike.
+    python3 -c 'import os; os.chdir("d"); [os.chdir("n" * 255) for _ in range(255)]; os.rename("n" * 255, "'"$work"'/rest")'
+    "$vault" save d >out && "$vault" restore master restored
+    equal "$("$vault" status restored)" ''
 }
 
 "${@:2}"

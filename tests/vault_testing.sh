@@ -5,7 +5,7 @@ set -euo pipefail
 vault=$(realpath "$1")
 here=$(realpath "$(dirname "${BASH_SOURCE[0]}")")
 work=$(mktemp -d)
-trap 'umount "$work/small" 2>/dev/null; chmod -R u+rwx "$work" 2>/dev/null; rm -rf "$work"' EXIT
+trap 'umount "$work/small" 2>/dev/null || true; chmod -R u+rwx "$work" 2>/dev/null; rm -rf "$work"' EXIT
 cd "$work"
 export VAULT_AUTHOR='Ann Example <ann@example.org>' TZ=Asia/Kathmandu
 

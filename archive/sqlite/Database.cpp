@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <fcntl.h>
 #include <new>
+#include <thread>
 #include <unistd.h>
 
 namespace KivArchive {
@@ -14,6 +15,8 @@ namespace KivArchive {
 namespace {
 
 constexpr int longestValue = 1 << 30;
+/// Waiting that nobody needs to know of.
+constexpr std::chrono::milliseconds untold{250};
 
 /// Makes an empty file for its owner alone, unless there is one.
 void MakePrivateFile(std::string const& path) {
@@ -52,7 +55,9 @@ Meaning MeaningOf(int code) {
 
 } // namespace
 
-Database::Database(std::string const& path, Access access, std::chrono::milliseconds wait) : path_(path) {
+Database::Database(std::string const& path, Access access, std::chrono::milliseconds wait,
+                   std::function<void()> waiting)
+    : path_(path), wait_(wait), waiting_(std::move(waiting)) {
     if (access == Access::Make)
         MakePrivateFile(path);
     sqlite3* handle = nullptr;
@@ -72,8 +77,7 @@ Database::Database(std::string const& path, Access access, std::chrono::millisec
     sqlite3_limit(handle, SQLITE_LIMIT_ATTACHED, 0);
     sqlite3_limit(handle, SQLITE_LIMIT_TRIGGER_DEPTH, 0);
     sqlite3_limit(handle, SQLITE_LIMIT_VDBE_OP, 25000);
-    auto const milliseconds = std::clamp<std::chrono::milliseconds::rep>(wait.count(), 0, 1 << 30);
-    sqlite3_busy_timeout(handle, static_cast<int>(milliseconds));
+    sqlite3_busy_handler(handle, &Database::WaitFor, this);
     Lookup::Register(handle);
     Run("PRAGMA cell_size_check=ON");
     Run("PRAGMA synchronous=FULL");
@@ -82,6 +86,25 @@ Database::Database(std::string const& path, Access access, std::chrono::millisec
 Database::~Database() {
     // Before the connection that they belong to.
     statements_.clear();
+}
+
+int Database::WaitFor(void* database, int attempt) noexcept {
+    auto& self = *static_cast<Database*>(database);
+    auto const now = std::chrono::steady_clock::now();
+    if (attempt == 0) {
+        self.waitsSince_ = now;
+        self.hasTold_ = false;
+    }
+    auto const waited = std::chrono::duration_cast<std::chrono::milliseconds>(now - self.waitsSince_);
+    if (waited >= self.wait_)
+        return 0;
+    if (waited >= untold && !self.hasTold_ && self.waiting_) {
+        self.hasTold_ = true;
+        self.waiting_();
+    }
+    std::chrono::milliseconds const next(1 << std::min(attempt, 6));
+    std::this_thread::sleep_for(std::min(next, self.wait_ - waited));
+    return 1;
 }
 
 void Database::Fail(int code) const {

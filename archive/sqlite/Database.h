@@ -20,7 +20,9 @@ class Database {
 public:
     enum class Access : std::uint8_t { Use, Make };
 
-    Database(std::string const& path, Access access, std::chrono::milliseconds wait);
+    /// @param waiting as in `SqliteOptions`
+    Database(std::string const& path, Access access, std::chrono::milliseconds wait,
+             std::function<void()> waiting = {});
     Database(Database const&) = delete;
     Database& operator=(Database const&) = delete;
     ~Database();
@@ -51,7 +53,14 @@ private:
         void operator()(sqlite3_stmt* statement) const noexcept { sqlite3_finalize(statement); }
     };
 
+    /// SQLite's busy handler. @return 0 when it has been long enough
+    static int WaitFor(void* database, int attempt) noexcept;
+
     std::string path_;
+    std::chrono::milliseconds wait_;
+    std::function<void()> waiting_;
+    std::chrono::steady_clock::time_point waitsSince_;
+    bool hasTold_ = false;
     std::unique_ptr<sqlite3, Close> handle_;
     std::unordered_map<const char*, std::unique_ptr<sqlite3_stmt, Finalize>> statements_;
 };

@@ -15,8 +15,8 @@ constexpr std::size_t maximumIdle = 8;
 
 SqliteStore::SqliteStore(std::string filePath, SqliteOptions const& givenOptions)
     : path(std::move(filePath)), options(givenOptions), cache(givenOptions.cacheBytes) {
-    auto first = std::make_unique<Connection>(path, options.create ? Database::Access::Make : Database::Access::Use,
-                                              options.wait);
+    auto first =
+        std::make_unique<Connection>(path, options.create ? Database::Access::Make : Database::Access::Use, options);
     EnsureSchema(first->database, options.create);
     connections.reserve(maximumIdle);
     connections.push_back(std::move(first));
@@ -31,7 +31,7 @@ std::unique_ptr<Connection> SqliteStore::Take() {
             return taken;
         }
     }
-    auto made = std::make_unique<Connection>(path, Database::Access::Use, options.wait);
+    auto made = std::make_unique<Connection>(path, Database::Access::Use, options);
     EnsureSchema(made->database, false);
     return made;
 }

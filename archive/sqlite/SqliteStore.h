@@ -67,8 +67,8 @@ private:
 };
 
 struct Connection {
-    Connection(std::string const& path, Database::Access access, std::chrono::milliseconds wait)
-        : database(path, access, wait) {}
+    Connection(std::string const& path, Database::Access access, SqliteOptions const& options)
+        : database(path, access, options.wait, options.waiting) {}
 
     Database database;
     Compressor compressor;

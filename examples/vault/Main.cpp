@@ -6,10 +6,10 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <array>
 #include <cstdlib>
 #include <functional>
 #include <iostream>
-#include <map>
 #include <new>
 #include <numeric>
 #include <sys/resource.h>
@@ -28,7 +28,7 @@ Begin:
   vault status ~/notes                      what differs from the last version
   vault save ~/notes -m 'More'              the next version
   vault log                                 all versions
-  vault diff master ~/notes --text          what has changed, line by line
+  vault diff ~/notes --text                 what has changed, line by line
   vault restore master:todo.txt todo.old    one file as it was
 Work with others:
   vault sync /mnt/stick/vault.db            brings their branches in as other/NAME
@@ -129,11 +129,13 @@ void DescribeViews(CommandLine& line) {
             line.diff.listing = line.listing;
             return Diff(line.place, line.diff);
         });
-    diff->add_option("BEFORE", line.diff.before, revisionHelp)->required();
-    diff->add_option("AFTER", line.diff.after, "a revision, or a directory")->required();
+    diff->add_option("BEFORE", line.diff.before, std::string(revisionHelp) + ", or a directory")->required();
+    diff->add_option("AFTER", line.diff.after,
+                     "likewise; without it, the current version is compared with what is given");
     diff->add_option("PATH", line.diff.path, "only what lies there");
-    diff->add_flag("--text", line.diff.text, "show the lines that differ");
+    auto* const text = diff->add_flag("--text", line.diff.text, "show the lines that differ");
     AddListingOptions(diff, line.listing);
+    text->excludes("--json");
 
     auto* const graph = line.Add("graph", "draw the history: as text on a terminal, otherwise for Graphviz",
                                  [&line] { return Graph(line.place, line.flag || isatty(STDOUT_FILENO) == 1); });
@@ -153,13 +155,29 @@ void DescribeBranches(CommandLine& line) {
         line.Add("checkout", "make a branch the current one", [&line] { return Checkout(line.place, line.first); });
     checkout->add_option("NAME", line.first, "the branch")->required();
 
+    auto* const rebase = line.Add("rebase", "put a branch's own versions, as they are, on top of another branch",
+                                  [&line] { return Rebase(line.place, line.first, line.second); });
+    rebase->add_option("BRANCH", line.first, "the branch to move")->required();
+    rebase->add_option("ONTO", line.second, "the branch to put it on")->required();
+
+    auto* const join = line.Add("join", "give two unrelated branches a common root",
+                                [&line] { return Join(line.place, line.first, line.second, line.third); });
+    join->add_option("FIRST", line.first, "a branch")->required();
+    join->add_option("SECOND", line.second, "another branch")->required();
+    join->add_option("ROOT", line.third, "the branch of the root, made if it is missing")->required();
+}
+
+ConflictPolicy PolicyOf(std::string_view word) noexcept {
+    return word == "left"     ? ConflictPolicy::Left
+           : word == "right"  ? ConflictPolicy::Right
+           : word == "base"   ? ConflictPolicy::Base
+           : word == "newest" ? ConflictPolicy::Newest
+                              : ConflictPolicy::Stop;
+}
+
+void DescribeMerging(CommandLine& line) {
     auto* const merge = line.Add("merge", "bring another branch's changes into the current one", [&line] {
-        const std::map<std::string, ConflictPolicy> policies{{"left", ConflictPolicy::Left},
-                                                             {"right", ConflictPolicy::Right},
-                                                             {"base", ConflictPolicy::Base},
-                                                             {"newest", ConflictPolicy::Newest},
-                                                             {"stop", ConflictPolicy::Stop}};
-        line.merge.policy = policies.at(line.policy);
+        line.merge.policy = PolicyOf(line.policy);
         line.merge.json = line.listing.json;
         return Merge(line.place, line.merge);
     });
@@ -182,17 +200,6 @@ void DescribeBranches(CommandLine& line) {
                                 [&line] { return Sync(line.place, line.first, line.removal.yes); });
     sync->add_option("OTHER", line.first, "the other vault")->required();
     sync->add_flag("--yes", line.removal.yes, "also bring back what was forgotten, without asking");
-
-    auto* const rebase = line.Add("rebase", "put a branch's own versions, as they are, on top of another branch",
-                                  [&line] { return Rebase(line.place, line.first, line.second); });
-    rebase->add_option("BRANCH", line.first, "the branch to move")->required();
-    rebase->add_option("ONTO", line.second, "the branch to put it on")->required();
-
-    auto* const join = line.Add("join", "give two unrelated branches a common root",
-                                [&line] { return Join(line.place, line.first, line.second, line.third); });
-    join->add_option("FIRST", line.first, "a branch")->required();
-    join->add_option("SECOND", line.second, "another branch")->required();
-    join->add_option("ROOT", line.third, "the branch of the root, made if it is missing")->required();
 }
 
 void DescribeUpkeep(CommandLine& line) {
@@ -251,8 +258,11 @@ std::string_view CommandWord(int argumentCount, char** arguments) {
 
 /// Describes the commands among which @p word is, or all of them: each takes a while.
 void DescribeCommands(CommandLine& line, std::string_view word) {
-    using Describe = void (*)(CommandLine&);
-    for (const Describe describe : {&DescribeViews, &DescribeFiles, &DescribeBranches, &DescribeUpkeep}) {
+    std::array order{&DescribeViews, &DescribeFiles, &DescribeBranches, &DescribeMerging, &DescribeUpkeep};
+    // Who reads about all of them begins with saving.
+    if (word.empty())
+        std::swap(order[0], order[1]);
+    for (auto* const describe : order) {
         describe(line);
         if (!line.app.get_subcommands([word](CLI::App* command) { return command->get_name() == word; }).empty())
             return;
@@ -284,7 +294,7 @@ int Run(CommandLine& line, int argumentCount, char** arguments) {
     auto& app = line.app;
     app.require_subcommand(1);
     app.set_version_flag("--version", std::string(VAULT_VERSION));
-    app.footer(footer);
+    app.footer("vault --help shows how to begin, and what the exit statuses stand for.");
     app.get_formatter()->column_width(34);
     app.add_option("-f,--file", line.place.file, "the vault: a file, or the address of a database (postgresql://...)")
         ->envname("VAULT_FILE")
@@ -293,6 +303,9 @@ int Run(CommandLine& line, int argumentCount, char** arguments) {
         ->capture_default_str();
     const auto word = CommandWord(argumentCount, arguments);
     DescribeCommands(line, word);
+    app.footer(footer);
+    if (word == "help")
+        throw CLI::CallForHelp();
     RequireCommand(line, word);
     app.parse(argumentCount, arguments);
     line.place.wait = std::chrono::seconds(line.waitSeconds);
@@ -331,6 +344,8 @@ int main(int argumentCount, char** arguments) {
     } catch (KivArchive::ArchiveError const& error) {
         const bool isDamage = error.GetKind() == KivArchive::Failure::Damaged;
         return vault::Complain(error.what(), isDamage ? vault::findingsExitStatus : 2);
+    } catch (CLI::ParseError const& error) {
+        return vault::Complain(vault::Printable(std::string_view(error.what())) + " (--help shows how)");
     } catch (std::bad_alloc const&) {
         return vault::Complain("out of memory");
     } catch (std::exception const& error) {

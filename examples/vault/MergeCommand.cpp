@@ -32,6 +32,11 @@ constexpr int mostAttempts = 20;
 /// What is put behind the name of the other side's file.
 constexpr std::string_view theirsSuffix = "~theirs";
 
+void WriteJson(std::string_view result, Id const& head, std::string const& conflicts) {
+    std::cout << R"({"result":")" << result << R"(","head":")" << DigitsOf(head) << "\",\"conflicts\":" << conflicts
+              << "}\n";
+}
+
 std::string Join(PathView path) {
     std::string joined;
     for (auto const& component : path)
@@ -120,20 +125,13 @@ public:
             if (conflict.settlement != ConflictSettlement::Combined)
                 versions_.settled.insert(path);
         }
-        if (merge.gaveUp || !merge.tree) {
-            Describe();
-            throw Problem("the merge was given up; nothing was changed", findingsExitStatus);
-        }
+        if (merge.gaveUp || !merge.tree)
+            Stop("the merge was given up; nothing was changed");
         auto merged = MergeAttributes(vault_.Archive(), merge.tree, versions_);
         modes_ = merged.conflicts;
-        if (options_.policy == ConflictPolicy::Stop && options_.into.empty() && IsDisputed()) {
-            isStopped_ = true;
-            Describe();
-            throw Problem(
-                "stopped by conflicts; nothing was changed (--on-conflict chooses who wins, --into writes them "
-                "into a directory)",
-                findingsExitStatus);
-        }
+        if (options_.policy == ConflictPolicy::Stop && options_.into.empty() && IsDisputed())
+            Stop("stopped by conflicts; nothing was changed (--on-conflict chooses who wins, --into writes them into a "
+                 "directory)");
         return merged;
     }
 
@@ -167,12 +165,19 @@ public:
             (json += json.size() == 1 ? "\n" : ",\n") +=
                 "{\"path\":" + JsonText(ToUtf8(conflict.path)) + ",\"left\":\"" + WordFor(conflict.leftChange) +
                 "\",\"right\":\"" + WordFor(conflict.rightChange) + "\",\"taken\":\"" +
-                std::string(WordFor(conflict.settlement)) + "\"}";
+                std::string(isStopped_ ? "undecided"
+                            : IsReal(conflict) && conflict.settlement == ConflictSettlement::Combined
+                                ? "marked"
+                                : WordFor(conflict.settlement)) +
+                "\"}";
         for (auto const& conflict : modes_)
             (json += json.size() == 1 ? "\n" : ",\n") += "{\"path\":" + JsonText(conflict.path) + ",\"left\":\"" +
                                                          std::string(conflict.left) + "\",\"right\":\"" +
                                                          std::string(conflict.right) + "\",\"taken\":\"" +
-                                                         (versions_.prefersRight ? "right" : "left") + "\"}";
+                                                         (isStopped_               ? "undecided"
+                                                          : versions_.prefersRight ? "right"
+                                                                                   : "left") +
+                                                         "\"}";
         return json + "\n]";
     }
 
@@ -189,12 +194,9 @@ public:
             ++disputed;
             const auto path = ToUtf8(conflict.path);
             const auto theirs = reader_.Find(right_.tree, path);
-            if (conflict.settlement == ConflictSettlement::Combined || !theirs || theirs->id == merged.tree)
+            if (conflict.settlement != ConflictSettlement::Left || !theirs || theirs->id == merged.tree)
                 continue;
-            const auto target = options_.into + '/' + FilePath(path) +
-                                (conflict.settlement == ConflictSettlement::Left ? std::string(theirsSuffix) : "");
-            if (conflict.settlement != ConflictSettlement::Left)
-                continue;
+            const auto target = options_.into + '/' + FilePath(path) + std::string(theirsSuffix);
             for (auto& problem : Restore(overlay, *theirs, {target, false, false, false}, progress))
                 problems.push_back(std::move(problem));
         }
@@ -204,6 +206,15 @@ public:
     }
 
 private:
+    [[noreturn]] void Stop(std::string const& reason) {
+        isStopped_ = true;
+        if (options_.json)
+            WriteJson("stopped", left_.id, Json());
+        else
+            Describe();
+        throw Problem(reason, findingsExitStatus);
+    }
+
     [[nodiscard]] KivArchive::MergeSources Sources() {
         return {[this](std::span<const Id> commits, std::size_t more) {
                     return vault_.Archive().ReadAncestry(commits, KivArchive::Follow::Everything, more);
@@ -310,8 +321,7 @@ private:
 void Finish(MergeOptions const& options, std::string_view result, std::string const& sentence, Id const& head,
             Merger const* merger) {
     if (options.json) {
-        std::cout << R"({"result":")" << result << R"(","head":")" << DigitsOf(head)
-                  << "\",\"conflicts\":" << (merger == nullptr ? "[]" : merger->Json()) << "}\n";
+        WriteJson(result, head, merger == nullptr ? "[]" : merger->Json());
         return;
     }
     if (merger != nullptr)
@@ -364,10 +374,11 @@ std::optional<int> TryMerge(Vault& vault, MergeOptions const& options, Author co
     auto merged = merger.Run();
     if (!options.into.empty()) {
         const auto disputed = merger.WriteInto(merged);
-        merger.Describe();
-        std::cout << disputed << " conflicts to settle in " << Printable(StoredName(options.into))
-                  << "; then say: vault save " << Printable(StoredName(options.into)) << " --merge "
-                  << Printable(options.revision) << '\n';
+        const auto directory = Printable(StoredName(options.into));
+        Finish(options, "written",
+               std::to_string(disputed) + " conflicts to settle in " + directory + "; then say: vault save " +
+                   directory + " --merge " + Printable(options.revision),
+               left.id, &merger);
         return disputed == 0 ? 0 : findingsExitStatus;
     }
     const auto commit =

@@ -1,5 +1,7 @@
 #include "Names.h"
 
+#include "Text.h"
+
 #include <algorithm>
 #include <cstring>
 
@@ -65,9 +67,8 @@ int Rank(std::string_view name, std::size_t at) noexcept {
 }
 
 void AppendHex(std::string& text, unsigned value, int digits) {
-    constexpr std::string_view hex = "0123456789abcdef";
     for (int shift = (digits - 1) * 4; shift >= 0; shift -= 4)
-        text += hex[(value >> static_cast<unsigned>(shift)) & 0xFU];
+        text += hexDigits[(value >> static_cast<unsigned>(shift)) & 0xFU];
 }
 
 } // namespace

@@ -340,7 +340,9 @@ std::vector<std::string> Restore(IArchive& archive, Entry const& entry, RestoreO
             return Writer(archive, existing.Top(), options, false, progress).WriteTree(entry.id);
     } else if (isThere && (entry.isDirectory || S_ISDIR(status.st_mode) || !options.force)) {
         throw Problem(Shown(options.target) + " is there already" +
-                      (entry.isDirectory || S_ISDIR(status.st_mode) ? "" : " (--force replaces it)"));
+                      (entry.isDirectory         ? ""
+                       : S_ISDIR(status.st_mode) ? " (name the file that it is to become)"
+                                                 : " (--force replaces it)"));
     }
     const auto place = FindPlace(isThere ? RealPath(options.target) : options.target);
     Sibling sibling(place);

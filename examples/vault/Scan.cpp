@@ -5,7 +5,6 @@
 #include "Parallel.h"
 #include "Problem.h"
 
-#include <KivVcs/Tree.h>
 #include <algorithm>
 #include <cerrno>
 #include <condition_variable>
@@ -22,6 +21,8 @@ namespace {
 
 /// How many directories wait with a descriptor of the one that they are in; the rest is opened by its path.
 constexpr int mostHeld = 200;
+/// Every directory below has a path that is longer than this one's: what a chain of them takes grows with its square.
+constexpr std::size_t longestPath = std::size_t{64} * 1024;
 
 struct Pattern {
     std::string text;
@@ -84,7 +85,6 @@ public:
 private:
     struct Task {
         std::size_t directory = 0;
-        std::size_t depth = 0;
         /// Of the directory that it is in, or null.
         std::shared_ptr<Descriptor> parent;
         std::string name;
@@ -145,7 +145,7 @@ private:
         const auto end = std::unique(found.begin(), found.end(),
                                      [](auto const& left, auto const& right) { return left.name == right.name; });
         directory.entries.assign(std::move_iterator(found.begin()), std::move_iterator(end));
-        PutOff(task, directory, opened);
+        PutOff(directory, opened);
     }
 
     Descriptor Open(Task const& task, ScannedDirectory const& directory, DirectoryOpener& opener) {
@@ -188,20 +188,21 @@ private:
     }
 
     /// Leaves the directories in @p directory to whoever has time.
-    void PutOff(Task const& task, ScannedDirectory& directory, std::shared_ptr<Descriptor> const& opened) {
+    void PutOff(ScannedDirectory& directory, std::shared_ptr<Descriptor> const& opened) {
         const std::scoped_lock lock(mutex_);
         for (auto& entry : directory.entries) {
             if (entry.kind != ScannedEntry::Kind::Directory)
                 continue;
-            // Each opens more deeply nested ones, up to what versions can be read back with.
-            if (task.depth + 1 >= KivVcs::deepestLoadedNesting)
-                throw Problem("nested too deep: " + PrintableName(directory.path + entry.name));
+            // Before anything is stored that could not be read back.
+            if (directory.path.size() + entry.name.size() >= longestPath)
+                throw Problem("nested too deep, nothing was saved: " + PrintableName(directory.path.substr(0, 200)) +
+                              "... and below that " + PrintableName(entry.name));
             entry.directory = scan_.directories.size();
             scan_.directories.push_back({directory.path + entry.name + '/', {}, {}});
             const bool isHeld = held_ < mostHeld;
             held_ += isHeld ? 1 : 0;
-            waiting_.push_back({entry.directory, task.depth + 1, isHeld ? opened : nullptr,
-                                isHeld ? FilePath(entry.name) : std::string(), &entry});
+            waiting_.push_back(
+                {entry.directory, isHeld ? opened : nullptr, isHeld ? FilePath(entry.name) : std::string(), &entry});
         }
     }
 

@@ -20,6 +20,8 @@ namespace {
 
 /// A file that was changed less than this before it was read may change again without showing it.
 constexpr std::int64_t racyNanoseconds = 2'000'000'000;
+/// Directories with longer paths, which are nested so deep that nobody made them by hand, are read every time.
+constexpr std::size_t longestIndexedPath = 4096;
 constexpr std::uint64_t mostPendingBytes = std::uint64_t{4} * 1024 * 1024;
 
 std::int64_t Now() noexcept {
@@ -323,6 +325,7 @@ private:
         packed.tree.earlier = state.previousTree;
         Add(std::move(packed.tree));
         if (options_.stores && pendingBytes_ > mostPendingBytes) {
+            snapshot_.stored += snapshot_.change.objects.size();
             archive_.Apply(snapshot_.change);
             snapshot_.change = {};
             pending_.clear();
@@ -341,6 +344,8 @@ private:
     [[nodiscard]] std::string MakeIndex() const {
         StatIndexWriter writer;
         for (std::size_t at = 0; at < states_.size(); ++at) {
+            if (scan_.directories[at].path.size() > longestIndexedPath)
+                continue;
             const auto known = states_[at].isOpen ? std::nullopt : index_.Find(scan_.directories[at].path);
             if (known)
                 writer.Copy(*known);

@@ -26,7 +26,7 @@ struct SnapshotOptions {
 struct Snapshot {
     Id tree;
     std::uint64_t files = 0;
-    /// How many contents were stored on the way.
+    /// How many objects were stored on the way.
     std::uint64_t stored = 0;
     /// What is still to be stored, children first: trees and contents of attributes; with what they rely on.
     KivArchive::Change change;

@@ -9,6 +9,8 @@
 
 namespace vault {
 
+inline constexpr std::string_view hexDigits = "0123456789abcdef";
+
 /// The library's text is UTF-16; files and terminals speak UTF-8.
 using Text = KivVcs::KivStringT<char16_t>;
 using TextView = KivVcs::KivStringViewT<char16_t>;

@@ -2,6 +2,7 @@
 
 #include "Names.h"
 #include "Problem.h"
+#include "Text.h"
 
 #include <KivArchive/Upkeep.h>
 #include <algorithm>
@@ -61,8 +62,7 @@ std::string OwnName(std::string_view name, bool isSpread) {
     for (const char c : name)
         hash = (hash ^ static_cast<unsigned char>(c)) * 16777619U;
     hash ^= hash >> 16U;
-    constexpr std::string_view hex = "0123456789abcdef";
-    return own += {hex[(hash >> 12U) & 0xFU], hex[(hash >> 8U) & 0xFU]};
+    return own += {hexDigits[(hash >> 12U) & 0xFU], hexDigits[(hash >> 8U) & 0xFU]};
 }
 
 NewObject MakeObject(ObjectType type, std::string_view data) {
@@ -227,13 +227,12 @@ Buffer BufferOf(std::string_view bytes) {
 }
 
 std::string DigitsOf(Id const& id) {
-    constexpr std::string_view hex = "0123456789abcdef";
     std::string digits;
     if (auto const* const digest = id.GetDigest()) {
         digits.reserve(2 * digest->size());
         for (const auto byte : *digest) {
-            digits += hex[byte >> 4U];
-            digits += hex[byte & 0xFU];
+            digits += hexDigits[byte >> 4U];
+            digits += hexDigits[byte & 0xFU];
         }
     }
     return digits;

@@ -7,10 +7,12 @@
 #include "OldVault.h"
 #include "Output.h"
 #include "Problem.h"
+#include "Progress.h"
 
 #include <KivArchive/SqliteArchive.h>
 #include <algorithm>
-#include <fcntl.h>
+#include <fstream>
+#include <sstream>
 #include <sys/stat.h>
 
 namespace vault {
@@ -39,17 +41,38 @@ Id Before(std::string digits) {
     return {};
 }
 
-/// Says who is writing to a vault, for those who are going to wait for that.
+/// Who is writing to a vault, or nobody that can be seen from here. SQLite's own files are not opened for that: the locks of
+/// this process would go when they are closed.
+std::string WhoWrites(std::string const& file) {
+    struct stat shared {};
+    constexpr unsigned long long writing = 120;
+    if (stat((file + "-shm").c_str(), &shared) != 0)
+        return {};
+    std::ifstream locks("/proc/locks");
+    for (std::string line; std::getline(locks, line);) {
+        // "1: POSIX  ADVISORY  WRITE 4711 08:01:1234 120 120"
+        std::istringstream words(line);
+        std::string number;
+        std::string kind;
+        std::string strength;
+        std::string access;
+        std::string process;
+        std::string inode;
+        unsigned long long first = 0;
+        unsigned long long last = 0;
+        words >> number >> kind >> strength >> access >> process >> inode >> first >> last;
+        if (words && access == "WRITE" && inode.ends_with(':' + std::to_string(shared.st_ino)) && first <= writing &&
+            writing <= last)
+            return process;
+    }
+    return {};
+}
+
 void TellWhoWrites(std::string const& file, std::chrono::seconds wait) {
-    // Who writes has a lock on this byte. Nothing of this process may have the file open, whose locks would go.
-    const Descriptor shared(open((file + "-shm").c_str(), O_RDONLY | O_CLOEXEC));
-    struct flock lock {};
-    lock.l_type = F_WRLCK;
-    lock.l_start = 120;
-    lock.l_len = 1;
-    if (shared.IsOpen() && fcntl(shared.Get(), F_GETLK, &lock) == 0 && lock.l_type != F_UNLCK)
-        Warn("waiting, at most " + std::to_string(wait.count()) + " s, for process " + std::to_string(lock.l_pid) +
-             ", which is writing to " + PrintableName(StoredName(file)));
+    const auto process = WhoWrites(file);
+    Warn("waiting, at most " + std::to_string(wait.count()) + " s, for " +
+         (process.empty() ? "another process" : "process " + process) + ", which is writing to " +
+         PrintableName(StoredName(file)));
 }
 
 } // namespace
@@ -69,13 +92,15 @@ Vault::Vault(VaultPlace const& place, Access access)
     if (isThere && S_ISDIR(status.st_mode))
         throw Problem(PrintableName(StoredName(place.file)) + " is a directory, not a vault file");
     isMadeHere_ = !isThere;
-    if (isThere && access != Access::Read)
-        TellWhoWrites(file_, place.wait);
     if (isThere)
         UpgradeOldVault(file_, place.wait);
     KivArchive::SqliteOptions options;
     options.create = access == Access::Create;
     options.wait = place.wait;
+    options.waiting = [this, wait = place.wait] {
+        if (!hasTold_.test_and_set())
+            TellWhoWrites(file_, wait);
+    };
     archive_ = std::make_shared<KivArchive::SqliteArchive>(file_, options);
     stored_ = archive_;
 }
@@ -140,7 +165,7 @@ CommitRecord Vault::Find(std::string const& revision) const {
     Id id = HeadOf(name);
     const auto isIdentifier = [&revision](std::size_t least) {
         return revision.size() >= least && revision.size() <= 64 &&
-               revision.find_first_not_of("0123456789abcdef") == std::string::npos;
+               revision.find_first_not_of(hexDigits) == std::string::npos;
     };
     if (id.IsEmpty() && !isIdentifier(64) && (revision.empty() || name == CurrentBranch()))
         throw Problem("branch " + Printable(name) + " has no versions yet");
@@ -162,7 +187,8 @@ CommitRecord Vault::Find(std::string const& revision) const {
             id = found.front();
     }
     if (id.IsEmpty())
-        throw Problem("no such revision: " + Printable(revision));
+        throw Problem("no such revision: " + Printable(revision) +
+                      " (a branch or an identifier, with :PATH behind it for a file of a version)");
     auto commits = KivArchive::ReadCommits(*archive_, std::span(&id, 1));
     if (commits.empty() || commits.front().state != KivArchive::CommitState::Sound)
         throw Problem("version " + DigitsOf(id) + " is damaged or missing", findingsExitStatus);
@@ -203,6 +229,12 @@ std::string StoredPath(std::string_view filePath) {
 bool MoveHead(Vault& vault, KivArchive::Change change, Text const& branch, Id const& expected, Id const& head) {
     change.branches.push_back({branch, expected, head});
     return vault.Archive().Apply(change).applied;
+}
+
+void Publish(KivArchive::ArchivedRepository& repository) {
+    Progress progress("writing");
+    if (!repository.Publish(&progress).published)
+        throw Problem("somebody else changed the branches meanwhile; nothing was changed. Try again");
 }
 
 } // namespace vault

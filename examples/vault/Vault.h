@@ -3,7 +3,9 @@
 #include "Text.h"
 #include "Trees.h"
 
+#include <KivArchive/ArchivedRepository.h>
 #include <KivArchive/Listings.h>
+#include <atomic>
 #include <chrono>
 #include <memory>
 
@@ -33,8 +35,8 @@ class Vault {
 public:
     enum class Access { Read, Write, Create };
 
-    /// Opens the database, or the file, bringing one of an earlier release up to date first; or makes it. Says
-    /// whom those who want to write will have to wait for.
+    /// Opens the database, or the file, bringing one of an earlier release up to date first; or makes it. Whoever has to
+    /// wait later for somebody else who writes is told.
     /// @throws Problem, KivArchive::ArchiveError
     explicit Vault(VaultPlace const& place, Access access = Access::Read);
     Vault(Vault const&) = delete;
@@ -67,6 +69,8 @@ public:
 
 private:
     std::string file_;
+    /// Whether it has been said whom this one waits for.
+    std::atomic_flag hasTold_;
     std::shared_ptr<IArchive> archive_;
     std::shared_ptr<IArchive> stored_;
     bool isMadeHere_ = false;
@@ -81,5 +85,8 @@ private:
 /// The current branch's new head, and what else is to change with it. @return false if somebody else has moved it
 [[nodiscard]] bool MoveHead(Vault& vault, KivArchive::Change change, Text const& branch, Id const& expected,
                             Id const& head);
+
+/// Stores what has become of branches in memory. @throws Problem if somebody else has changed them meanwhile
+void Publish(KivArchive::ArchivedRepository& repository);
 
 } // namespace vault

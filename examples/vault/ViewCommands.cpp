@@ -30,6 +30,19 @@ std::string ColouredWord(PathChange::Kind kind) {
                                                               : Colour::Yellow);
 }
 
+void ListChange(PathChange const& change) {
+    std::cout << ColouredWord(change.kind) << ' ' << PrintableName(change.path)
+              << (change.sameAs.empty() ? "" : " (as in " + PrintableName(change.sameAs) + ')') << '\n';
+}
+
+/// @return the exit status
+int TellOfRest(std::size_t count) {
+    if (count == 0)
+        return 0;
+    Warn(std::to_string(count) + " more paths differ");
+    return cutOffExitStatus;
+}
+
 void ListEntries(Directory const& directory) {
     for (auto const& entry : directory.entries) {
         std::cout << (entry.isDirectory                 ? "tree "
@@ -126,7 +139,7 @@ private:
 };
 
 /// Writes what differs as `patch` reads it.
-void WriteTextDifferences(std::vector<PathChange> const& changes, Side const& before, Side const& after) {
+void WriteTextDifferences(std::span<PathChange const> changes, Side const& before, Side const& after) {
     for (auto const& change : changes) {
         const auto path = PrintableName(change.path);
         const auto old = before.Read(change.path, change.oldId);
@@ -136,7 +149,7 @@ void WriteTextDifferences(std::vector<PathChange> const& changes, Side const& be
         options.newLabel = (change.newId.IsEmpty() ? "/dev/null" : "b/" + path).c_str();
         const auto text = old && current ? KivArchive::UnifiedText(*old, *current, options) : std::nullopt;
         if (change.oldId.IsEmpty() && change.newId.IsEmpty())
-            std::cout << WordFor(change.kind) << ' ' << path << '\n';
+            ListChange(change);
         else if (text)
             std::cout << BytesOf(*text);
         else
@@ -214,15 +227,13 @@ int ListChanges(std::vector<PathChange> const& changes, ListingOptions const& li
                       << "\",\"new\":\"" << DigitsOf(change.newId) << '"'
                       << (change.sameAs.empty() ? "" : ",\"as\":" + JsonText(change.sameAs)) << '}';
         else
-            std::cout << ColouredWord(change.kind) << ' ' << PrintableName(change.path)
-                      << (change.sameAs.empty() ? "" : " (as in " + PrintableName(change.sameAs) + ')') << '\n';
+            ListChange(change);
     }
     if (listing.json)
         std::cout << "\n]\n";
-    if (shown == changes.size())
-        return 0;
-    Warn(std::to_string(changes.size() - shown) + " more paths differ");
-    return cutOffExitStatus;
+    if (changes.empty() && IsTerminal() && !listing.json)
+        std::cout << "nothing differs\n";
+    return TellOfRest(changes.size() - shown);
 }
 
 int Log(VaultPlace const& place, std::string const& target, ListingOptions const& listing) {
@@ -251,6 +262,8 @@ int Log(VaultPlace const& place, std::string const& target, ListingOptions const
     });
     if (listing.json)
         std::cout << "\n]\n";
+    if (isCutOff && listing.json)
+        Warn("there are more versions");
     return isCutOff ? cutOffExitStatus : 0;
 }
 
@@ -270,13 +283,15 @@ int Show(VaultPlace const& place, std::string const& target) {
 int Diff(VaultPlace const& place, DiffOptions const& options) {
     Vault vault(place);
     Overlay archive(vault.Archive());
-    const Side before(vault, archive, options.before, {});
-    const Side after(vault, archive, options.after, before.Tree());
+    const bool isAlone = options.after.empty();
+    const Side before(vault, archive, isAlone ? std::string() : options.before, {});
+    const Side after(vault, archive, isAlone ? options.before : options.after, before.Tree());
     const auto changes = FindChanges(archive, before.Tree(), after.Tree(), StoredPath(options.path));
     if (!options.text)
         return ListChanges(changes, options.listing);
-    WriteTextDifferences(changes, before, after);
-    return 0;
+    const auto shown = std::min(options.listing.limit, changes.size());
+    WriteTextDifferences(std::span(changes).first(shown), before, after);
+    return TellOfRest(changes.size() - shown);
 }
 
 } // namespace vault

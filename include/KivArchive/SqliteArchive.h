@@ -17,6 +17,9 @@ struct SqliteOptions {
     bool create = true;
     /// How long to wait while somebody else writes.
     std::chrono::milliseconds wait{30000};
+    /// Called when a call has waited for others a quarter of a second, on its thread, so that a host can say so. It must
+    /// not call the archive, nor throw. May be empty.
+    std::function<void()> waiting;
     /// How many threads one call may use for compressing and hashing; 0 stands for as many as there are processors.
     unsigned workers = 0;
     /// About how much memory to keep stored forms in that differences refer to.
