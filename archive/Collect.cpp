@@ -197,59 +197,88 @@ void InPages(std::vector<Id> const& ids, Call call) {
         call(std::span<const Id>(ids.data() + begin, std::min(pageSize, ids.size() - begin)));
 }
 
+/// One collection. Its parts are made in this order: what is used after its mark was read is unmarked then, which removing
+/// sees.
+class Collecting {
+public:
+    Collecting(IArchive& archive, CollectOptions const& options, IProgress* progress)
+        : archive_(archive), options_(options), progress_(progress), due_(ReadMarks(archive, options.grace)),
+          marked_(ReadMarks(archive, std::chrono::seconds(0))), index_(archive, progress),
+          walk_(archive, index_, progress) {}
+
+    CollectReport Run() {
+        Reach();
+        report_.reached = walk_.CountReached();
+        Mark();
+        report_.removed = Removal(archive_, walk_, options_, progress_).Run(Doomed());
+        while (std::uint64_t const rest = archive_.Compact(options_.sliceBytes))
+            ReportProgress(progress_, {"giving space back", 0, rest}, {});
+        return report_;
+    }
+
+private:
+    void Reach() {
+        std::vector<Id> roots = options_.kept;
+        for (Branch const& branch : archive_.ReadBranches())
+            roots.push_back(branch.head);
+        walk_.From(roots, true);
+        // Which may be gone already, from before they were kept.
+        std::vector<Id> exchanged;
+        for (ExchangedHead const& head : ReadExchangedHeads(archive_))
+            if (!head.tree.IsEmpty() && index_.Find(head.tree))
+                exchanged.push_back(head.tree);
+        walk_.From(exchanged, false);
+    }
+
+    /// Marks what is not reached and unmarks what is.
+    void Mark() {
+        std::vector<Id> unmarked;
+        for (Id const& id : marked_)
+            if (walk_.HasReached(id))
+                unmarked.push_back(id);
+        std::vector<Id> newlyMarked;
+        for (std::size_t number = 0; number < index_.Size(); ++number) {
+            Id const id = index_.At(number);
+            if (walk_.HasReached(number) || due_.count(id) != 0)
+                continue;
+            young_.push_back(id);
+            if (marked_.count(id) == 0)
+                newlyMarked.push_back(id);
+        }
+        // What is marked alone, without what names it, could not be removed.
+        if (newlyMarked.size() > options_.mostMarked)
+            newlyMarked = TopDown(archive_, newlyMarked).Next(options_.mostMarked);
+        InPages(unmarked, [this](std::span<const Id> page) { archive_.Unmark(page); });
+        InPages(newlyMarked, [this](std::span<const Id> page) { archive_.Mark(page); });
+        report_.unmarked = unmarked.size();
+        report_.marked = newlyMarked.size();
+    }
+
+    /// What is not due yet keeps all that it names.
+    [[nodiscard]] std::vector<Id> Doomed() {
+        walk_.From(young_, false);
+        std::vector<Id> doomed;
+        for (Id const& id : due_)
+            if (!walk_.HasReached(id))
+                doomed.push_back(id);
+        return doomed;
+    }
+
+    IArchive& archive_;
+    CollectOptions const& options_;
+    IProgress* progress_;
+    std::unordered_set<Id> due_;
+    std::unordered_set<Id> marked_;
+    ObjectIndex index_;
+    Walk walk_;
+    std::vector<Id> young_;
+    CollectReport report_;
+};
+
 } // namespace
 
 CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgress* progress) {
-    // In this order: what is used after its mark was read is unmarked then, which Remove sees.
-    std::unordered_set<Id> const due = ReadMarks(archive, options.grace);
-    std::unordered_set<Id> const marked = ReadMarks(archive, std::chrono::seconds(0));
-    ObjectIndex const index(archive, progress);
-    std::vector<Id> roots = options.kept;
-    for (Branch const& branch : archive.ReadBranches())
-        roots.push_back(branch.head);
-    Walk walk(archive, index, progress);
-    walk.From(roots, true);
-    // Which may be gone already, from before they were kept.
-    std::vector<Id> exchanged;
-    for (ExchangedHead const& head : ReadExchangedHeads(archive))
-        if (!head.tree.IsEmpty() && index.Find(head.tree))
-            exchanged.push_back(head.tree);
-    walk.From(exchanged, false);
-
-    CollectReport report;
-    report.reached = walk.CountReached();
-    std::vector<Id> unmarked;
-    for (Id const& id : marked)
-        if (walk.HasReached(id))
-            unmarked.push_back(id);
-    std::vector<Id> young;
-    std::vector<Id> newlyMarked;
-    for (std::size_t number = 0; number < index.Size(); ++number) {
-        Id const id = index.At(number);
-        if (walk.HasReached(number) || due.count(id) != 0)
-            continue;
-        young.push_back(id);
-        if (marked.count(id) == 0)
-            newlyMarked.push_back(id);
-    }
-    // What is marked alone, without what names it, could not be removed.
-    if (newlyMarked.size() > options.mostMarked)
-        newlyMarked = TopDown(archive, newlyMarked).Next(options.mostMarked);
-    InPages(unmarked, [&](std::span<const Id> page) { archive.Unmark(page); });
-    InPages(newlyMarked, [&](std::span<const Id> page) { archive.Mark(page); });
-    report.unmarked = unmarked.size();
-    report.marked = newlyMarked.size();
-
-    // What is not due yet keeps all that it names.
-    walk.From(young, false);
-    std::vector<Id> doomed;
-    for (Id const& id : due)
-        if (!walk.HasReached(id))
-            doomed.push_back(id);
-    report.removed = Removal(archive, walk, options, progress).Run(doomed);
-    while (std::uint64_t const rest = archive.Compact(options.sliceBytes))
-        ReportProgress(progress, {"giving space back", 0, rest}, {});
-    return report;
+    return Collecting(archive, options, progress).Run();
 }
 
 } // namespace KivArchive

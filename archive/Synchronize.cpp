@@ -1,4 +1,5 @@
 #include "Changes.h"
+#include "CommitsToCopy.h"
 #include "ExchangedHeads.h"
 #include "KivArchive/Upkeep.h"
 
@@ -47,83 +48,6 @@ std::unordered_map<Id, Arriving> Fetch(IArchive& from, std::vector<Id> const& id
     return fetched;
 }
 
-/// Missing commits, parents and what was merged before those who have them.
-class MissingCommits {
-public:
-    MissingCommits(IArchive& from, IArchive& to, std::vector<Id> const& heads, IProgress* progress)
-        : from_(from), to_(to) {
-        for (std::vector<Id> open = heads; !open.empty();) {
-            ReportProgress(progress, {"looking for missing versions", facts_.size(), 0}, {});
-            open = Discover(std::move(open));
-        }
-        for (Id const& head : heads)
-            Order(head);
-    }
-
-    [[nodiscard]] std::vector<Id> const& InOrder() const noexcept { return inOrder_; }
-    [[nodiscard]] Ancestry const& FactsOf(Id const& id) const { return facts_.at(id); }
-
-private:
-    /// Takes in those of @p open that are missing. @return what these lead to
-    std::vector<Id> Discover(std::vector<Id> open) {
-        std::erase_if(open, [this](Id const& id) { return facts_.count(id) != 0; });
-        std::vector<Id> const missing = to_.FindMissing(open);
-        auto known = from_.ReadAncestry(missing, Follow::Parents, 0);
-        std::vector<Id> next;
-        for (Ancestry& facts : known) {
-            std::vector<Id> const before = Before(facts);
-            next.insert(next.end(), before.begin(), before.end());
-            Id const commit = facts.commit;
-            facts_.insert_or_assign(commit, std::move(facts));
-        }
-        for (Id const& id : missing)
-            if (facts_.count(id) == 0)
-                Fail(Failure::Damaged, "The archive to copy from does not know the ancestry of one of its versions.");
-        return next;
-    }
-
-    /// What a commit comes after. A merged one that the source has collected is missed by nobody.
-    [[nodiscard]] std::vector<Id> Before(Ancestry const& facts) {
-        std::vector<Id> before;
-        for (ContainedCommit const& contained : facts.contains)
-            if (contained.how == Containment::Merged)
-                before.push_back(contained.id);
-        for (Id const& gone : from_.FindMissing(before))
-            std::erase(before, gone);
-        if (!facts.parent.IsEmpty())
-            before.push_back(facts.parent);
-        return before;
-    }
-
-    void Order(Id const& head) {
-        std::vector<std::pair<Id, bool>> open{{head, false}};
-        while (!open.empty()) {
-            auto const [id, isDone] = open.back();
-            open.pop_back();
-            auto const found = facts_.find(id);
-            if (found == facts_.end())
-                continue;
-            if (isDone) {
-                if (ordered_.insert(id).second)
-                    inOrder_.push_back(id);
-                continue;
-            }
-            if (!entered_.insert(id).second)
-                continue;
-            open.emplace_back(id, true);
-            for (Id const& before : Before(found->second))
-                open.emplace_back(before, false);
-        }
-    }
-
-    IArchive& from_;
-    IArchive& to_;
-    std::unordered_map<Id, Ancestry> facts_;
-    std::unordered_set<Id> entered_;
-    std::unordered_set<Id> ordered_;
-    std::vector<Id> inOrder_;
-};
-
 /// Copies the commits that it is given, with all that they bring.
 class Copying {
 public:
@@ -132,13 +56,14 @@ public:
 
     [[nodiscard]] std::uint64_t CountStored() const noexcept { return stored_; }
 
-    void Copy(std::span<const Id> commits, MissingCommits const& missing) {
+    void Copy(std::span<const Id> commits, CommitsToCopy const& missing) {
         arriving_ = Fetch(from_, {commits.begin(), commits.end()}, ObjectType::Commit);
         FetchTrees(commits, missing);
         StoreBlobs();
+        std::unordered_set<Id> const gone = GoneOfMerged(commits, missing);
         for (Id const& commit : commits) {
             StoreWithTrees(commit);
-            RelyOnMerged(missing.FactsOf(commit));
+            RelyOnMerged(missing.FactsOf(commit), gone);
             change_.ancestry.push_back(missing.FactsOf(commit));
         }
         Flush();
@@ -153,18 +78,31 @@ private:
         Id earlier;
     };
 
-    void RelyOnMerged(Ancestry const& facts) {
+    /// What the commits have merged and is not there: it was collected, or is about to come.
+    [[nodiscard]] std::unordered_set<Id> GoneOfMerged(std::span<const Id> commits, CommitsToCopy const& missing) {
         std::vector<Id> merged;
-        for (ContainedCommit const& contained : facts.contains)
-            if (contained.how == Containment::Merged)
-                merged.push_back(contained.id);
-        for (Id const& gone : to_.FindMissing(merged))
-            std::erase(merged, gone);
+        for (Id const& commit : commits)
+            AddMerged(missing.FactsOf(commit), merged);
+        auto const gone = to_.FindMissing(merged);
+        return {gone.begin(), gone.end()};
+    }
+
+    void RelyOnMerged(Ancestry const& facts, std::unordered_set<Id> const& gone) {
+        std::vector<Id> merged;
+        AddMerged(facts, merged);
+        std::erase_if(merged, [&](Id const& id) { return gone.count(id) != 0 && hasStored_.count(id) == 0; });
         change_.relied.insert(change_.relied.end(), merged.begin(), merged.end());
     }
 
     /// Level by level, so that the number of calls depends on the depth.
-    void FetchTrees(std::span<const Id> commits, MissingCommits const& missing) {
+    void FetchTrees(std::span<const Id> commits, CommitsToCopy const& missing) {
+        std::vector<Id> parents;
+        for (Id const& commit : commits)
+            if (Id const& parent = missing.FactsOf(commit).parent; !parent.IsEmpty())
+                parents.push_back(parent);
+        std::unordered_map<Id, Id> treesOf;
+        for (Ancestry const& facts : from_.ReadAncestry(parents, Follow::Parents, 0))
+            treesOf.emplace(facts.commit, facts.tree);
         std::vector<Pair> level;
         for (Id const& commit : commits) {
             Ancestry const& facts = missing.FactsOf(commit);
@@ -174,10 +112,8 @@ private:
                 (link.type == ObjectType::Tree ? tree : parentId) = link.id;
             if (!(tree == facts.tree) || !(parentId == facts.parent))
                 Fail(Failure::Damaged, "The archive to copy from knows another ancestry than its versions have.");
-            auto const parent =
-                from_.ReadAncestry({&facts.parent, facts.parent.IsEmpty() ? 0U : 1U}, Follow::Parents, 0);
             if (!tree.IsEmpty())
-                level.push_back({tree, parent.empty() ? Id() : parent.front().tree});
+                level.push_back({tree, treesOf[facts.parent]});
         }
         while (!level.empty())
             level = FetchLevel(std::move(level));
@@ -190,14 +126,7 @@ private:
         std::erase_if(level, [&](Pair const& pair) { return missing.count(pair.id) == 0; });
         std::vector<Id> wanted(missing.begin(), missing.end());
         auto trees = Fetch(from_, wanted, ObjectType::Tree);
-        std::vector<Id> earlier;
-        for (Pair const& pair : level)
-            if (!pair.earlier.IsEmpty() && trees.count(pair.earlier) == 0 && arriving_.count(pair.earlier) == 0)
-                earlier.push_back(pair.earlier);
-        // A hint only: what the source has dropped is none.
-        for (Id const& gone : from_.FindMissing(earlier))
-            std::erase(earlier, gone);
-        auto const before = Fetch(from_, earlier, ObjectType::Tree);
+        auto const before = FetchEarlier(level, trees);
         std::vector<Pair> blobs;
         std::vector<Pair> next;
         for (Pair const& pair : level) {
@@ -226,6 +155,20 @@ private:
             if (missingBlobs.count(pair.id) != 0 && wantedBlobs_.insert(pair.id).second)
                 blobs_.push_back(pair);
         return next;
+    }
+
+    /// The trees that those of a level replace, unless they come themselves.
+    [[nodiscard]] std::unordered_map<Id, Arriving> FetchEarlier(std::vector<Pair> const& level,
+                                                                std::unordered_map<Id, Arriving> const& trees) {
+        std::vector<Id> earlier;
+        for (Pair const& pair : level)
+            if (!pair.earlier.IsEmpty() && trees.count(pair.earlier) == 0 && arriving_.count(pair.earlier) == 0)
+                earlier.push_back(pair.earlier);
+        // A hint only: what the source has dropped is none.
+        auto const missing = from_.FindMissing(earlier);
+        std::unordered_set<Id> const gone(missing.begin(), missing.end());
+        std::erase_if(earlier, [&gone](Id const& id) { return gone.count(id) != 0; });
+        return Fetch(from_, earlier, ObjectType::Tree);
     }
 
     [[nodiscard]] std::unordered_set<Id> Missing(std::vector<Pair> const& pairs) {
@@ -408,7 +351,7 @@ SynchronizeReport Synchronize(IArchive& from, IArchive& to, SynchronizeOptions c
             report.heads.push_back(branch);
             heads.push_back(branch.head);
         }
-    MissingCommits const missing(from, to, heads, progress);
+    CommitsToCopy const missing(from, to, heads, progress);
     Copying copying(from, to, options, progress);
     std::span<const Id> rest(missing.InOrder());
     for (; !rest.empty(); rest = rest.subspan(std::min(commitsTogether, rest.size())))

@@ -57,6 +57,23 @@ private:
     std::int64_t const& seconds_;
 };
 
+/// Whether the head stands for a version whose parent others have rewritten.
+[[nodiscard]] inline bool WasPutOnRewritten(TimedRepository const& repo, Id const& version) {
+    Ancestry const facts = repo.FactsOf(repo.GetHead()->GetId()).front();
+    return std::count(facts.contains.begin(), facts.contains.end(),
+                      ContainedCommit{Containment::RewrittenFrom, version}) != 0;
+}
+
+/// Whether a version was put on a rewritten one, and that then gave way to another one with its tree.
+[[nodiscard]] inline bool GaveWayRewritten(TimedRepository const& repo, Id const& version) {
+    Ancestry const facts = repo.FactsOf(repo.GetHead()->GetId()).front();
+    return std::any_of(facts.contains.begin(), facts.contains.end(), [&](ContainedCommit const& each) {
+        auto const below = repo.FactsOf(each.id);
+        return !below.empty() && std::count(below.front().contains.begin(), below.front().contains.end(),
+                                            ContainedCommit{Containment::RewrittenFrom, version}) != 0;
+    });
+}
+
 /// An archive, and what those know who share it.
 struct SharedArchive {
     std::shared_ptr<MemArchive> archive = std::make_shared<MemArchive>();

@@ -313,11 +313,11 @@ private:
         if (sharing_ == Sharing::Branch && eachContainsOther && result == right)
             return; // Nothing was unpublished.
         if (model.LeftContainsRight() != model.RightContainsLeft() &&
-            !(model.LeftContainsRight() && WasPutOnRewritten(i, left)))
+            !(model.LeftContainsRight() && WasPutOnRewritten(Repo(i), left)))
             return result == (model.LeftContainsRight() ? left : right) ? void()
                                                                         : Fault("a version that nobody needed");
         if (haveOneTree && isOne)
-            return result == std::min(left, right) || (result == right && GaveWayRewritten(i, left))
+            return result == std::min(left, right) || (result == right && GaveWayRewritten(Repo(i), left))
                        ? void()
                        : Fault("not the smaller of two equal ones");
         if (isOne)
@@ -341,23 +341,6 @@ private:
                 Fault(fault + ", " + path);
         }
         Add(result, std::move(version));
-    }
-
-    /// Whether the head stands for a version whose parent others have rewritten.
-    [[nodiscard]] bool WasPutOnRewritten(std::size_t i, Id const& version) {
-        Ancestry const facts = Repo(i).FactsOf(Head(i)).front();
-        return std::count(facts.contains.begin(), facts.contains.end(),
-                          ContainedCommit{Containment::RewrittenFrom, version}) != 0;
-    }
-
-    /// Whether a version was put on a rewritten one, and that then gave way to another one with its tree.
-    [[nodiscard]] bool GaveWayRewritten(std::size_t i, Id const& version) {
-        Ancestry const facts = Repo(i).FactsOf(Head(i)).front();
-        return std::any_of(facts.contains.begin(), facts.contains.end(), [&](ContainedCommit const& each) {
-            auto const below = Repo(i).FactsOf(each.id);
-            return !below.empty() && std::count(below.front().contains.begin(), below.front().contains.end(),
-                                                ContainedCommit{Containment::RewrittenFrom, version}) != 0;
-        });
     }
 
     void CheckQuestions(ModelMerge const& model, Paths const& asked) {

@@ -47,6 +47,34 @@ inline void CheckListing(Trial& trial, IArchive& archive, std::vector<Id> ids) {
                  "objects are counted by type");
 }
 
+/// All of @p objects, with their types and sizes.
+inline void CheckReading(Trial& trial, IArchive& archive, std::vector<NewObject> const& objects,
+                         std::vector<Id> const& ids) {
+    auto const found = ReadAll(archive, ids);
+    for (NewObject const& object : objects) {
+        auto const data = found.find(DigitsOf(object.id));
+        trial.Expect(data != found.end() && data->second == TextOf(object.data),
+                     "objects come back as they were stored");
+        auto const info = archive.Describe({&object.id, 1});
+        trial.Expect(info.size() == 1 && info[0].type == object.type && info[0].size == object.data.GetSize(),
+                     "types and sizes are reported");
+    }
+}
+
+/// Some of @p ids, which are there, among others.
+inline void CheckMissing(Trial& trial, IArchive& archive, std::vector<Id> const& ids) {
+    std::vector<Id> asked;
+    std::vector<Id> unknown;
+    for (std::size_t i = 0; i < 100; ++i) {
+        asked.push_back(ids[i]);
+        if (i % 3 == 0)
+            asked.push_back(unknown.emplace_back(Object(ObjectType::Blob, "unknown " + std::to_string(i)).id));
+    }
+    ReadOutcome const outcome = archive.Read(asked, [](ArchivedObject const&) {});
+    trial.Expect(outcome.missing == unknown && outcome.damaged.empty() && archive.FindMissing(asked) == unknown,
+                 "missing objects are reported, in order");
+}
+
 inline void CheckObjects(Trial& trial, IArchive& archive) {
     trial.Expect(archive.FindMissing({}).empty() && archive.Describe({}).empty() && ReadAll(archive, {}).empty(),
                  "empty batches give nothing");
@@ -59,26 +87,8 @@ inline void CheckObjects(Trial& trial, IArchive& archive) {
     trial.Expect(archive.FindMissing(ids) == ids, "an empty archive misses everything, in order");
     trial.Expect(Store(archive, objects).applied && Store(archive, objects).applied, "storing twice is storing once");
     trial.Expect(archive.FindMissing(ids).empty(), "what is stored is not missing");
-
-    auto const found = ReadAll(archive, ids);
-    for (NewObject const& object : objects) {
-        auto const data = found.find(DigitsOf(object.id));
-        trial.Expect(data != found.end() && data->second == TextOf(object.data),
-                     "objects come back as they were stored");
-        auto const info = archive.Describe({&object.id, 1});
-        trial.Expect(info.size() == 1 && info[0].type == object.type && info[0].size == object.data.GetSize(),
-                     "types and sizes are reported");
-    }
-    std::vector<Id> asked;
-    std::vector<Id> unknown;
-    for (std::size_t i = 0; i < 100; ++i) {
-        asked.push_back(ids[i]);
-        if (i % 3 == 0)
-            asked.push_back(unknown.emplace_back(Object(ObjectType::Blob, "unknown " + std::to_string(i)).id));
-    }
-    ReadOutcome const outcome = archive.Read(asked, [](ArchivedObject const&) {});
-    trial.Expect(outcome.missing == unknown && outcome.damaged.empty() && archive.FindMissing(asked) == unknown,
-                 "missing objects are reported, in order");
+    CheckReading(trial, archive, objects, ids);
+    CheckMissing(trial, archive, ids);
     CheckListing(trial, archive, std::move(ids));
 }
 

@@ -1,3 +1,4 @@
+#include "ForwardingArchive.h"
 #include "archive_upkeep/Upkeep.h"
 
 #include <sqlite3.h>
@@ -49,7 +50,7 @@ int SynchronizeInParts(IArchive& from, IArchive& to) {
         int rest = 0;
     } stop;
     int interruptions = 0;
-    for (int patience = 1;; patience += 25, ++interruptions) {
+    for (int patience = 1;; patience += 10, ++interruptions) {
         stop.rest = patience;
         try {
             Synchronize(from, to, Everything(), &stop);
@@ -83,6 +84,28 @@ TEST_P(Synchronizing, BringsHistoriesFactsAndRecords) {
 }
 
 /// Later merges are made against what was brought last, also when its commit is gone.
+TEST(ArchiveSynchronize, AsksForManyVersionsAtOnce) {
+    struct Counting final : ForwardingArchive {
+        IArchive& Reach() override { return ++calls, archive; }
+        MemArchive archive;
+        std::size_t calls = 0;
+    } from, to;
+    SmallHost host(from, 1);
+    for (int i = 0; i < 400; ++i)
+        host.Publish();
+    from.calls = 0;
+    Synchronize(from, to, Everything(), nullptr);
+    EXPECT_EQ(to.archive.GetStatistics().commits, 400U);
+    // Every fourth version has a large content, which is asked for and stored by itself.
+    EXPECT_LT(from.calls, 300U);
+    EXPECT_LT(to.calls, 200U);
+    host.Publish();
+    from.calls = to.calls = 0;
+    Synchronize(from, to, Everything(), nullptr);
+    EXPECT_EQ(to.archive.GetStatistics().commits, 401U);
+    EXPECT_LT(from.calls + to.calls, 40U);
+}
+
 TEST_P(Synchronizing, KeepsTheTreeOfTheHeadExchangedLast) {
     Source from(directory_.Path("from"));
     auto const to = Make();
