@@ -109,6 +109,10 @@ def listing(parent):
 def trees(parent):
     copy, file, near, target = (os.path.join(parent, name) for name in ("copy", "file.kiv", "near.kiv", "target"))
     shutil.copytree(TREE, copy, symlinks=True, ignore=lambda at, names: [n for n in names if os.path.islink(os.path.join(at, n))])
+    # Directories of nothing but links, which no version has.
+    for at, _, _ in os.walk(copy, topdown=False):
+        if not os.listdir(at):
+            os.rmdir(at)
 
     def to_file(_):
         for suffix in ("", "-wal", "-shm"):
