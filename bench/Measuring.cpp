@@ -24,16 +24,18 @@ std::unique_ptr<Repository> MakeRepository() {
     return std::make_unique<Repository>(std::make_unique<MemObjectsStorage>());
 }
 
+// Tables are asked of clones, so that the repository goes on as if nobody had asked.
+
 std::unordered_set<Id> StoredIds(Repository const& repo) {
     std::unordered_set<Id> ids;
     const auto add = [&ids](auto const& table) {
         for (auto const& [id, object] : table)
             ids.insert(id);
     };
-    IObjectsStorage const& storage = *repo.GetStorage();
-    add(storage.GetBlobs());
-    add(storage.GetTrees());
-    add(storage.GetCommits());
+    const auto storage = repo.GetStorage()->Clone();
+    add(storage->GetBlobs());
+    add(storage->GetTrees());
+    add(storage->GetCommits());
     return ids;
 }
 
@@ -59,10 +61,10 @@ void HashFloor::AddStored(Repository const& repo, std::unordered_set<Id> const& 
                 AddForm(*object);
         }
     };
-    IObjectsStorage const& storage = *repo.GetStorage();
-    add(storage.GetBlobs());
-    add(storage.GetTrees());
-    add(storage.GetCommits());
+    const auto storage = repo.GetStorage()->Clone();
+    add(storage->GetBlobs());
+    add(storage->GetTrees());
+    add(storage->GetCommits());
 }
 
 double HashFloor::Run(std::vector<char> const* content) {

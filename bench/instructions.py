@@ -12,7 +12,7 @@ import pathlib
 import re
 import sys
 
-tolerance = 0.05
+tolerance = 0.02
 portable_compression = "Sha256::CompressPortably"
 vector_compression = "::CompressEightLanes"
 trigger = "desc: Trigger: Client Request: "

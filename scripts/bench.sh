@@ -8,7 +8,7 @@
 # `archive` may be followed by the names of some of its rows: files, text, source, history, million, large, edits.
 # With `postgres` as FILTER it runs archives in a database beside bare transactions and archives in files.
 # --check counts the instructions of one small round of each workload and fails where they are more than bench/baseline.json
-# says by over 5 %; --update writes that file. docs/performance.md says what is measured.
+# says by over 2 %; --update writes that file. docs/performance.md says what is measured.
 
 . "$(dirname "$0")/lib.sh"
 

@@ -40,17 +40,11 @@ struct Signature {
     TimeDelta bias;
 };
 
-/// The text up to its first U+0000, beyond which a packed form shows nothing.
-KivStringViewT<char16_t> UntilZero(KivStringViewT<char16_t> text) {
-    const int end = text.Find(KivStringViewT<char16_t>(u"", 1));
-    return end < 0 ? text : text.Left(end);
-}
-
 /// An identifier as the lines of a commit show it.
 KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
     KivStringT<char> line = key.ToString();
     if (Id::Digest const* const digest = id.GetDigest())
-        line += KivStringT<char>::Build(64, [digest](char* digits) { WriteDigits(*digest, digits); });
+        line += KivStringT<char>::Build(int{idLength}, [digest](char* digits) { WriteDigits(*digest, digits); });
     else
         line += DataEncoding::Utf8Encode(UntilZero(id.GetText()));
     return line += "\n";

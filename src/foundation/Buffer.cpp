@@ -248,8 +248,8 @@ void Buffer::Append(Buffer const& other, std::uint64_t offset, std::uint64_t siz
         }
         if (other.content_->kind != Kind::Chain) {
             auto* block = static_cast<Block*>(other.content_.get());
-            return AppendPiece(block,
-                               block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));
+            return AppendPiece(
+                block, block->Chunk().subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size)));
         }
     }
     const Buffer source(other);

@@ -3,6 +3,9 @@
 #include "KivVcs/Id.h"
 #include "KivVcs/SHADigest256.h"
 
+#include <algorithm>
+#include <tuple>
+
 namespace KivVcs {
 
 /// What precedes the data in a packed form: the type word, a blank, the data's size in decimal, a zero byte.
@@ -11,7 +14,16 @@ void AppendPackedHeader(Buffer& packed, KivStringViewT<char> word, std::uint64_t
 /// Writes the same to @p out, at most 22 bytes and the word, and returns the end of what was written.
 char* WritePackedHeader(KivStringViewT<char> word, std::uint64_t size, char* out) noexcept;
 
-/// Writes the 64 digits of @p digest as packed forms show them, and returns the end of what was written. Unlike
+/// How long an identifier is there.
+inline constexpr std::size_t idLength = 2 * std::tuple_size_v<Id::Digest>;
+
+/// The text up to its first U+0000, beyond which packed forms show nothing.
+inline KivStringViewT<char16_t> UntilZero(KivStringViewT<char16_t> text) noexcept {
+    const char16_t* const end = std::find(text.begin(), text.end(), u'\0');
+    return text.Left(static_cast<int>(end - text.begin()));
+}
+
+/// Writes the digits of @p digest as packed forms show them, and returns the end of what was written. Unlike
 /// `Id::GetText` it leaves nothing behind.
 char* WriteDigits(Id::Digest const& digest, char* out) noexcept;
 

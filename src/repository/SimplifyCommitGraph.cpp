@@ -4,6 +4,7 @@
 #include "repository/CommitSet.h"
 #include "repository/CommonBaseIndex.h"
 
+#include <cstring>
 #include <typeinfo>
 #include <unordered_map>
 #include <unordered_set>
@@ -28,7 +29,19 @@ struct KeptCommit {
     bool isLinked = false;
 };
 
-using KeptCommits = std::unordered_map<Id, KeptCommit>;
+/// Takes the beginning of the digest as it is.
+struct HashByDigest {
+    std::size_t operator()(Id const& id) const noexcept {
+        Id::Digest const* const digest = id.GetDigest();
+        if (digest == nullptr)
+            return id.Hash();
+        std::size_t hash = 0;
+        std::memcpy(&hash, digest->data(), sizeof hash);
+        return hash;
+    }
+};
+
+using KeptCommits = std::unordered_map<Id, KeptCommit, HashByDigest>;
 
 } // namespace
 

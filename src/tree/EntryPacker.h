@@ -24,7 +24,6 @@ inline bool KeepsRuns(Node const& top) noexcept {
 inline constexpr std::string_view blobWords = "100644 blob ";
 inline constexpr std::string_view treeWords = "40000 tree ";
 inline constexpr std::size_t pieceSize = 4096;
-inline constexpr std::size_t idLength = 2 * std::tuple_size_v<Id::Digest>;
 
 /// Hands the code units of a name to @p take as a packed form shows them, up to the first U+0000.
 /// @return false, at the first code unit that is not ASCII
@@ -36,11 +35,6 @@ bool ForEachAsciiUnit(KivStringViewT<char16_t> name, Take take) noexcept {
         take(static_cast<char>(unit));
     }
     return true;
-}
-
-inline KivStringViewT<char16_t> UntilZero(KivStringViewT<char16_t> text) noexcept {
-    const char16_t* const end = std::find(text.begin(), text.end(), u'\0');
-    return text.Left(static_cast<int>(end - text.begin()));
 }
 
 inline std::size_t PackedNameSize(KivStringViewT<char16_t> name) noexcept {

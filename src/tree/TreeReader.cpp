@@ -33,8 +33,6 @@ std::string_view TakeType(std::string_view& rest) noexcept {
     return TakeUntil(rest, ' ');
 }
 
-using detail::idLength;
-
 /// How much of a packed form is taken at most.
 constexpr std::size_t longestText = std::numeric_limits<int>::max();
 
