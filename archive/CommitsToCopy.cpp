@@ -47,6 +47,7 @@ std::vector<Id> CommitsToCopy::Discover(std::vector<Id> const& open, std::size_t
     std::vector<Ancestry> known = from_.ReadAncestry(missing, Follow::Reachable, ahead);
     std::unordered_set<Id> const gone = GoneOfMerged(from_, known);
     std::vector<Id> read;
+    read.reserve(known.size());
     for (Ancestry const& facts : known)
         read.push_back(facts.commit);
     met_.insert(read.begin(), read.end());
