@@ -71,9 +71,12 @@ typename ObjectTable<T>::Table const& ObjectTable<T>::Show() const {
     auto shown = std::make_unique<Shown>();
     shown->table.reserve(size_);
     for (std::size_t number = 0; number < list_.size(); ++number) {
-        if (T const* const object = ObjectAt(number))
-            shown->table.try_emplace(Id::FromDigest(*object->GetKnownDigest())).first->second =
-                cow_ptr<T>::attach(object);
+        T const* const object = ObjectAt(number);
+        if (object == nullptr)
+            continue;
+        // In two steps: where the first fails, there must be no handle yet that would give up the list's reference.
+        cow_ptr<T>& named = shown->table.try_emplace(Id::FromDigest(*object->GetKnownDigest())).first->second;
+        named = cow_ptr<T>::attach(object);
     }
     return shown_.Replace(known, shown.get()) ? shown.release()->table : known->table;
 }
