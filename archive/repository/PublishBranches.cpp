@@ -167,6 +167,7 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
     publishing.Store(commits);
     // Everything that could fail comes before the branches move.
     std::vector<Id> published;
+    published.reserve(commits.size());
     for (auto const& commit : commits)
         published.push_back(commit->GetId());
     for (BranchMove const& move : pending.moves)

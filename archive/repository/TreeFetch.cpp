@@ -71,7 +71,7 @@ private:
         }
         auto const group = std::make_shared<ContentGroup>(fetch_.source_.GetContents(), missing);
         for (Id const& id : missing) {
-            madeBlobs_.push_back(KivVcs::immu::make<ArchivedBlob>(DigestOf(id), group));
+            madeBlobs_.emplace_back(KivVcs::immu::make<ArchivedBlob>(DigestOf(id), group));
             staging_.AddBlobToStorage(madeBlobs_.back());
         }
     }

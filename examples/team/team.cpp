@@ -78,14 +78,14 @@ void Work(std::string const& address, std::string const& cacheFile, std::string 
 
 int main(int count, char** arguments) {
     if (count != 6) {
-        std::fprintf(stderr, "usage: team ADDRESS CACHE-FILE NAME EDITS MEMBERS\n");
+        (void)std::fprintf(stderr, "usage: team ADDRESS CACHE-FILE NAME EDITS MEMBERS\n");
         return 2;
     }
     try {
         Work(arguments[1], arguments[2], arguments[3], std::stoi(arguments[4]), std::stoul(arguments[5]));
         return 0;
     } catch (std::exception const& failure) {
-        std::fprintf(stderr, "%s\n", failure.what());
+        (void)std::fprintf(stderr, "%s\n", failure.what());
         return 1;
     }
 }
