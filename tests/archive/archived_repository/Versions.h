@@ -10,6 +10,8 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
+
 /// Builders of versions in archives, and an archive that counts.
 
 namespace KivArchive {
@@ -22,7 +24,7 @@ using KivVcs::NameOf;
 using KivVcs::Tree;
 using KivVcs::Wide;
 
-/// An archive that counts what it is asked for.
+/// An archive that counts what it is asked for, by any thread.
 class CountingArchive final : public ForwardingArchive {
 public:
     ReadOutcome Read(std::span<const Id> ids, ObjectReceiver const& receiver) override {
@@ -42,10 +44,10 @@ public:
         return ForwardingArchive::Apply(change);
     }
 
-    std::size_t calls = 0;
-    std::size_t contents = 0;
-    std::size_t stored = 0;
-    std::size_t relied = 0;
+    std::atomic<std::size_t> calls = 0;
+    std::atomic<std::size_t> contents = 0;
+    std::atomic<std::size_t> stored = 0;
+    std::atomic<std::size_t> relied = 0;
     std::vector<Id> inherited;
 
 protected:
