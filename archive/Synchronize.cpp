@@ -76,6 +76,8 @@ private:
     struct Pair {
         Id id;
         Id earlier;
+        /// The first one of the commits that bring it.
+        Id commit;
     };
 
     /// What the commits have merged and is not there: it was collected, or is about to come.
@@ -113,7 +115,7 @@ private:
             if (!(tree == facts.tree) || !(parentId == facts.parent))
                 Fail(Failure::Damaged, "The archive to copy from knows another ancestry than its versions have.");
             if (!tree.IsEmpty())
-                level.push_back({tree, treesOf[facts.parent]});
+                level.push_back({tree, treesOf[facts.parent], commit});
         }
         while (!level.empty())
             level = FetchLevel(std::move(level));
@@ -139,12 +141,12 @@ private:
                     for (Link const& link : found->second.links)
                         names.emplace(link.name, &link);
             for (Link const& link : tree->second.links) {
-                CheckName(link.name);
+                CheckName(link.name, pair.commit);
                 auto const same = names.find(link.name);
                 Id const earlierId = same != names.end() && same->second->type == link.type ? same->second->id : Id();
                 // What the earlier tree names, too, comes or is there with that one.
                 if (!(earlierId == link.id))
-                    (link.type == ObjectType::Tree ? next : blobs).push_back({link.id, earlierId});
+                    (link.type == ObjectType::Tree ? next : blobs).push_back({link.id, earlierId, pair.commit});
             }
             tree->second.earlier = pair.earlier;
         }
@@ -180,12 +182,13 @@ private:
         return {missing.begin(), missing.end()};
     }
 
-    void CheckName(std::string_view name) const {
+    void CheckName(std::string_view name, Id const& commit) const {
         if (!options_.acceptsName)
             return;
         auto const text = KivVcs::String::ToStringW(KivStringViewT<char>(name.data(), static_cast<int>(name.size())));
         if (!options_.acceptsName(text))
-            Fail(Failure::Unrepresentable, "The name \"" + std::string(name) + "\" cannot be had here.");
+            Fail(Failure::Unrepresentable, "Version " + KivVcs::ToUtf8(commit.GetText()) + " has the name \"" +
+                                               std::string(name) + "\", which cannot be had here.");
     }
 
     void StoreBlobs() {

@@ -117,6 +117,12 @@ def main():
     first = log.splitlines()[-1].split()[0]
     compare("diff of the first and the last", 1.0, lambda: git("diff", "--name-status", "HEAD~300", "HEAD"),
             lambda: vault("diff", first, "master"))
+    views = (("branch",), ("log",), ("graph",), ("diff", first, "master"))
+    for number in range(300, 2000):
+        edit(number)
+        vault("save", "tree", "-m", f"edit {number}", "--exclude", ".git")
+    for command in views:
+        peak(f"{command[0]} beside 2,000 versions: memory", 30, *command)
     shutil.rmtree("restored", ignore_errors=True)
     os.mkdir("large")
     with open("large/file", "wb") as file:
@@ -125,7 +131,7 @@ def main():
     peak("save of a file of 300 MB: memory", 100, "save", "large")
     peak("restore of it", 100, "restore", "master", "restored")
     peak("verify", 100, "verify")
-    for command in (("branch",), ("log",), ("graph",), ("diff", first, "master")):
+    for command in views:
         peak(f"{command[0]} beside it", 30, *command)
 
 

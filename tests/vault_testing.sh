@@ -3,6 +3,7 @@
 
 set -euo pipefail
 vault=$(realpath "$1")
+# shellcheck disable=SC2034
 here=$(realpath "$(dirname "${BASH_SOURCE[0]}")")
 work=$(mktemp -d)
 trap 'umount "$work/small" 2>/dev/null || true; chmod -R u+rwx "$work" 2>/dev/null; rm -rf "$work"' EXIT

@@ -333,9 +333,9 @@ int main(int argumentCount, char** arguments) {
     try {
         vault::CommandLine line;
         try {
-            // What describes the commands ends with the process.
-            std::exit(
-                vault::Run(line, argumentCount, arguments)); // NOLINT(concurrency-mt-unsafe): no other thread is left
+            const int status = vault::Run(line, argumentCount, arguments);
+            // What describes the commands ends with the process; no other thread is left.
+            std::exit(status); // NOLINT(concurrency-mt-unsafe)
         } catch (CLI::Success const& success) {
             return line.app.exit(success);
         }
@@ -343,12 +343,13 @@ int main(int argumentCount, char** arguments) {
         return vault::Complain(problem.what(), problem.ExitStatus());
     } catch (KivArchive::ArchiveError const& error) {
         const bool isDamage = error.GetKind() == KivArchive::Failure::Damaged;
-        return vault::Complain(error.what(), isDamage ? vault::findingsExitStatus : 2);
+        return vault::Complain(vault::Printable(vault::StoredName(error.what())),
+                               isDamage ? vault::findingsExitStatus : 2);
     } catch (CLI::ParseError const& error) {
-        return vault::Complain(vault::Printable(std::string_view(error.what())) + " (--help shows how)");
+        return vault::Complain(vault::Printable(vault::StoredName(error.what())) + " (--help shows how)");
     } catch (std::bad_alloc const&) {
         return vault::Complain("out of memory");
     } catch (std::exception const& error) {
-        return vault::Complain(vault::Printable(std::string_view(error.what())));
+        return vault::Complain(vault::Printable(vault::StoredName(error.what())));
     }
 }
