@@ -39,7 +39,7 @@ HEADERS = {
     "tree": ("Tree", "CommitTree", "Differences", "PortablePaths", "detail/DigestTrail", "detail/EntryTable"),
     "merge": ("Merge", "Conflicts"),
     "commit": ("Commit", "History", "detail/DeferredLinks"),
-    "storage": ("Storage", "ShortIds"),
+    "storage": ("Storage", "ShortIds", "detail/ObjectTable"),
     "repository": ("Repository", "MergeOutcome"),
     "core": ("KivVcs",),
 }

@@ -27,7 +27,7 @@ std::string SystemReason() {
     return std::generic_category().message(errno);
 }
 
-std::string const unsettled = "changes while it is read";
+constexpr char const* unsettled = "changes while it is read";
 
 /// A file as a stream of as many bytes as it had at first.
 class FileStream final : public KivVcs::IStream {

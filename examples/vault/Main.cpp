@@ -233,10 +233,10 @@ void DescribeUpkeep(CommandLine& line) {
 std::size_t Distance(std::string_view one, std::string_view other) {
     std::vector<std::size_t> row(other.size() + 1);
     std::iota(row.begin(), row.end(), std::size_t{0});
-    for (std::size_t i = 0; i < one.size(); ++i) {
+    for (const char letter : one) {
         auto diagonal = row[0]++;
         for (std::size_t j = 0; j < other.size(); ++j) {
-            const auto replaced = diagonal + (one[i] == other[j] ? 0U : 1U);
+            const auto replaced = diagonal + (letter == other[j] ? 0U : 1U);
             diagonal = row[j + 1];
             row[j + 1] = std::min({replaced, row[j] + 1, row[j + 1] + 1});
         }

@@ -254,7 +254,7 @@ private:
         for (auto& content : packed.attributes)
             Add(std::move(content));
         packed.tree.earlier = level.origins.left;
-        const auto id = packed.tree.id;
+        auto id = packed.tree.id;
         Add(std::move(packed.tree));
         return id;
     }

@@ -33,7 +33,7 @@ constexpr int mostAttempts = 20;
 constexpr std::string_view theirsSuffix = "~theirs";
 
 void WriteJson(std::string_view result, Id const& head, std::string const& conflicts) {
-    std::cout << R"({"result":")" << result << R"(","head":")" << DigitsOf(head) << "\",\"conflicts\":" << conflicts
+    std::cout << R"({"result":")" << result << R"(","head":")" << DigitsOf(head) << R"(","conflicts":)" << conflicts
               << "}\n";
 }
 
@@ -163,21 +163,21 @@ public:
         std::string json = "[";
         for (auto const& conflict : conflicts_)
             (json += json.size() == 1 ? "\n" : ",\n") +=
-                "{\"path\":" + JsonText(ToUtf8(conflict.path)) + ",\"left\":\"" + WordFor(conflict.leftChange) +
-                "\",\"right\":\"" + WordFor(conflict.rightChange) + "\",\"taken\":\"" +
+                R"({"path":)" + JsonText(ToUtf8(conflict.path)) + R"(,"left":")" + WordFor(conflict.leftChange) +
+                R"(","right":")" + WordFor(conflict.rightChange) + R"(","taken":")" +
                 std::string(isStopped_ ? "undecided"
                             : IsReal(conflict) && conflict.settlement == ConflictSettlement::Combined
                                 ? "marked"
                                 : WordFor(conflict.settlement)) +
-                "\"}";
+                R"("})";
         for (auto const& conflict : modes_)
-            (json += json.size() == 1 ? "\n" : ",\n") += "{\"path\":" + JsonText(conflict.path) + ",\"left\":\"" +
-                                                         std::string(conflict.left) + "\",\"right\":\"" +
-                                                         std::string(conflict.right) + "\",\"taken\":\"" +
+            (json += json.size() == 1 ? "\n" : ",\n") += R"({"path":)" + JsonText(conflict.path) + R"(,"left":")" +
+                                                         std::string(conflict.left) + R"(","right":")" +
+                                                         std::string(conflict.right) + R"(","taken":")" +
                                                          (isStopped_               ? "undecided"
                                                           : versions_.prefersRight ? "right"
                                                                                    : "left") +
-                                                         "\"}";
+                                                         R"("})";
         return json + "\n]";
     }
 

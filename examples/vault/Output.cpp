@@ -50,12 +50,12 @@ std::string DescribeMessage(CommitRecord const& commit) {
 std::string JsonCommit(CommitRecord const& commit) {
     std::string merged;
     for (auto const& id : commit.merged)
-        merged += (merged.empty() ? "\"" : ",\"") + DigitsOf(id) + '"';
-    return "{\"id\":\"" + DigitsOf(commit.id) + "\",\"parent\":\"" + DigitsOf(commit.parent) + "\",\"merged\":[" +
-           merged + "],\"tree\":\"" + DigitsOf(commit.tree) +
-           "\",\"readable\":" + (commit.state == KivArchive::CommitState::Sound ? "true" : "false") +
-           ",\"author\":" + JsonText(ToUtf8(commit.authorName)) + ",\"email\":" + JsonText(ToUtf8(commit.authorEmail)) +
-           ",\"time\":\"" + DescribeTime(commit) + "\",\"message\":" + JsonText(ToUtf8(commit.description)) + '}';
+        merged += (merged.empty() ? R"(")" : R"(,")") + DigitsOf(id) + '"';
+    return R"({"id":")" + DigitsOf(commit.id) + R"(","parent":")" + DigitsOf(commit.parent) + R"(","merged":[)" +
+           merged + R"(],"tree":")" + DigitsOf(commit.tree) + R"(","readable":)" +
+           (commit.state == KivArchive::CommitState::Sound ? "true" : "false") + R"(,"author":)" +
+           JsonText(ToUtf8(commit.authorName)) + R"(,"email":)" + JsonText(ToUtf8(commit.authorEmail)) +
+           R"(,"time":")" + DescribeTime(commit) + R"(","message":)" + JsonText(ToUtf8(commit.description)) + '}';
 }
 
 bool IsTerminal() noexcept {

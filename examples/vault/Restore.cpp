@@ -106,6 +106,7 @@ public:
 private:
     void WriteDirectories(std::vector<PendingDirectory> const& directories, std::vector<PendingDirectory>& rest) {
         std::vector<Id> trees;
+        trees.reserve(directories.size());
         for (auto const& pending : directories)
             trees.push_back(pending.tree);
         const auto read = reader_.Read(trees);

@@ -72,6 +72,7 @@ Snapshot Take(Vault const& vault, SaveOptions const& options, Id const& previous
             return false;
         Warn(std::to_string(paths.size()) + " saved paths are excluded now:");
         std::vector<std::string> printable;
+        printable.reserve(paths.size());
         for (auto const& path : paths)
             printable.push_back(PrintableName(path));
         NamePaths(printable);

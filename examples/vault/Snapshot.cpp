@@ -165,6 +165,7 @@ private:
             });
             if (level.empty())
                 break;
+            trees.reserve(level.size());
             for (const auto at : level)
                 trees.push_back(states_[at].previousTree);
             const auto read = reader_.Read(trees);

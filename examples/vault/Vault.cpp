@@ -17,12 +17,10 @@
 
 namespace vault {
 
-using KivArchive::ObjectInfo;
-
 namespace {
 
 constexpr char16_t const* firstBranch = u"master";
-Text const currentBranchRecord = u"vault/branch";
+constexpr char16_t const* currentBranchRecord = u"vault/branch";
 
 /// Of an identifier's beginning; shorter ones are rather names, of directories or of branches that are not there.
 constexpr std::size_t leastDigits = 4;
@@ -125,7 +123,8 @@ Text Vault::CurrentBranch() const {
         const auto note = ReadNote(file_);
         return note ? RequireUtf8(*note, "the current branch") : Text(firstBranch);
     }
-    const auto records = archive_->ReadRecords(std::span(&currentBranchRecord, 1));
+    const Text name = currentBranchRecord;
+    const auto records = archive_->ReadRecords(std::span(&name, 1));
     if (records.empty() || !records.front().value)
         return firstBranch;
     return RequireUtf8(BytesOf(*records.front().value), "the current branch");

@@ -222,10 +222,10 @@ int ListChanges(std::vector<PathChange> const& changes, ListingOptions const& li
     for (std::size_t i = 0; i < shown; ++i) {
         auto const& change = changes[i];
         if (listing.json)
-            std::cout << (i == 0 ? "\n" : ",\n") << "{\"change\":\"" << WordFor(change.kind)
-                      << "\",\"path\":" << JsonText(change.path) << ",\"old\":\"" << DigitsOf(change.oldId)
-                      << "\",\"new\":\"" << DigitsOf(change.newId) << '"'
-                      << (change.sameAs.empty() ? "" : ",\"as\":" + JsonText(change.sameAs)) << '}';
+            std::cout << (i == 0 ? "\n" : ",\n") << R"({"change":")" << WordFor(change.kind) << R"(","path":)"
+                      << JsonText(change.path) << R"(,"old":")" << DigitsOf(change.oldId) << R"(","new":")"
+                      << DigitsOf(change.newId) << '"'
+                      << (change.sameAs.empty() ? "" : R"(,"as":)" + JsonText(change.sameAs)) << '}';
         else
             ListChange(change);
     }
