@@ -29,7 +29,7 @@ bool TakeIdentifierLine(std::string_view& text, KivVcs::Id& id) noexcept {
     return true;
 }
 
-/// The author's line without its key, behind which @p text is left, behind the committer's equal line and an empty one.
+/// The author's line without its key, after which @p text is left, after the committer's equal line and an empty one.
 /// Nothing if there are none such. Names may hold anything, also what looks like the committer's line.
 std::optional<std::string_view> TakeSignature(std::string_view& text) noexcept {
     constexpr std::string_view committer = "\ncommitter ";
@@ -188,7 +188,7 @@ int CompareNames(std::string_view left, std::string_view right) noexcept {
     std::string_view const single = isOnePair ? right : left;
     unsigned const unit = FirstUnit(single, at);
     unsigned const first = FirstUnit(pair, at);
-    // Behind a lone surrogate only what is U+E000 or above comes behind the second unit of a pair.
+    // After a lone surrogate only what is U+E000 or above comes after the second unit of a pair.
     unsigned const next = ByteAt(single, at + 3);
     bool const isPairLess = unit == first ? next > leadOfSurrogates && next < leadOfPairs : first < unit;
     return isPairLess == isOnePair ? -1 : 1;

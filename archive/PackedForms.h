@@ -60,7 +60,7 @@ public:
     explicit PackedEntries(std::span<const std::byte> data) noexcept
         : rest_(reinterpret_cast<const char*>(data.data()), data.size()) {}
 
-    /// Goes to the next entry. @return false behind the last one, and at the first byte that is not as trees have it
+    /// Goes to the next entry. @return false after the last one, and at the first byte that is not as trees have it
     bool Next();
     [[nodiscard]] PackedEntry const& Get() const noexcept { return entry_; }
     /// After `Next` has returned false: whether that was the end of the data, and the names were UTF-8, in the order
@@ -73,7 +73,7 @@ private:
     bool areSound_ = true;
 };
 
-/// Less than, equal to or greater than zero as the first name comes before, is, or comes behind the other one in trees,
+/// Less than, equal to or greater than zero as the first name comes before, is, or comes after the other one in trees,
 /// which is the order of their UTF-16 code units. Of what is not UTF-8 the order is that of the bytes.
 [[nodiscard]] int CompareNames(std::string_view left, std::string_view right) noexcept;
 

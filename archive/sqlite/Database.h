@@ -87,7 +87,7 @@ public:
     /// What a function of ours finds by @p type. Must live as long as the query.
     Query& WithPointer(void* pointer, const char* type);
 
-    /// Goes to the next row. @return false behind the last one
+    /// Goes to the next row. @return false after the last one
     bool Next();
     /// Runs to the end.
     void Run();

@@ -10,7 +10,7 @@ struct NewCommit {
     NewObject object;
     KivArchive::Ancestry facts;
 
-    /// Puts it behind the objects of @p change.
+    /// Puts it after the objects of @p change.
     void AddTo(KivArchive::Change& change) const;
 };
 

@@ -29,7 +29,7 @@ namespace {
 using PathView = KivVcs::array_view<TextView const>;
 
 constexpr int mostAttempts = 20;
-/// What is put behind the name of the other side's file.
+/// What is put after the name of the other side's file.
 constexpr std::string_view theirsSuffix = "~theirs";
 
 void WriteJson(std::string_view result, Id const& head, std::string const& conflicts) {

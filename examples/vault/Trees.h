@@ -55,7 +55,7 @@ struct Entry {
 /// A directory of a version. Its tree holds its entries under their names, and its attributes, and those of its files, in
 /// entries of the vault's own, whose contents are lines of
 ///
-///     MODE TIME NAME\0        MODE in octal, with an "l" behind it for a link; the directory itself has no NAME
+///     MODE TIME NAME\0        MODE in octal, with an "l" after it for a link; the directory itself has no NAME
 ///
 /// There is one of these entries, or, in large directories, 256 among which names are spread by a hash, so that one change
 /// rewrites little.

@@ -9,7 +9,7 @@
 /// Threads: any number of calls may run concurrently.
 ///
 /// Cost: proportional to the contents where they differ in a few places; at most proportional to the number of lines times
-/// its square root, whatever the contents: where very much differs, the changes found may not be the fewest. At most some
+/// its square root, whatever the contents: where very much differs, the changes found may be more than the least. At most some
 /// dozen bytes of memory for each line.
 
 #include "KivArchive/Export.h"

@@ -84,7 +84,7 @@ struct Buffer::Chain final : Content {
         Add(Handle<Block>(owner), piece);
     }
 
-    /// The bytes that can be written behind the last piece without anybody else seeing them.
+    /// The bytes that can be written after the last piece without anybody else seeing them.
     [[nodiscard]] std::size_t RoomAtEnd() const noexcept {
         if (owners.empty() || owners.back().use_count() != 1)
             return 0;

@@ -91,7 +91,7 @@ private:
         blocks_ = staged / blockSize;
     }
 
-    /// Ends the message behind the @p staged bytes. @return the size of its last blocks
+    /// Ends the message after the @p staged bytes. @return the size of its last blocks
     [[nodiscard]] std::size_t Pad(std::size_t staged) noexcept {
         const std::size_t size = (staged + 9 + blockSize - 1) / blockSize * blockSize;
         staged_[staged] = 0x80;

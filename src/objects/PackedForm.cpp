@@ -10,7 +10,7 @@ namespace KivVcs {
 
 namespace {
 
-/// The part of a header behind the type word.
+/// The part of a header after the type word.
 class SizeField {
 public:
     explicit SizeField(std::uint64_t size) noexcept {

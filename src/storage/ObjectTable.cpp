@@ -240,7 +240,7 @@ bool ObjectTable<T>::MakeRoom() {
 template <class T>
 cow_ptr<T> ObjectTable<T>::TakeOutOf(std::size_t slot) noexcept {
     const std::uint32_t number = slots_[slot].number;
-    // Those behind it move up as far as they would have been put without it.
+    // Those after it move up as far as they would have been put without it.
     const auto distance = [this](std::size_t from, std::size_t to) {
         return to >= from ? to - from : to + slots_.size() - from;
     };

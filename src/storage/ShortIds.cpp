@@ -27,7 +27,7 @@ ShortIds::ShortIds(IObjectsStorage const& storage) {
 
 std::string ShortIds::ShortFormOf(Id const& id, int digits) const {
     const std::string text = ToUtf8(id.GetText());
-    // What begins most like it stands right before or right behind it.
+    // What begins most like it stands right before or right after it.
     auto neighbour = std::lower_bound(ids_.begin(), ids_.end(), id);
     int common = 0;
     if (neighbour != ids_.begin())

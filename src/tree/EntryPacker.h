@@ -19,7 +19,7 @@ inline bool KeepsRuns(Node const& top) noexcept {
     return top.Total().Objects() >= minObjectsWithKeptRuns;
 }
 
-/// Mode and type of our own objects, with the blanks behind them. The copy of either takes as many bytes, the shorter one's
+/// Mode and type of our own objects, with the blanks after them. The copy of either takes as many bytes, the shorter one's
 /// terminator among them, so that it is no call.
 inline constexpr std::string_view blobWords = "100644 blob ";
 inline constexpr std::string_view treeWords = "40000 tree ";
