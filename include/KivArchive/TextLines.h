@@ -9,8 +9,8 @@
 /// Threads: any number of calls may run concurrently.
 ///
 /// Cost: proportional to the contents where they differ in a few places; at most proportional to the number of lines times
-/// its square root, whatever the contents: where very much differs, the changes found may be more than the least. At most some
-/// dozen bytes of memory for each line.
+/// its square root, whatever the contents: where very much differs, more changes may be found than are needed. At most
+/// some dozen bytes of memory for each line.
 
 #include "KivArchive/Export.h"
 
