@@ -1,6 +1,7 @@
 #include "CommitsToCopy.h"
 
 #include "Changes.h"
+#include "NamedFirst.h"
 
 #include <algorithm>
 #include <iterator>
@@ -37,8 +38,16 @@ CommitsToCopy::CommitsToCopy(IArchive& from, IArchive& to, std::vector<Id> const
         ReportProgress(progress, {"looking for missing versions", commits_.size(), 0}, {});
         open = Discover(open, ahead);
     }
-    for (Id const& head : heads)
-        Order(head);
+    VisitNamedFirst<Id>(
+        heads,
+        [this](Id const& id, std::vector<Id>& named) {
+            auto const found = commits_.find(id);
+            if (found == commits_.end())
+                return false;
+            named = found->second.before;
+            return true;
+        },
+        [this](Id const& id) { inOrder_.push_back(id); });
 }
 
 /// Takes in those of @p open that are missing, and of what they lead to up to @p ahead. @return what is to be looked at next
@@ -72,27 +81,6 @@ std::vector<Id> CommitsToCopy::Discover(std::vector<Id> const& open, std::size_t
         commits_.insert_or_assign(commit, Commit{std::move(facts), std::move(before)});
     }
     return next;
-}
-
-void CommitsToCopy::Order(Id const& head) {
-    std::vector<std::pair<Id, bool>> open{{head, false}};
-    while (!open.empty()) {
-        auto const [id, isDone] = open.back();
-        open.pop_back();
-        auto const found = commits_.find(id);
-        if (found == commits_.end())
-            continue;
-        if (isDone) {
-            if (ordered_.insert(id).second)
-                inOrder_.push_back(id);
-            continue;
-        }
-        if (!entered_.insert(id).second)
-            continue;
-        open.emplace_back(id, true);
-        for (Id const& before : found->second.before)
-            open.emplace_back(before, false);
-    }
 }
 
 } // namespace KivArchive

@@ -27,15 +27,12 @@ private:
     };
 
     std::vector<Id> Discover(std::vector<Id> const& open, std::size_t ahead);
-    void Order(Id const& head);
 
     IArchive& from_;
     IArchive& to_;
     std::unordered_map<Id, Commit> commits_;
     /// Whose facts have been read: these, and some that are not missing.
     std::unordered_set<Id> met_;
-    std::unordered_set<Id> entered_;
-    std::unordered_set<Id> ordered_;
     std::vector<Id> inOrder_;
 };
 

@@ -2,6 +2,7 @@
 #include "CommitsToCopy.h"
 #include "ExchangedHeads.h"
 #include "KivArchive/Upkeep.h"
+#include "NamedFirst.h"
 
 #include <algorithm>
 #include <unordered_map>
@@ -80,6 +81,8 @@ private:
         Id commit;
     };
 
+    using LinksByName = std::unordered_map<std::string_view, Link const*>;
+
     /// What the commits have merged and is not there: it was collected, or is about to come.
     [[nodiscard]] std::unordered_set<Id> GoneOfMerged(std::span<const Id> commits, CommitsToCopy const& missing) {
         std::vector<Id> merged;
@@ -135,19 +138,12 @@ private:
             auto const tree = trees.find(pair.id);
             if (tree == trees.end() || arriving_.count(pair.id) != 0)
                 continue;
-            std::unordered_map<std::string_view, Link const*> names;
+            LinksByName earlier;
             for (auto const* known : {&before, &std::as_const(arriving_), &std::as_const(trees)})
-                if (auto const found = known->find(pair.earlier); found != known->end() && names.empty())
+                if (auto const found = known->find(pair.earlier); found != known->end() && earlier.empty())
                     for (Link const& link : found->second.links)
-                        names.emplace(link.name, &link);
-            for (Link const& link : tree->second.links) {
-                CheckName(link.name, pair.commit);
-                auto const same = names.find(link.name);
-                Id const earlierId = same != names.end() && same->second->type == link.type ? same->second->id : Id();
-                // What the earlier tree names, too, comes or is there with that one.
-                if (!(earlierId == link.id))
-                    (link.type == ObjectType::Tree ? next : blobs).push_back({link.id, earlierId, pair.commit});
-            }
+                        earlier.emplace(link.name, &link);
+            AddNewEntries(tree->second.links, earlier, pair.commit, next, blobs);
             tree->second.earlier = pair.earlier;
         }
         for (auto& [id, tree] : trees)
@@ -157,6 +153,19 @@ private:
             if (missingBlobs.count(pair.id) != 0 && wantedBlobs_.insert(pair.id).second)
                 blobs_.push_back(pair);
         return next;
+    }
+
+    /// Adds the entries of a tree that the one before does not have, each with what that one has under its name.
+    void AddNewEntries(std::vector<Link> const& entries, LinksByName const& earlier, Id const& commit,
+                       std::vector<Pair>& trees, std::vector<Pair>& blobs) const {
+        for (Link const& link : entries) {
+            CheckName(link.name, commit);
+            auto const same = earlier.find(link.name);
+            Id const earlierId = same != earlier.end() && same->second->type == link.type ? same->second->id : Id();
+            // What the earlier tree names, too, comes or is there with that one.
+            if (!(earlierId == link.id))
+                (link.type == ObjectType::Tree ? trees : blobs).push_back({link.id, earlierId, commit});
+        }
     }
 
     /// The trees that those of a level replace, unless they come themselves.
@@ -232,26 +241,24 @@ private:
 
     /// Stores a tree or commit behind all that it names.
     void StoreWithTrees(Id const& root) {
-        std::vector<std::pair<Id, bool>> open{{root, false}};
-        while (!open.empty()) {
-            auto const [id, isDone] = open.back();
-            open.pop_back();
-            auto const found = arriving_.find(id);
-            if (found == arriving_.end() || hasStored_.count(id) != 0)
-                continue;
-            Arriving const& object = found->second;
-            if (!isDone) {
-                open.emplace_back(id, true);
-                for (Link const& link : object.links)
+        VisitNamedFirst<Id>(
+            {&root, 1},
+            [this](Id const& id, std::vector<Id>& named) {
+                auto const found = arriving_.find(id);
+                if (found == arriving_.end() || hasStored_.count(id) != 0)
+                    return false;
+                for (Link const& link : found->second.links)
                     if (link.type == ObjectType::Tree)
-                        open.emplace_back(link.id, false);
-                continue;
-            }
-            hasStored_.insert(id);
-            for (Link const& link : object.links)
-                change_.relied.push_back(link.id);
-            Add({id, object.type, object.data, object.earlier});
-        }
+                        named.push_back(link.id);
+                return true;
+            },
+            [this](Id const& id) {
+                Arriving const& object = arriving_.at(id);
+                hasStored_.insert(id);
+                for (Link const& link : object.links)
+                    change_.relied.push_back(link.id);
+                Add({id, object.type, object.data, object.earlier});
+            });
     }
 
     void Add(NewObject object) {

@@ -11,10 +11,31 @@ namespace {
 
 constexpr std::int64_t ticksPerMinute = 600'000'000;
 
-void SetTexts(CommitRecord& record, PackedCommit const& packed) {
+/// The last text that was decoded: of most commits the author is that of the one before, and shares its texts.
+class LastText {
+public:
+    [[nodiscard]] KivStringT<char16_t> const& Decode(std::string_view bytes) {
+        if (bytes != bytes_) {
+            text_ = KivUtils::FromUtf8(bytes);
+            bytes_ = bytes;
+        }
+        return text_;
+    }
+
+private:
+    std::string bytes_;
+    KivStringT<char16_t> text_;
+};
+
+struct LastAuthor {
+    LastText name;
+    LastText email;
+};
+
+void SetTexts(CommitRecord& record, PackedCommit const& packed, LastAuthor& author) {
     record.state = CommitState::Sound;
-    record.authorName = KivUtils::FromUtf8(packed.authorName);
-    record.authorEmail = KivUtils::FromUtf8(packed.authorEmail);
+    record.authorName = author.name.Decode(packed.authorName);
+    record.authorEmail = author.email.Decode(packed.authorEmail);
     record.description = KivUtils::FromUtf8(packed.description);
     record.time = KivVcs::Time::FromTimeT(packed.seconds, KivVcs::TimeZone::Utc);
     record.bias = KivVcs::TimeDelta(packed.biasMinutes * ticksPerMinute);
@@ -39,13 +60,14 @@ void ReadTexts(IArchive& archive, std::span<CommitRecord> records, TakesLinks ta
     for (CommitRecord& record : records)
         if (firsts.emplace(record.id, &record).second)
             ids.push_back(record.id);
+    LastAuthor author;
     auto const outcome = archive.Read(ids, [&](ArchivedObject const& object) {
         CommitRecord& record = *firsts.at(object.id);
         record.state = CommitState::Unrepresentable;
         auto const packed = object.type == ObjectType::Commit ? ReadPackedCommit(object.data) : std::nullopt;
         if (!packed)
             return;
-        SetTexts(record, *packed);
+        SetTexts(record, *packed, author);
         if (takesLinks(record)) {
             record.parent = packed->parent;
             record.tree = packed->tree;

@@ -121,10 +121,10 @@ std::vector<AncestryGraph::Node> AncestryGraph::CycleOf(Node node, std::vector<N
     std::vector<Node> cycle{node};
     std::unordered_set<Node> met{node};
     for (std::size_t next = 0; next < cycle.size(); ++next)
-        if (auto const found = above.find(cycle[next]); found != above.end())
-            for (Node const one : found->second)
-                if (met.insert(one).second)
-                    cycle.push_back(one);
+        ForEachAbove(above, cycle[next], [&](Node one) {
+            if (met.insert(one).second)
+                cycle.push_back(one);
+        });
     return cycle;
 }
 
@@ -210,20 +210,8 @@ AncestryGraph::Meeting AncestryGraph::Meet(Node left, Node right) {
     }
 }
 
-std::vector<AncestryGraph::Node> AncestryGraph::FindFirstWithAll(Node side, Node other, std::span<const Node> commits,
-                                                                 std::function<bool(Node)> const& isUsable) {
-    if (commits.size() > lastBit)
-        return {};
-    BeginWalk();
-    std::vector<Node> beyond = Reach(side, leftSide);
-    std::ignore = Reach(other, rightSide);
-    std::erase_if(beyond, [this](Node node) { return MarkOf(node).sides == bothSides; });
-    Above const above = TurnLinks(beyond);
-    auto const forEachAbove = [&above](Node node, auto const& visit) {
-        if (auto const found = above.find(node); found != above.end())
-            std::for_each(found->second.begin(), found->second.end(), visit);
-    };
-    // From here on `reachedFrom` is counted from below.
+/// Marks, with a bit for each of @p commits or of the cycles that they are in, what contains it. @return all these bits
+std::uint64_t AncestryGraph::MarkAbove(std::span<const Node> commits, Above const& above) {
     std::uint64_t all = 0;
     std::unordered_set<Node> met;
     for (std::size_t i = 0; i < commits.size(); ++i) {
@@ -237,7 +225,7 @@ std::vector<AncestryGraph::Node> AncestryGraph::FindFirstWithAll(Node side, Node
         while (!open.empty()) {
             Node const node = open.back();
             open.pop_back();
-            forEachAbove(node, [&](Node one) {
+            ForEachAbove(above, node, [&](Node one) {
                 if (Mark& mark = MarkOf(one); (mark.reachedFrom & bit) == 0) {
                     mark.reachedFrom |= bit;
                     open.push_back(one);
@@ -245,6 +233,19 @@ std::vector<AncestryGraph::Node> AncestryGraph::FindFirstWithAll(Node side, Node
             });
         }
     }
+    return all;
+}
+
+std::vector<AncestryGraph::Node> AncestryGraph::FindFirstWithAll(Node side, Node other, std::span<const Node> commits,
+                                                                 std::function<bool(Node)> const& isUsable) {
+    if (commits.size() > lastBit)
+        return {};
+    BeginWalk();
+    std::vector<Node> beyond = Reach(side, leftSide);
+    std::ignore = Reach(other, rightSide);
+    std::erase_if(beyond, [this](Node node) { return MarkOf(node).sides == bothSides; });
+    Above const above = TurnLinks(beyond);
+    std::uint64_t const all = MarkAbove(commits, above);
     auto const hasAll = [&](Node node) { return MarkOf(node).sides == leftSide && MarkOf(node).reachedFrom == all; };
     std::vector<Node> open;
     for (Node const node : beyond) {
@@ -261,7 +262,7 @@ std::vector<AncestryGraph::Node> AncestryGraph::FindFirstWithAll(Node side, Node
         if (isUsable(node))
             found.push_back(node);
         else
-            forEachAbove(node, [&open](Node one) { open.push_back(one); });
+            ForEachAbove(above, node, [&open](Node one) { open.push_back(one); });
     }
     return found;
 }

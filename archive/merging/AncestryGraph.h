@@ -91,6 +91,12 @@ private:
     /// @param reached all that it contains
     [[nodiscard]] std::vector<Node> CycleOf(Node node, std::vector<Node> const& reached) const;
     [[nodiscard]] Above TurnLinks(std::vector<Node> const& nodes) const;
+    template <class Visit>
+    static void ForEachAbove(Above const& above, Node node, Visit const& visit) {
+        if (auto const found = above.find(node); found != above.end())
+            std::for_each(found->second.begin(), found->second.end(), visit);
+    }
+    [[nodiscard]] std::uint64_t MarkAbove(std::span<const Node> commits, Above const& above);
 
     AncestryReader read_;
     std::unordered_map<Id, Node> numbers_;

@@ -1,5 +1,6 @@
 #include "repository/MissingCommits.h"
 
+#include "NamedFirst.h"
 #include "repository/Unreadable.h"
 
 namespace KivArchive {
@@ -77,31 +78,23 @@ void MissingCommits::CheckUnheld(std::vector<Id> const& parents) const {
 }
 
 std::vector<cow_ptr<Commit>> MissingCommits::InOrder(std::vector<cow_ptr<Commit>> const& heads) const {
-    std::vector<cow_ptr<Commit>> ordered;
-    std::unordered_set<Id> entered;
-    std::unordered_set<Id> done;
-    std::vector<std::pair<Id, bool>> open;
-    open.reserve(heads.size());
+    std::vector<Id> roots;
+    roots.reserve(heads.size());
     for (auto const& head : heads)
-        open.emplace_back(head->GetId(), false);
-    while (!open.empty()) {
-        auto const [id, isDone] = open.back();
-        open.pop_back();
-        auto const found = missing_.find(id);
-        if (found == missing_.end())
-            continue;
-        if (isDone) {
-            if (done.insert(id).second)
-                ordered.push_back(found->second);
-            continue;
-        }
-        if (!entered.insert(id).second)
-            continue;
-        open.emplace_back(id, true);
-        for (auto const& merged : facts_.MergedBy(id))
-            open.emplace_back(merged->GetId(), false);
-        open.emplace_back(found->second->GetParentId(), false);
-    }
+        roots.push_back(head->GetId());
+    std::vector<cow_ptr<Commit>> ordered;
+    VisitNamedFirst<Id>(
+        roots,
+        [this](Id const& id, std::vector<Id>& named) {
+            auto const found = missing_.find(id);
+            if (found == missing_.end())
+                return false;
+            for (auto const& merged : facts_.MergedBy(id))
+                named.push_back(merged->GetId());
+            named.push_back(found->second->GetParentId());
+            return true;
+        },
+        [&](Id const& id) { ordered.push_back(missing_.at(id)); });
     return ordered;
 }
 

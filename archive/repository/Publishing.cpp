@@ -2,6 +2,7 @@
 
 #include "Changes.h"
 #include "KivArchive/ArchivedBlob.h"
+#include "NamedFirst.h"
 #include "repository/CommitForm.h"
 
 #include <algorithm>
@@ -68,25 +69,21 @@ bool Publishing::AreOnExpectedHeads(std::span<cow_ptr<Commit> const> commits) co
 }
 
 void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
-    // On a list of its own: nesting has no bound that a thread's stack would hold.
-    std::vector<std::pair<std::size_t, bool>> open{{root, false}};
-    while (!open.empty()) {
-        auto const [number, isDone] = open.back();
-        open.pop_back();
-        NewDirectory const& directory = trees.At(number);
-        if (!trees.IsMissing(directory.id) || stored_.contains(directory.id))
-            continue;
-        if (isDone) {
+    VisitNamedFirst<std::size_t>(
+        {&root, 1},
+        [&](std::size_t number, std::vector<std::size_t>& named) {
+            NewDirectory const& directory = trees.At(number);
+            if (!trees.IsMissing(directory.id) || stored_.contains(directory.id))
+                return false;
+            StoreFiles(trees, number);
+            named.assign(directory.subdirectories.rbegin(), directory.subdirectories.rend());
+            return true;
+        },
+        [&](std::size_t number) {
+            NewDirectory const& directory = trees.At(number);
             if (!StoreDirectory(directory))
                 trees.Refuse(directory.holder, directory.name, notItself);
-            continue;
-        }
-        StoreFiles(trees, number);
-        open.emplace_back(number, true);
-        for (auto subdirectory = directory.subdirectories.rbegin(); subdirectory != directory.subdirectories.rend();
-             ++subdirectory)
-            open.emplace_back(*subdirectory, false);
-    }
+        });
 }
 
 void Publishing::StoreFiles(MissingTrees const& trees, std::size_t directory) {

@@ -1,7 +1,6 @@
 #include "KivVcs/Differences.h"
 
-#include "tree/ForEachDifference.h"
-#include "tree/PathPrefix.h"
+#include "tree/DirectoryPairs.h"
 
 #include <algorithm>
 #include <utility>
@@ -16,81 +15,46 @@ Id IdOf(Object const* object) {
     return object != nullptr ? object->GetId() : Id();
 }
 
-/// Two directories of one path, either of which may be null, and how much of the path of the directory entered last is
-/// also the beginning of theirs.
-struct DirectoryPair {
-    Tree const* before;
-    Tree const* after;
-    KivStringT<char16_t> const* name;
-    std::size_t prefixLength;
-};
+bool IsSame(Tree const* before, Tree const* after) {
+    return before != nullptr && after != nullptr && before->HasSameId(*after);
+}
 
-/// Walks the directories that differ, with a stack of its own, since they may be nested deeper than calls can be. Both trees
-/// stay as they are meanwhile, and hold all that it looks at.
-class DifferenceWalk {
-public:
-    explicit DifferenceWalk(std::size_t atMost) : atMost_(atMost) {}
+Difference DifferenceOf(KivStringT<char16_t> path, Held const& was, Held const& is) {
+    Difference difference;
+    difference.oldId = IdOf(was.Visible());
+    difference.newId = IdOf(is.Visible());
+    if (was.GetBlob() != nullptr && is.GetBlob() != nullptr)
+        difference.kind = ChangeKind::Changed;
+    else if (was.GetBlob() != nullptr)
+        difference.kind = difference.newId.IsEmpty() ? ChangeKind::Removed : ChangeKind::FileBecameDirectory;
+    else
+        difference.kind = difference.oldId.IsEmpty() ? ChangeKind::Added : ChangeKind::DirectoryBecameFile;
+    difference.path = std::move(path);
+    return difference;
+}
 
-    /// False if there was more than wanted.
-    bool Run(Tree const* before, Tree const* after) {
-        if (!Compare(before, after))
+/// Appends the differences between two trees, either of which may be null, directory by directory. False if there are more
+/// of them, or more directories to look into, than @p atMost.
+bool FindDifferences(Tree const* before, Tree const* after, std::size_t atMost, std::vector<Difference>& found) {
+    detail::DirectoryPairs pairs(before, after);
+    std::size_t entered = 0;
+    bool isComplete = true;
+    do {
+        if (entered++ > atMost)
             return false;
-        for (std::size_t entered = 0; !open_.empty(); ++entered) {
-            if (entered == atMost_)
-                return false;
-            const DirectoryPair pair = open_.back();
-            open_.pop_back();
-            prefix_.Enter(pair.prefixLength, *pair.name);
-            if (!Compare(pair.before, pair.after))
-                return false;
-        }
-        return true;
-    }
-
-    [[nodiscard]] std::vector<Difference> Take() noexcept { return std::move(found_); }
-
-private:
-    bool Compare(Tree const* before, Tree const* after) {
-        const auto openBefore = static_cast<std::ptrdiff_t>(open_.size());
-        bool isComplete = true;
-        detail::ForEachDifference(detail::TopOf(before), detail::TopOf(after),
-                                  [&](KivStringT<char16_t> const& name, Held const& was, Held const& is) {
-                                      if (detail::BlobDiffers(was, is)) {
-                                          isComplete = isComplete && found_.size() < atMost_;
-                                          if (isComplete)
-                                              Add(name, was, is);
-                                      }
-                                      // One that a blob of the same name hides may be the same on both sides.
-                                      if (isComplete && !name.IsEmpty() && detail::TreeDiffers(was, is) &&
-                                          !IsSame(was.GetTree(), is.GetTree()))
-                                          open_.push_back({was.GetTree(), is.GetTree(), &name, prefix_.GetLength()});
-                                  });
-        std::reverse(open_.begin() + openBefore, open_.end());
-        return isComplete;
-    }
-
-    [[nodiscard]] static bool IsSame(Tree const* before, Tree const* after) {
-        return before != nullptr && after != nullptr && before->HasSameId(*after);
-    }
-
-    void Add(KivStringT<char16_t> const& name, Held const& was, Held const& is) {
-        Difference& difference = found_.emplace_back();
-        difference.oldId = IdOf(was.Visible());
-        difference.newId = IdOf(is.Visible());
-        if (was.GetBlob() != nullptr && is.GetBlob() != nullptr)
-            difference.kind = ChangeKind::Changed;
-        else if (was.GetBlob() != nullptr)
-            difference.kind = difference.newId.IsEmpty() ? ChangeKind::Removed : ChangeKind::FileBecameDirectory;
-        else
-            difference.kind = difference.oldId.IsEmpty() ? ChangeKind::Added : ChangeKind::DirectoryBecameFile;
-        difference.path = prefix_.PathOf(name);
-    }
-
-    std::size_t atMost_;
-    PathPrefix prefix_;
-    std::vector<DirectoryPair> open_;
-    std::vector<Difference> found_;
-};
+        pairs.ForEachDifference([&](KivStringT<char16_t> const& name, Held const& was, Held const& is) {
+            if (detail::BlobDiffers(was, is)) {
+                isComplete = isComplete && found.size() < atMost;
+                if (isComplete)
+                    found.push_back(DifferenceOf(pairs.PathOf(name), was, is));
+            }
+            // One that a blob of the same name hides may be the same on both sides.
+            return isComplete && !name.IsEmpty() && detail::TreeDiffers(was, is) &&
+                   !IsSame(was.GetTree(), is.GetTree());
+        });
+    } while (isComplete && pairs.Next());
+    return isComplete;
+}
 
 KivStringViewT<char16_t> NameOf(KivStringT<char16_t> const& path) noexcept {
     int begin = path.GetLength();
@@ -180,9 +144,7 @@ void PairRenames(std::vector<Difference>& differences) {
 }
 
 Differences::Differences(cow_ptr<Tree> const& before, cow_ptr<Tree> const& after, DifferenceOptions const& options) {
-    DifferenceWalk walk(options.atMost);
-    isComplete_ = walk.Run(before.get(), after.get());
-    differences_ = walk.Take();
+    isComplete_ = FindDifferences(before.get(), after.get(), options.atMost, differences_);
     // Names are visited in order; what breaks the order of paths are files beside directories.
     if (!std::is_sorted(differences_.begin(), differences_.end(), IsBeforeByPath))
         SortByPath(differences_);

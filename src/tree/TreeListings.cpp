@@ -1,9 +1,9 @@
 #include "KivVcs/Tree.h"
 
-#include "tree/ForEachDifference.h"
-#include "tree/PathPrefix.h"
+#include "tree/DirectoryPairs.h"
 
 #include <unordered_map>
+#include <utility>
 
 namespace KivVcs {
 
@@ -15,75 +15,28 @@ using detail::TreeDiffers;
 
 namespace {
 
-/// Collects full paths, directory by directory, the names of each in their order.
-class PathCollector {
-public:
-    void Enter(std::size_t length, KivStringT<char16_t> const& name) {
-        prefix_.Enter(length, name);
-        isFirst_ = true;
-    }
-
-    /// The length of what the paths of this directory begin with.
-    [[nodiscard]] std::size_t PrefixLength() const noexcept { return prefix_.GetLength(); }
-
-    void Add(KivStringT<char16_t> const& name) {
-        paths_.push_back(prefix_.PathOf(name));
-        // Within a directory paths ascend as names do.
-        if (std::exchange(isFirst_, false) && paths_.size() > 1)
-            isAscending_ = isAscending_ && paths_[paths_.size() - 2] < paths_.back();
-    }
-
-    /// The paths, sorted, each once.
-    [[nodiscard]] PathList Take() {
-        if (!isAscending_) {
-            std::sort(paths_.begin(), paths_.end());
-            paths_.erase(std::unique(paths_.begin(), paths_.end()), paths_.end());
-        }
-        return std::move(paths_);
-    }
-
-private:
-    PathPrefix prefix_;
-    PathList paths_;
-    bool isFirst_ = false;
-    bool isAscending_ = true;
-};
-
-/// Two directories of the same path that are compared, either of which may be null, and how the path begins that their
-/// name ends.
-struct DirectoryPair {
-    KivStringT<char16_t> const* name;
-    Tree const* mine;
-    Tree const* theirs;
-    std::size_t prefixLength;
-};
-
-/// Adds the paths that differ right in a pair of directories, and puts the pairs of subdirectories that differ on @p open,
-/// the first one last.
-void CompareDirectories(Tree const* mine, Tree const* theirs, PathCollector& paths, std::vector<DirectoryPair>& open) {
-    const auto before = static_cast<std::ptrdiff_t>(open.size());
-    detail::ForEachDifference(TopOf(mine), TopOf(theirs),
-                              [&](KivStringT<char16_t> const& name, Held const& here, Held const& there) {
-                                  if (BlobDiffers(here, there))
-                                      paths.Add(name);
-                                  if (TreeDiffers(here, there))
-                                      open.push_back({&name, here.GetTree(), there.GetTree(), paths.PrefixLength()});
-                              });
-    std::reverse(open.begin() + before, open.end());
-}
-
-/// The paths of all blobs that differ between two trees, either of which may be null, without recursing into directories.
+/// The paths of all blobs that differ between two trees, either of which may be null, sorted, each once.
 PathList DeepBlobDiffs(Tree const* mine, Tree const* theirs) {
-    PathCollector paths;
-    std::vector<DirectoryPair> open;
-    CompareDirectories(mine, theirs, paths, open);
-    while (!open.empty()) {
-        const DirectoryPair pair = open.back();
-        open.pop_back();
-        paths.Enter(pair.prefixLength, *pair.name);
-        CompareDirectories(pair.mine, pair.theirs, paths, open);
+    PathList paths;
+    bool isAscending = true;
+    detail::DirectoryPairs pairs(mine, theirs);
+    do {
+        // Within a directory paths ascend as names do.
+        bool isFirst = true;
+        pairs.ForEachDifference([&](KivStringT<char16_t> const& name, Held const& here, Held const& there) {
+            if (BlobDiffers(here, there)) {
+                paths.push_back(pairs.PathOf(name));
+                if (std::exchange(isFirst, false) && paths.size() > 1)
+                    isAscending = isAscending && paths[paths.size() - 2] < paths.back();
+            }
+            return TreeDiffers(here, there);
+        });
+    } while (pairs.Next());
+    if (!isAscending) {
+        std::sort(paths.begin(), paths.end());
+        paths.erase(std::unique(paths.begin(), paths.end()), paths.end());
     }
-    return paths.Take();
+    return paths;
 }
 
 template <class Differs>
