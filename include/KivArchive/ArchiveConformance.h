@@ -1,8 +1,7 @@
 #pragma once
 
 /// @file
-/// What every archive must do, for those who write one: hand `CheckArchiveConformance` a way to make empty archives and
-/// a place to report failures to. Needs no test framework and no more than the library.
+/// The conformance suite for those who write an archive. It needs no test framework.
 
 #include "KivArchive/detail/ConformanceContents.h"
 #include "KivArchive/detail/ConformanceTables.h"
@@ -12,13 +11,13 @@
 
 namespace KivArchive {
 
-/// An archive is tried with nothing but what is in it; each case begins with an empty one.
+/// Makes a new, empty archive. Each case uses one of its own.
 using ArchiveMaker = std::function<std::unique_ptr<IArchive>()>;
 
-/// Receives what is wrong, in a sentence that begins with the case. May throw, which ends the check.
+/// Receives each failure as a sentence that begins with the name of the case. May throw, which ends the check.
 using ConformanceFailure = std::function<void(std::string const&)>;
 
-/// Tries everything that `IArchive` promises. @p makeEmpty gives a new, empty archive at each call.
+/// Checks everything that `IArchive` promises.
 inline void CheckArchiveConformance(ArchiveMaker const& makeEmpty, ConformanceFailure const& onFailure) {
     struct Case {
         const char* name;

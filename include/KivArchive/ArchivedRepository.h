@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// A repository whose versions are in an archive, and come from there when they are asked for.
+/// A repository whose versions are in an archive and are fetched when they are asked for.
 
 #include "KivArchive/ArchivedBlob.h"
 #include "KivArchive/IArchive.h"
@@ -20,23 +20,24 @@ using KivVcs::cow_ptr;
 using KivVcs::Resolvers;
 
 struct RepositoryOptions {
-    /// At most so many bytes of contents are kept for those who read them again, and held by streams; what was not used
-    /// for the longest time goes first. Contents that a blob keeps, since its `GetData` was called, are not counted.
+    /// At most this many bytes of contents are cached or held by streams; the least recently used are dropped first.
+    /// Contents that a blob keeps because its `GetData` was called are not counted.
     std::uint64_t contentBytes = std::uint64_t{64} * 1024 * 1024;
-    /// On how many threads `ReadContents` reads; 0 stands for as many as there are processors.
+    /// How many threads `ReadContents` uses; 0 stands for as many as there are processors.
     unsigned workers = 0;
     /// How many times `PublishMerging` tries.
     unsigned attempts = 20;
-    /// How long it waits after it has lost a race for the first time, at most; twice as long each further time, up to a
-    /// second.
+    /// How long `PublishMerging` waits at most after the first race that it loses; doubled after each further one, up
+    /// to a second.
     std::chrono::milliseconds backOff{10};
-    /// Gives the commit of a merge its author and description; it is given the commit that is merged. May be empty.
+    /// Sets the author and description of the commit of a merge; `merged` is the commit that is merged in. May be
+    /// empty.
     std::function<void(Commit& merge, Commit const& merged)> describeMerge;
 };
 
 /// What became of the branches that were to be published.
 struct PublishOutcome {
-    /// Whether the archive has them now. If not it has none of them.
+    /// Whether the archive has them now. If false, none of them has moved there.
     bool published = false;
     /// The branches that others have moved meanwhile, with their heads in the archive; null for none.
     std::vector<Branch> moved;
@@ -45,16 +46,16 @@ struct PublishOutcome {
 };
 
 struct RefreshOutcome {
-    /// The branches that were moved, made or removed here, since others had done so.
+    /// The branches that were moved, made or removed here because others had done so in the archive.
     std::vector<KivStringT<char16_t>> moved;
-    /// The branches that others have moved and that have something unpublished here, which stay as they are.
+    /// The branches that others have moved and that have unpublished commits here. They stay as they are.
     std::vector<KivStringT<char16_t>> diverged;
 };
 
 enum class PublishMergingResult : std::uint8_t {
-    Published, ///< The archive has all of it.
+    Published, ///< The archive has all branches.
     GaveUp,    ///< A merge was refused: a resolver gave up.
-    Lost,      ///< Others were faster each time.
+    Lost,      ///< Every attempt lost its race.
 };
 
 struct PublishMergingOutcome {
@@ -63,28 +64,29 @@ struct PublishMergingOutcome {
     unsigned attempts = 0;
     /// The branch that could not be merged; empty if none was refused.
     KivStringT<char16_t> branch;
-    /// What the merges did, those of races that were lost included.
+    /// What each merge did, including those whose race was lost afterwards.
     std::vector<MergeReport> merges;
 };
 
 /// A repository over an archive, which it may share with others.
 ///
-/// Its branches are read when it is made. Commits are fetched when something reaches them, a walk's in growing batches
-/// ahead of it; root trees when they are asked for, whole, with one batch for each level; contents when they are asked for,
-/// as `ArchivedBlob` says, and never by anything in here but publishing, of what hosts have added. What has been fetched is
-/// in the storage, also of its clones, and keeps the archive alive, not the repository. Lookups by identifier answer from
-/// the storage and fetch nothing; `Load` brings in others. Counts and tables show what is loaded.
+/// Its branches are read when it is made. Commits are fetched when something reaches them, ahead of a walk in growing
+/// batches; root trees when they are asked for, whole, with one batch for each level; contents when they are asked for,
+/// as `ArchivedBlob` says. No operation here asks for contents of its own accord, except that publishing reads those
+/// that hosts have added. What has been fetched is in the storage and in those of all clones, and keeps the archive
+/// alive, not the repository. Lookups by identifier search the storage and fetch nothing; `Load` fetches. Counts and
+/// tables show what is loaded.
 ///
 /// The archive sees nothing of what is committed here until it is published.
 ///
-/// Threads: as every repository; several repositories may share one archive on several threads. Fetching may happen on any
-/// thread that reads a commit.
-/// @throws ArchiveError from everything that asks the archive, and from everything that walks to what has not been fetched:
-/// `Damaged`, `Unrepresentable` or `Collected` if it cannot be had, which never looks like an end of the history
+/// Threads: as for every repository; several repositories may share one archive on several threads. Fetching may happen
+/// on any thread that reads a commit.
+/// @throws ArchiveError from everything that asks the archive or reaches what has not been fetched; `Damaged`,
+/// `Unrepresentable` or `Collected` if that cannot be read, so that it never looks like the end of a history
 class KIVARCHIVE_EXPORT ArchivedRepository : public KivVcs::Repository {
 public:
-    /// Opens the archive, which must not be null: reads its branches and their heads, with two batches. An archive without
-    /// branches gives the branch "master" without a head. A head that cannot be read locks out its own branch only.
+    /// Reads the branches of the archive, which must not be null, and their heads, with two batches. If there are none,
+    /// the repository has the branch "master" without a head. A head that cannot be read affects its own branch only.
     explicit ArchivedRepository(std::shared_ptr<IArchive> archive, RepositoryOptions const& options = {});
     ArchivedRepository(ArchivedRepository const&) = delete;
     ArchivedRepository& operator=(ArchivedRepository const&) = delete;
@@ -96,91 +98,94 @@ public:
     /// @throws ArchiveError if the archive has a head that cannot be read
     [[nodiscard]] cow_ptr<Commit> GetHead(KivStringViewT<char16_t> branch) const override;
 
-    /// Brings commits, trees with all below them, and blobs into the storage; commits and blobs by one batch each.
-    /// @param progress may be null; of the trees none enters the storage if it asks to stop
+    /// Brings commits, blobs, and trees with everything below them into the storage; commits and blobs with one batch
+    /// each.
+    /// @param progress may be null; if it asks to stop, no tree enters the storage
     /// @return those that the archive does not have
     std::vector<Id> Load(std::span<const Id> ids, IProgress* progress = nullptr);
 
-    /// The content of a blob that is in the archive, as a value or as a stream, within the byte budget. Nobody needs to
-    /// have loaded the blob.
+    /// The content of a blob that is in the archive, as a value or as a stream, within the byte budget. The blob need
+    /// not be loaded.
     [[nodiscard]] Buffer ReadContent(Id const& id);
     [[nodiscard]] StreamIO OpenContent(Id const& id);
 
-    /// Hands all these contents to @p receiver, verified, on up to `RepositoryOptions::workers` threads at once, this one
-    /// among them; each of a part of @p ids, so that these are best given in the order of their paths. Of a content larger
-    /// than `largestWholeContent` the receiver gets no data, and calls `OpenContent`. Nothing is kept.
-    /// @param receiver may be called on several threads at once; what it throws ends all of them and passes through
+    /// Passes all these contents, verified, to @p receiver, on up to `RepositoryOptions::workers` threads at once, this
+    /// one among them. Each thread reads one part of @p ids, which is fastest in the order of their paths. For a
+    /// content larger than `largestWholeContent` the receiver gets no data, and calls `OpenContent`. Nothing is cached.
+    /// @param receiver may be called on several threads at once; what it throws stops all of them and passes through
     /// @param progress may be null; called on this thread
-    /// @return what could not be given
+    /// @return what could not be read
     ReadOutcome ReadContents(std::span<const Id> ids, ObjectReceiver const& receiver, IProgress* progress = nullptr);
 
     /// Opens a content at its beginning each time it is called.
     using ContentOpener = std::function<StreamIO()>;
 
-    /// A stored blob with the content of a stream. One larger than `largestWholeContent` is not held: it goes to the
-    /// archive at once, in pieces, where nothing shows it until a commit that has it is published. It is read twice, to be
-    /// identified first.
+    /// Stores the content of a stream as a blob. One larger than `largestWholeContent` is not held in memory: it is
+    /// read a first time to be identified, and a second time into the archive, in pieces. There it stays invisible
+    /// until a commit that has it is published.
     /// @param earlier the content that this one replaces under its path, which makes it cheap to store; may be null
     /// @param progress may be null
-    /// @return null if the stream cannot be read to its end, or gives something else the second time
+    /// @return null if the stream cannot be read to its end, or differs the second time
     cow_ptr<KivVcs::Blob> StoreContent(ContentOpener const& open, Id const& earlier = {},
                                        IProgress* progress = nullptr);
     /// The same for a file. @param path in the encoding of the file system
     cow_ptr<KivVcs::Blob> StoreFile(std::string const& path, Id const& earlier = {}, IProgress* progress = nullptr);
 
-    /// Writes a content to a new file, in pieces; an existing file is replaced. After a failure there is none.
+    /// Writes a content to a new file, in pieces, in place of an existing one. After a failure there is no file.
     /// @param progress may be null
     /// @throws ArchiveError, `Unavailable` or `DiskFull` if the file cannot be written
     void RestoreFile(Id const& id, std::string const& path, IProgress* progress = nullptr);
 
-    /// The head that a branch had in the archive when that was last looked at; null if it had none.
+    /// The head that a branch had in the archive when the archive's branches were last read; null if it had none.
     [[nodiscard]] Id GetPublishedHead(KivStringViewT<char16_t> branch) const;
-    /// Whether a branch stands elsewhere than in the archive, as far as that is known, because it was moved here.
+    /// Whether a branch was moved here and so differs from the archive's, as last read.
     [[nodiscard]] bool HasUnpublished(KivStringViewT<char16_t> branch) const;
 
-    /// Writes what the heads of these branches reach and the archive lacks, and moves the branches there: all of them, and
-    /// the records, or none. Branches that were removed here are removed there. What has been merged, too, is published with
-    /// the commit that merged it.
+    /// Stores in the archive what the heads of these branches reach and the archive lacks, and moves the branches
+    /// there: all of them, and the records, or none. Branches that were removed here are removed there. A commit that
+    /// was merged is published along with the one that merged it.
     ///
-    /// Asks for what is missing from the top, directories against those of the parent; stores children first, in
-    /// changes of 8 MiB and a little more, the last of which moves the branches. Whatever is stored before that is not
-    /// visible, and stays for the next try. Tries again if something that it relied on has been collected meanwhile.
+    /// Looks for what is missing from the top down, comparing directories with those of the parent; stores each object
+    /// after those that it names, in changes of a little more than 8 MiB. The last change moves the branches; what is
+    /// stored before it is invisible, and stays for the next try. Tries again if something that it relied on has been
+    /// collected meanwhile.
     /// @param branches those that have nothing unpublished, or do not exist, are left out
     /// @param progress may be null
-    /// @throws ArchiveError, `Unrepresentable` with its path for what a packed form cannot show, and `Collected` if
-    /// something is gone that is only known here by its identifier; what a host's objects throw
+    /// @throws ArchiveError; `Unrepresentable`, naming the path, for what a packed form cannot show, and `Collected` if
+    /// the archive has lost something of which only the identifier is known here; what a host's objects throw
     PublishOutcome Publish(std::span<const KivStringT<char16_t>> branches,
                            std::vector<RecordChange> const& records = {}, IProgress* progress = nullptr);
     /// The same for all branches.
     PublishOutcome Publish(IProgress* progress = nullptr);
 
-    /// Looks at the archive's branches, and moves those that have nothing unpublished here to where they are there. A branch
-    /// that was removed here comes back if others have moved it.
+    /// Reads the archive's branches, and gives those that have nothing unpublished here the heads that they have there.
+    /// A branch that was removed here comes back if others have moved it.
     /// @param progress may be null; nothing has moved if it asks to stop
     RefreshOutcome Refresh(IProgress* progress = nullptr);
 
-    /// Publishes all branches, merging what others have published until it wins: refreshes, merges every branch that has
-    /// moved on both sides, publishes, and begins again if others were faster. Where the head that is known here was
-    /// rewritten there, the commits on top of it are put on the rebuilt one without a merge. The current branch stays
-    /// current.
+    /// Publishes all branches, merging what others have published until it succeeds: refreshes, merges every branch
+    /// that has moved on both sides, publishes, and begins again if it has lost the race. Where others have rewritten
+    /// the published head, the commits on top of it are rebased onto the rewritten one without a merge. The current
+    /// branch stays current.
     ///
-    /// What has been merged stays so if a later step fails.
+    /// What has been merged stays merged if a later step fails.
     /// @param resolvers as `Merge` takes them; may be asked again about what was merged for a race that was lost
     /// @param progress may be null
     /// @throws as `Publish` and `Refresh`; what resolvers throw
     PublishMergingOutcome PublishMerging(Resolvers const& resolvers, IProgress* progress = nullptr);
     PublishMergingOutcome PublishMerging(MergeResolvers const& resolvers, IProgress* progress = nullptr);
 
-    /// Moves the current branch if that takes no new commit: to @p commit if that contains the head, or if both have one
-    /// tree and @p commit the smaller identifier; nowhere if the head contains @p commit, or both have one tree and the head
-    /// has the smaller identifier. Of two with one tree the one that is taken is noted to contain the other, so that both
-    /// sides of an exchange end with the same head.
+    /// Moves the current branch if that takes no new commit: to @p commit if it contains the head, or if both have the
+    /// same tree and @p commit has the smaller identifier. Leaves it where it is if the head contains @p commit, or if
+    /// both have the same tree and the head has the smaller identifier. Of two commits with the same tree, the one that
+    /// is taken is recorded to contain the other, so that both sides of an exchange end with the same head.
     /// @return whether the branch has @p commit now
     bool FastForwardMerge(cow_ptr<Commit> commit) override;
     /// As `Repository::Merge`, with `FastForwardMerge` and `Merge3Way` of this class.
     bool Merge(cow_ptr<Commit> commit, Resolvers resolvers) override;
-    /// Merges the tree of @p commit into the current branch with `MergeAgain`, by a new commit that contains both, also if its
-    /// tree is that of one side. `GetCommonBase` is not asked: what counts is what a commit contains, not only its parents.
+    /// Merges the tree of @p commit into the current branch with `MergeAgain`, by a new commit that contains both, even
+    /// if its tree is that of one side. `GetCommonBase` is not called: all that a commit contains counts, not only its
+    /// parents.
     bool Merge3Way(cow_ptr<Commit> commit, Resolvers resolvers) override;
 
     /// `Merge` and `Merge3Way` with all resolvers, and with an account of what was done.
@@ -191,18 +196,18 @@ public:
                                     IProgress* progress = nullptr);
 
 protected:
-    /// Notes that @p rebuilt stands for @p old on a rewritten history, for the archive to know once it is published.
+    /// Records that @p rebuilt stands for @p old on a rewritten history. Publishing @p rebuilt stores this.
     void CommitRewritten(cow_ptr<Commit> old, cow_ptr<Commit> rebuilt) override;
 
     /// Merges what others have published on @p branch into it, for `PublishMerging`, with `MergeWithReport`.
     [[nodiscard]] virtual MergeReport MergePublished(KivStringViewT<char16_t> branch, cow_ptr<Commit> const& theirs,
                                                      MergeResolvers const& resolvers, IProgress* progress);
 
-    /// Notes that @p commit contains @p contained, for the archive to know once @p commit is published. What was merged is
-    /// kept until then, and published along.
+    /// Records that @p commit contains @p contained. Publishing @p commit stores this; a commit that it merged is held
+    /// until then, and published along.
     void RecordContained(cow_ptr<Commit> const& commit, Containment how, cow_ptr<Commit> const& contained);
 
-    /// As `IArchive::ReadAncestry`, with what is known of commits that have not been published.
+    /// As `IArchive::ReadAncestry`, including the facts of commits that have not been published.
     [[nodiscard]] std::vector<Ancestry> ReadAncestry(std::span<const Id> commits, Follow follow,
                                                      std::size_t more) const;
 

@@ -1,8 +1,8 @@
 #pragma once
 
 /// @file
-/// What people are shown of an archive: histories, graphs, files and differences, as plain values that are read from
-/// packed forms without making commits, trees or contents.
+/// What hosts show of an archive: histories, graphs, files and differences, as plain values that are read from packed
+/// forms without making objects.
 
 #include "KivArchive/IArchive.h"
 
@@ -12,13 +12,13 @@
 
 namespace KivArchive {
 
-/// Whether a commit could be read. Its links are those of its facts in any case, so that a history goes on behind what
-/// is damaged.
+/// Whether a commit could be read. Its links come from its facts in any case, so that a history goes on after a damaged
+/// commit.
 enum class CommitState : std::uint8_t {
     Sound,
     Missing,         ///< Only its facts are there.
-    Damaged,         ///< There, but not what was stored.
-    Unrepresentable, ///< Sound, but nothing that commits are packed to.
+    Damaged,         ///< There, but not as it was stored.
+    Unrepresentable, ///< As it was stored, but not in the packed form of a commit.
 };
 
 /// A commit in a history or a graph. The texts are empty and the time is zero unless its state is `Sound`.
@@ -38,32 +38,32 @@ struct CommitRecord {
 };
 
 struct CommitListOptions {
-    /// `Parents` lists the line of history of each head, and reads no further than is asked for. Otherwise the listing is
-    /// a graph: no commit comes before one that leads to it, for which the facts of all commits are read first.
+    /// `Parents` lists the line of history of each head, and reads no further than is asked for. Otherwise the listing
+    /// is a graph: no commit comes before one that leads to it, for which the facts of all commits are read first.
     Follow follow = Follow::Parents;
     std::uint64_t atMost = std::numeric_limits<std::uint64_t>::max();
-    /// Only commits in which this path holds something else than in their parent: a file or directory that came, went or
-    /// has another identifier. What a root commit holds came with it. The path without components is the whole tree.
+    /// Only commits in which this path differs from their parent: a file or directory was added, was removed or has
+    /// another identifier. A root commit adds all that it holds. The path without components is the whole tree.
     std::optional<KivStringT<char16_t>> changing;
 };
 
-/// Takes one commit after the other. @return false to end the listing
+/// Receives commits one at a time. @return false to end the listing
 using CommitReceiver = std::function<bool(CommitRecord const&)>;
 
-/// Hands the commits that @p heads lead to, these among them, to @p receiver, each once: newest first along each line of
-/// history. The null identifier leads nowhere.
+/// Passes @p heads and the commits that they lead to to @p receiver, each once, newest first along each line of
+/// history. Null identifiers are skipped.
 ///
-/// One call of the archive for the facts and one for the texts of up to 500 commits, and if `changing` is set one
-/// more for each component of the path. Holds 500 of them; of a graph 200 bytes for each commit reached.
+/// Calls the archive twice for every 500 commits, for their facts and for their texts, and if `changing` is set once
+/// more for each component of the path. Holds 500 commits; for a graph also 200 bytes for each commit reached.
 /// @param progress may be null
 /// @throws ArchiveError; of kind `Damaged` or `Collected` for a tree that `changing` needs
 KIVARCHIVE_EXPORT void ListCommits(IArchive& archive, std::span<const Id> heads, CommitListOptions const& options,
                                    CommitReceiver const& receiver, IProgress* progress);
 
-/// The same for these commits only, in the order given. Those without facts are shown with the links of their text.
+/// The same for these commits only, in the order given. Those without facts have the links of their packed form.
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<CommitRecord> ReadCommits(IArchive& archive, std::span<const Id> commits);
 
-/// What a directory holds under a name, or a version under a path.
+/// What a directory holds under a name, or a version under a path: a file, or a directory.
 struct EntryRecord {
     KivStringT<char16_t> path;
     Id id;
@@ -72,15 +72,17 @@ struct EntryRecord {
 
 /// The entries of one directory, ordered by name. The null identifier is an empty directory.
 /// @throws ArchiveError of kind `Collected` if the tree is not there, of kind `Damaged` or `Unrepresentable` if it
-/// cannot be read, as everything below
+/// cannot be read; so do all functions below
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<EntryRecord> ListDirectory(IArchive& archive, Id const& tree);
 
-/// The entries that a path leads to in each of @p trees: the tree itself for the path without components, no element for
-/// a tree in which there is none.
+/// An entry, and the tree in which its path leads to it.
 struct FoundEntry {
     Id tree;
     EntryRecord entry;
 };
+
+/// The entries that a path leads to in each of @p trees: the tree itself for the path without components, no element
+/// for a tree in which there is none.
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<FoundEntry> FindEntries(IArchive& archive, std::span<const Id> trees,
                                                                     KivStringT<char16_t> const& path);
 
@@ -94,8 +96,8 @@ struct DifferenceList {
 
 /// What `KivVcs::Differences` gives for the trees of these identifiers, null for an empty one.
 ///
-/// Subtrees with equal identifiers are not entered; two subtrees are compared once however often they stand against each
-/// other. Reads the directories that differ level by level, 500 at a time; no content is asked for.
+/// Subtrees with equal identifiers are not entered; two subtrees are compared once, in however many places the one
+/// takes the place of the other. Reads the directories that differ level by level, 500 at a time; no content is read.
 /// @param progress may be null
 [[nodiscard]] KIVARCHIVE_EXPORT DifferenceList ListDifferences(IArchive& archive, Id const& before, Id const& after,
                                                                KivVcs::DifferenceOptions const& options,
@@ -109,7 +111,7 @@ struct FileList {
     bool isComplete = true;
 };
 
-/// All files below @p tree, at most @p atMost. A subtree that stands in many places is read once.
+/// All files below @p tree, at most @p atMost. A subtree that occurs in many places is read once.
 /// @param progress may be null
 [[nodiscard]] KIVARCHIVE_EXPORT FileList ListFiles(IArchive& archive, Id const& tree, std::size_t atMost,
                                                    IProgress* progress);

@@ -9,11 +9,11 @@
 
 namespace KivArchive {
 
-/// An archive that lives as long as this object: for tests, and in front of slower ones. Keeps data as it is given,
-/// sharing large buffers.
+/// An archive that lives as long as this object: for tests, and in front of slower archives. Large buffers are shared,
+/// not copied.
 class KIVARCHIVE_EXPORT MemArchive final : public IArchive {
 public:
-    /// The time that marks are made at, by an arbitrary beginning.
+    /// The time that marks are given, counted from any moment.
     using Clock = std::function<std::chrono::seconds()>;
 
     /// An empty archive. An empty clock stands for the system's steady one.

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// How long operations report how far they are, and how a host stops them.
+/// How long-running operations report how far they are, and how a host stops them.
 
 #include "KivArchive/Export.h"
 
@@ -9,7 +9,7 @@
 
 namespace KivArchive {
 
-/// How far a long operation is.
+/// How far a long-running operation is.
 struct Progress {
     /// A few words for a person, such as "storing objects"; valid during the call only.
     const char* step = "";
@@ -18,14 +18,14 @@ struct Progress {
     std::uint64_t total = 0;
 };
 
-/// A host's view of long operations. Called on the thread that called the operation, one call at a time, with no lock
-/// held, some times a second at most for large work and once for each batch of small work.
+/// Receives the progress of long-running operations. Called on the thread that called the operation, one call at a
+/// time, with no lock held: for large work at most a few times a second, for small work once for each batch.
 class KIVARCHIVE_EXPORT IProgress {
 public:
     virtual ~IProgress();
 
-    /// @return false to stop: the operation then throws `ArchiveError` of kind `Failure::Cancelled`.
-    /// What it throws passes through the operation, which leaves everything as a failure does.
+    /// What this throws passes through the operation, which leaves everything as after a failure.
+    /// @return false to stop: the operation then throws `ArchiveError` of kind `Failure::Cancelled`
     virtual bool Report(Progress const& progress) = 0;
 
 protected:

@@ -3,14 +3,14 @@
 /// @file
 /// Texts compared and merged line by line.
 ///
-/// A line ends after its line feed, so that line ends of either kind are part of their line and kept; only the last line
-/// may lack one. A content that has a zero byte, or more bytes than allowed, is no text.
+/// A line includes its line feed, and a carriage return before it; only the last line may lack one. A content that has
+/// a zero byte, or more bytes than allowed, is no text.
 ///
 /// Threads: any number of calls may run concurrently.
 ///
-/// Cost: proportional to the contents where they differ in a few places; at most proportional to the number of lines times
-/// its square root, whatever the contents: where very much differs, more changes may be found than are needed. At most
-/// some dozen bytes of memory for each line.
+/// Cost: proportional to the contents if they differ in few places, and never more than proportional to the number of
+/// lines times its square root: where very much differs, more changes may be found than are needed. Takes at most some
+/// dozen bytes of memory for each line.
 
 #include "KivArchive/Export.h"
 
@@ -36,7 +36,7 @@ struct LineChange {
     friend bool operator==(LineChange const&, LineChange const&) noexcept = default;
 };
 
-/// What makes one text of another one, from the beginning on, with equal lines between the changes:
+/// The changes that turn one text into another, in order, with equal lines between them:
 ///
 ///     for (auto const& change : DiffTextLines(before, after))
 struct TextDifferences {
@@ -61,12 +61,12 @@ struct UnifiedTextOptions {
 };
 
 /// The differences as text for people and for `patch`; empty if nothing differs.
-/// @return nothing if one of them is no text.
+/// @return nothing if one of the contents is no text
 [[nodiscard]] KIVARCHIVE_EXPORT std::optional<KivVcs::Buffer>
 UnifiedText(KivVcs::Buffer const& before, KivVcs::Buffer const& after, UnifiedTextOptions const& options = {});
 
 enum class TextMergeResult : std::uint8_t {
-    Merged,    ///< Nothing is left to settle.
+    Merged,    ///< There is no conflict.
     Conflicts, ///< Both sides changed the same lines, or lines beside each other, differently.
     GaveUp,    ///< One of the contents is no text.
 };
@@ -90,7 +90,7 @@ struct TextMergeOptions {
 
 struct TextMerge {
     TextMergeResult result = TextMergeResult::GaveUp;
-    /// The merged text; with conflicts, empty or the text that shows them.
+    /// The merged text. If there are conflicts, the text that shows them, or empty.
     KivVcs::Buffer text;
     std::size_t conflicts = 0;
 };

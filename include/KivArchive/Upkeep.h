@@ -17,16 +17,16 @@ struct Link {
     std::string_view name;
 };
 
-/// What the data of a tree or a commit names: files and directories, or the root tree and the parent. A blob names
-/// nothing.
-/// @return false, with the links before it, at the first byte that is not as the packed form has it
+/// Appends to @p links what the data of a tree or a commit names: files and directories, or the root tree and the
+/// parent. A blob names nothing.
+/// @return false, with the links up to there, at the first byte that does not fit the packed form
 [[nodiscard]] KIVARCHIVE_EXPORT bool ReadLinks(ObjectType type, std::span<const std::byte> data,
                                                std::vector<Link>& links);
 
-/// An object that is named and not there.
+/// An object that others name and that is not there.
 struct MissingObject {
     Id id;
-    /// One of those that name it.
+    /// One of the objects that name it.
     Id namedBy;
 };
 
@@ -34,13 +34,13 @@ struct MissingObject {
 struct VerifyReport {
     /// How many objects were read.
     std::uint64_t objects = 0;
-    /// Objects whose stored bytes are not theirs, or whose data is not of their type.
+    /// Objects whose bytes do not match their identifier, or whose data is not that of their type.
     std::vector<Id> damaged;
     /// Objects that sound ones name and that are not there, each once.
     std::vector<MissingObject> missing;
     /// Branches whose head is not a commit that is there and sound.
     std::vector<Branch> branches;
-    /// Commits that are there and whose facts are missing, or name another parent or tree than they do.
+    /// Commits that are there and whose facts are missing, or have another parent or tree than the commits name.
     std::vector<Id> ancestry;
 
     [[nodiscard]] bool IsSound() const noexcept {
@@ -48,25 +48,25 @@ struct VerifyReport {
     }
 };
 
-/// Reads every object, compares it with its identifier, and looks for all that it names. Goes on whatever it finds. What
-/// others store meanwhile is seen or not.
+/// Reads every object, compares it with its identifier, and looks for all that it names. Goes on whatever it finds.
+/// What others store meanwhile may be read or not.
 ///
-/// Takes 32 bytes an object, and 120 bytes each for up to 262,144 of them, which are asked for at once: what an archive
-/// keeps together it decompresses once for each of these batches.
+/// Takes 32 bytes of memory for each object, and 120 bytes more for each of up to 262,144 that it reads at once, so
+/// that an archive seldom decompresses twice what it keeps together.
 /// @param progress may be null
 /// @throws ArchiveError for what concerns the archive as a whole
 [[nodiscard]] KIVARCHIVE_EXPORT VerifyReport Verify(IArchive& archive, IProgress* progress);
 
 struct CollectOptions {
-    /// How long an object stays after it was first found unreached, for those who are about to use it.
+    /// How long an object stays after it was first found unreached, for hosts that are about to use it.
     std::chrono::seconds grace{std::chrono::hours{14 * 24}};
     /// Trees and commits that are kept with all that they reach, though no branch reaches them.
     std::vector<Id> kept;
-    /// One transaction removes at most so many objects, or gives back about so many bytes at most.
+    /// One transaction removes at most this many objects, or gives back at most about this many bytes.
     std::size_t slice = 1000;
     std::uint64_t sliceBytes = std::uint64_t{4} * 1024 * 1024;
-    /// One call marks at most so many objects, those that name others first. For archives that have little room: a mark
-    /// takes some 60 bytes, and is what makes room in a later call.
+    /// One call marks at most this many objects, those that name others first. For archives with little space left: a
+    /// mark takes some 60 bytes, and space is freed only by a later call.
     std::size_t mostMarked = SIZE_MAX;
 };
 
@@ -78,20 +78,21 @@ struct CollectReport {
     std::uint64_t removed = 0;
 };
 
-/// Marks what neither branches nor `kept` reach, along parents, trees, contents and what was merged, nor the trees of the
-/// heads last exchanged (`ReadExchangedHeads`), which later merges are made against; removes, those that
-/// name others first, what has been marked for the grace time and is still unreached; and gives the space back. Facts of
-/// ancestry stay.
+/// Marks what is not reached, along parents, trees, contents and merged commits, from branches, from `kept`, or from
+/// the trees of the heads last exchanged (`ReadExchangedHeads`), which later merges are made against; removes what has
+/// been marked for the grace time and is still unreached, each object before those that it names; and gives the space
+/// back. Facts stay.
 ///
-/// May run while others read and publish, and may be interrupted at any point: what is present has all that it names at
-/// every moment. A commit whose ancestry names a merged one that is gone already does not miss it.
+/// May run while others read and publish, and may be interrupted at any point: at every moment, what is present has all
+/// that it names. Only a merged commit that the facts of another one name may be gone.
 ///
-/// Reads every tree and commit once. Takes 32 bytes an object that is reached, more for those that are not.
+/// Reads every tree and commit once. Takes 32 bytes of memory for each object that is reached, more for the others.
 /// @param progress may be null
-/// @throws ArchiveError, of kind `Damaged` before anything is removed if a tree or commit that is reached cannot be read
+/// @throws ArchiveError, of kind `Damaged` before anything is removed if a tree or commit that is reached cannot be
+/// read
 KIVARCHIVE_EXPORT CollectReport Collect(IArchive& archive, CollectOptions const& options, IProgress* progress);
 
-/// A branch of one archive, and the name under which another one gets it.
+/// A branch of one archive, and the name that it gets in another.
 struct SynchronizedBranch {
     KivStringT<char16_t> from;
     /// Empty if no branch is to be moved there.
@@ -101,10 +102,10 @@ struct SynchronizedBranch {
 struct SynchronizeOptions {
     /// Those that the source does not have are left out.
     std::vector<SynchronizedBranch> branches;
-    /// Records that are copied over what is there; likewise.
+    /// The records that are copied, replacing what is there. Those that the source does not have are left out.
     std::vector<KivStringT<char16_t>> records;
-    /// Says whether a host can have an entry of that name, which comes from the source and may be anything, such as "..",
-    /// "/" or empty. Empty accepts all.
+    /// Returns whether the host accepts an entry with that name, which comes from the source and may be anything, such
+    /// as "..", "/" or empty. An empty function accepts all.
     std::function<bool(KivStringViewT<char16_t> name)> acceptsName;
 };
 
@@ -125,36 +126,38 @@ struct ExchangedHead {
     Id tree;
 };
 
-/// What was last brought to @p archive of each branch, which its records that begin with "exchanged/" hold.
+/// The heads that `Synchronize` last brought to @p archive, which keeps them in records whose names begin with
+/// "exchanged/".
 /// @throws ArchiveError
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<ExchangedHead> ReadExchangedHeads(IArchive& archive);
 
-/// Copies what the branches of @p from reach and @p to lacks, along parents, trees, contents and what was merged; then all
-/// facts of ancestry; and in the last transaction it moves the branches, whatever they stood at, and sets the records, also those of the heads exchanged.
+/// Copies what the branches of @p from reach and @p to lacks, along parents, trees, contents and merged commits; then
+/// all facts. In the last transaction it moves the branches, whatever their heads were, and sets the records, including
+/// those of the heads exchanged.
 ///
-/// Objects are stored children first, those of older commits before those of newer ones, so that an interrupted call is
-/// gone on with by the next one. Everything is compared with its identifier, and read as what it is said to be, before it
-/// is stored. Subtrees that @p to has are not entered.
+/// Each object is stored after those that it names, and older commits before newer ones, so that the next call
+/// continues where an interrupted one stopped. Everything is compared with its identifier and parsed before it is
+/// stored. Subtrees that @p to has are not entered.
 ///
 /// Holds the identifiers of the commits that are missing, the trees that a hundred of them bring, and a few MiB.
 /// @param progress may be null
-/// @throws ArchiveError of kind `Damaged` if the source lacks something or has it damaged, and of kind
-/// `Unrepresentable` for a name that is not accepted; of kind `Collected` if somebody collects in @p to meanwhile.
-/// What has been stored until then stays, and no branch has moved
+/// @throws ArchiveError of kind `Damaged` if the source lacks something or has it damaged, of kind `Unrepresentable`
+/// for a name that is not accepted, and of kind `Collected` if somebody collects in @p to meanwhile. What has been
+/// stored until then stays, and no branch has moved
 KIVARCHIVE_EXPORT SynchronizeReport Synchronize(IArchive& from, IArchive& to, SynchronizeOptions const& options,
                                                 IProgress* progress);
 
-/// What became of what was damaged or missing.
+/// What was repaired, and what could not be.
 struct RepairReport {
     std::vector<Id> repaired;
-    /// Not to be had from the source either.
+    /// What the source does not have either.
     std::vector<Id> lost;
 };
 
-/// Verifies @p archive, and takes what is damaged or missing in it from @p source, as far as that has it and it is what
-/// its identifier says. Whatever else is in @p archive stays as it is.
+/// Verifies @p archive, and copies what is damaged or missing in it from @p source, as far as the source has it and it
+/// matches its identifier. Whatever else is in @p archive stays as it is.
 /// @param progress may be null
-/// @throws ArchiveError for what concerns an archive as a whole
+/// @throws ArchiveError for what concerns either archive as a whole
 KIVARCHIVE_EXPORT RepairReport Repair(IArchive& archive, IArchive& source, IProgress* progress);
 
 } // namespace KivArchive

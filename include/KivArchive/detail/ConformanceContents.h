@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The cases about objects: storing, reading, versions, large contents and removing.
+/// The cases of objects: storing, reading, versions, large contents and removing.
 
 #include "KivArchive/detail/ConformanceObjects.h"
 
@@ -26,7 +26,7 @@ inline std::vector<NewObject> SomeObjects() {
     return objects;
 }
 
-/// Page by page, in ascending order, and counted. @param ids all that are there
+/// Checks that objects are listed page by page, in ascending order, and counted. @param ids of all objects there
 inline void CheckListing(Trial& trial, IArchive& archive, std::vector<Id> ids) {
     std::vector<Id> listed;
     for (Id after;;) {
@@ -47,7 +47,7 @@ inline void CheckListing(Trial& trial, IArchive& archive, std::vector<Id> ids) {
                  "objects are counted by type");
 }
 
-/// All of @p objects, with their types and sizes.
+/// Checks that all of @p objects can be read, and their types and sizes.
 inline void CheckReading(Trial& trial, IArchive& archive, std::vector<NewObject> const& objects,
                          std::vector<Id> const& ids) {
     auto const found = ReadAll(archive, ids);
@@ -61,7 +61,7 @@ inline void CheckReading(Trial& trial, IArchive& archive, std::vector<NewObject>
     }
 }
 
-/// Some of @p ids, which are there, among others.
+/// Asks for some of @p ids, which are there, among others that are not.
 inline void CheckMissing(Trial& trial, IArchive& archive, std::vector<Id> const& ids) {
     std::vector<Id> asked;
     std::vector<Id> unknown;
@@ -165,7 +165,7 @@ inline void CheckLargeContents(Trial& trial, IArchive& archive) {
     trial.Expect(!archive.ReadContent(Object(ObjectType::Blob, "?").id, 0, 1).has_value(), "others are not there");
 }
 
-/// What was stored as the difference to an object outlives it, and can take its place.
+/// What may have been stored as a difference to an earlier version outlives that version.
 inline void CheckRemovedEarlierVersions(Trial& trial, IArchive& archive) {
     std::vector<NewObject> versions;
     std::string text = SomeText(7, 100000);

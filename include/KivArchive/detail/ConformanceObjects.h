@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What the cases of the archives' conformance suite are made of.
+/// Builders and helpers for the cases of the conformance suite.
 
 #include "KivArchive/IArchive.h"
 
@@ -61,7 +61,7 @@ inline NewCommit Commit(Id const& tree, Id const& parent, std::string const& des
     return {std::move(object), std::move(facts)};
 }
 
-/// Text that compresses as sources do, the same for one seed everywhere.
+/// Text that compresses as source code does; equal seeds give equal texts everywhere.
 inline std::string SomeText(std::uint32_t seed, std::size_t size) {
     std::mt19937 random(seed);
     std::string text;
@@ -109,7 +109,7 @@ inline Change Moving(std::vector<BranchMove> moves, std::vector<NewObject> objec
     return change;
 }
 
-/// Where a case tells what is wrong.
+/// Reports the failures of one case.
 class Trial {
 public:
     Trial(std::string name, std::function<void(std::string const&)> fail)

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The cases about branches, records, ancestry and marks.
+/// The cases of branches, records, ancestry and marks.
 
 #include "KivArchive/detail/ConformanceObjects.h"
 

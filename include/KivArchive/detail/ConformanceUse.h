@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The cases about refusals, callbacks and threads.
+/// The cases of refusals, callbacks and threads.
 
 #include "KivArchive/detail/ConformanceObjects.h"
 
