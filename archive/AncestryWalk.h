@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The walk along known facts that `IArchive::ReadAncestry` describes.
+/// The walk along facts that `IArchive::ReadAncestry` promises.
 
 #include "Changes.h"
 
@@ -9,7 +9,7 @@
 
 namespace KivArchive {
 
-/// @param lookUp gives the facts of an identifier, as a pointer or an optional value; none if they are not known
+/// @param lookUp returns the facts of a commit as a pointer or an optional value; nothing if there are none
 template <class LookUp>
 [[nodiscard]] std::vector<Ancestry> WalkAncestry(std::span<const Id> commits, Follow follow, std::size_t more,
                                                  LookUp lookUp) {
@@ -33,7 +33,7 @@ template <class LookUp>
     auto const follows = [follow](ContainedCommit const& contained) {
         return follow == Follow::Everything || (follow == Follow::Reachable && contained.how == Containment::Merged);
     };
-    // What has been found is its own queue.
+    // `found` is also the queue of the walk.
     std::vector<Id> links;
     for (std::size_t next = 0; next < found.size() && more > 0; ++next) {
         links.assign(1, found[next].parent);

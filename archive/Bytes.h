@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Bytes as stored forms are written to and read from.
+/// Writing stored forms to bytes, and reading them.
 
 #include <cstddef>
 #include <cstdint>
@@ -14,7 +14,7 @@ namespace KivArchive {
 using Bytes = std::vector<std::byte>;
 using ByteView = std::span<const std::byte>;
 
-/// Thrown where a stored form is not one that this library writes.
+/// Thrown if a stored form is not one that this library writes.
 struct Malformed final : std::exception {
     [[nodiscard]] const char* what() const noexcept override { return "a stored form is malformed"; }
 };
@@ -39,7 +39,7 @@ class ByteReader {
 public:
     explicit ByteReader(ByteView bytes) noexcept : rest_(bytes) {}
 
-    /// @throws Malformed, as everything here, if there is less
+    /// @throws Malformed if fewer bytes are left; so does everything here
     [[nodiscard]] ByteView Take(std::uint64_t size) {
         if (size > rest_.size())
             throw Malformed();

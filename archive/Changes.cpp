@@ -106,7 +106,7 @@ bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& r
 }
 
 Bytes BytesOfName(KivStringT<char16_t> const& name) {
-    // As a view, so that the zeros of a name are kept.
+    // As a view, since a name may hold zeros.
     KivStringT<char> const text = KivVcs::DataEncoding::Utf8Encode(KivStringViewT<char16_t>(name));
     Bytes bytes(static_cast<std::size_t>(text.GetLength()));
     std::transform(text.GetString(), text.GetString() + text.GetLength(), bytes.begin(),

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What all archives do with identifiers and changes before they store anything.
+/// What all archives do with identifiers and changes.
 
 #include "Bytes.h"
 #include "KivArchive/IArchive.h"
@@ -12,17 +12,17 @@
 
 namespace KivArchive {
 
-/// A record has at most so many bytes.
+/// The most bytes that a record may have.
 inline constexpr std::uint64_t largestRecord = 16 * largestWholeContent;
 
 /// The digest of an identifier that must be one. @throws std::invalid_argument
 [[nodiscard]] Id::Digest const& DigestOf(Id const& id);
 
-/// Throws unless @p change can be stored anywhere: all its identifiers are digests where they have to be, and nothing is
-/// too large. @throws std::invalid_argument, ArchiveError
+/// Checks what no archive can store: identifiers that should be digests and are not, and what is too large.
+/// @throws std::invalid_argument, ArchiveError
 void CheckChange(Change const& change, std::string const& file);
 
-/// A digest that has taken the header of a packed form, and goes on with its data.
+/// A digest that has been fed the header of a packed form. Its data is next.
 [[nodiscard]] KivVcs::SHADigest256 BeginPackedForm(ObjectType type, std::uint64_t size);
 
 [[noreturn]] void ThrowCollected(Id const& id, std::string const& file);
@@ -30,19 +30,19 @@ void CheckChange(Change const& change, std::string const& file);
 /// Throws if @p progress, which may be null, asks to stop.
 void ReportProgress(IProgress* progress, Progress const& state, std::string const& file);
 
-/// The content as one piece of memory, sharing @p data where it is one already.
+/// The bytes of @p data in one piece of memory, shared if they are in one already.
 [[nodiscard]] Buffer Joined(Buffer const& data);
 
-/// The bytes of a buffer that is one piece.
+/// The bytes of a buffer that is in one piece.
 [[nodiscard]] std::span<const std::byte> BytesOf(Buffer const& joined) noexcept;
 
-/// Adds to @p known those of @p further that it does not have.
+/// Adds those of @p further that @p known does not have.
 void AddContained(std::vector<ContainedCommit>& known, std::vector<ContainedCommit> const& further);
 
-/// Whether both are the same bytes, or both none.
+/// Whether both have the same bytes, or both are nothing.
 [[nodiscard]] bool SameValue(std::optional<Buffer> const& left, std::optional<Buffer> const& right);
 
-/// The bytes that names are stored as, and the name that they stand for.
+/// Names as they are stored, and back.
 [[nodiscard]] Bytes BytesOfName(KivStringT<char16_t> const& name);
 [[nodiscard]] KivStringT<char16_t> NameOfBytes(ByteView bytes);
 

@@ -12,7 +12,7 @@ namespace {
 /// How many trees and commits are read at once.
 constexpr std::size_t batchSize = 1000;
 
-/// Everything marked for @p grace.
+/// Everything that was marked at least @p grace ago.
 std::unordered_set<Id> ReadMarks(IArchive& archive, std::chrono::seconds grace) {
     std::unordered_set<Id> marked;
     for (Id after;;) {
@@ -24,7 +24,7 @@ std::unordered_set<Id> ReadMarks(IArchive& archive, std::chrono::seconds grace) 
     }
 }
 
-/// Follows what objects name, and what commits have merged.
+/// Finds all that some roots reach, along what objects name and what commits have merged.
 class Walk {
 public:
     Walk(IArchive& archive, ObjectIndex const& index, IProgress* progress)
@@ -37,8 +37,8 @@ public:
     }
     [[nodiscard]] std::uint64_t CountReached() const noexcept { return count_; }
 
-    /// Reaches @p roots and everything below them.
-    /// @param needsAll whether it is a failure if something cannot be read; otherwise the rest is reached all the same
+    /// Reaches @p roots and all that they lead to.
+    /// @param needsAll whether it is a failure if something cannot be read; otherwise the walk goes on without it
     void From(std::vector<Id> const& roots, bool needsAll) {
         for (Id const& root : roots)
             Reach(root, true);
@@ -98,7 +98,7 @@ private:
     std::uint64_t count_ = 0;
 };
 
-/// Objects in an order in which those that name others come before these.
+/// Puts objects into an order in which each comes before those that it names.
 class TopDown {
 public:
     TopDown(IArchive& archive, std::vector<Id> const& ids) : archive_(archive) {
@@ -117,7 +117,7 @@ public:
 
     [[nodiscard]] std::size_t Size() const noexcept { return namedBy_.size(); }
 
-    /// The next @p count of them, or as many as there are: named by nothing but what is given before or with them.
+    /// The next @p count of them, or as many as are left, which nothing names but what comes before or with them.
     [[nodiscard]] std::vector<Id> Next(std::size_t count) {
         std::vector<Id> next;
         while (!ready_.empty() && next.size() < count) {
@@ -135,7 +135,7 @@ public:
     }
 
 private:
-    /// Those of the objects that each of @p ids names.
+    /// What each of @p ids names, of the objects that are put in order.
     [[nodiscard]] std::unordered_map<Id, std::vector<Id>> LinksOf(std::span<const Id> ids) {
         std::unordered_map<Id, std::vector<Id>> found;
         archive_.Read(ids, [&](ArchivedObject const& object) {
@@ -154,8 +154,8 @@ private:
     std::deque<Id> ready_;
 };
 
-/// Removes objects, those that name others before these. Others may come to use some meanwhile, which unmarks them: they
-/// and all that they reach stay.
+/// Removes objects, each before those that it names. Hosts may begin to use one meanwhile, which takes its mark away:
+/// it stays then, with all that it reaches.
 class Removal {
 public:
     Removal(IArchive& archive, Walk& kept, CollectOptions const& options, IProgress* progress)
@@ -197,8 +197,8 @@ void InPages(std::vector<Id> const& ids, Call call) {
         call(std::span<const Id>(ids.data() + begin, std::min(pageSize, ids.size() - begin)));
 }
 
-/// One collection. Its parts are made in this order: what is used after its mark was read is unmarked then, which removing
-/// sees.
+/// One collection. Marks are read before anything else, so that what is used after that is found out by removing it,
+/// since its mark is gone.
 class Collecting {
 public:
     Collecting(IArchive& archive, CollectOptions const& options, IProgress* progress)
@@ -222,7 +222,7 @@ private:
         for (Branch const& branch : archive_.ReadBranches())
             roots.push_back(branch.head);
         walk_.From(roots, true);
-        // Which may be gone already, from before they were kept.
+        // Trees of heads exchanged were not always kept: some may be gone.
         std::vector<Id> exchanged;
         for (ExchangedHead const& head : ReadExchangedHeads(archive_))
             if (!head.tree.IsEmpty() && index_.Find(head.tree))
@@ -245,7 +245,7 @@ private:
             if (marked_.count(id) == 0)
                 newlyMarked.push_back(id);
         }
-        // What is marked alone, without what names it, could not be removed.
+        // An object can only be removed along with what names it, which must be marked, too.
         if (newlyMarked.size() > options_.mostMarked)
             newlyMarked = TopDown(archive_, newlyMarked).Next(options_.mostMarked);
         InPages(unmarked, [this](std::span<const Id> page) { archive_.Unmark(page); });
@@ -254,7 +254,7 @@ private:
         report_.marked = newlyMarked.size();
     }
 
-    /// What is not due yet keeps all that it names.
+    /// What is due and not reached, not even by what is not due yet.
     [[nodiscard]] std::vector<Id> Doomed() {
         walk_.From(young_, false);
         std::vector<Id> doomed;

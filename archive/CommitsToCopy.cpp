@@ -13,7 +13,7 @@ namespace {
 /// How many commits are read at once, at most.
 constexpr std::size_t mostAhead = 1000;
 
-/// What the commits have merged and the archive has collected, which nobody misses.
+/// What the commits have merged and the archive has collected since, as it may.
 std::unordered_set<Id> GoneOfMerged(IArchive& archive, std::vector<Ancestry> const& commits) {
     std::vector<Id> merged;
     for (Ancestry const& facts : commits)
@@ -50,7 +50,7 @@ CommitsToCopy::CommitsToCopy(IArchive& from, IArchive& to, std::vector<Id> const
         [this](Id const& id) { inOrder_.push_back(id); });
 }
 
-/// Takes in those of @p open that are missing, and of what they lead to up to @p ahead. @return what is to be looked at next
+/// Takes in those of @p open that are missing, and up to @p ahead of what they lead to. @return what to look at next
 std::vector<Id> CommitsToCopy::Discover(std::vector<Id> const& open, std::size_t ahead) {
     std::vector<Id> const missing = to_.FindMissing(open);
     std::vector<Ancestry> known = from_.ReadAncestry(missing, Follow::Reachable, ahead);

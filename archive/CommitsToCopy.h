@@ -10,7 +10,7 @@
 
 namespace KivArchive {
 
-/// What some heads of @p from reach and @p to lacks; parents and what was merged come before those that have them.
+/// The commits that some heads of @p from reach and @p to lacks, each after its parent and what it merged.
 class CommitsToCopy {
 public:
     /// @throws ArchiveError of kind `Damaged` if @p from does not know the ancestry of one of them
@@ -22,7 +22,7 @@ public:
 private:
     struct Commit {
         Ancestry facts;
-        /// What it comes after.
+        /// The parent and merged commits that it has to come after.
         std::vector<Id> before;
     };
 
@@ -31,7 +31,7 @@ private:
     IArchive& from_;
     IArchive& to_;
     std::unordered_map<Id, Commit> commits_;
-    /// Whose facts have been read: these, and some that are not missing.
+    /// All commits whose facts have been read, also those that turned out not to be missing.
     std::unordered_set<Id> met_;
     std::vector<Id> inOrder_;
 };

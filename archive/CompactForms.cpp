@@ -41,7 +41,7 @@ char* Write(std::string_view text, char* to) noexcept {
     return std::copy(text.begin(), text.end(), to);
 }
 
-/// Takes @p line and 64 digits and a line break from the front of @p text.
+/// Takes @p line, 64 digits and a line feed from the front of @p text.
 bool TakeIdentifier(std::string_view& text, std::string_view line, Bytes& digests) {
     if (text.substr(0, line.size()) != line || text.size() < line.size() + digitCount + 1 ||
         text[line.size() + digitCount] != '\n')
@@ -56,7 +56,7 @@ bool TakeIdentifier(std::string_view& text, std::string_view line, Bytes& digest
 } // namespace
 
 std::optional<Bytes> CompactTree(ByteView data) {
-    // An entry shrinks, so that the form is never larger than the data.
+    // Every entry shrinks: the form is never larger than the data.
     Bytes form(data.size());
     std::byte* to = form.data();
     std::string_view rest = TextOf(data);
@@ -85,7 +85,7 @@ std::optional<Bytes> CompactTree(ByteView data) {
 }
 
 Bytes ExpandTree(ByteView form, std::uint64_t size) {
-    // No entry grows beyond three times its size.
+    // No entry grows to more than three times its size.
     if (size > 3 * static_cast<std::uint64_t>(form.size()))
         throw Malformed();
     Bytes data(static_cast<std::size_t>(size));

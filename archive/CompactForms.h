@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Trees and commits with their identifiers in 32 bytes instead of 64 digits, and without what they repeat.
+/// Trees and commits with identifiers of 32 bytes instead of 64 digits, and without what they repeat.
 
 #include "Bytes.h"
 
@@ -9,15 +9,15 @@
 
 namespace KivArchive {
 
-/// Each entry as one byte (0 a file, 1 a directory), the name, a zero byte and the digest. None if @p data is not what
-/// trees are packed to, byte for byte, so that unpacking could not give it back.
+/// The form of a tree: each entry as one byte (0 a file, 1 a directory), the name, a zero byte and the digest.
+/// @return nothing if @p data is not exactly what trees are packed to, so that expanding could not restore it
 [[nodiscard]] std::optional<Bytes> CompactTree(ByteView data);
 
-/// The inverse. @param size the size of the data @throws Malformed if @p form is no compact form of that much data
+/// The data that a form stands for. @param size its size @throws Malformed if @p form is none of that much data
 [[nodiscard]] Bytes ExpandTree(ByteView form, std::uint64_t size);
 
-/// One byte (1 with, 0 without a parent), the digests, and the text behind "author ", without the line of the
-/// committer, who is the author. None as above.
+/// The form of a commit: one byte (1 with, 0 without a parent), the digests, and the text after "author ", without the
+/// committer's line, which repeats the author's. Nothing in the same case.
 [[nodiscard]] std::optional<Bytes> CompactCommit(ByteView data);
 [[nodiscard]] Bytes ExpandCommit(ByteView form, std::uint64_t size);
 

@@ -12,7 +12,7 @@ namespace KivArchive {
 namespace {
 
 constexpr int level = 3;
-/// From here on zstd's matcher for long distances finds what its tables for short ones have forgotten.
+/// From this size on, zstd's long-distance matcher finds what its ordinary tables no longer hold.
 constexpr std::size_t longDistance = 200000;
 
 void CheckMemory(std::size_t code) {
@@ -20,7 +20,7 @@ void CheckMemory(std::size_t code) {
         throw std::bad_alloc();
 }
 
-/// How many bytes both begin with, at most @p limit.
+/// How many equal bytes both begin with, at most @p limit.
 std::size_t CommonBeginning(const std::byte* left, const std::byte* right, std::size_t limit) noexcept {
     std::size_t same = 0;
     while (same + sizeof(std::uint64_t) <= limit && std::memcmp(left + same, right + same, sizeof(std::uint64_t)) == 0)
@@ -110,7 +110,7 @@ void Compressor::Decompress(ByteView bytes, ByteView prefix, std::byte* to, std:
 }
 
 bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept {
-    // A block of 128 KiB takes four bytes at least.
+    // A block of 128 KiB takes at least four bytes.
     constexpr std::uint64_t maximumGrowth = 32768;
     return size / maximumGrowth <= bytes.size() && ZSTD_getFrameContentSize(bytes.data(), bytes.size()) == size;
 }
@@ -126,7 +126,7 @@ bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std:
     AppendNumber(to, end);
     Append(to, std::byte{1});
     std::size_t const head = to.size() - before;
-    // What is small, or does not become smaller, is kept as it is.
+    // Bytes that are few, or do not become fewer, are stored as they are.
     constexpr std::size_t worthTrying = 48;
     if (between.size() > worthTrying &&
         compressor.Compress(between, replaced, std::min(limit > head ? limit - head : 0, between.size()), to))

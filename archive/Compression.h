@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// zstd, and the difference of one form to another one.
+/// Compression with zstd, and the differences between stored forms.
 
 #include "Bytes.h"
 
@@ -9,7 +9,7 @@
 
 namespace KivArchive {
 
-/// Compresses and decompresses; used by one thread at a time.
+/// Compresses and decompresses. Used by one thread at a time.
 class Compressor {
 public:
     /// @throws std::bad_alloc
@@ -18,11 +18,11 @@ public:
     Compressor& operator=(Compressor const&) = delete;
     ~Compressor();
 
-    /// Appends the compressed @p bytes to @p to, in which they may refer to @p prefix.
-    /// @return false, appending nothing, if that does not take less than @p limit bytes
+    /// Appends the compressed @p bytes to @p to. They may refer to @p prefix, which decompressing them takes, too.
+    /// @return false, appending nothing, if they take @p limit bytes or more
     bool Compress(ByteView bytes, ByteView prefix, std::size_t limit, Bytes& to);
 
-    /// Decompresses exactly @p size bytes to @p to. @throws Malformed if @p bytes hold no such frame
+    /// Decompresses exactly @p size bytes to @p to. @throws Malformed if @p bytes are no frame of that size
     void Decompress(ByteView bytes, ByteView prefix, std::byte* to, std::size_t size);
 
 private:
@@ -30,15 +30,16 @@ private:
     std::unique_ptr<Contexts> contexts_;
 };
 
-/// Whether @p bytes claim to be a frame of @p size bytes and may be; asked before memory is taken for them.
+/// Whether @p bytes claim to be a frame of @p size bytes, and are not too few for it: checked before memory is
+/// allocated.
 [[nodiscard]] bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept;
 
-/// Appends the difference that makes @p form of @p base: how many bytes both begin and end with alike, and what is
-/// between, compressed with the base's part for reference.
+/// Appends the difference that turns @p base into @p form: how many bytes both begin and end with alike, and the bytes
+/// of @p form between, compressed with those of @p base as prefix.
 /// @return false, leaving @p to as it was, if that takes @p limit bytes or more
 [[nodiscard]] bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit, Bytes& to);
 
-/// The form of @p size bytes that @p difference makes of @p base. @throws Malformed
+/// The form of @p size bytes that @p difference turns @p base into. @throws Malformed
 [[nodiscard]] Bytes ApplyDifference(Compressor& compressor, ByteView base, ByteView difference, std::size_t size);
 
 } // namespace KivArchive

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Digests as the 64 lowercase hexadecimal digits that packed forms show.
+/// Digests as the 64 lowercase hexadecimal digits of packed forms.
 
 #include <array>
 #include <cstddef>
@@ -13,9 +13,9 @@ namespace KivArchive {
 inline constexpr std::size_t digestSize = 32;
 inline constexpr std::size_t digitCount = 2 * digestSize;
 
-/// Writes the digest that 64 digits stand for; false if they are none.
+/// Writes the digest that 64 digits stand for. @return false if one of them is no such digit
 inline bool ReadDigits(const char* digits, std::byte* digest) noexcept {
-    // Without branches, for several digits at once.
+    // Without a branch for each digit, so that compilers read several at once.
     std::array<std::uint8_t, digitCount> values{};
     std::uint8_t wrong = 0;
     for (std::size_t i = 0; i < digitCount; ++i) {

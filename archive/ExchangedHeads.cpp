@@ -11,7 +11,7 @@ namespace {
 
 constexpr const char16_t* prefix = u"exchanged/";
 
-/// A digest, or as many zeros for none.
+/// Appends a digest; zeros for null.
 void AppendId(Buffer& value, Id const& id) {
     Id::Digest const digest = id.IsEmpty() ? Id::Digest{} : DigestOf(id);
     value.Append(digest.data(), digest.size());
@@ -41,7 +41,7 @@ std::vector<ExchangedHead> ReadExchangedHeads(IArchive& archive) {
         Buffer const value = Joined(record.value.value_or(Buffer()));
         ByteReader reader(BytesOf(value));
         constexpr std::size_t expected = 2 * std::tuple_size_v<Id::Digest>;
-        // A host may have a record of such a name.
+        // A host may have made a record with such a name.
         if (reader.Rest().size() != expected)
             continue;
         ExchangedHead head;

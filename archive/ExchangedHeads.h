@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The records in which archives keep the heads that were exchanged last.
+/// The records that hold the heads exchanged last.
 
 #include "KivArchive/Upkeep.h"
 

@@ -12,7 +12,7 @@ Id Finish(KivVcs::SHADigest256& digest) {
     return Id::FromDigest(bytes);
 }
 
-/// Fetches a content window by window; hands out its last bytes only if all of them are what the identifier says.
+/// Fetches a content window by window. Does not give its last bytes unless the whole matches the identifier.
 class Content final : public KivVcs::IStream {
 public:
     Content(IArchive& archive, Id id, std::uint64_t size)
@@ -45,7 +45,7 @@ public:
 private:
     bool Fetch() {
         constexpr std::uint64_t windowSize = 4 * largestWholeContent;
-        // The one before goes first, so that no two are held.
+        // The last window is released first, so that there are never two.
         window_ = Buffer();
         windowBegin_ = position_;
         auto window = archive_.ReadContent(id_, position_, windowSize);

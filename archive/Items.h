@@ -1,32 +1,32 @@
 #pragma once
 
 /// @file
-/// What is to be stored, on its way into archives on disks and servers.
+/// What is to be stored in a database, a file's or a server's.
 
 #include "Segment.h"
 
 namespace KivArchive {
 
-/// Something to be stored: an object, or a piece of a content.
+/// An object, or a piece of a content, to be stored.
 struct Item {
     Id id;
     StoredType type = StoredType::Blob;
-    /// The size of `data`, or of the content that `data` lists the pieces of.
+    /// The size of `data`, or of the content whose pieces `data` lists.
     std::uint64_t size = 0;
     Buffer data;
     Id earlier;
 };
 
-/// What is made of an item.
+/// An item with its stored form.
 struct ItemForm {
     Item const* item = nullptr;
     Member member;
-    /// The stored form: compact where that can be, otherwise the data itself, which the item keeps.
+    /// The bytes of `form` if it is compact; otherwise it is the item's data.
     Bytes compact;
     ByteView form;
 };
 
-/// Makes the form of an item, as that of a member that shares a frame.
+/// Makes the form of `made.item`, for a member that shares the frame of its segment.
 void MakeForm(ItemForm& made);
 
 } // namespace KivArchive

@@ -8,7 +8,7 @@ namespace KivArchive {
 
 namespace {
 
-/// Takes what @p text begins with. @return false, taking nothing, if that is something else
+/// Takes @p expected from the front of @p text. @return false, taking nothing, if it begins with something else
 bool Take(std::string_view& text, std::string_view expected) {
     if (text.substr(0, expected.size()) != expected)
         return false;

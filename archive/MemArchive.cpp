@@ -17,7 +17,7 @@ struct StoredObject {
 
 using Digest = Id::Digest;
 
-/// The values of up to @p limit entries behind @p after, each as @p make gives it.
+/// What @p make returns for each of up to @p limit entries after @p after.
 template <class Table, class Make>
 auto List(Table const& table, Id const& after, std::size_t limit, Make make) {
     std::vector<decltype(make(*table.begin()))> listed;
@@ -86,7 +86,6 @@ struct MemArchive::State {
         return complete;
     }
 
-    /// Nothing in here fails.
     void Unmark(Change const& change) noexcept {
         for (NewObject const& object : change.objects)
             marks.erase(*object.id.GetDigest());
@@ -196,7 +195,7 @@ ChangeOutcome MemArchive::Apply(Change const& change) {
         if (record.value)
             records.insert_or_assign(record.name, *record.value);
 
-    // From here on nothing fails: nodes made above move in.
+    // Nothing fails from here on: the entries made above are moved in.
     state_->objects.merge(added);
     for (auto const& [digest, facts] : ancestry)
         state_->ancestry.erase(digest);

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The order in which an archive takes objects: what is named before what names it.
+/// The order in which an archive takes objects: each after those that it names.
 
 #include <span>
 #include <unordered_set>
@@ -10,10 +10,11 @@
 
 namespace KivArchive {
 
-/// Visits @p roots and what they lead to, each once and behind all that it names, with a stack of its own, since neither
-/// histories nor directories have a bound that a thread's stack would hold. In a cycle, the one that is met first comes last.
-/// @param enter called as `enter(key, named)` when a key is met: adds what it names to an empty list, the last one to be met
-/// first, or returns false if the key is to be left out
+/// Visits @p roots and what they lead to, each once and after all that it names. Has a stack of its own, since
+/// histories and directories may be deeper than a thread's stack. Of a cycle, the key that is met first is visited
+/// last.
+/// @param enter called as `enter(key, named)` when a key is met: adds what it names to an empty list, of which the last
+/// is met first, or returns false if the key is to be left out
 /// @param visit called with each key that was entered, once all that it names has been visited
 template <class Key, class Enter, class Visit>
 void VisitNamedFirst(std::span<Key const> roots, Enter const& enter, Visit const& visit) {

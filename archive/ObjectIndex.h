@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// All objects of an archive at one time, by number.
+/// The objects of an archive by number, as they were at one time.
 
 #include "Changes.h"
 
@@ -9,7 +9,7 @@
 
 namespace KivArchive {
 
-/// How many objects are asked for at once where all of them are visited.
+/// How many objects or marks are asked for at once where all of them are visited.
 inline constexpr std::size_t pageSize = 4096;
 
 class ObjectIndex {
@@ -28,7 +28,7 @@ public:
 
     [[nodiscard]] std::size_t Size() const noexcept { return digests_.size(); }
     [[nodiscard]] Id At(std::size_t number) const noexcept { return Id::FromDigest(digests_[number]); }
-    /// The number of an object, in ascending order of the digests; none if it is not among them.
+    /// The number of an object, in ascending order of the digests; nothing if it is not among them.
     [[nodiscard]] std::optional<std::size_t> Find(Id const& id) const {
         auto const found = std::lower_bound(digests_.begin(), digests_.end(), DigestOf(id));
         if (found == digests_.end() || *found != DigestOf(id))
@@ -37,7 +37,7 @@ public:
     }
 
 private:
-    /// Many, since an archive looks at whatever it keeps together once for each of these batches.
+    /// Many, since an archive reads what it keeps together once for each of these batches.
     static constexpr std::size_t listedAtOnce = std::size_t{1} << 16U;
 
     std::vector<Id::Digest> digests_;

@@ -11,7 +11,7 @@ namespace KivArchive {
 
 namespace {
 
-/// Takes what @p text begins with. @return false, taking nothing, if that is something else
+/// Takes @p expected from the front of @p text. @return false, taking nothing, if it begins with something else
 bool Take(std::string_view& text, std::string_view expected) noexcept {
     if (text.substr(0, expected.size()) != expected)
         return false;
@@ -29,8 +29,9 @@ bool TakeIdentifierLine(std::string_view& text, KivVcs::Id& id) noexcept {
     return true;
 }
 
-/// The author's line without its key, after which @p text is left, after the committer's equal line and an empty one.
-/// Nothing if there are none such. Names may hold anything, also what looks like the committer's line.
+/// Takes the rest of the author's line, the committer's equal line and an empty line from the front of @p text.
+/// @return what the author's line says; nothing if they are not there. Names may hold anything, also what looks like
+/// the committer's line
 std::optional<std::string_view> TakeSignature(std::string_view& text) noexcept {
     constexpr std::string_view committer = "\ncommitter ";
     constexpr std::string_view end = "\n\n";
@@ -48,7 +49,7 @@ std::optional<std::string_view> TakeSignature(std::string_view& text) noexcept {
     return std::nullopt;
 }
 
-/// A number as it is written, without needless zeros and signs.
+/// The number that @p digits stand for; nothing if it is not written so, or with needless zeros or signs.
 template <class Number>
 std::optional<Number> NumberOf(std::string_view digits) noexcept {
     Number number = 0;
@@ -61,10 +62,10 @@ std::optional<Number> NumberOf(std::string_view digits) noexcept {
     return number;
 }
 
-/// Minutes that an offset such as "-0530" stands for.
+/// The minutes that an offset such as "-0530" stands for.
 std::optional<std::int64_t> MinutesOf(std::string_view offset) noexcept {
     constexpr std::size_t shortest = 5;
-    // What differences of time can hold.
+    // No `TimeDelta` holds more.
     constexpr std::int64_t maximumHours = 256'000'000;
     bool const isNegative = offset.substr(0, 1) == "-";
     if (offset.size() < shortest || (!isNegative && offset.front() != '+'))
@@ -74,7 +75,7 @@ std::optional<std::int64_t> MinutesOf(std::string_view offset) noexcept {
     };
     auto const hours = number(offset.substr(1, offset.size() - 3));
     auto const minutes = number(offset.substr(offset.size() - 2));
-    // A negative fraction of an hour is written with "+".
+    // Negative offsets of less than an hour are packed with "+".
     if (!hours || !minutes || *hours < 0 || *hours > maximumHours || *minutes < 0 || *minutes >= 60 ||
         (isNegative && *hours == 0))
         return std::nullopt;
@@ -94,7 +95,7 @@ std::string_view TakeLastWord(std::string_view& text) noexcept {
 bool ReadSignature(std::string_view signature, PackedCommit& commit) noexcept {
     auto const minutes = MinutesOf(TakeLastWord(signature));
     auto const seconds = NumberOf<std::int32_t>(TakeLastWord(signature));
-    // Wherever a name is parted from an address, both are packed to the same bytes.
+    // If there are several, it does not matter at which one the name ends: all ways are packed to the same bytes.
     std::size_t const begin = signature.rfind(" <");
     if (!minutes || !seconds || signature.empty() || signature.back() != '>' || begin == std::string_view::npos)
         return false;
@@ -106,7 +107,7 @@ bool ReadSignature(std::string_view signature, PackedCommit& commit) noexcept {
 }
 
 bool IsAscii(std::string_view text) noexcept {
-    // Without branches, for several bytes at once.
+    // Without a branch for each byte, so that compilers read several at once.
     unsigned char all = 0;
     for (char const byte : text)
         all |= static_cast<unsigned char>(byte);
@@ -117,7 +118,7 @@ unsigned ByteAt(std::string_view text, std::size_t at) noexcept {
     return at < text.size() ? static_cast<unsigned char>(text[at]) : 0U;
 }
 
-/// The UTF-16 code unit that a sequence of three or four bytes begins with.
+/// The first UTF-16 code unit of the character that the three or four bytes at @p at encode.
 unsigned FirstUnit(std::string_view text, std::size_t at) noexcept {
     unsigned const lead = ByteAt(text, at);
     unsigned const codePoint =
@@ -178,7 +179,7 @@ int CompareNames(std::string_view left, std::string_view right) noexcept {
         return left.size() < right.size() ? -1 : static_cast<int>(left.size() > right.size());
     unsigned const one = ByteAt(left, at);
     unsigned const other = ByteAt(right, at);
-    // Only beyond U+FFFF two units stand for one character, and come before what is U+E000 and above.
+    // Characters beyond U+FFFF take two units, which come before the units from U+E000 on.
     constexpr unsigned leadOfPairs = 0xF0;
     constexpr unsigned leadOfSurrogates = 0xED;
     bool const isOnePair = one >= leadOfPairs;
@@ -188,7 +189,7 @@ int CompareNames(std::string_view left, std::string_view right) noexcept {
     std::string_view const single = isOnePair ? right : left;
     unsigned const unit = FirstUnit(single, at);
     unsigned const first = FirstUnit(pair, at);
-    // After a lone surrogate only what is U+E000 or above comes after the second unit of a pair.
+    // After a lone surrogate, only units from U+E000 on come after the second unit of a pair.
     unsigned const next = ByteAt(single, at + 3);
     bool const isPairLess = unit == first ? next > leadOfSurrogates && next < leadOfPairs : first < unit;
     return isPairLess == isOnePair ? -1 : 1;

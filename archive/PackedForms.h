@@ -1,8 +1,7 @@
 #pragma once
 
 /// @file
-/// What the data of packed commits and trees says, read exactly: nothing is taken for something else, and what is read
-/// would be packed to the same bytes again.
+/// Reads the data of packed commits and trees exactly: whatever is accepted would be packed to the same bytes again.
 
 #include "Digits.h"
 
@@ -27,13 +26,12 @@ struct PackedCommit {
     std::int64_t seconds = 0;
     /// Local time's offset from UTC.
     std::int64_t biasMinutes = 0;
-    /// May have any number of lines.
     std::string_view description;
 };
 
 /// Reads the data of a commit.
-/// @return nothing if it is not what a commit is packed to: another committer than author, further lines, texts with zero
-/// bytes or that are not UTF-8, a time or an offset that is written otherwise
+/// @return nothing if no commit is packed to it: if the committer is not the author, if there are further lines, if
+/// texts have zero bytes or are not UTF-8, or if the time or its offset is written otherwise
 [[nodiscard]] std::optional<PackedCommit> ReadPackedCommit(std::span<const std::byte> data);
 
 /// An entry of a tree, within the data that it was read from.
@@ -60,11 +58,11 @@ public:
     explicit PackedEntries(std::span<const std::byte> data) noexcept
         : rest_(reinterpret_cast<const char*>(data.data()), data.size()) {}
 
-    /// Goes to the next entry. @return false after the last one, and at the first byte that is not as trees have it
+    /// Goes to the next entry. @return false after the last one, and at the first byte that no packed tree has there
     bool Next();
     [[nodiscard]] PackedEntry const& Get() const noexcept { return entry_; }
-    /// After `Next` has returned false: whether that was the end of the data, and the names were UTF-8, in the order
-    /// of trees, none twice, none empty and none with "/".
+    /// After `Next` has returned false: whether that was the end of the data, and all names are UTF-8, in the order of
+    /// trees, none twice, none empty and none with "/".
     [[nodiscard]] bool AreSound() const noexcept { return areSound_ && rest_.empty(); }
 
 private:
@@ -73,8 +71,8 @@ private:
     bool areSound_ = true;
 };
 
-/// Less than, equal to or greater than zero as the first name comes before, is, or comes after the other one in trees,
-/// which is the order of their UTF-16 code units. Of what is not UTF-8 the order is that of the bytes.
+/// Less than, equal to or greater than zero as @p left comes before, equals or comes after @p right in trees, which
+/// order names by their UTF-16 code units. Where names are not UTF-8, by their bytes.
 [[nodiscard]] int CompareNames(std::string_view left, std::string_view right) noexcept;
 
 /// Whether decoding the text and encoding it again gives the same bytes.

@@ -15,7 +15,7 @@ namespace KivArchive {
 
 /// Calls `work(index, compressor)` for every index below @p count, on up to @p workers threads, this one among them; 0
 /// stands for as many as there are processors.
-/// @throws what a call has thrown; the calls not yet begun are left out then
+/// @throws what a call throws; calls that have not begun by then are left out
 template <class Work>
 void ForEachInParallel(std::size_t count, unsigned workers, Compressor& own, Work const& work) {
     std::atomic<std::size_t> next{0};
@@ -47,7 +47,7 @@ void ForEachInParallel(std::size_t count, unsigned workers, Compressor& own, Wor
                 }
             });
     } catch (...) {
-        // With fewer helpers it only takes longer.
+        // Without some of the helpers it only takes longer.
     }
     run(own);
     for (std::thread& helper : helpers)

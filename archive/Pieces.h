@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Contents in pieces, as archives on disks and servers store the large ones.
+/// Large contents, which databases store in pieces.
 
 #include "Bytes.h"
 #include "Changes.h"
@@ -16,13 +16,13 @@ namespace KivArchive {
 /// How many pieces are stored in one transaction.
 inline constexpr std::size_t piecesAtOnce = 8;
 
-/// Reads a content piece by piece, and says in the end whether it is the one expected.
+/// Reads a content piece by piece, and identifies it on the way.
 class PieceReader {
 public:
     PieceReader(StreamIO& content, std::uint64_t size)
         : content_(content), rest_(size), digest_(BeginPackedForm(ObjectType::Blob, size)) {}
 
-    /// The next piece; empty at the end, and none if it cannot be read.
+    /// The next piece; empty at the end, and nothing if it cannot be read.
     [[nodiscard]] std::optional<Buffer> Next() {
         std::uint64_t const size = std::min(rest_, largestWholeContent);
         bool isRead = true;
@@ -54,12 +54,12 @@ private:
     return content.GetSize() - std::min(content.GetSize(), content.GetPosition());
 }
 
-/// Adds a piece to the stored form of the content that it belongs to.
+/// Adds a piece to the list of pieces, which is the stored form of a large content.
 inline void AppendDigest(Buffer& list, Id const& id) {
     list.Append(DigestOf(id).data(), DigestOf(id).size());
 }
 
-/// The pieces of a content, of its stored form. @throws Malformed
+/// The pieces that a list names. @throws Malformed
 inline std::vector<Id> ReadDigests(ByteView list) {
     std::vector<Id> pieces;
     for (ByteReader digests(list); !digests.Rest().empty();) {
@@ -71,11 +71,11 @@ inline std::vector<Id> ReadDigests(ByteView list) {
     return pieces;
 }
 
-/// Stores a content: a large one as its pieces, some at a time, and then as the list of them.
-/// @param earlierPieces those of the content that it replaces
+/// Stores a content: a large one as pieces, some at a time, and then as the list of them.
+/// @param earlierPieces those of the content that this one replaces
 /// @param workers how many threads hash pieces; 0 stands for as many as there are processors
-/// @param file what failures name
-/// @param store takes items and what they rely on
+/// @param file named by failures
+/// @param store stores items, along with a change that names what they rely on
 /// @return false if the content cannot be read to its end, or is not what @p id says
 template <class Store>
 [[nodiscard]] bool StoreInPieces(Id const& id, StreamIO& content, Id const& earlier,

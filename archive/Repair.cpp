@@ -28,14 +28,14 @@ public:
         while (!wanted.empty())
             wanted = Take(wanted);
         RemoveDamaged();
-        // What was found last is named by what was found first.
+        // What was found first names what was found later.
         for (auto found = found_.rbegin(); found != found_.rend(); ++found)
             Store(*found);
         return std::move(report_);
     }
 
 private:
-    /// Reads what the source has of @p wanted. @return what that names and the archive lacks
+    /// Reads what the source has of @p wanted. @return what these objects name and the archive lacks
     std::vector<Id> Take(std::vector<Id> const& wanted) {
         ReportProgress(progress_, {"reading what is to be repaired", found_.size(), 0}, {});
         std::unordered_set<Id> given;
@@ -63,7 +63,7 @@ private:
         return further;
     }
 
-    /// Takes away what stands in the place of what was found.
+    /// Removes the damaged objects that the source has, since an archive skips identifiers that it has already.
     void RemoveDamaged() {
         std::vector<Id> ids;
         for (Found const& found : found_)

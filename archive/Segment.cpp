@@ -53,7 +53,7 @@ void AppendMember(Bytes& form, Member const& member) {
     if (member.encoding == Encoding::Removed)
         return;
     AppendNumber(form, member.size);
-    // Only compact forms and lists of pieces differ in size from their data.
+    // All other forms have the size of their data.
     if (member.isCompact || member.type == StoredType::LargeBlob)
         AppendNumber(form, member.formSize);
     if (member.encoding != Encoding::Difference)
@@ -64,7 +64,8 @@ void AppendMember(Bytes& form, Member const& member) {
     AppendNumber(form, member.base.member);
 }
 
-/// The member without its own bytes: any others of @p form, as many as they are.
+/// Reads a member. Its own bytes follow all members: until then `own` has their number, but refers to others of @p
+/// form.
 Member TakeMember(ByteReader& reader, ByteView form) {
     Member member = TakeHead(reader);
     auto const setOwnSize = [&](std::uint64_t size) { member.own = ByteReader(form).Take(size); };
@@ -99,7 +100,7 @@ Segment::Segment(std::uint64_t number, Bytes form, Verified verified) : number_(
     if (reader.TakeByte() != static_cast<std::uint8_t>(formatOfSegments))
         throw Malformed();
     std::uint64_t const count = reader.TakeNumber();
-    // Each takes a byte at least.
+    // Each takes at least a byte.
     if (count > reader.Rest().size())
         throw Malformed();
     members_.reserve(static_cast<std::size_t>(count));
@@ -173,7 +174,7 @@ Bytes SegmentBuilder::Make(Compressor& compressor) const {
     Bytes shared;
     for (Member const& member : members_)
         Append(member.encoding == Encoding::Shared ? shared : form, member.own);
-    // What hardly becomes smaller is kept as it is, which reads faster.
+    // What hardly becomes smaller is stored as it is, which is faster to read.
     if (!shared.empty() && compressor.Compress(shared, {}, shared.size() - shared.size() / 16, form))
         form[flag] = std::byte{1};
     else

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Segments: what stored forms are kept in, many small ones or one large one. docs/archive.md has the bytes.
+/// Segments, which hold stored forms: many small ones or one large one. docs/archive.md describes their bytes.
 
 #include "Compression.h"
 #include "KivArchive/IArchive.h"
@@ -16,10 +16,10 @@ namespace KivArchive {
 enum class StoredType : std::uint8_t { Blob, Tree, Commit, Piece, LargeBlob };
 
 enum class Encoding : std::uint8_t {
-    Removed,    ///< A place whose form is gone, so that its neighbours keep theirs.
+    Removed,    ///< The form is gone; the member is left so that the others keep their numbers.
     Plain,      ///< The form as it is.
     Shared,     ///< In the frame that the segment's members share.
-    Difference, ///< What makes it of another member's form.
+    Difference, ///< A difference to the form of another member, its base.
 };
 
 /// Where a stored form is.
@@ -30,8 +30,8 @@ struct Place {
     friend auto operator<=>(Place const& left, Place const& right) noexcept = default;
 };
 
-/// Members name a base in a segment that is stored together with theirs by the distance to it, since numbers are only
-/// given then.
+/// Where the base of a difference is. Segments that are stored together get their numbers only then: a base in one of
+/// them is named by its distance, how many segments before this one it is.
 struct Base {
     bool isDistance = false;
     std::uint64_t segment = 0;
@@ -46,12 +46,12 @@ struct Member {
     /// The size of the data, and of the stored form.
     std::uint64_t size = 0;
     std::uint64_t formSize = 0;
-    /// How many versions its path has had since one that is no difference; 0 for that one.
+    /// How many versions its path has had since the last one that is no difference; 0 for that one.
     std::uint64_t generation = 0;
     Base base;
-    /// The bytes of its own; empty if it is shared.
+    /// The bytes that only this member has; empty if it is shared.
     ByteView own;
-    /// Where it begins in what the shared frame holds.
+    /// Where it begins in the decompressed frame.
     std::uint64_t sharedOffset = 0;
 };
 
@@ -60,24 +60,24 @@ class Segment {
 public:
     enum class Verified : std::uint8_t { Now, Later };
 
-    /// @param verified `Later` leaves it to `Verify` to find out that @p form is another one than was stored
-    /// @throws Malformed unless @p form is one that `SegmentBuilder` made
+    /// @param verified `Later` leaves it to `Verify` to find out whether @p form is as it was stored
+    /// @throws Malformed unless @p form could have been made by a `SegmentBuilder`
     Segment(std::uint64_t number, Bytes form, Verified verified = Verified::Now);
     Segment(Segment const&) = delete;
     Segment& operator=(Segment const&) = delete;
     ~Segment() = default;
 
-    /// Hashes it, once. @throws Malformed unless it is what was stored
+    /// Hashes the form, the first time only. @throws Malformed unless it is as it was stored
     void Verify() const;
 
     [[nodiscard]] std::uint64_t Number() const noexcept { return number_; }
-    /// A number that differs between forms.
+    /// The beginning of the form's digest, which tells it from other forms.
     [[nodiscard]] std::uint64_t Check() const noexcept { return check_; }
     [[nodiscard]] std::uint64_t FormSize() const noexcept { return form_.size(); }
     [[nodiscard]] std::span<const Member> Members() const noexcept { return members_; }
     /// @throws Malformed if there is no such member, or if it is removed
     [[nodiscard]] Member const& At(std::uint64_t member) const;
-    /// Where the base of a member that is a difference is.
+    /// Where the base of a difference is.
     [[nodiscard]] Place BaseOf(Member const& member) const;
     /// The forms of all shared members, one after the other. @throws Malformed
     [[nodiscard]] Bytes DecompressShared(Compressor& compressor) const;
@@ -93,15 +93,15 @@ private:
     ByteView shared_;
 };
 
-/// Makes the form of a segment. The forms added must stay alive until it is made.
+/// Makes the form of a segment. The bytes added must stay valid until then.
 class SegmentBuilder {
 public:
-    /// @param own the bytes of a plain member or a difference, the form of a shared one; nothing for a removed one
+    /// @param own the bytes of a plain member or a difference, or the form of a shared member; empty for a removed one
     /// @return the number of the member
     std::uint64_t Add(Member const& member, ByteView own);
     [[nodiscard]] bool IsEmpty() const noexcept { return members_.empty(); }
     [[nodiscard]] std::span<const Member> Members() const noexcept { return members_; }
-    /// The bytes of all forms added.
+    /// How many bytes have been added.
     [[nodiscard]] std::uint64_t GetSize() const noexcept { return size_; }
     [[nodiscard]] Bytes Make(Compressor& compressor) const;
 
@@ -110,12 +110,12 @@ private:
     std::uint64_t size_ = 0;
 };
 
-/// The digest of stored bytes that are no object, such as a piece of a content.
+/// The digest of bytes that are no object's: of a piece of a content.
 [[nodiscard]] Id DigestOfBytes(ByteView bytes);
 
 /// The data that a stored form stands for.
 [[nodiscard]] Bytes ExpandForm(Member const& member, ByteView form);
-/// The @p size bytes of data that the compact form of a tree or commit stands for.
+/// The @p size bytes of data that a compact form of a tree or commit stands for.
 [[nodiscard]] Bytes ExpandForm(StoredType type, ByteView form, std::uint64_t size);
 
 } // namespace KivArchive

@@ -17,7 +17,7 @@ constexpr std::size_t batchSize = 1000;
 constexpr std::size_t commitsTogether = 100;
 constexpr std::uint64_t changeSize = 8 * largestWholeContent;
 
-/// A tree or commit on its way.
+/// A tree or commit to be stored.
 struct Arriving {
     ObjectType type = ObjectType::Tree;
     Buffer data;
@@ -29,7 +29,7 @@ struct Arriving {
     throw ArchiveError(kind, {}, sentence);
 }
 
-/// Reads and checks all of @p ids, which are said to be of one type.
+/// Reads all of @p ids, and checks that they are what they should be.
 std::unordered_map<Id, Arriving> Fetch(IArchive& from, std::vector<Id> const& ids, ObjectType type) {
     std::unordered_map<Id, Arriving> fetched;
     for (std::size_t begin = 0; begin < ids.size(); begin += batchSize) {
@@ -49,7 +49,7 @@ std::unordered_map<Id, Arriving> Fetch(IArchive& from, std::vector<Id> const& id
     return fetched;
 }
 
-/// Copies the commits that it is given, with all that they bring.
+/// Copies commits with all that they bring.
 class Copying {
 public:
     Copying(IArchive& from, IArchive& to, SynchronizeOptions const& options, IProgress* progress)
@@ -77,13 +77,13 @@ private:
     struct Pair {
         Id id;
         Id earlier;
-        /// The first one of the commits that bring it.
+        /// The first of the commits that bring it.
         Id commit;
     };
 
     using LinksByName = std::unordered_map<std::string_view, Link const*>;
 
-    /// What the commits have merged and is not there: it was collected, or is about to come.
+    /// What the commits have merged and the target lacks: it was collected, or is still to be copied.
     [[nodiscard]] std::unordered_set<Id> GoneOfMerged(std::span<const Id> commits, CommitsToCopy const& missing) {
         std::vector<Id> merged;
         for (Id const& commit : commits)
@@ -99,7 +99,7 @@ private:
         change_.relied.insert(change_.relied.end(), merged.begin(), merged.end());
     }
 
-    /// Level by level, so that the number of calls depends on the depth.
+    /// Level by level, so that the number of calls depends on the depth only.
     void FetchTrees(std::span<const Id> commits, CommitsToCopy const& missing) {
         std::vector<Id> parents;
         for (Id const& commit : commits)
@@ -155,27 +155,27 @@ private:
         return next;
     }
 
-    /// Adds the entries of a tree that the one before does not have, each with what that one has under its name.
+    /// Adds the entries that the earlier tree does not have, each with what that one has under its name.
     void AddNewEntries(std::vector<Link> const& entries, LinksByName const& earlier, Id const& commit,
                        std::vector<Pair>& trees, std::vector<Pair>& blobs) const {
         for (Link const& link : entries) {
             CheckName(link.name, commit);
             auto const same = earlier.find(link.name);
             Id const earlierId = same != earlier.end() && same->second->type == link.type ? same->second->id : Id();
-            // What the earlier tree names, too, comes or is there with that one.
+            // What the earlier tree names, too, is there or is copied with it.
             if (!(earlierId == link.id))
                 (link.type == ObjectType::Tree ? trees : blobs).push_back({link.id, earlierId, commit});
         }
     }
 
-    /// The trees that those of a level replace, unless they come themselves.
+    /// The trees that those of a level replace, except those that are copied themselves.
     [[nodiscard]] std::unordered_map<Id, Arriving> FetchEarlier(std::vector<Pair> const& level,
                                                                 std::unordered_map<Id, Arriving> const& trees) {
         std::vector<Id> earlier;
         for (Pair const& pair : level)
             if (!pair.earlier.IsEmpty() && trees.count(pair.earlier) == 0 && arriving_.count(pair.earlier) == 0)
                 earlier.push_back(pair.earlier);
-        // A hint only: what the source has dropped is none.
+        // They only save asking, so that it does not matter if the source lacks one.
         auto const missing = from_.FindMissing(earlier);
         std::unordered_set<Id> const gone(missing.begin(), missing.end());
         std::erase_if(earlier, [&gone](Id const& id) { return gone.count(id) != 0; });
@@ -239,7 +239,7 @@ private:
         ++stored_;
     }
 
-    /// Stores a tree or commit behind all that it names.
+    /// Stores a tree or commit after all that it names.
     void StoreWithTrees(Id const& root) {
         VisitNamedFirst<Id>(
             {&root, 1},
@@ -289,7 +289,7 @@ private:
     std::uint64_t stored_ = 0;
 };
 
-/// Adds the facts that @p to lacks. @return of how many commits
+/// Adds the facts that @p to lacks. @return the number of commits that they are of
 std::uint64_t CopyAncestry(IArchive& from, IArchive& to, IProgress* progress) {
     std::uint64_t copied = 0;
     for (Id after;;) {
@@ -316,7 +316,7 @@ std::uint64_t CopyAncestry(IArchive& from, IArchive& to, IProgress* progress) {
     }
 }
 
-/// Records the heads that were brought.
+/// Adds the records of the heads that are brought.
 void RecordHeads(IArchive& from, SynchronizeOptions const& options, std::vector<Branch> const& heads, Change& change) {
     for (Branch const& head : heads)
         for (SynchronizedBranch const& branch : options.branches) {

@@ -29,7 +29,7 @@ public:
     }
 
 private:
-    /// An archive gives objects in the order that is cheapest, which is all the cheaper the more it is asked for.
+    /// Many, since an archive reads in the order that is cheapest, and what it keeps together only once for each batch.
     static constexpr std::size_t readAtOnce = std::size_t{1} << 18U;
 
     void VerifyBatch(std::vector<Id> const& batch) {
@@ -105,7 +105,7 @@ private:
         }
     }
 
-    /// What was stored while the objects were listed is not missing.
+    /// Drops what was stored while the objects were listed, which only seemed to be missing.
     void ForgetWhatCameLater() {
         std::vector<Id> const ids(missing_.begin(), missing_.end());
         auto const missing = archive_.FindMissing(ids);

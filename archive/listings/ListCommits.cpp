@@ -11,7 +11,7 @@ namespace {
 
 constexpr std::int64_t ticksPerMinute = 600'000'000;
 
-/// The last text that was decoded: of most commits the author is that of the one before, and shares its texts.
+/// Decodes texts, and shares one that equals the last: most commits have the author of the one before.
 class LastText {
 public:
     [[nodiscard]] KivStringT<char16_t> const& Decode(std::string_view bytes) {
@@ -49,8 +49,8 @@ void SetLinks(CommitRecord& record, Ancestry const& facts) {
             record.merged.push_back(contained.id);
 }
 
-/// Reads the texts of records whose identifiers are set. @param takesLinks the number of a record whose links are to be
-/// those of its text
+/// Reads the texts of records whose identifiers are set.
+/// @param takesLinks returns whether the record with that number gets the links of its packed form, too
 template <class TakesLinks>
 void ReadTexts(IArchive& archive, std::span<CommitRecord> records, TakesLinks takesLinks) {
     std::unordered_map<Id, CommitRecord*> firsts;
@@ -86,7 +86,7 @@ void ReadTexts(IArchive& archive, std::span<CommitRecord> records, TakesLinks ta
 class Order {
 public:
     virtual ~Order() = default;
-    /// Up to @p count further ones; none at the end.
+    /// The facts of the next commits, at most @p count; none at the end.
     [[nodiscard]] virtual std::vector<Ancestry> Next(std::size_t count) = 0;
 
 protected:
@@ -95,7 +95,7 @@ protected:
     Order& operator=(Order const&) = default;
 };
 
-/// One line of history, read as far as it is asked for.
+/// One line of history, read as far as asked for.
 class LineOrder final : public Order {
 public:
     LineOrder(IArchive& archive, Id head) : archive_(archive), next_(std::move(head)) {}
@@ -118,8 +118,8 @@ private:
     bool isFirst_ = true;
 };
 
-/// All that the heads lead to: no commit before one that leads to it, and the lines of history in one piece as far as
-/// that goes.
+/// All that the heads lead to: no commit before one that leads to it, and lines of history in one piece where that
+/// allows it.
 class GraphOrder final : public Order {
 public:
     GraphOrder(IArchive& archive, std::span<const Id> heads, Follow follow) : follow_(follow) {
@@ -161,7 +161,7 @@ private:
     }
 
     bool Advance() {
-        // Commits that were rebased there and back lead to each other: the first of them that is left comes first.
+        // Commits that were rebased there and back lead to each other: the first one left is as good as any.
         for (; ready_.empty() && firstLeft_ < facts_.size(); ++firstLeft_)
             if (!isGiven_[firstLeft_])
                 ready_.push_back(firstLeft_);
@@ -187,7 +187,7 @@ private:
     std::size_t given_ = 0;
 };
 
-/// Keeps those in which @p path is not what it is in their parent.
+/// Keeps the commits in which @p path differs from their parent.
 void KeepChanging(IArchive& archive, KivStringT<char16_t> const& path, std::vector<Ancestry>& commits) {
     std::unordered_map<Id, Id> trees;
     std::vector<Id> parents;
@@ -203,7 +203,7 @@ void KeepChanging(IArchive& archive, KivStringT<char16_t> const& path, std::vect
         auto const found = trees.find(facts.parent);
         return found == trees.end() ? Id() : found->second;
     };
-    // Where the whole tree is the same, nothing in it has changed.
+    // Where the root trees are the same, there is nothing to look up.
     std::erase_if(commits, [&](Ancestry const& facts) { return facts.tree == parentTree(facts); });
     std::unordered_map<Id, Id> entries;
     std::vector<Id> asked;
@@ -217,7 +217,7 @@ void KeepChanging(IArchive& archive, KivStringT<char16_t> const& path, std::vect
                   [&](Ancestry const& facts) { return entries.at(facts.tree) == entries.at(parentTree(facts)); });
 }
 
-/// Hands records over. @return false if the receiver ended that
+/// Passes the records of @p commits on. @return false if the receiver ended the listing
 bool HandOver(IArchive& archive, std::span<const Ancestry> commits, CommitReceiver const& receiver) {
     std::vector<CommitRecord> records(commits.size());
     for (std::size_t i = 0; i < records.size(); ++i) {

@@ -12,7 +12,7 @@ namespace {
 using KivVcs::ChangeKind;
 using KivVcs::Difference;
 
-/// Two directories that stand against each other; null for none.
+/// Two directories that are compared; null for none.
 struct Pair {
     Id before;
     Id after;
@@ -24,7 +24,7 @@ struct HashOfPair {
     std::size_t operator()(Pair const& pair) const noexcept { return pair.before.Hash() * 31U + pair.after.Hash(); }
 };
 
-/// A name that differs: as a file, if it has a kind, and as a directory, if there is a pair below.
+/// A name that differs: as a file if it has a kind, as a directory if there is a pair below.
 struct Entry {
     static constexpr std::size_t none = std::numeric_limits<std::size_t>::max();
 
@@ -39,12 +39,12 @@ struct Entry {
 struct Compared {
     Pair pair;
     std::vector<Entry> entries;
-    /// Whether a file differs here or below.
+    /// Whether a file differs in it or below.
     bool hasFiles = false;
     bool isDecided = false;
 };
 
-/// Compares the directories of two versions, each pair once, and then goes through the places where they stand.
+/// Compares the directories of two versions, each pair once, and then visits all places where these pairs are.
 class Comparison {
 public:
     Comparison(IArchive& archive, std::size_t atMost, IProgress* progress)
@@ -123,7 +123,7 @@ private:
         }
     }
 
-    /// Both lists of entries at once, in the order of the names.
+    /// The names that differ, found by walking both lists of entries at once.
     std::vector<Entry> Compare(Pair const& pair, TreeData const& data) {
         std::vector<Entry> differing;
         PackedEntries before(data.At(pair.before));
@@ -170,7 +170,7 @@ private:
         return entry;
     }
 
-    /// Bottom-up, so that places without any file, of which there can be very many, are not visited.
+    /// Bottom-up, so that pairs without any file, which may be in very many places, are not visited.
     void DecideWhereFilesAre() {
         struct Frame {
             std::size_t number;
@@ -222,7 +222,7 @@ DifferenceList ListDifferences(IArchive& archive, Id const& before, Id const& af
         list.differences.push_back({entry.kind, KivUtils::FromUtf8(path), {}, entry.oldId, entry.newId});
     });
     list.isComplete = isAllRead && isAllGiven;
-    // Only a directory whose name begins another one's breaks the order of paths.
+    // The visit is in the order of paths, except where one directory's name is the beginning of another name.
     std::sort(list.differences.begin(), list.differences.end(),
               [](Difference const& left, Difference const& right) { return left.path < right.path; });
     if (options.findRenames)

@@ -27,7 +27,7 @@ std::vector<std::string> ComponentsOf(KivStringT<char16_t> const& path) {
     return components;
 }
 
-/// The entry of that name; none if there is none.
+/// The entry with that name; nothing if there is none.
 std::optional<PackedEntry> Find(std::span<const std::byte> tree, std::string_view name) {
     for (PackedEntries entries(tree); entries.Next();)
         if (entries.Get().name == name)
@@ -84,7 +84,7 @@ std::vector<FoundEntry> FindEntries(IArchive& archive, std::span<const Id> trees
             for (FoundEntry const& one : batch)
                 ids.push_back(one.entry.id);
             TreeData const data(archive, ids);
-            // Versions that follow each other share most of their directories.
+            // Successive versions share most of their directories.
             std::unordered_map<Id, std::optional<PackedEntry>> known;
             for (FoundEntry& one : batch) {
                 auto const [entry, isNew] = known.try_emplace(one.entry.id);

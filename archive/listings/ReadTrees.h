@@ -11,14 +11,14 @@
 
 namespace KivArchive {
 
-/// How many objects the listings ask for at once.
+/// How many objects listings read at once.
 inline constexpr std::size_t listedAtOnce = 500;
 
 /// The data of trees by identifier; the null one has none.
 class TreeData {
 public:
-    /// Reads those of @p ids that are not null, of which there may be several equal ones.
-    /// @throws ArchiveError of kind `Collected` or `Damaged` if one of them is not there, or no sound tree
+    /// Reads those of @p ids that are not null; some may be equal.
+    /// @throws ArchiveError of kind `Collected` if one is not there, of kind `Damaged` if one is not a sound tree
     TreeData(IArchive& archive, std::vector<Id> ids);
 
     [[nodiscard]] std::span<const std::byte> At(Id const& id) const {

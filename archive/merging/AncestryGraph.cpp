@@ -54,7 +54,7 @@ void AncestryGraph::Read(std::span<const Node> nodes, std::size_t more) {
         ids.push_back(CommitOf(node));
     for (Ancestry const& facts : read_(ids, more))
         Learn(facts);
-    // Of those that were not given nothing is known.
+    // Those without facts are read as well: nothing is known of them.
     for (Node const node : nodes)
         entries_[node].isRead = true;
 }
@@ -71,8 +71,8 @@ std::vector<AncestryGraph::Node> AncestryGraph::Reach(Node from, std::uint8_t si
     return reached;
 }
 
-/// The common ones, each before all that it contains, but for cycles: the first of a cycle's commits comes before all that
-/// the cycle contains.
+/// The common ancestors, each before all that it contains. Of a cycle, only the first commit comes before all that the
+/// cycle contains.
 std::vector<AncestryGraph::Node> AncestryGraph::OrderCommon(std::vector<Node> const& reached) {
     std::vector<Node> ordered;
     std::vector<std::pair<Node, std::uint32_t>> open;
@@ -136,7 +136,8 @@ AncestryGraph::Above AncestryGraph::TurnLinks(std::vector<Node> const& nodes) co
     return above;
 }
 
-/// In the order that `OrderCommon` gives, one that nothing before it contains is contained by none but its own cycle.
+/// In the order of `OrderCommon`, a commit that none before it contains is contained by nothing outside of its own
+/// cycle.
 std::vector<std::vector<AncestryGraph::Node>> AncestryGraph::FindBest(std::vector<Node> const& ordered) {
     std::vector<std::vector<Node>> best;
     for (Node const node : ordered)
@@ -147,7 +148,7 @@ std::vector<std::vector<AncestryGraph::Node>> AncestryGraph::FindBest(std::vecto
     return best;
 }
 
-/// Those of the cycles that the sides are, or that commits of one side only contain without another one in between.
+/// Those commits of the cycles that are a side themselves, or that a commit links to which only one side contains.
 std::vector<AncestryGraph::Node> AncestryGraph::FindArrivals(std::vector<std::vector<Node>> const& cycles,
                                                              std::vector<Node> const& reached,
                                                              std::span<const Node> sides) {
@@ -190,7 +191,7 @@ AncestryGraph::Meeting AncestryGraph::Meet(Node left, Node right) {
             meeting.bases.push_back(cycle.front());
         meeting.leftContainsRight = MarkOf(right).sides == bothSides;
         meeting.rightContainsLeft = MarkOf(left).sides == bothSides;
-        // What all best ones contain leads neither to another common one nor, but in cycles, back to one of them.
+        // What all bases contain leads to no further base and, except in cycles, back to none of them.
         std::uint64_t const all = (std::uint64_t{1} << std::min(meeting.bases.size(), lastBit)) - 1;
         bool const canSettle = !meeting.bases.empty() && meeting.bases.size() <= lastBit;
         reached.insert(reached.end(), others.begin(), others.end());
@@ -210,12 +211,13 @@ AncestryGraph::Meeting AncestryGraph::Meet(Node left, Node right) {
     }
 }
 
-/// Marks, with a bit for each of @p commits or of the cycles that they are in, what contains it. @return all these bits
+/// Marks whatever contains one of @p commits, with a bit for each of them or of the cycles that they are in.
+/// @return all these bits
 std::uint64_t AncestryGraph::MarkAbove(std::span<const Node> commits, Above const& above) {
     std::uint64_t all = 0;
     std::unordered_set<Node> met;
     for (std::size_t i = 0; i < commits.size(); ++i) {
-        // What contains one of a cycle contains all of it.
+        // What contains one commit of a cycle contains all of it.
         if (met.count(commits[i]) != 0)
             continue;
         std::uint64_t const bit = std::uint64_t{1} << i;

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What is known of the histories of commits, read as far as it is needed.
+/// The histories of commits by their facts, read as far as needed.
 
 #include "KivArchive/Merging.h"
 
@@ -11,8 +11,8 @@
 
 namespace KivArchive {
 
-/// Commits by number, with all that they contain: parents, what was merged, rewritten and found equal. Not a tree, and not
-/// free of cycles: a line of commits may have been rebased there and back.
+/// Commits as numbered nodes, with links to what they contain: parents, and what was merged, rewritten and found equal.
+/// There may be cycles: commits may have been rebased there and back.
 class AncestryGraph {
 public:
     using Node = std::uint32_t;
@@ -21,8 +21,8 @@ public:
     struct Meeting {
         /// The common ancestors that no other one contains, one for each cycle, ordered by identifier.
         std::vector<Node> bases;
-        /// Where the sides come to the bases: these themselves, but of a cycle all commits that a side has been at. Each side
-        /// knows of what all of them did, and nobody can say which is the latest.
+        /// The bases themselves, but of a cycle all commits that a side has been at: both sides contain what all of
+        /// these changed, and none of them is the latest.
         std::vector<Node> arrivals;
         bool leftContainsRight = false;
         bool rightContainsLeft = false;
@@ -30,19 +30,19 @@ public:
 
     explicit AncestryGraph(AncestryReader read) : read_(std::move(read)) {}
 
-    /// The number of a commit, whether or not anything is known of it.
+    /// The number of a commit, whether or not it has facts.
     [[nodiscard]] Node Enter(Id const& commit);
     [[nodiscard]] Id const& CommitOf(Node node) const noexcept { return *entries_[node].commit; }
-    /// Null for a commit without a tree, and for one of which nothing is known.
+    /// Null for a commit without a tree or without facts.
     [[nodiscard]] Id const& TreeOf(Node node) const noexcept { return entries_[node].tree; }
     [[nodiscard]] bool IsKnown(Node node) const noexcept { return entries_[node].isKnown; }
 
-    /// Reads what is needed for it.
+    /// Finds where two histories meet, reading as many facts as that takes.
     [[nodiscard]] Meeting Meet(Node left, Node right);
 
-    /// The earliest commits that @p side contains, @p other does not, and that contain all of @p commits, which both
-    /// sides do: where this side brought them together. For those that @p isUsable rejects the next ones above stand in.
-    /// Empty if there are none, or more than 64 commits are asked about.
+    /// Where a side brought @p commits together, which both sides contain: the earliest commits that contain all of
+    /// them, and that @p side contains and @p other does not. One that @p isUsable rejects is replaced by the next ones
+    /// above. Empty if there are none, or if @p commits are more than 64.
     /// @pre the two have met
     [[nodiscard]] std::vector<Node> FindFirstWithAll(Node side, Node other, std::span<const Node> commits,
                                                      std::function<bool(Node)> const& isUsable);
@@ -56,15 +56,15 @@ private:
         bool isRead = false;
         bool isKnown = false;
     };
-    /// What a walk has found out about a commit; the next walk forgets it.
+    /// What a walk has found out about a commit. Valid during that walk only.
     struct Mark {
         std::uint64_t walk = 0;
-        /// One bit for each of up to 63 commits that it was reached from; the last one stands for all others.
+        /// One bit for each of the first 63 commits that it was reached from; the last bit stands for all others.
         std::uint64_t reachedFrom = 0;
         std::uint8_t sides = 0;
         bool isOrdered = false;
     };
-    /// The links of some commits upside down.
+    /// For each commit, those that link to it.
     using Above = std::unordered_map<Node, std::vector<Node>>;
 
     static constexpr std::uint8_t leftSide = 1;

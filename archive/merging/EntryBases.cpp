@@ -55,7 +55,7 @@ bool VersionTrees::IsGone(Node version) {
 }
 
 cow_ptr<Tree> const& VersionTrees::DirectoryOf(Node version) {
-    // From the lowest level that has been asked for before.
+    // Down from the lowest level that is known of this version.
     std::size_t level = levels_.size();
     while (levels_[level - 1].count(version) == 0)
         --level;
@@ -110,7 +110,7 @@ HeldEntry EntryBases::EntryAt(Node version, KivStringT<char16_t> const* name) {
     return name != nullptr ? EntryIn(directory, *name) : EntryOf(directory);
 }
 
-/// What all of these have; nothing if they differ, or one is gone, or there are none.
+/// The entry that all of @p versions have; nothing if they differ, if one is gone, or if there are none.
 BaseEntry EntryBases::CommonEntry(std::vector<Node> const& versions, KivStringT<char16_t> const* name) {
     BaseEntry common;
     for (Node const version : versions) {
@@ -132,10 +132,10 @@ BaseEntry EntryBases::Find(Pair pair, KivStringT<char16_t> const* name, Found& f
     if (found.depth == deepest || found.entries.size() == maximumPairsOfEntry)
         return {};
     AncestryGraph::Meeting const* const meeting = MeetingOf(pair);
-    // Where each contains the other neither is older.
+    // If each contains the other, neither is the older one.
     if (meeting == nullptr || (meeting->leftContainsRight && meeting->rightContainsLeft))
         return {};
-    // Nothing, for those who come back to it.
+    // Finding it may lead back to this pair, for which there is no base then.
     found.entries.emplace(pair, BaseEntry());
     ++found.depth;
     BaseEntry base = meeting->bases.empty() ? HeldEntry() : BringTogether(pair, meeting->arrivals, name, found);
@@ -163,7 +163,7 @@ BaseEntry EntryBases::BringTogether(Pair pair, std::vector<Node> const& bases, K
     return last.empty() || last.size() == bases.size() ? BaseEntry() : DecidedByBoth(pair, last, name);
 }
 
-/// Whether one of @p bases has changed what @p base has of the entry.
+/// Whether another one of @p bases has changed the entry that @p base has.
 // NOLINTNEXTLINE(misc-no-recursion): no deeper than `deepest`
 bool EntryBases::IsChangedBy(Node base, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
                              Found& found) {
@@ -178,7 +178,7 @@ bool EntryBases::IsChangedBy(Node base, std::vector<Node> const& bases, KivStrin
     return false;
 }
 
-/// What both sides had when each had brought the bases together.
+/// What both sides had when each had brought the bases together, if that is the same.
 BaseEntry EntryBases::DecidedByBoth(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name) {
     BaseEntry one = CommonEntry(FirstWithAll(pair.first, pair.second, bases), name);
     BaseEntry const other = one ? CommonEntry(FirstWithAll(pair.second, pair.first, bases), name) : BaseEntry();

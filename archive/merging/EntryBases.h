@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What both sides of a merge started from, entry by entry.
+/// The bases of a merge, entry by entry.
 
 #include "AncestryGraph.h"
 
@@ -28,15 +28,15 @@ struct HeldEntry {
 [[nodiscard]] HeldEntry EntryIn(cow_ptr<Tree> const& directory, KivStringT<char16_t> const& name);
 [[nodiscard]] HeldEntry EntryOf(cow_ptr<Tree> directory);
 
-/// Nothing where it is not known what there was, or there is no base.
+/// The entry that both sides started from; nothing if that is not known, or there is no base.
 using BaseEntry = std::optional<HeldEntry>;
 
-/// The trees of all versions that a merge looks at, each as far down as the merge is.
+/// The trees of all versions that a merge reads, each down to the directory that the merge is in.
 class VersionTrees {
 public:
     VersionTrees(MergeSources const& sources, AncestryGraph const& graph) : sources_(sources), graph_(graph) {}
 
-    /// What need not be asked for.
+    /// Sets the tree of a version, which is not asked for then.
     void Give(AncestryGraph::Node version, cow_ptr<Tree> tree) { levels_.front().emplace(version, std::move(tree)); }
 
     /// The view must stay valid until `Leave`.
@@ -59,7 +59,7 @@ private:
     std::set<Id> gone_;
 };
 
-/// Finds the base of every entry of a merge. The same for both orders of the sides.
+/// Finds the base of each entry of a merge, the same one for either order of the sides.
 class EntryBases {
 public:
     EntryBases(MergeSources const& sources, MergeSide const& left, MergeSide const& right);
@@ -68,7 +68,7 @@ public:
     void Enter(KivStringT<char16_t> const& name) { versions_.Enter(name); }
     void Leave() noexcept { versions_.Leave(); }
 
-    /// For the trees of the merge themselves.
+    /// The base of the trees that are merged.
     [[nodiscard]] BaseEntry OfAll();
     [[nodiscard]] BaseEntry Of(KivStringT<char16_t> const& name);
 
@@ -84,10 +84,11 @@ private:
         unsigned depth = 0;
     };
 
-    /// Merges that have crossed again and again make a ladder. It is climbed down as far as this.
+    /// Bases whose own bases are several, and so on, as merges that cross again and again leave them, are followed this
+    /// far.
     static constexpr unsigned deepest = 16;
-    /// The most pairs that are looked at for one entry, and the most whose meeting is looked for at all. What lies beyond
-    /// counts as not known, so that somebody is asked.
+    /// The most pairs of versions that are compared for one entry, and the most whose bases are looked for in one
+    /// merge. Whatever is beyond these limits counts as not known, so that resolvers are asked.
     static constexpr std::size_t maximumPairsOfEntry = 256;
     static constexpr std::size_t maximumPairs = 4096;
 

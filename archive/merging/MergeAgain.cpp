@@ -18,11 +18,11 @@ struct Level {
     cow_ptr<Tree> left;
     cow_ptr<Tree> right;
     cow_ptr<Tree> result;
-    /// What differs, and is a directory on one side at least; files are merged before these.
+    /// The names that differ and are a directory on at least one side. They are merged after all others.
     PathList directories;
     std::size_t next = 0;
 
-    /// Empty directories are only there if somebody made them so.
+    /// A directory stays empty only if a side has it empty; one that the merge has emptied is removed.
     [[nodiscard]] bool IsKept() const noexcept {
         return !result->IsEmpty() || (left && left->IsEmpty()) || (right && right->IsEmpty());
     }
@@ -38,8 +38,7 @@ PathList DifferingNames(cow_ptr<Tree> const& left, cow_ptr<Tree> const& right) {
     return names;
 }
 
-/// Merges level by level. The levels stand on a stack of their own, since directories may be nested deeper than calls can
-/// be.
+/// Merges directory by directory, with a stack of its own, since directories may be nested deeper than calls.
 class Merging {
 public:
     Merging(IRepository& repo, MergeSources const& sources, MergeSide const& left, MergeSide const& right,
@@ -63,8 +62,8 @@ public:
     }
 
 private:
-    /// Takes an entry of one side, or the base's, or opens the directory as a new level. @p name is null for the trees of
-    /// the merge.
+    /// Takes the entry of a side or of the base, or opens the directory as a new level.
+    /// @param name null for the trees that are merged
     void MergeDirectory(HeldEntry const& left, HeldEntry const& right, KivStringT<char16_t> const* name) {
         if (left == right)
             return Take(left, name);
@@ -94,7 +93,7 @@ private:
         questions_.Leave();
     }
 
-    /// Makes an entry that of the innermost level's result.
+    /// Sets an entry in the result of the innermost level.
     void Take(HeldEntry const& entry, KivStringT<char16_t> const* name) {
         if (name == nullptr) {
             top_ = entry.directory;
@@ -136,7 +135,7 @@ private:
         Take(questions_.AskAboutEntry(name, left, right, base), &name);
     }
 
-    /// A file on one side and a directory on the other.
+    /// Merges a name that is a file on one side and a directory on the other.
     void MergeKinds(KivStringT<char16_t> const& name, HeldEntry const& left, HeldEntry const& right,
                     BaseEntry const& base) {
         Level const& level = levels_.back();

@@ -15,7 +15,7 @@ cow_ptr<Tree> RootTreeOf(Commit const& commit) {
 
 } // namespace
 
-/// What a host brings and the storage does not know. Its facts are read from there.
+/// Enters a commit of the host's, with its ancestors, that the storage does not have, since facts are read from there.
 void ArchivedRepository::EnterLine(cow_ptr<Commit> commit) {
     for (; commit && !GetCommitFromStorage(commit->GetId()); commit = commit->GetHeldParent())
         SyncWithStorage(commit);
@@ -49,7 +49,7 @@ MergeSources ArchivedRepository::SourcesOfMerge(IProgress* progress) {
     return sources;
 }
 
-/// What can be done without a new commit; nothing if that cannot be.
+/// Merges if that takes no new commit; otherwise returns nothing.
 std::optional<MergeResult> ArchivedRepository::MergeWithoutCommit(cow_ptr<Commit> const& commit, IProgress* progress) {
     if (!commit)
         return MergeResult::NothingToCommit;
@@ -73,7 +73,7 @@ std::optional<MergeResult> ArchivedRepository::MergeWithoutCommit(cow_ptr<Commit
         return forward();
     if (!(head->GetRootId() == commit->GetRootId()))
         return {};
-    // Both sides of an exchange take the same one of the two.
+    // The smaller identifier, so that both sides of an exchange take the same commit.
     bool const staysHere = headId < commitId;
     if (!bothContain)
         RecordContained(staysHere ? head : commit, Containment::FoundEqual, staysHere ? commit : head);
@@ -127,7 +127,7 @@ bool ArchivedRepository::CommitMerge(cow_ptr<Commit> const& head, cow_ptr<Commit
     try {
         RecordContained(stored, Containment::Merged, commit);
     } catch (...) {
-        // A merge that does not say what it merged would bring back what it has settled.
+        // Without a record of what was merged, a later merge would ask again about what this one has settled.
         MoveBranchTo(GetCurentBranch(), head);
         throw;
     }

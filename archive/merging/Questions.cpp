@@ -37,7 +37,7 @@ KivStringT<char16_t> Join(std::vector<KivStringViewT<char16_t>> const& path) {
     return joined;
 }
 
-/// A directory that questions are about, for as long as an entry of it is asked about.
+/// Enters a directory for as long as it exists.
 class Entering {
 public:
     Entering(Questions& questions, KivStringT<char16_t> const& name) : questions_(questions) { questions_.Enter(name); }
@@ -56,7 +56,7 @@ HeldEntry const& Chosen(ConflictSettlement settlement, HeldEntry const& left, He
     return settlement == ConflictSettlement::Right ? right : left;
 }
 
-/// Nobody can take a base that is not there.
+/// An answer that takes the base counts as undecided if there is none.
 ConflictSettlement WhereThereIs(BaseEntry const& base, ConflictSettlement settlement) noexcept {
     return settlement == ConflictSettlement::Root && !base ? ConflictSettlement::Undecided : settlement;
 }
@@ -163,7 +163,7 @@ TreeConflictChoice Questions::AskAboutDirectory(HeldEntry const& left, HeldEntry
     return settlement == ConflictSettlement::Undecided ? TreeConflictChoice::Merge : choice;
 }
 
-/// Where there is not exactly one base, the root that resolvers are shown gets the base of what they are asked about.
+/// Unless the root that resolvers see is the tree of the only base, puts the base of this entry into it.
 void Questions::ShowBase(BaseEntry const& base) {
     if (isRootWhole_ || gaveUp_ || !base)
         return;

@@ -1,21 +1,21 @@
 #pragma once
 
 /// @file
-/// What a merge asks its resolvers, and what came of it.
+/// What a merge asks its resolvers, and what they answer.
 
 #include "EntryBases.h"
 
 namespace KivArchive {
 
-/// Stands between a merge and its resolvers. Keeps a list of what was asked; once something was left undecided it asks no
-/// more, and everything that comes is noted as undecided, too.
+/// Asks the resolvers of a merge, and lists what they were asked about. Once something was left undecided it asks no
+/// more, and lists everything else as undecided, too.
 class Questions {
 public:
     using IsFree = std::function<bool(KivStringT<char16_t> const& name)>;
 
     struct KindAnswer {
         HeldEntry entry;
-        /// Under which name the file goes beside the directory; empty if it does not.
+        /// The name under which the file is kept beside the directory; empty if it is not.
         KivStringT<char16_t> fileName;
     };
 
@@ -28,13 +28,13 @@ public:
     void Enter(KivStringViewT<char16_t> name) { path_.push_back(name); }
     void Leave() noexcept { path_.pop_back(); }
 
-    /// What becomes of an entry of the directory that is a directory on neither side or on one; after giving up, anything.
+    /// The merged entry, for one that is a directory on at most one side. Meaningless after giving up.
     [[nodiscard]] HeldEntry AskAboutEntry(KivStringT<char16_t> const& name, HeldEntry const& left,
                                           HeldEntry const& right, BaseEntry const& base);
     [[nodiscard]] KindAnswer AskAboutKinds(KivStringT<char16_t> const& name, HeldEntry const& left,
                                            HeldEntry const& right, BaseEntry const& base, IsFree const& isFree);
-    /// What becomes of the directory itself, which is never undecided, and only `Root` if there is a base: once the merge has
-    /// given up it goes on inside.
+    /// How the directory itself is merged. Never `Undecided`, and `Root` only if there is a base: after giving up the
+    /// merge goes on inside, to list what is left.
     [[nodiscard]] KivVcs::TreeConflictChoice AskAboutDirectory(HeldEntry const& left, HeldEntry const& right,
                                                                BaseEntry const& base);
 
@@ -55,7 +55,8 @@ private:
     MergeSources const& sources_;
     MergeResolvers const& resolvers_;
     KivVcs::MergeTrees trees_;
-    /// False if what is shown as root is put together as it is needed.
+    /// Whether resolvers see the tree of the only base as root. Otherwise they see a tree that `ShowBase` puts
+    /// together.
     bool isRootWhole_;
     std::vector<KivStringViewT<char16_t>> path_;
     std::vector<KivVcs::MergeConflict> conflicts_;

@@ -21,7 +21,7 @@ Buffer const& ArchivedBlob::GetData() const {
         return *content;
     auto fetched = std::make_unique<Buffer const>(group_->GetContents()->Fetch(GetId()));
     Buffer const* held = nullptr;
-    // Of several threads that fetch at once, the first one's content is everybody's.
+    // If several threads fetch at once, all use the content of the first.
     if (content_.compare_exchange_strong(held, fetched.get(), std::memory_order_acq_rel, std::memory_order_acquire))
         held = fetched.release();
     return *held;

@@ -85,12 +85,13 @@ void ArchivedRepository::RecordContained(cow_ptr<Commit> const& commit, Containm
 
 std::vector<Ancestry> ArchivedRepository::ReadAncestry(std::span<const Id> commits, Follow follow,
                                                        std::size_t more) const {
-    // As far as is asked for, since the archive walks that far for each batch.
+    // About as many as the caller asks for, since the archive walks that far for each batch.
     std::size_t const batchSize = std::clamp<std::size_t>(more, 16, 256);
     std::unordered_map<Id, Ancestry> archived;
     std::unordered_set<Id> asked;
     auto const ask = [&](Id const& id) {
-        // What was made here goes along: of one after the other the archive would say that it does not know it.
+        // All unpublished commits of the line in one batch, instead of one call for each that the archive does not
+        // know.
         std::vector<Id> line{id};
         for (cow_ptr<Commit> held = state_->storage->GetCommit(id);
              held && line.size() < batchSize && state_->storage->MayBeUnpublished(line.back());) {

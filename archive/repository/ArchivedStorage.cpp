@@ -12,8 +12,8 @@ typename Table::mapped_type FindIn(Table const& table, Id const& id) {
     return found == table.end() ? nullptr : found->second;
 }
 
-/// A table with what has arrived and without what is hidden; the settled one as long as that is the same.
-/// @param tables those made before, which only lack what has arrived since
+/// A table with what has arrived and without what is hidden; the settled table itself if that is the same.
+/// @param tables the tables made before, which only lack what has arrived since
 template <class Table>
 Table const& TableOf(Table const& settled, Table const& arrived, std::unordered_set<Id> const& hidden,
                      std::uint64_t count, std::list<Table>& tables) {
@@ -93,7 +93,7 @@ void ArchivedStorage::AddCommit(cow_ptr<Commit> commit) {
     if (cow_ptr<Commit> const living = objects_.GetCommit(id)) {
         if (!hidden_.contains(id))
             return;
-        // A deleted object gives way to the one that the host brings.
+        // A deleted object is replaced by the one that the host adds.
         objects_.DeleteCommit(living);
         --hiddenCount_;
     }

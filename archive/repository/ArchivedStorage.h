@@ -12,12 +12,14 @@
 
 namespace KivArchive {
 
-/// A storage in memory that objects enter as they are fetched, whichever repository, clone or thread reaches them first.
+/// A storage in memory that objects enter as they are fetched, whichever repository, clone or thread reaches them
+/// first.
 ///
-/// What has been fetched waits apart until the host changes the storage, so that tables stay valid as long as they have to.
-/// A deleted commit that somebody holds is hidden rather than forgotten: it stays the one living object of its identifier.
+/// What has been fetched is kept apart until the host changes the storage, since tables that hosts were given must stay
+/// as they are until then. A deleted commit that somebody holds is hidden, not dropped: it stays the only living object
+/// with its identifier.
 ///
-/// Threads: as every storage; besides, objects may enter at any time. All tables of the storages of one source have one lock.
+/// Threads: as for every storage, and objects may enter at any time. The storages of one source have one lock.
 class ArchivedStorage final : public KivVcs::IObjectsStorage {
 public:
     explicit ArchivedStorage(std::shared_ptr<ObjectSource> source);
@@ -48,13 +50,13 @@ public:
     [[nodiscard]] cow_ptr<Commit> GetHead(KivStringViewT<char16_t> name) const override;
     [[nodiscard]] std::vector<KivStringT<char16_t>> GetCommitBranches(cow_ptr<Commit> commit) const override;
 
-    /// The living object of an identifier, hidden or not. To be called under the lock of the source, as `Enter`.
+    /// The living object with that identifier, hidden or not. Called under the lock of the source, as is `Enter`.
     [[nodiscard]] cow_ptr<Commit> FindLiving(Id const& id) const;
     void Enter(cow_ptr<Commit> const& commit);
     void Enter(cow_ptr<Tree> const& tree);
     void Enter(cow_ptr<Blob> const& blob);
 
-    /// Whether a commit may be one that the archive has never had: a host brought it, and it has not been published.
+    /// Whether the archive may never have had a commit: a host added it, and it has not been published.
     [[nodiscard]] bool MayBeUnpublished(Id const& id) const;
     void SetPublished(std::span<const Id> commits) noexcept;
 
@@ -74,11 +76,11 @@ private:
     CommitTable arrivedCommits_;
     TreeTable arrivedTrees_;
     BlobTable arrivedBlobs_;
-    /// The commits that were deleted; those of them that live are among the objects all the same.
+    /// The commits that were deleted. Those that are still alive are among the objects all the same.
     std::unordered_set<Id> hidden_;
     std::uint64_t hiddenCount_ = 0;
     std::unordered_set<Id> unpublished_;
-    /// Tables with what has arrived, for hosts that asked for them; as valid as tables are.
+    /// Tables that include what has arrived, for hosts that asked for them; kept until the host changes the storage.
     mutable std::list<CommitTable> commitTables_;
     mutable std::list<TreeTable> treeTables_;
     mutable std::list<BlobTable> blobTables_;

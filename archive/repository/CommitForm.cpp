@@ -22,7 +22,7 @@ cow_ptr<Commit> ReadCommit(Id const& id, std::span<const std::byte> data, Commit
     read.SetCommitTimezoneBias(KivVcs::TimeDelta(packed->biasMinutes * ticksPerMinute));
     read.DeferRoot(packed->tree, std::move(fetchRoot));
     read.DeferParent(packed->parent, std::move(fetchParent));
-    // Only the identifier says whether everything was understood.
+    // Only an equal identifier proves that everything was understood.
     return read.GetId() == id ? commit : nullptr;
 }
 

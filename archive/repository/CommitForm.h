@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Commits read exactly.
+/// Reading commits exactly.
 
 #include "KivArchive/IArchive.h"
 
@@ -9,7 +9,7 @@
 
 namespace KivArchive {
 
-/// The commit whose packed form has the given data, with its parent and root deferred; null if no commit has.
+/// The commit that is packed to the given data, with its parent and root deferred; null if no commit is.
 /// @param id the digest of that packed form
 [[nodiscard]] KivVcs::cow_ptr<KivVcs::Commit> ReadCommit(Id const& id, std::span<const std::byte> data,
                                                          KivVcs::Commit::FetchCommit fetchParent,

@@ -6,7 +6,7 @@ namespace KivArchive {
 
 namespace {
 
-/// What a stream over a content holds at most.
+/// The most bytes that a stream over a content holds.
 constexpr std::uint64_t windowSize = 4 * largestWholeContent;
 
 ObjectInfo DescribeContent(IArchive& archive, Id const& id) {
@@ -29,7 +29,7 @@ Buffer FetchLarge(IArchive& archive, Id const& id, std::uint64_t size) {
 
 } // namespace
 
-/// The stream of an archive, which it keeps alive, and the share of the budget that it takes.
+/// The stream of a content. Keeps the archive alive, and takes its share of the budget.
 class BudgetedStream final : public KivVcs::IStream {
 public:
     BudgetedStream(std::shared_ptr<Contents> contents, Id const& id)

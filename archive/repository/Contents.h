@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Contents of an archive, within a byte budget.
+/// Reading contents from an archive, within a byte budget.
 
 #include "KivArchive/IArchive.h"
 
@@ -12,16 +12,16 @@
 
 namespace KivArchive {
 
-/// Fetches contents, and keeps those that were asked for last.
+/// Fetches contents, and caches those that were asked for last.
 ///
-/// Threads: all operations may run concurrently. Nothing is locked while the archive is asked.
+/// Threads: all operations may run concurrently. No lock is held while the archive is asked.
 class Contents : public std::enable_shared_from_this<Contents> {
 public:
     Contents(std::shared_ptr<IArchive> archive, std::uint64_t budget) : archive_(std::move(archive)), budget_(budget) {}
 
-    /// The content, verified and kept by nobody else. @throws ArchiveError
+    /// The content, verified and not cached. @throws ArchiveError
     [[nodiscard]] Buffer Fetch(Id const& id);
-    /// The content, kept as long as the budget allows.
+    /// The content, cached as long as the budget allows.
     [[nodiscard]] Buffer Read(Id const& id);
     /// A stream that holds one window, which counts against the budget.
     [[nodiscard]] StreamIO Open(Id const& id);
@@ -45,13 +45,13 @@ private:
     std::shared_ptr<IArchive> archive_;
     std::uint64_t const budget_;
     std::mutex mutex_;
-    /// What was used last first.
+    /// The most recently used first.
     std::list<Kept> kept_;
     std::unordered_map<Id, std::list<Kept>::iterator> places_;
     std::uint64_t used_ = 0;
 };
 
-/// The files that were read along with each other, whose sizes are asked for together.
+/// Files that were read together, and whose sizes are asked for together.
 class ContentGroup {
 public:
     ContentGroup(std::shared_ptr<Contents> contents, std::vector<Id> ids)

@@ -60,7 +60,7 @@ bool ForEachPiece(StreamIO& stream, const char* step, IProgress* progress, Take 
     return true;
 }
 
-/// The file that a content is written to; gone unless it was kept.
+/// The file that a content is written to. Removed in the end unless `Keep` was called.
 class NewFile {
 public:
     explicit NewFile(std::string const& path) : path_(path) {

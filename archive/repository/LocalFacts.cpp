@@ -53,7 +53,7 @@ std::vector<Ancestry> LocalFacts::All() const {
     all.reserve(entries_.size());
     auto const isDigest = [](Id const& known) { return known.IsEmpty() || known.GetDigest() != nullptr; };
     for (auto const& [id, entry] : entries_) {
-        // An archive knows objects by digests only.
+        // Archives take digests only; a host's class may have other identifiers.
         if (!isDigest(id) || !isDigest(entry.facts.parent) || !isDigest(entry.facts.tree))
             continue;
         all.push_back(entry.facts);

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Facts about commits that the archive does not know yet.
+/// The facts that the archive does not have yet.
 
 #include "KivArchive/IArchive.h"
 
@@ -12,25 +12,24 @@
 
 namespace KivArchive {
 
-/// What commits contain, and the facts of unpublished commits that others were rewritten from. Kept until the archive has
-/// them.
+/// What commits contain, and the facts of unpublished commits that others contain. Kept until the archive has them.
 class LocalFacts {
 public:
     using CommitHandle = KivVcs::cow_ptr<KivVcs::Commit>;
     using IsUnpublished = std::function<bool(Id const&)>;
 
-    /// @param merged what must not be purged before @p commit is published; may be null
+    /// @param merged a commit that must not be purged before @p commit is published; may be null
     void Add(KivVcs::Commit const& commit, ContainedCommit const& contained, CommitHandle merged);
     /// Adds the facts of @p commit, of its ancestors and of what these have merged, as far as they are unpublished.
     void AddLine(CommitHandle commit, IsUnpublished const& isUnpublished);
 
-    /// The facts of a commit; null if there are none but its parent and its tree.
+    /// The facts of a commit; null if it is not known to contain anything but its parent.
     [[nodiscard]] Ancestry const* Find(Id const& id) const;
     [[nodiscard]] std::span<const CommitHandle> MergedBy(Id const& id) const;
     [[nodiscard]] std::vector<Ancestry> All() const;
     /// Whether there are facts of published commits: publishing commits would not bring these to the archive.
     [[nodiscard]] bool HasFactsOfPublished(IsUnpublished const& isUnpublished) const;
-    /// Drops what the archive has stored, except about commits that are still unpublished.
+    /// Drops all facts but those of commits that are still unpublished.
     void ForgetPublished(IsUnpublished const& isUnpublished);
 
 private:

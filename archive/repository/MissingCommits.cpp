@@ -7,10 +7,9 @@ namespace KivArchive {
 
 namespace {
 
-/// How many commits of one line are asked about at once.
+/// The most commits of one line that are asked about at once.
 constexpr std::size_t maximumAskedOfLine = 1000;
-/// Up to so many commits that a host has just made are taken for missing unasked: storing what is there already costs less
-/// than asking.
+/// Up to this many commits are taken for missing without asking: storing some that are there already costs less.
 constexpr std::size_t maximumUnasked = 8;
 
 } // namespace
@@ -20,7 +19,7 @@ std::vector<cow_ptr<Commit>> MissingCommits::Find(std::vector<cow_ptr<Commit>> c
     return InOrder(heads);
 }
 
-/// The commit and its ancestors up to the first that the archive is known to have had.
+/// The commit and its ancestors, up to the first one that the archive is known to have had.
 std::vector<cow_ptr<Commit>> MissingCommits::LineToAskFor(cow_ptr<Commit> commit) const {
     std::vector<cow_ptr<Commit>> line;
     for (; commit && line.size() < maximumAskedOfLine; commit = commit->GetHeldParent()) {
@@ -50,7 +49,7 @@ void MissingCommits::Discover(std::vector<cow_ptr<Commit>> open) {
             bool isWhollyMissing = !line.empty();
             for (auto const& commit : line) {
                 Id const id = commit->GetId();
-                // What is there has all that it names.
+                // A commit that is there has all that it names.
                 isWhollyMissing = missing.contains(id);
                 if (!isWhollyMissing)
                     break;

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What a publish has to bring, from the top.
+/// Which commits publishing has to store.
 
 #include "repository/ArchivedStorage.h"
 #include "repository/LocalFacts.h"
@@ -10,11 +10,11 @@
 
 namespace KivArchive {
 
-/// The commits that some heads reach and the archive lacks, in the order in which they have to be stored: parents and what
-/// was merged first.
+/// Finds the commits that some heads reach and the archive lacks, each after its parent and what it merged, as they
+/// have to be stored.
 class MissingCommits {
 public:
-    /// @param asksForAll whether the archive is asked also for commits that it has had
+    /// @param asksForAll whether to ask also for commits that the archive has had, and that may have been collected
     MissingCommits(ArchivedStorage const& storage, LocalFacts const& facts, IArchive& archive, bool asksForAll)
         : storage_(storage), facts_(facts), archive_(archive), asksForAll_(asksForAll) {}
 

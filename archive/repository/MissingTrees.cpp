@@ -39,14 +39,14 @@ void MissingTrees::Find(bool isNew) {
     while (!toAskFor_.empty()) {
         for (Id& id : archive_.FindMissing(std::exchange(toAskFor_, {})))
             missing_.insert(std::move(id));
-        // Those that are added meanwhile wait for the next batch, unless an earlier version says what is new in them.
+        // Directories that this adds are asked for with the next batch before they are listed.
         for (std::size_t const end = directories_.size(); looked_ < end; ++looked_)
             if (IsMissing(directories_[looked_].id) && !directories_[looked_].isListed)
                 List(looked_);
     }
 }
 
-/// Whether it costs less to store all of it than to ask for it first.
+/// Whether storing all of it costs less than asking for it first.
 bool MissingTrees::AreFewAndSmall() const {
     return toAskFor_.size() <= maximumUnasked &&
            std::all_of(directories_.begin(), directories_.end(), [](NewDirectory const& directory) {
@@ -69,7 +69,7 @@ std::size_t MissingTrees::AddDirectory(NewDirectory directory) {
 }
 
 void MissingTrees::List(std::size_t number) {
-    // On a list of its own: nesting has no bound that a thread's stack would hold.
+    // A list instead of recursion: directories may be nested deeper than a thread's stack allows.
     for (std::vector<std::size_t> open{number}; !open.empty();) {
         std::size_t const next = open.back();
         open.pop_back();
@@ -85,9 +85,9 @@ void MissingTrees::List(std::size_t number) {
     }
 }
 
-/// Lists a directory whole that is below one that is listed whole, also if it was added before, to be compared with the one
-/// that it replaces in another version: that comparison leaves out what both have, which the archive may lack.
-/// @return whether that has to be done at once, since `Find` has passed it
+/// Lets a directory below one that is listed whole be listed whole, too. It may have been added before, to list only
+/// what differs from an earlier version, and so without what the archive may lack.
+/// @return whether to list it now, since `Find` has passed it already
 bool MissingTrees::ListsWholeNow(std::size_t number) {
     NewDirectory& directory = directories_[number];
     if (!directory.earlier)
@@ -122,7 +122,7 @@ void MissingTrees::ListSubdirectories(std::size_t number) {
                                          : directory.tree->GetLocalSubtreePaths();
     std::vector<std::size_t> subdirectories;
     for (auto const& name : names) {
-        // Adding moves the directories.
+        // Not before the loop, since adding moves the directories.
         NewDirectory const& holder = directories_[number];
         NewDirectory subdirectory;
         subdirectory.tree = holder.tree->GetLocalTree(name);
@@ -170,7 +170,7 @@ std::string MissingTrees::PathOf(std::size_t directory, KivStringViewT<char16_t>
     std::string path;
     for (; !names.empty(); names.pop_back())
         path += (path.empty() ? "" : "/") + names.back();
-    // Sentences end at their first zero byte.
+    // `what()` ends at the first zero byte.
     for (std::size_t zero = path.find('\0'); zero != std::string::npos; zero = path.find('\0', zero))
         path.replace(zero, 1, "\\0");
     return path;

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The directories and files that some commits bring.
+/// Which directories and files publishing has to store.
 
 #include "KivArchive/IArchive.h"
 
@@ -16,7 +16,8 @@ using KivVcs::Blob;
 using KivVcs::cow_ptr;
 using KivVcs::Tree;
 
-/// A directory that may have to be stored, with those of its entries that the directory that it replaces does not have.
+/// A directory that may have to be stored, with its entries, of which those are left out that the directory it replaces
+/// has, too.
 struct NewDirectory {
     static constexpr auto none = static_cast<std::size_t>(-1);
 
@@ -29,9 +30,9 @@ struct NewDirectory {
 
     cow_ptr<Tree> tree;
     Id id;
-    /// What it replaces, which is or will be in the archive; null if there is nothing.
+    /// The directory that it replaces, which is in the archive or will be; null if there is none.
     cow_ptr<Tree> earlier;
-    /// Where it is, by number; a root is nowhere.
+    /// The number of the directory that it is in; `none` for a root.
     std::size_t holder = none;
     KivStringT<char16_t> name;
     std::size_t depth = 0;
@@ -40,24 +41,24 @@ struct NewDirectory {
     bool isListed = false;
 };
 
-/// Looks for what the archive lacks of trees, from the top: a directory that is there is not entered. One batch for each
-/// level below what is new; what differs from an earlier version is asked for in one batch.
+/// Looks for what the archive lacks of some trees, from the top down: a directory that is there is not entered. Asks
+/// with one batch for whatever differs from earlier versions, and with one for each level of what is wholly new.
 class MissingTrees {
 public:
     explicit MissingTrees(IArchive& archive) : archive_(archive) {}
 
-    /// @param earlier the root that @p root replaces, which is or will be in the archive; may be null
+    /// @param earlier the root that @p root replaces, which is in the archive or will be; may be null
     /// @throws ArchiveError of kind `Unrepresentable`, as everything here
     void Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier);
     /// Asks the archive about all that was added.
-    /// @param isNew whether a few small things that differ from earlier versions are taken for missing unasked
+    /// @param isNew whether a few small objects that differ from earlier versions are taken for missing without asking
     void Find(bool isNew);
 
     [[nodiscard]] bool IsMissing(Id const& id) const { return missing_.contains(id); }
     /// The number of a directory that was looked for.
     [[nodiscard]] std::size_t NumberOf(Id const& id) const { return numbers_.at(id); }
     [[nodiscard]] NewDirectory const& At(std::size_t number) const { return directories_[number]; }
-    /// Says by its path that an entry of a directory cannot be shown.
+    /// Throws because an entry of a directory cannot be stored, naming its path.
     [[noreturn]] void Refuse(std::size_t directory, KivStringViewT<char16_t> name, const char* why) const;
 
 private:
@@ -73,7 +74,7 @@ private:
 
     IArchive& archive_;
     std::vector<NewDirectory> directories_;
-    /// How many directories have been looked at since the archive was asked about them.
+    /// How many directories `Find` has passed.
     std::size_t looked_ = 0;
     std::unordered_map<Id, std::size_t> numbers_;
     std::vector<Id> toAskFor_;

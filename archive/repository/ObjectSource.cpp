@@ -13,7 +13,7 @@ namespace KivArchive {
 
 namespace {
 
-/// How many commits a walk that has just begun fetches with one batch, and how many one that goes on for long.
+/// How many commits the first batch of a walk fetches, and how many its largest ones.
 constexpr std::size_t fewestAhead = 32;
 constexpr std::size_t mostAhead = 2048;
 
@@ -98,7 +98,7 @@ cow_ptr<Commit> ObjectSource::FetchCommit(Id const& id) {
     if (fetched)
         return fetched;
     {
-        // Another thread may have been faster.
+        // Another thread may have entered it meanwhile.
         Lock const lock(mutex_);
         if (cow_ptr<Commit> living = FindCommit(id)) {
             Enter(living);
@@ -129,7 +129,7 @@ std::vector<Id> ObjectSource::AncestorsAhead(Id const& id) {
     return ids;
 }
 
-/// @return the one living commit; null if it is none that can be shown
+/// @return the only living commit with that identifier; null if no commit is packed to this object
 cow_ptr<Commit> ObjectSource::ReadObject(ArchivedObject const& object) {
     if (object.type != ObjectType::Commit)
         return nullptr;

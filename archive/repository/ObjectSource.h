@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Where the storages of a repository and of its clones get objects from.
+/// Fetching objects for the storages of a repository and its clones.
 
 #include "KivArchive/IArchive.h"
 #include "repository/Contents.h"
@@ -21,9 +21,9 @@ using KivVcs::Tree;
 
 class ArchivedStorage;
 
-/// Fetches commits and trees from an archive, each at most once as long as a storage has it, and enters them into every
-/// storage that is made on it. Commits hold it by the functions that fetch what they defer, so that it must hold neither
-/// commits nor storages.
+/// Fetches commits and trees from an archive, each only if no storage has it, and enters them into all storages that
+/// are made on this source. The functions with which commits fetch what they defer hold the source, so that it must
+/// hold neither commits nor storages.
 ///
 /// Threads: all operations may run concurrently. The lock is never held while the archive is asked.
 class ObjectSource : public std::enable_shared_from_this<ObjectSource> {
@@ -32,23 +32,23 @@ public:
 
     [[nodiscard]] std::shared_ptr<IArchive> const& GetArchive() const noexcept { return archive_; }
     [[nodiscard]] std::shared_ptr<Contents> const& GetContents() const noexcept { return contents_; }
-    /// The lock of all storages: recursive, since hosts' objects may be asked under it.
+    /// The lock of all storages. Recursive, since operations of hosts' objects are called under it.
     [[nodiscard]] std::recursive_mutex& Mutex() const noexcept { return mutex_; }
 
     void Add(ArchivedStorage& storage);
     void Remove(ArchivedStorage& storage) noexcept;
 
-    /// The object of that identifier. @throws ArchiveError if it cannot be had
+    /// The object with that identifier. @throws ArchiveError if it cannot be read
     [[nodiscard]] cow_ptr<Commit> FetchCommit(Id const& id);
     [[nodiscard]] cow_ptr<Tree> FetchTree(Id const& id);
 
-    /// What was asked for and why it cannot be had.
+    /// What could not be read, and why.
     using Failures = std::unordered_map<Id, Failure>;
 
     /// Fetches those of @p ids that no storage has, in one batch.
     Failures LoadCommits(std::span<const Id> ids);
     /// Fetches trees, with one batch for each level of all of them. @param progress may be null
-    /// @throws ArchiveError if one cannot be had
+    /// @throws ArchiveError if one cannot be read
     void LoadTrees(std::span<const Id> ids, IProgress* progress);
     /// Enters blobs, which are not fetched.
     void LoadBlobs(std::span<const Id> ids);
@@ -70,7 +70,7 @@ private:
     std::shared_ptr<Contents> contents_;
     mutable std::recursive_mutex mutex_;
     std::vector<ArchivedStorage*> storages_;
-    /// Where the last batch of ancestors ended, and how many the next one takes: a walk that goes on takes more and more.
+    /// The commit after the last batch of ancestors, and the size of the next batch: they grow while a walk goes on.
     Id nextAncestor_;
     std::size_t ahead_;
 };

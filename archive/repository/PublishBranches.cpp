@@ -12,23 +12,24 @@ namespace KivArchive {
 
 namespace {
 
-/// How often publishing is tried if others collect meanwhile what it relies on.
+/// How many times publishing is tried if others collect meanwhile what it relies on.
 constexpr int mostAttempts = 3;
 
-/// How many facts are looked at for a head that was rewritten, first and at most.
+/// How many facts are read to find what stands for a rewritten head, at first and at most.
 constexpr std::size_t firstFactsOfRewriting = 40;
 constexpr std::size_t mostFactsOfRewriting = 10'240;
 
 constexpr std::chrono::milliseconds longestBackOff{1000};
 
-/// The commit that stands for another one on a line, and whether reading more facts could not change that.
+/// The commit of a line that stands for a rewritten one.
 struct StandIn {
-    /// Null if nothing does, or if the line goes through the commit itself.
+    /// Null if there is none, or if the line contains the commit itself.
     Id commit;
+    /// Whether reading more facts could not change it.
     bool isCertain = true;
 };
 
-/// Follows parents from @p head on to the first commit that was rewritten from @p wanted, over any number of steps.
+/// Follows parents from @p head to the first commit that was rewritten from @p wanted, be it over several steps.
 StandIn FindStandIn(std::vector<Ancestry> const& known, Id const& head, Id const& wanted) {
     std::unordered_map<Id, Ancestry const*> facts;
     for (Ancestry const& one : known)
@@ -67,10 +68,10 @@ StandIn FindStandIn(std::vector<Ancestry> const& known, Id const& head, Id const
 
 } // namespace
 
-/// The branches that stand elsewhere than in the archive.
+/// The branches to be moved in the archive.
 struct ArchivedRepository::Moves {
     std::vector<BranchMove> moves;
-    /// Of those that are not removed.
+    /// The heads of those that are not removed.
     std::vector<cow_ptr<Commit>> heads;
 };
 
@@ -85,7 +86,7 @@ ArchivedRepository::Moves ArchivedRepository::PendingMoves(std::span<const KivSt
         bool const isUnreadable = !own && branch.unreadable && state_->storage->BranchExist(name);
         if (isUnreadable || ownId == branch.published)
             continue;
-        // What others have published counts as taken in if the host has merged it.
+        // What others have published may be replaced if the host has merged it.
         bool const hasMerged = own && !(branch.published == branch.taken) && IsContained(branch.published, own);
         Id const expected = hasMerged ? branch.published : branch.taken;
         if (ownId == expected)
@@ -97,7 +98,7 @@ ArchivedRepository::Moves ArchivedRepository::PendingMoves(std::span<const KivSt
     return pending;
 }
 
-/// Whether the unpublished commits of a line, or what they were put on or have merged, are or contain a commit.
+/// Whether one of the unpublished commits of @p in's line is @p commit, is on top of it, or contains it.
 bool ArchivedRepository::IsContained(Id const& commit, cow_ptr<Commit> const& in) const {
     std::vector<cow_ptr<Commit>> open{in};
     std::set<Id> met;
@@ -147,7 +148,8 @@ PublishOutcome ArchivedRepository::Publish(std::span<const KivStringT<char16_t>>
     }
 }
 
-/// Whether a race was lost only because an earlier try has succeeded, although it ended with an exception.
+/// Whether a race was lost only to an earlier try of this repository, which succeeded although it ended with an
+/// exception.
 bool ArchivedRepository::IsOwnDoing(PublishOutcome const& outcome) const {
     return !outcome.published && outcome.changedRecords.empty() &&
            std::all_of(outcome.moved.begin(), outcome.moved.end(),
@@ -165,7 +167,7 @@ PublishOutcome ArchivedRepository::PublishOnce(std::span<const KivStringT<char16
     auto const commits = MissingCommits(*state.storage, state.facts, state.Archive(), asksForAll).Find(pending.heads);
     Publishing publishing(state.Archive(), *state.storage, state.facts, pending.moves, asksForAll, progress);
     publishing.Store(commits);
-    // Everything that could fail comes before the branches move.
+    // Whatever can fail is done before the branches move.
     std::vector<Id> published;
     published.reserve(commits.size());
     for (auto const& commit : commits)
@@ -230,7 +232,7 @@ MergeReport ArchivedRepository::MergeDiverged(KivStringT<char16_t> const& branch
     return report;
 }
 
-/// If what the unpublished commits of the branch are on was rewritten, puts them on what stands for it.
+/// If the commit below the unpublished ones of the branch was rewritten, rebases these onto what stands for it.
 void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch) {
     cow_ptr<Commit> const own = state_->storage->GetHead(branch);
     cow_ptr<Commit> fork = own;
@@ -239,7 +241,7 @@ void ArchivedRepository::RebaseOntoRewritten(KivStringT<char16_t> const& branch)
     if (!fork || fork == own)
         return;
     Id const published = state_->branches.at(branch).published;
-    // Most of the time others have published little since then.
+    // Few at first: mostly, others have published little since then.
     std::size_t more = firstFactsOfRewriting;
     for (;; more *= 4) {
         auto const known = state_->Archive().ReadAncestry({&published, 1}, Follow::Everything, more);
@@ -263,7 +265,7 @@ MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, 
         try {
             ReturnTo(before);
         } catch (...) { // NOLINT(bugprone-empty-catch)
-            // The merged branch stays current then: the host has to hear what ended the merge.
+            // The merged branch stays current then, since the host must get the first exception.
         }
         throw;
     }
@@ -271,7 +273,7 @@ MergeReport ArchivedRepository::MergePublished(KivStringViewT<char16_t> branch, 
     return *std::move(report);
 }
 
-/// Makes a branch current, also if it has been removed.
+/// Makes a branch current again, even if it has been removed meanwhile.
 void ArchivedRepository::ReturnTo(KivStringT<char16_t> const& branch) {
     auto* const storage = state_->storage;
     if (storage->BranchExist(branch)) {

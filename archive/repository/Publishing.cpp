@@ -11,7 +11,7 @@ namespace KivArchive {
 
 namespace {
 
-/// How much one change stores, and how many commits are looked at together.
+/// How many bytes one change stores, and of how many commits the trees are looked for together.
 constexpr std::uint64_t changeSize = 8 * largestWholeContent;
 constexpr std::size_t commitsTogether = 256;
 
@@ -32,7 +32,7 @@ void Publishing::Store(std::vector<cow_ptr<Commit>> const& commits) {
         StoreTogether({commits.data() + begin, std::min(commitsTogether, commits.size() - begin)});
 }
 
-/// The root of a commit, unless that would have to be fetched.
+/// The root of a commit; null if it would have to be fetched.
 cow_ptr<Tree> Publishing::HeldRootOf(Commit const& commit) const {
     auto const holder = commit.GetHeldCommitTree();
     return holder ? holder->GetRoot() : storage_.GetTree(commit.GetRootId());
@@ -45,7 +45,7 @@ void Publishing::StoreTogether(std::span<cow_ptr<Commit> const> commits) {
         if (cow_ptr<Tree> root = HeldRootOf(*commit))
             trees.Add(std::move(root), parent ? HeldRootOf(*parent) : nullptr);
     }
-    // What was merged or rewritten is made of what is there.
+    // Commits of merges and rewritten ones mostly name what is there already.
     bool const areNew = !asksForAll_ && std::none_of(commits.begin(), commits.end(), [this](auto const& commit) {
         return facts_.Find(commit->GetId()) != nullptr;
     });
@@ -58,7 +58,7 @@ void Publishing::StoreTogether(std::span<cow_ptr<Commit> const> commits) {
     }
 }
 
-/// Whether each of them is on top of an expected head, or of another one that comes before it or is in this change.
+/// Whether each commit is on top of an expected head, of one before it, or of one in this change.
 bool Publishing::AreOnExpectedHeads(std::span<cow_ptr<Commit> const> commits) const {
     std::unordered_set<Id> met;
     return std::all_of(commits.begin(), commits.end(), [&](cow_ptr<Commit> const& commit) {
@@ -95,7 +95,7 @@ void Publishing::StoreFiles(MissingTrees const& trees, std::size_t directory) {
 bool Publishing::StoreFile(NewDirectory::File const& file) {
     auto const* const archived =
         file.blob->IsOfHostClass() ? dynamic_cast<ArchivedBlob const*>(file.blob.get()) : nullptr;
-    // It is in another archive: this one lacks it.
+    // It comes from another archive, since this one lacks it.
     if (archived != nullptr && archived->GetSize() > largestWholeContent)
         return StoreLarge(file, archived->OpenContent());
     Buffer const data = archived != nullptr ? archived->ReadContent() : file.blob->GetData();
@@ -117,7 +117,7 @@ bool Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content) {
 
 bool Publishing::StoreDirectory(NewDirectory const& directory) {
     bool const isHosts = directory.tree->IsOfHostClass();
-    // A tree keeps its packed form as long as it lives, which may be long. So a copy is asked for it.
+    // The data of a copy, since a tree keeps its packed form for as long as it lives.
     Buffer const data = isHosts ? directory.tree->GetData() : Tree(*directory.tree).GetData();
     if (isHosts && !(Identify(ObjectType::Tree, data) == directory.id))
         return false;
@@ -181,7 +181,7 @@ void Publishing::Add(NewObject object) {
 
 void Publishing::Flush() {
     ReportProgress(progress_, {"publishing", storedCount_, 0}, {});
-    // No branch is moved yet, so that none keeps anything.
+    // This change moves no branch, and so expects no head that would keep these.
     change_.relied.insert(change_.relied.end(), change_.inherited.begin(), change_.inherited.end());
     change_.inherited.clear();
     archive_.Apply(change_);

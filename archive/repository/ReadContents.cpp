@@ -12,7 +12,7 @@ namespace {
 
 constexpr std::size_t batchSize = 256;
 
-/// Several threads that read a part each, and stop together.
+/// Reads with several threads, a part on each, which stop together.
 class ParallelReading {
 public:
     ParallelReading(IArchive& archive, std::span<const Id> ids, ObjectReceiver const& receiver, IProgress* progress)
@@ -38,7 +38,7 @@ public:
             for (; started < workers; ++started)
                 threads.emplace_back(read, started);
         } catch (std::system_error const&) {
-            // Without a thread for every part it only takes longer.
+            // Without some of the threads it only takes longer.
         } catch (std::bad_alloc const&) {
         }
         read(0);

@@ -38,7 +38,7 @@ void ArchivedRepository::RefreshBranch(Branch const& theirs, RefreshOutcome& out
     }
     if (hasUnpublished && isThere && isNew)
         outcome.diverged.push_back(theirs.name);
-    // One that was removed here comes back if others have moved it.
+    // A branch that was removed here comes back if others have moved it.
     if (hasUnpublished && (isThere || !isNew))
         return;
     TakePublished(theirs.name);
@@ -57,12 +57,12 @@ void ArchivedRepository::ForgetRemoved(std::vector<Branch> const& theirs, Refres
             RemoveBranch(name);
             outcome.moved.push_back(name);
         }
-        // What is left here is a new branch from now on.
+        // If the branch is still here, it is a new one from now on.
         state_->branches.erase(name);
     }
 }
 
-/// Moves the branch to its published head, or leaves it without one if that cannot be had.
+/// Moves the branch to its published head, or leaves it without one if that cannot be read.
 void ArchivedRepository::TakePublished(KivStringT<char16_t> const& branch) {
     KnownBranch& known = state_->branches.at(branch);
     cow_ptr<Commit> head;
@@ -82,7 +82,7 @@ void ArchivedRepository::TakePublished(KivStringT<char16_t> const& branch) {
     }
     bool const hasMoved =
         BranchExist(branch) ? MoveBranchTo(branch, std::move(head)) : CreateBranch(branch, std::move(head));
-    // A host's class may refuse; what has not been taken in must not be taken for something to publish over it.
+    // A host's class may refuse to move. Its head must then not seem to include what others have published.
     if (hasMoved && state_->OwnHead(branch) == known.published) {
         known.taken = known.published;
         known.unreadable.reset();

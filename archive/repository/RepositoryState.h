@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What a repository knows of its archive.
+/// The state of a repository over an archive.
 
 #include "KivArchive/ArchivedRepository.h"
 #include "repository/ArchivedStorage.h"
@@ -13,11 +13,11 @@ namespace KivArchive {
 
 /// A branch as the archive has it.
 struct KnownBranch {
-    /// Its head when it was last looked at; null for none.
+    /// Its head when it was last read; null for none.
     Id published;
-    /// The published head that the branch here has taken in, and that publishing expects to find.
+    /// The published head that the branch here was last moved to, and that publishing expects to find.
     Id taken;
-    /// Why the published head cannot be had. The branch here has no head then.
+    /// Why the published head cannot be read. The branch here has no head then.
     std::optional<Failure> unreadable;
 };
 
@@ -39,7 +39,7 @@ struct ArchivedRepository::State {
 
     std::shared_ptr<ObjectSource> source;
     RepositoryOptions options;
-    /// Until the repository has it.
+    /// Owns the storage until the repository does.
     std::unique_ptr<KivVcs::IObjectsStorage> made;
     ArchivedStorage* storage = nullptr;
     std::map<KivStringT<char16_t>, KnownBranch> branches;

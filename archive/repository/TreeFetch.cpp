@@ -13,14 +13,14 @@
 
 namespace KivArchive {
 
-/// Makes trees of the forms that were read, in a storage of its own.
+/// Makes trees from the forms that were read, in a storage of its own.
 class TreeFetch::Assembly {
 public:
     explicit Assembly(TreeFetch const& fetch) : fetch_(fetch), staging_(std::make_unique<KivVcs::MemObjectsStorage>()) {
         AddBlobs();
         for (auto const& [id, tree] : fetch.living_)
             staging_.AddTreeToStorage(tree);
-        // `Deserialize` gives no tree without entries.
+        // `Deserialize` makes no tree without entries.
         for (auto const& [id, form] : fetch.forms_)
             if (form.entries.empty())
                 staging_.AddTreeToStorage(KivVcs::immu::make<Tree>());
@@ -28,13 +28,13 @@ public:
 
     [[nodiscard]] cow_ptr<Tree> Make(Id const& root) {
         cow_ptr<Tree> tree = Tree::Deserialize(root, &staging_, [this](Id const& id) { return OpenForm(id); });
-        // Only the identifier says whether everything was understood.
+        // Only an equal identifier proves that everything was understood.
         if (!tree || !(tree->GetId() == root))
             ThrowUnreadable(Failure::Unrepresentable, "directory", root);
         return tree;
     }
 
-    /// Enters everything into the storages. @return false, entering nothing, if another thread was faster with some of it
+    /// Enters everything into the storages. @return false, entering nothing, if another thread has entered some of it
     [[nodiscard]] bool Publish() const {
         ObjectSource& source = fetch_.source_;
         auto const& trees = std::as_const(staging_).GetStorage()->GetTrees();
@@ -121,7 +121,7 @@ void TreeFetch::ReadForms(std::vector<Id> level) {
     }
 }
 
-/// Takes those off @p level that are there.
+/// Takes out of @p level what the storages have.
 void TreeFetch::FindLiving(std::vector<Id>& level) {
     ObjectSource::Lock const lock(source_.mutex_);
     std::erase_if(level, [this](Id const& id) {

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// Trees read whole, level by level.
+/// Fetching trees whole, level by level.
 
 #include "repository/ObjectSource.h"
 
@@ -11,13 +11,13 @@
 
 namespace KivArchive {
 
-/// One fetch of trees with everything below them, except for the contents: one batch for each level.
+/// Fetches trees with everything below them except contents, with one batch for each level.
 class TreeFetch {
 public:
     /// @param progress may be null
     TreeFetch(ObjectSource& source, IProgress* progress) : source_(source), progress_(progress) {}
 
-    /// @throws ArchiveError if anything of it cannot be had; nothing has entered a storage then
+    /// @throws ArchiveError if anything of it cannot be read; nothing has entered a storage then
     [[nodiscard]] std::vector<cow_ptr<Tree>> Fetch(std::span<const Id> ids);
 
 private:
@@ -44,7 +44,7 @@ private:
     ObjectSource& source_;
     IProgress* progress_;
     std::unordered_map<Id, Form> forms_;
-    /// Those that need not be read.
+    /// The trees that storages have, which need not be read.
     std::unordered_map<Id, cow_ptr<Tree>> living_;
 };
 

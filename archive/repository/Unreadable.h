@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// What a repository says about an object that it cannot have.
+/// The failure of a repository that cannot read an object.
 
 #include "KivArchive/IArchive.h"
 

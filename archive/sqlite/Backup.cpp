@@ -12,7 +12,7 @@ namespace {
 
 constexpr int pagesAtOnce = 1024;
 
-/// A new file, removed unless it is kept.
+/// A new file. Removed in the end unless it was kept.
 class NewFile {
 public:
     explicit NewFile(std::string path) : path_(std::move(path)) {
@@ -62,7 +62,7 @@ void SqliteArchive::Backup(std::string const& path, IProgress* progress) {
     NewFile file(path);
     {
         Database copy(path, Database::Access::Use, store_->options.wait);
-        // What others write meanwhile does not begin it again.
+        // Reading within a transaction, so that the copy need not begin again whenever others write.
         Transaction const transaction(connection->database, Transaction::Kind::Read);
         static_cast<void>(connection->database.Ask("SELECT count(*) FROM branches"));
         Copy(connection->database, copy, progress);

@@ -17,7 +17,7 @@ void MarkAt(Database& database, Id const& id, std::int64_t time) {
     Query(database, "INSERT INTO marks(id, time) VALUES(?, ?) ON CONFLICT DO NOTHING").With(id).With(time).Run();
 }
 
-/// Lets the pieces of a content go as soon as no other one names them.
+/// Marks the pieces of a content so that they are removed as soon as no other content names them.
 void ReleasePieces(Connection& connection, FormCache& cache, ObjectRow const& row) {
     FormReader reader(connection, cache);
     try {
@@ -26,12 +26,12 @@ void ReleasePieces(Connection& connection, FormCache& cache, ObjectRow const& ro
                 .With(piece)
                 .Run();
     } catch (Malformed const&) {
-        // They go when their time has come, as those that nothing names.
+        // They are removed after the grace time, like other pieces that no content names.
     }
 }
 
-/// While it is there, what a connection writes is brought from the log into the file early, so that the log stays short:
-/// whoever collects may have little room left.
+/// As long as it exists, the log of a connection is copied into the file early and so stays short, since hosts may
+/// collect when they have little space left.
 class ShortLog {
 public:
     explicit ShortLog(Database& database) : database_(database) { Write(longest); }
@@ -41,7 +41,7 @@ public:
 
 private:
     static constexpr int longest = 64;
-    /// As SQLite has it unless told otherwise.
+    /// SQLite's default.
     static constexpr int ordinary = 1000;
 
     void Write(int pages) const noexcept { sqlite3_wal_autocheckpoint(database_.Handle(), pages); }

@@ -9,15 +9,15 @@ namespace KivArchive {
 
 namespace {
 
-/// Pieces that no content names are kept that long, for the content that they may be meant for.
+/// How many seconds pieces that no content names are kept, since their content may still be on its way.
 constexpr std::int64_t graceOfPieces = std::int64_t{14} * 24 * 3600;
 
 void MakeSparse(Database& database, std::uint64_t segment) {
     Query(database, "INSERT INTO sparse(segment) VALUES(?) ON CONFLICT DO NOTHING").With(segment).Run();
 }
 
-/// The identifiers of the members of a segment, which are what their forms hash to. Null for those that are removed, and
-/// for what cannot be read, which is kept; large contents are told apart by the table.
+/// The identifiers of the members of a segment, found by hashing their forms. Null for those that are removed, for
+/// those that cannot be read, which are kept, and for large contents, which the table of objects is searched for.
 std::vector<Id> IdentifyMembers(FormReader& reader, Segment const& segment) {
     std::vector<Id> ids(segment.Members().size());
     for (std::size_t i = 0; i < ids.size(); ++i) {
@@ -59,7 +59,7 @@ public:
         KeepLargeContents(connection.database);
         for (std::uint64_t const dependant : DependantsOf(connection.database, segment.Number()))
             KeepBasesOf(*reader.SegmentAt(dependant));
-        // Bases come before what refers to them.
+        // Backwards, since bases come before the differences to them, and are themselves differences to others.
         for (std::size_t i = stays_.size(); i-- > 0;)
             if (stays_[i])
                 KeepBaseOf(segment, segment.Members()[i]);
@@ -132,8 +132,8 @@ std::set<std::uint64_t> BasesOf(Segment const& segment, std::vector<bool> const&
     return bases;
 }
 
-/// What is written when a segment loses members: its form, or nothing at all if it loses all of them; and the segments
-/// that nothing of it refers to any more.
+/// Writes a segment that has lost members, or removes it if none is left, and notes that the segments to which nothing
+/// in it refers any more may be cleared, too.
 void WriteCleared(Database& database, Segment const& segment, std::vector<bool> const& stays, Bytes const& form) {
     std::vector<bool> const all(stays.size(), true);
     std::set<std::uint64_t> const bases = BasesOf(segment, stays);
@@ -145,7 +145,7 @@ void WriteCleared(Database& database, Segment const& segment, std::vector<bool> 
                 .Run();
             MakeSparse(database, base);
         }
-    // The newest one stays, so that its number is not given to another one.
+    // The newest segment stays even if it is empty, so that its number is not given to another one.
     bool const isNewest =
         static_cast<std::uint64_t>(database.Ask("SELECT max(number) FROM segments")) == segment.Number();
     if (std::find(stays.begin(), stays.end(), true) == stays.end() && !isNewest)
@@ -217,7 +217,7 @@ std::uint64_t ClearSegment(Connection& connection, SqliteStore& store, std::uint
                 return segment->FormSize();
         }
     } catch (Malformed const&) {
-        // What is gone needs no clearing, and what is damaged stays for those who look at it.
+        // A segment that is gone needs no clearing, and a damaged one stays as it is.
         std::scoped_lock const turn(store.writing);
         DoneWith(connection.database, number);
         return 1;
@@ -243,7 +243,7 @@ void SweepPieces(Connection& connection, SqliteStore& store) {
             if (Id const id = pieces.Identifier(0); inUse.count(DigestOf(id)) == 0)
                 unused.push_back(id);
     } catch (Malformed const&) {
-        // Which pieces a damaged content has is not known.
+        // The pieces of a damaged content are not known, so that none may be removed.
         return;
     }
     if (unused.empty())

@@ -15,7 +15,7 @@ namespace KivArchive {
 namespace {
 
 constexpr int longestValue = 1 << 30;
-/// Waiting that nobody needs to know of.
+/// How long to wait before the host is told.
 constexpr std::chrono::milliseconds untold{250};
 
 /// Makes an empty file for its owner alone, unless there is one.
@@ -84,7 +84,7 @@ Database::Database(std::string const& path, Access access, std::chrono::millisec
 }
 
 Database::~Database() {
-    // Before the connection that they belong to.
+    // They must be gone before the connection is closed.
     statements_.clear();
 }
 
@@ -238,7 +238,7 @@ std::optional<Bytes> RowBlobs::Read(std::uint64_t row) {
 }
 
 Transaction::~Transaction() {
-    // An error may have ended it already; another one here changes nothing.
+    // An error may have ended it already; and one here would change nothing.
     if (isOpen_ && sqlite3_get_autocommit(database_.Handle()) == 0)
         sqlite3_exec(database_.Handle(), "ROLLBACK", nullptr, nullptr, nullptr);
 }

@@ -14,8 +14,8 @@
 
 namespace KivArchive {
 
-/// A connection; used by one thread at a time. Set up so that nothing that a file holds can run: no triggers, views or
-/// functions of its schema.
+/// A connection, used by one thread at a time. Nothing that a file holds can run on it: no triggers, views or functions
+/// of its schema.
 class Database {
 public:
     enum class Access : std::uint8_t { Use, Make };
@@ -35,11 +35,11 @@ public:
     /// The first column of the only row of a statement.
     [[nodiscard]] std::int64_t Ask(const char* sql);
 
-    /// A number that is another one for every version of the file, if a transaction reads and does not write; none
+    /// A number that changes whenever the file does, within a transaction that reads and does not write; nothing
     /// otherwise.
     [[nodiscard]] std::optional<std::uint32_t> VersionRead() const noexcept;
 
-    /// Throws what the failure @p code means. @param code as SQLite gave it
+    /// Throws the failure that SQLite's result code @p code stands for.
     [[noreturn]] void Fail(int code) const;
 
     /// The statement of a literal, prepared once.
@@ -53,7 +53,7 @@ private:
         void operator()(sqlite3_stmt* statement) const noexcept { sqlite3_finalize(statement); }
     };
 
-    /// SQLite's busy handler. @return 0 when it has been long enough
+    /// SQLite's busy handler. @return 0 to give up
     static int WaitFor(void* database, int attempt) noexcept;
 
     std::string path_;
@@ -77,30 +77,30 @@ public:
         sqlite3_clear_bindings(statement_);
     }
 
-    /// The next parameter. Bytes must stay as they are until the query ends.
+    /// Binds the next parameter. Bytes must stay valid until the query ends.
     Query& With(std::int64_t number);
     Query& With(std::uint64_t number) { return With(static_cast<std::int64_t>(number)); }
     Query& With(ByteView bytes);
     Query& With(Id::Digest const& digest) { return With(std::as_bytes(std::span(digest))); }
-    /// Null becomes no bytes.
+    /// A null identifier is stored as no bytes.
     Query& With(Id const& id);
-    /// What a function of ours finds by @p type. Must live as long as the query.
+    /// A pointer for a table of our own, which asks for it by @p type. Must stay valid as long as the query.
     Query& WithPointer(void* pointer, const char* type);
 
     /// Goes to the next row. @return false after the last one
     bool Next();
     /// Runs to the end.
     void Run();
-    /// Makes it ready to be run once more with other parameters.
+    /// Resets the query, to be run again with other parameters.
     Query& Again();
 
     [[nodiscard]] bool IsNull(int column) const { return sqlite3_column_type(statement_, column) == SQLITE_NULL; }
     [[nodiscard]] std::int64_t Number(int column) const { return sqlite3_column_int64(statement_, column); }
     /// Valid until the next row.
     [[nodiscard]] ByteView Blob(int column) const;
-    /// @throws ArchiveError of kind `Damaged` if it is none, as if it were null
+    /// @throws ArchiveError of kind `Damaged` if it is no identifier
     [[nodiscard]] Id Identifier(int column) const;
-    /// Null for no bytes.
+    /// Null if there are no bytes.
     [[nodiscard]] Id OptionalIdentifier(int column) const;
 
 private:
@@ -111,15 +111,14 @@ private:
     int bound_ = 0;
 };
 
-/// Reads the blobs that a column holds, one row after the other, in less time than a query for each. Within one
-/// transaction.
+/// Reads the blobs of a column by row, within one transaction, which is faster than a query for each.
 class RowBlobs {
 public:
-    /// @param table has row numbers
+    /// @param table one with row numbers
     RowBlobs(Database& database, const char* table, const char* column) noexcept
         : database_(database), table_(table), column_(column) {}
 
-    /// Nothing if there is no such row, or something else in it.
+    /// Nothing if there is no such row, or no blob in it.
     [[nodiscard]] std::optional<Bytes> Read(std::uint64_t row);
 
 private:

@@ -9,12 +9,12 @@ namespace KivArchive {
 namespace {
 
 constexpr std::uint64_t maximumHeldSegments = std::uint64_t{8} * 1024 * 1024;
-/// As much as that a connection keeps for the next call.
+/// The most bytes of segments that a connection keeps for the next call.
 constexpr std::uint64_t maximumKeptSegments = std::uint64_t{512} * 1024;
-/// The flag under which the cache keeps what the members of a segment share, beside the check of its form: that changes
-/// when members are removed.
+/// A place with this flag, and the check of a segment's form instead of a member, stands for the frame that its members
+/// share. The check changes when members are removed.
 constexpr std::uint64_t sharedFlag = std::uint64_t{1} << 63U;
-/// A version is that many steps from one that is no difference at most, one for each bit of its number.
+/// The most steps from a version to one that is no difference: one for each bit of its generation.
 constexpr std::size_t maximumSteps = 64;
 
 } // namespace
@@ -124,7 +124,7 @@ Form SegmentReader::FormAt(Place place, Trust trust) {
         Member const& member;
         Place place;
     };
-    // Down to a form that is no difference or that is known, and back up.
+    // Follows bases to a form that is no difference or is cached, and applies the differences on the way back.
     std::vector<Step> steps;
     Form form;
     while (form.owner == nullptr) {

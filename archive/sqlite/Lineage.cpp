@@ -4,12 +4,12 @@ namespace KivArchive {
 
 namespace {
 
-/// Beyond this, differences take more memory than is good.
+/// Differences between larger forms would take too much memory.
 constexpr std::uint64_t largestDifferenced = 16 * largestWholeContent;
 /// A difference must be this many times smaller than the form.
 constexpr std::size_t worthwhile = 3;
 
-/// Goes from @p place back to the version of generation @p wanted, or the nearest before it.
+/// Goes back from @p place to the version of generation @p wanted, or to the nearest one before it.
 void FindStoredBase(Prepared& prepared, Place place, std::uint64_t wanted, FormReader& reader) {
     auto segment = reader.SegmentAt(place.segment);
     Member member = segment->At(place.member);
@@ -30,7 +30,7 @@ void FindStoredBase(Prepared& prepared, Place place, std::uint64_t wanted, FormR
 } // namespace
 
 void FindBase(Prepared& prepared, Prepared const* earlier, FormReader& reader, Database& database) {
-    // What is damaged is no base; reading finds out.
+    // A damaged version is no base. It is for reading to report it.
     try {
         std::optional<Place> place;
         std::optional<std::pair<Id, Place>> relied;

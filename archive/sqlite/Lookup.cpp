@@ -9,7 +9,7 @@ namespace KivArchive {
 
 namespace {
 
-/// What a statement is given to find the identifier asked for.
+/// The type of the pointer by which a statement finds the identifier asked for.
 constexpr const char* pointerType = "KivArchive identifier";
 
 enum Column : int { IdColumn, SourceColumn };
@@ -22,7 +22,7 @@ Cursor& CursorOf(sqlite3_vtab_cursor* cursor) {
     return *static_cast<Cursor*>(cursor);
 }
 
-/// Hands a new object over to SQLite, which gives it back in the end.
+/// Hands a new object over to SQLite, which passes it to the function that deletes it.
 template <class T, class Base>
 int Give(Base** object) {
     try {
@@ -46,7 +46,7 @@ int Disconnect(sqlite3_vtab* table) {
     return SQLITE_OK;
 }
 
-/// The source is a parameter, without which there is nothing to be had.
+/// A query must name the source, which is a parameter of the table.
 int FindBestIndex(sqlite3_vtab* /*table*/, sqlite3_index_info* info) {
     for (int i = 0; i < info->nConstraint; ++i)
         if (auto const& constraint = info->aConstraint[i]; constraint.iColumn == SourceColumn &&
@@ -75,7 +75,7 @@ int Filter(sqlite3_vtab_cursor* cursor, int /*index*/, const char* /*name*/, int
     return SQLITE_OK;
 }
 
-/// Whoever steps the statement has asked for the next identifier before.
+/// There is always another row: `Lookup` sets the next identifier before it steps the statement.
 int Next(sqlite3_vtab_cursor* /*cursor*/) {
     return SQLITE_OK;
 }
@@ -123,7 +123,7 @@ Query const& Lookup::At(Id const& id) {
 }
 
 void Lookup::Register(sqlite3* database) {
-    // Without it, no statement that needs it can be prepared.
+    // If this fails, preparing a statement that needs it does.
     static_cast<void>(sqlite3_create_module(database, "asked", &asked, nullptr));
 }
 

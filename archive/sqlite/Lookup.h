@@ -1,17 +1,17 @@
 #pragma once
 
 /// @file
-/// Rows for many identifiers, one after the other.
+/// Looking up many identifiers, one after the other.
 
 #include "sqlite/Database.h"
 
 namespace KivArchive {
 
-/// From how many identifiers on a lookup takes less time than what planning its statement takes.
+/// The number of identifiers from which on a lookup is worth the planning of its statement.
 inline constexpr std::size_t worthLookup = 32;
 
-/// Looks up one identifier after the other with one run of a statement, which takes about half of what a run for each of
-/// them does; the next one may depend on what the one before has led to. Within one transaction.
+/// Looks up one identifier after the other with one run of a statement, within one transaction, which takes half of the
+/// time of a run for each. The next identifier may depend on the row that was found.
 class Lookup {
 public:
     /// @param sql a literal: "SELECT ... FROM asked(?) LEFT JOIN table ON table.id=asked.id"
@@ -23,7 +23,7 @@ public:
     /// The row for @p id, valid until the next one is asked for; its columns are null if there is none.
     [[nodiscard]] Query const& At(Id const& id);
 
-    /// Lets statements of a connection name `asked`, which has the identifier asked for in its only row.
+    /// Gives a connection the table `asked`, whose only row holds the identifier asked for.
     static void Register(sqlite3* database);
 
 private:

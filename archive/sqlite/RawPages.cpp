@@ -29,7 +29,7 @@ std::uint64_t BigEndian(ByteView bytes) noexcept {
     return number;
 }
 
-/// A number as SQLite writes it in one to nine bytes. @throws Malformed
+/// A number of one to nine bytes, as SQLite writes it. @throws Malformed
 std::uint64_t TakeVarint(ByteReader& reader) {
     std::uint64_t number = 0;
     for (int i = 0; i < 8; ++i) {
@@ -84,7 +84,7 @@ RawValue ValueOf(std::uint64_t serial, ByteView bytes) {
     constexpr std::uint64_t one = 9;
     if (serial >= 12)
         return {false, 0, bytes};
-    // Small numbers are not negative in an archive.
+    // Numbers of less than eight bytes are never negative in an archive.
     return {true, serial == one ? 1 : static_cast<std::int64_t>(BigEndian(bytes)), {}};
 }
 
@@ -106,7 +106,7 @@ std::vector<RawValue> ValuesOf(ByteView payload) {
     return values;
 }
 
-/// A page of rows, as far as it is one.
+/// A page of rows, read as far as it makes sense as one.
 class RowPage {
 public:
     RowPage(RawPages const& pages, std::uint64_t number, RawPages::State state)
@@ -125,7 +125,7 @@ public:
     [[nodiscard]] std::size_t Count() const noexcept { return count_; }
     [[nodiscard]] bool IsOfIndex() const noexcept { return type_ == indexLeaf || type_ == indexInterior; }
 
-    /// The pages below, of an index.
+    /// The pages below this one, in an index.
     [[nodiscard]] std::vector<std::uint64_t> Children() const {
         std::vector<std::uint64_t> children;
         if (type_ != indexInterior)
@@ -211,7 +211,7 @@ void RawPages::ReadLog(std::string const& path) {
     if (log_ < 0 || !ReadAt(log_, 0, header.data(), header.size()))
         return;
     std::uint64_t const size = SizeOf(log_);
-    // Up to the end of the last transaction; frames of earlier rounds have other salts.
+    // Frames count up to the end of the last transaction. Those left from before the log began anew have other salts.
     std::unordered_map<std::uint64_t, std::uint64_t> open;
     for (std::uint64_t at = logHeader; at + frameHeader + pageSize <= size; at += frameHeader + pageSize) {
         std::array<std::byte, frameHeader> frame{};

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The rows of an archive's file, found page by page without what leads to them: what is left when that is damaged.
+/// The rows of an archive's file, found page by page, for files of which the pages that lead to others are damaged.
 
 #include "Bytes.h"
 #include "KivArchive/IArchive.h"
@@ -15,10 +15,11 @@
 
 namespace KivArchive {
 
-/// A file and its write-ahead log as pages, numbered from 1. Whatever they hold is only ever read within bounds.
+/// The pages of a file and its write-ahead log, numbered from 1. Nothing in them is trusted: all reading stays in
+/// bounds.
 class RawPages {
 public:
-    /// Which state of the file: with what its log holds, or without.
+    /// The state of the file: with its log, or without.
     enum class State : std::uint8_t { Newest, Checkpointed };
 
     /// @throws ArchiveError of kind `Unavailable`, as everything here, if the file cannot be read
@@ -28,7 +29,7 @@ public:
     ~RawPages();
 
     [[nodiscard]] std::uint64_t Count() const noexcept { return count_; }
-    /// Whether the states differ in a page.
+    /// Whether the log has a newer form of a page.
     [[nodiscard]] bool IsLogged(std::uint64_t number) const { return logged_.count(number) != 0; }
     /// Empty if there is no such page.
     [[nodiscard]] Bytes Read(std::uint64_t number, State state) const;
@@ -40,7 +41,7 @@ private:
     int file_ = -1;
     int log_ = -1;
     std::uint64_t count_ = 0;
-    /// Where in the log the newest form of a page is.
+    /// The offset in the log of the newest form of each page in it.
     std::unordered_map<std::uint64_t, std::uint64_t> logged_;
 };
 
@@ -62,21 +63,22 @@ struct RawPlace {
 struct RawRow {
     bool isOfTable = false;
     std::int64_t number = 0;
-    /// The payload, which the values are within.
+    /// The bytes that the values are parts of.
     std::shared_ptr<const Bytes> payload;
     std::vector<RawValue> values;
 };
 
-/// Hands every row that can be made out in a page to @p receive, with its place.
-/// @param budget how many pages may still be read for rows that take several, since many could name the same ones
+/// Passes every row that can be found in a page to @p receive, with its place.
+/// @param budget how many further pages may be read for rows that take several, since hostile rows could all name the
+/// same
 void ForEachRow(RawPages const& pages, std::uint64_t page, RawPages::State state, std::uint64_t& budget,
                 std::function<void(RawPlace const&, RawRow const&)> const& receive);
 
 /// The row at a place; nothing if there is none.
 [[nodiscard]] std::optional<RawRow> RowAt(RawPages const& pages, RawPlace const& place);
 
-/// The rows of the table without row numbers that is called @p name, in the newest state; nothing if a page of it, or
-/// what leads to it, is none of such a table.
+/// The rows of the table @p name, which has no row numbers, in the newest state; nothing if one of its pages is
+/// damaged, or what leads to them.
 [[nodiscard]] std::optional<std::vector<RawRow>> RowsOfTable(RawPages const& pages, std::string_view name);
 
 } // namespace KivArchive

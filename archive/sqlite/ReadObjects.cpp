@@ -7,10 +7,10 @@ namespace KivArchive {
 
 namespace {
 
-/// How much is read in one transaction before it is handed over.
+/// How many bytes are read in one transaction before they are passed on.
 constexpr std::uint64_t windowSize = largestWholeContent / 4;
 
-/// What was found for an identifier; no form if it cannot be read.
+/// What was found for an identifier. Has no form if it cannot be read.
 struct Found {
     Id const* id = nullptr;
     StoredType type = StoredType::Blob;
@@ -23,7 +23,7 @@ bool ByPlace(FoundRow const& left, FoundRow const& right) noexcept {
     return left.row.place < right.row.place;
 }
 
-/// Those of @p ids that are objects here, in the order in which they are stored.
+/// The rows of those of @p ids that are there, in the order in which their objects are stored.
 std::vector<FoundRow> Locate(Database& database, std::span<const Id> ids, std::vector<Id>* missing) {
     std::vector<FoundRow> found;
     found.reserve(ids.size());
@@ -44,7 +44,7 @@ Found ReadOne(FormReader& reader, Id const& id, ObjectRow const& row) {
     bool isOfType = false;
     bool const isSound = IsSound([&] {
         bool const isLarge = row.type == StoredType::LargeBlob;
-        // A large content is not read here, so that nothing else shows what is wrong.
+        // Nobody compares a large content with its identifier here, so that its segment must be verified.
         auto const segment = reader.SegmentAt(row.place.segment, isLarge ? Trust::Verified : Trust::Unverified);
         Member const& member = segment->At(row.place.member);
         isOfType = member.type == row.type;
@@ -57,7 +57,7 @@ Found ReadOne(FormReader& reader, Id const& id, ObjectRow const& row) {
     return found;
 }
 
-/// Hands over what is what its identifier says. @return false if it is not
+/// Passes an object on if it matches its identifier. @return false if not
 bool HandOver(Found const& found, ObjectReceiver const& receiver) {
     if (found.form.owner == nullptr)
         return false;
@@ -147,7 +147,7 @@ ReadOutcome SqliteArchive::Read(std::span<const Id> ids, ObjectReceiver const& r
         for (Found& found : window) {
             if (!HandOver(found, receiver)) {
                 store_->cache.Clear();
-                // What has been collected since it was located is not damaged.
+                // It may have been collected since it was located.
                 bool const isThere = FindRow(connection->database, *found.id).has_value();
                 (isThere ? outcome.damaged : outcome.missing).push_back(*found.id);
             }

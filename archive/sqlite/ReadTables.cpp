@@ -9,13 +9,13 @@ namespace KivArchive {
 
 namespace {
 
-/// How many rows are asked of SQLite at once stays bounded, whatever a host asks for.
+/// The most rows that SQLite is asked for at once, whatever a host asks for.
 constexpr std::size_t maximumRows = 1U << 20U;
 
 /// Reads facts within one transaction.
 class FactsReader {
 public:
-    /// @param count of how many commits the facts are wanted, at most
+    /// @param count the most commits whose facts will be asked for
     FactsReader(Database& database, std::size_t count) : database_(database), areMany_(count > worthLookup) {
         if (areMany_)
             hasContained_ = database.Ask("SELECT EXISTS(SELECT 1 FROM contained)") != 0;
@@ -32,7 +32,7 @@ public:
 
     [[nodiscard]] Ancestry FactsOf(Id const& id, Id parent, Id tree) {
         Ancestry facts{id, std::move(parent), std::move(tree), {}};
-        // Many histories have never merged.
+        // Many archives have no merges at all.
         if (!hasContained_)
             return facts;
         Query contained(database_, "SELECT how, other FROM contained WHERE id=?");

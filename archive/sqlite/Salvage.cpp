@@ -31,10 +31,10 @@ Id IdOf(RawValue const& value) {
     return Id::FromDigest(digest);
 }
 
-/// Calls @p use for every row of every page, in the newest state of the file before the one without its log.
+/// Calls @p use for every row of every page, first in the newest state of the file, then in the one without its log.
 template <class Use>
 void ForAllRows(RawPages const& pages, IProgress* progress, Use use) {
-    // What rows that take several pages take is there once, and a second time where the log has it, too.
+    // Each page belongs to at most one row, in each of the states; the rest is to spare.
     std::uint64_t budget = 4 * pages.Count();
     for (auto const state : {RawPages::State::Newest, RawPages::State::Checkpointed})
         for (std::uint64_t page = 1; page <= pages.Count(); ++page) {
@@ -49,10 +49,10 @@ void ForAllRows(RawPages const& pages, IProgress* progress, Use use) {
 /// A name, and the head of a branch or the value of a record.
 using Pair = std::pair<KivStringT<char16_t>, Buffer>;
 
-/// What the tables beside the segments say.
+/// What the tables other than that of the segments hold.
 struct RawTables {
     std::map<Id::Digest, Ancestry> facts;
-    /// Rows of two columns, of which pages do not say whether they are branches or records.
+    /// Rows of two columns. A page does not say whether they are branches or records.
     std::vector<Pair> pairs;
 };
 
@@ -72,7 +72,7 @@ public:
     }
 
 private:
-    /// The newest one that is what was stored.
+    /// The newest form that is as it was stored.
     Bytes Load(std::uint64_t number) override {
         auto const found = places_.find(number);
         if (found == places_.end())
@@ -157,7 +157,7 @@ private:
     void TakeRow(RawPlace const& place, RawRow const& row) {
         auto const& values = row.values;
         if (row.isOfTable) {
-            // The number stands for the first column, which is stored as nothing.
+            // The row's number is the value of the first column, which is stored empty.
             if (row.number > 0 && values.size() == 2 && !values[1].isNumber)
                 segments_.Add(static_cast<std::uint64_t>(row.number), place);
             return;
@@ -177,7 +177,7 @@ private:
         }
     }
 
-    /// In the order of the segments and within them, which is that in which objects were stored: children first.
+    /// Segments, and objects in them, are in the order in which they were stored: each after those that it names.
     void SalvageSegment(std::uint64_t number) {
         std::shared_ptr<const Segment> segment;
         if (!IsSound([&] { segment = segments_.SegmentAt(number); })) {
@@ -204,7 +204,7 @@ private:
         Bytes const data = ExpandForm(member, form.bytes);
         NewObject object{Identify(type, data), type, {}, {}};
         object.data.Append(data.data(), data.size());
-        // Nearly what it replaced.
+        // The base is an earlier version, though not always the last one before it.
         if (member.encoding == Encoding::Difference)
             if (auto const base = ids_.find(segment.BaseOf(member)); base != ids_.end())
                 object.earlier = Id::FromDigest(base->second);
@@ -238,7 +238,7 @@ private:
         ++report_.objects;
     }
 
-    /// The text of a commit is what its parent and tree are known from.
+    /// Takes a commit's parent and tree from its data.
     void SalvageFactsOf(Id const& id, ByteView data, Place const& place) {
         std::vector<Link> links;
         if (!ReadLinks(ObjectType::Commit, data, links))
@@ -298,7 +298,7 @@ private:
         return {NameOfBytes(row.values[0].bytes), std::move(value)};
     }
 
-    /// As they are where they can be read to their ends, and otherwise what pages show.
+    /// Takes the tables as they are if they can be read to their ends, and otherwise what pages show.
     void SalvageTables() {
         auto const pairsOf = [this](std::string_view table) -> std::optional<std::vector<Pair>> {
             auto const rows = RowsOfTable(pages_, table);
@@ -320,14 +320,15 @@ private:
             SetRecord({name, value});
     }
 
-    /// Null unless it can be one.
+    /// The value as a head; nothing if it cannot be one.
     static std::optional<Id> HeadOf(Buffer const& value) {
         Buffer const joined = Joined(value);
         RawValue const raw{false, 0, BytesOf(joined)};
         return IsDigest(raw) ? std::optional(IdOf(raw)) : std::nullopt;
     }
 
-    /// Branches by the commits that they name, of several the one stored last. @param others receives what are none
+    /// Takes for branches what names a commit; of several rows with one name, that of the commit stored last.
+    /// @param others receives all other rows
     std::map<KivStringT<char16_t>, Id> GuessHeads(std::vector<Pair>& others) const {
         std::map<KivStringT<char16_t>, std::pair<Place, Id>> latest;
         for (Pair const& pair : tables_.pairs) {
@@ -354,7 +355,7 @@ private:
         (isThere && to_.Apply(change).applied ? report_.branches : report_.lostBranches).push_back(branch);
     }
 
-    /// Unless there is one.
+    /// Sets a record unless there is one with that name.
     void SetRecord(Record const& record) {
         Change change;
         change.records.push_back({record, true, std::nullopt});

@@ -7,7 +7,7 @@
 
 namespace KivArchive {
 
-/// Makes the tables if the file is empty and @p make is set. Refuses every file that does not have exactly them.
+/// Makes the tables if the file is empty and @p make is true. Refuses a file that does not have exactly these.
 /// @throws ArchiveError
 void EnsureSchema(Database& database, bool make);
 

@@ -8,7 +8,7 @@ namespace KivArchive {
 
 namespace {
 
-/// Connections kept for the next call.
+/// The most connections that are kept open for later calls.
 constexpr std::size_t maximumIdle = 8;
 
 } // namespace

@@ -21,22 +21,22 @@ struct Form {
     std::uint64_t held = 0;
 };
 
-/// How far what segments give is trusted.
+/// Whether a form is known to be as it was stored.
 enum class Trust : std::uint8_t {
-    Verified,   ///< It is what was stored: the segments that it comes from have been hashed.
-    Unverified, ///< Whoever reads it compares it with its identifier, which costs less than hashing whole segments.
+    Verified,   ///< The segments that it comes from have been hashed.
+    Unverified, ///< The caller compares it with its identifier, which costs less than hashing whole segments.
 };
 
-/// The forms that were made last, up to a number of bytes, for those that are differences to them. Any number of
+/// Caches the forms that were made last, up to a number of bytes, for reading differences to them. Any number of
 /// threads may use it.
 class FormCache {
 public:
     explicit FormCache(std::uint64_t budget) noexcept : budget_(budget) {}
 
-    /// What is verified serves everybody. Null if it is not there.
+    /// Null if it is not there. Verified forms are found with either kind of trust.
     [[nodiscard]] std::shared_ptr<const Bytes> Find(Place const& place, Trust trust);
     void Keep(Place const& place, Trust trust, std::shared_ptr<const Bytes> const& form);
-    /// Drops everything, of which something was not what was stored.
+    /// Drops everything, after something in it was found to be damaged.
     void Clear() noexcept;
 
 private:
@@ -72,12 +72,12 @@ struct Connection {
 
     Database database;
     Compressor compressor;
-    /// What was read last, for the next call if the file is still at that version.
+    /// The segments read last, for the next call, provided that the file has not changed since.
     HeldSegments held;
     std::optional<std::uint32_t> heldVersion;
 };
 
-/// Reads stored forms out of segments, wherever these come from.
+/// Reads stored forms from segments, wherever these are.
 class SegmentReader {
 public:
     SegmentReader(SegmentReader const&) = delete;
@@ -86,7 +86,7 @@ public:
 
     /// @throws Malformed if there is no such segment
     [[nodiscard]] std::shared_ptr<const Segment> SegmentAt(std::uint64_t number, Trust trust = Trust::Verified);
-    /// The stored form of a member, whatever it is a difference to. @throws Malformed
+    /// The stored form of a member, also of one that is a difference. @throws Malformed
     [[nodiscard]] Form FormAt(Place place, Trust trust = Trust::Verified);
 
 protected:
@@ -120,26 +120,26 @@ private:
     std::optional<std::uint32_t> version_;
 };
 
-/// What the table of objects stores.
+/// A row of the table of objects, without its identifier.
 struct ObjectRow {
     StoredType type = StoredType::Blob;
     Place place;
 };
 
-/// What three columns of a row say: type, segment and member.
+/// Reads three columns of a row: type, segment and member.
 [[nodiscard]] ObjectRow RowOf(Database const& database, Query const& query, int firstColumn);
 
-/// The row of @p id; none if it is not there.
+/// The row of @p id; nothing if it is not there.
 [[nodiscard]] std::optional<ObjectRow> FindRow(Database& database, Id const& id);
 /// The rows of all of @p ids, with one run of a statement if they are many.
 [[nodiscard]] std::vector<std::optional<ObjectRow>> FindRows(Database& database, std::span<const Id> ids);
 
-/// What is behind one `SqliteArchive`.
+/// The implementation of one `SqliteArchive`.
 class SqliteStore {
 public:
     SqliteStore(std::string path, SqliteOptions const& options);
 
-    /// A connection for the time of a call.
+    /// A connection for the duration of a call.
     class Lease {
     public:
         explicit Lease(SqliteStore& store) : store_(store), connection_(store.Take()) {}
@@ -169,23 +169,23 @@ public:
     std::string path;
     SqliteOptions options;
     FormCache cache;
-    /// Writers of one process take turns here rather than by the file's lock, for which they would sleep.
+    /// Writers of one process take turns by this, since waiting for the file's lock means sleeping.
     std::mutex writing;
     std::mutex connectionsMutex;
     std::vector<std::unique_ptr<Connection>> connections;
 };
 
-/// A row that was found for an identifier, which is that of number @p wanted among those asked for.
+/// A row, and the index of its identifier among those asked for.
 struct FoundRow {
     std::size_t wanted = 0;
     ObjectRow row;
 };
 
-/// The sizes of what is at @p rows; none for those that cannot be read. Segments are read once, in their order.
+/// The sizes of the objects at @p rows; nothing for those that cannot be read. Reads each segment once, in order.
 [[nodiscard]] std::vector<std::optional<std::uint64_t>> SizesOf(Connection& connection, FormCache& cache,
                                                                 std::vector<FoundRow> rows);
 
-/// Runs @p read, which reads what is stored. @return false if that is not sound
+/// Runs @p read. @return false if what it read is damaged
 template <class Read>
 [[nodiscard]] bool IsSound(Read read) {
     try {
@@ -194,7 +194,7 @@ template <class Read>
     } catch (Malformed const&) {
         return false;
     } catch (ArchiveError const& error) {
-        // One damaged page hides what is on it, not the rest.
+        // One damaged page costs only what is on it.
         if (error.GetKind() != Failure::Damaged)
             throw;
         return false;

@@ -10,14 +10,14 @@ namespace KivArchive {
 
 namespace {
 
-/// How much a segment holds before it is compressed, apart from single larger forms.
+/// The most bytes that a segment holds, before it is compressed, unless it holds a single larger form.
 constexpr std::uint64_t segmentSize = std::uint64_t{256} * 1024;
-/// What is less than this altogether takes one segment instead of one for each type.
+/// Up to this many bytes go into one segment instead of one for each type.
 constexpr std::uint64_t smallChange = std::uint64_t{64} * 1024;
-/// Fewer commits than that in one change are kept as they are, so that a log reads them without decompressing.
+/// Fewer commits than this in one change are stored uncompressed, so that listing them is fast.
 constexpr std::size_t fewCommits = 16;
 
-/// Everything that is made of the items before the transaction that stores them.
+/// Everything that is made from the items before the transaction that stores them.
 class Preparation {
 public:
     Preparation(std::vector<Item> const& items, Connection& connection, FormCache& cache, unsigned workers)
@@ -44,7 +44,7 @@ public:
 
     [[nodiscard]] std::vector<Prepared> const& Items() const noexcept { return prepared_; }
     [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
-    /// What is there and has to be stored anew.
+    /// The items that are there, but damaged, and have to be stored anew.
     [[nodiscard]] std::vector<std::pair<Id, Place>> const& Damaged() const noexcept { return damaged_; }
 
     /// The forms of all segments, in order.
@@ -78,14 +78,14 @@ private:
         }
     }
 
-    /// Nobody but a content asks for its pieces, so that one that is damaged would be found out when it is too late.
+    /// A piece that is there already is checked, since otherwise only reading its content would find it damaged.
     static bool IsUsable(Item const& item, ObjectRow const& row, FormReader& reader) {
         bool isSame = item.type != StoredType::Piece;
         return isSame ||
                (IsSound([&] { isSame = DigestOfBytes(reader.FormAt(row.place).bytes) == item.id; }) && isSame);
     }
 
-    /// The version before, if it is among those prepared and comes before @p one.
+    /// The earlier version, if it is among the prepared items, before @p one.
     [[nodiscard]] Prepared const* EarlierPrepared(Prepared const& one) const {
         auto const found = numbers_.find(one.item->earlier);
         if (found == numbers_.end() || &prepared_[found->second] >= &one)
@@ -93,7 +93,8 @@ private:
         return &prepared_[found->second];
     }
 
-    /// Segments of one type each, in the order of the items; what is left in the end goes together if it is little.
+    /// Assigns items to segments, each of one type, in their order. What is left in the end shares one segment if it is
+    /// small.
     void LayOut() {
         std::array<std::vector<std::size_t>, 3> open;
         std::array<std::uint64_t, 3> sizes{};
@@ -150,7 +151,7 @@ private:
     std::vector<std::vector<std::size_t>> layout_;
 };
 
-/// Writes what was prepared. @return false if the archive has changed so that it must be prepared anew
+/// Writes what was prepared. @return false if it must be prepared anew, since the archive has changed
 bool WriteItems(Writer& writer, Preparation const& preparation, std::vector<Bytes> const& forms) {
     for (Id const& id : preparation.Present())
         if (!writer.Use(id))

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The statements of a transaction that stores.
+/// The statements of a transaction that writes.
 
 #include "sqlite/SqliteStore.h"
 
@@ -14,20 +14,20 @@ public:
 
     /// Whether branches and records are as @p change expects them.
     [[nodiscard]] ChangeOutcome Compare(Change const& change);
-    /// Takes the mark of an object away. @return false if the object is not there
+    /// Removes the mark of an object. @return false if the object is not there
     bool Use(Id const& id);
     [[nodiscard]] bool IsAt(Id const& id, Place const& place);
 
-    /// The number of the first segment to be added. They are never used twice.
+    /// The number of the next segment. None is used twice.
     [[nodiscard]] std::uint64_t NextSegment();
     void AddSegment(std::uint64_t number, ByteView form);
-    /// The first one of an identifier stays, and another one's place is left to be cleared.
+    /// If there is an object with that identifier it stays, and @p place is left to be cleared.
     void AddObject(Id const& id, StoredType type, Place const& place);
-    /// Its place is left to be cleared.
+    /// Leaves its place to be cleared.
     void RemoveObject(Id const& id, Place const& place);
     void AddDependency(std::uint64_t base, std::uint64_t segment);
 
-    /// Facts, branches and records, and what is relied on. @throws ArchiveError of kind `Collected`
+    /// Writes facts, branches and records, and uses what is relied on. @throws ArchiveError of kind `Collected`
     void Write(Change const& change);
 
 private:

@@ -11,10 +11,10 @@ namespace {
 
 /// Equal lines have equal numbers.
 using Numbers = std::vector<std::uint32_t>;
-/// For each line whether it is changed, with one unchanged line more at both ends: line 0 is at index 1.
+/// Whether each line is changed. There is one more unchanged line at either end, so that line 0 is at index 1.
 using Flags = std::vector<char>;
 
-/// The lines of both sides by number.
+/// Gives the lines of both sides their numbers.
 std::array<Numbers, 2> NumberLines(std::array<std::vector<std::string_view>, 2> const& sides) {
     struct Line {
         std::size_t hash;
@@ -29,7 +29,7 @@ std::array<Numbers, 2> NumberLines(std::array<std::vector<std::string_view>, 2> 
         for (std::uint32_t index = 0; index < sides[side].size(); ++index)
             sorted.push_back({std::hash<std::string_view>()(sides[side][index]), sides[side][index], side, index});
     }
-    // Sorted, not kept in a hash table: lines that are chosen to have equal hashes take little longer.
+    // Sorted instead of put into a hash table, which lines with equal hashes, chosen by an attacker, would slow down.
     std::sort(sorted.begin(), sorted.end(), [](Line const& left, Line const& right) {
         return left.hash != right.hash ? left.hash < right.hash : left.text < right.text;
     });
@@ -42,12 +42,12 @@ std::array<Numbers, 2> NumberLines(std::array<std::vector<std::string_view>, 2> 
     return numbers;
 }
 
-/// Finds what two sequences have in common: a shortest way of insertions and deletions, walked from both ends at once
-/// until the walks meet in the middle (Myers, "An O(ND) Difference Algorithm and Its Variations"). A search that takes too
-/// long is cut short where it got farthest.
+/// Finds what two sequences have in common: a shortest sequence of insertions and deletions, searched from both ends at
+/// once until the searches meet in the middle (Myers, "An O(ND) Difference Algorithm and Its Variations"). One that
+/// takes too long is cut short where it got farthest.
 class SequenceComparison {
 public:
-    /// Sets the flags of the elements that have no partner, by @p places.
+    /// Sets the flags of the elements that have no partner. @param places the index of each element's flag
     SequenceComparison(std::array<Numbers, 2> const& sequences, std::array<Numbers, 2> const& places,
                        std::array<Flags, 2>& changed)
         : old_(sequences[0]), new_(sequences[1]), places_(places), changed_(changed),
@@ -58,7 +58,7 @@ public:
     }
 
     void Run() {
-        // A list of its own: what is compared decides how deep the halves lie in each other.
+        // A list instead of recursion, whose depth would depend on what is compared.
         std::vector<Box> open{{0, static_cast<Position>(old_.size()), 0, static_cast<Position>(new_.size())}};
         while (!open.empty()) {
             Box box = open.back();
@@ -108,16 +108,17 @@ private:
             changed_[side][places_[side][static_cast<std::size_t>(begin)] + 1] = 1;
     }
 
-    // By diagonal x - y: how far the walk from the beginning, and that from the end, have come on it.
+    // How far the searches from the beginning and from the end have come on the diagonal x - y.
     Position& Forward(Position diagonal) { return forward_[static_cast<std::size_t>(middle_ + diagonal)]; }
     Position& Backward(Position diagonal) { return backward_[static_cast<std::size_t>(middle_ + diagonal)]; }
 
-    /// The diagonals between which one of the walks has come, every other one of them.
+    /// The range of diagonals that one of the searches has reached, every second of them.
     struct Reached {
         Position least, greatest;
     };
 
-    /// Goes one diagonal farther on both sides, where the box allows it; what lies beyond must never be the better neighbour.
+    /// Widens the range by one diagonal at either end, within the box.
+    /// @param setBeyond makes the diagonal beyond a neighbour that is never the better one
     template <class Beyond>
     static void Widen(Reached& reached, Position lowest, Position highest, Beyond setBeyond) {
         if (reached.least > lowest)
@@ -130,7 +131,7 @@ private:
             --reached.greatest;
     }
 
-    /// A point, neither the first nor the last of the box, through which a short way leads.
+    /// A point through which a short sequence of edits leads, neither the first nor the last of the box.
     Point FindMiddle(Box const& box) {
         const Position lowest = box.oldBegin - box.newEnd;
         const Position highest = box.oldEnd - box.newBegin;
@@ -169,7 +170,7 @@ private:
         }
     }
 
-    /// Where the walk that came farther got to.
+    /// The point that the search which came farther has reached.
     Point Farthest(Box const& box, Reached ahead, Reached back) {
         Point best{box.oldBegin, box.newBegin};
         for (Position d = ahead.greatest; d >= ahead.least; d -= 2) {
@@ -198,8 +199,8 @@ private:
     Position maximumSteps_ = 256;
 };
 
-/// Slides groups of changed lines along equal lines to where they end last, or to where the other side has changes, too: so
-/// that one insertion is found in one place, whatever it is compared with.
+/// Slides groups of changed lines along equal lines as far towards the end as possible, or to changes of the other
+/// side, so that the same insertion is always found in the same place.
 class GroupSlide {
 public:
     GroupSlide(Numbers const& numbers, Flags& changed, Flags const& otherChanged)
@@ -208,7 +209,7 @@ public:
 
     void Run() {
         const std::size_t end = numbers_.size() + 1;
-        // Both are indexes of flags; the lines there correspond, each being the first behind a group or without one.
+        // Indexes of flags at which both sides correspond: of the first line after a group, or of a line without one.
         std::size_t at = 1;
         std::size_t otherAt = 1;
         while (true) {
@@ -255,7 +256,7 @@ private:
             MoveBack(begin, end, otherAt);
     }
 
-    // A group that meets another one takes it in.
+    // A group that meets another one joins it.
     void MoveBack(std::size_t& begin, std::size_t& end, std::size_t& otherAt) {
         changed_[--begin] = 1;
         changed_[--end] = 0;
@@ -280,7 +281,7 @@ private:
     Numbers const& numbers_;
     Flags& changed_;
     Flags const& other_;
-    /// Moving many groups back and forth through lines that are all the same would take too long.
+    /// A limit, since sliding many groups through lines that are all the same would take too long.
     std::size_t movesLeft_;
 };
 
@@ -300,7 +301,7 @@ std::array<Flags, 2> FindChanged(std::array<std::vector<std::string_view>, 2> co
         changed[side].resize(numbers[side].size() + 2);
         for (std::uint32_t place = 0; place < numbers[side].size(); ++place) {
             const auto number = numbers[side][place];
-            // A line that the other side lacks is changed, without any search.
+            // A line that the other side lacks is changed in any case, and not searched for.
             changed[side][place + 1] = occurs[1 - side][number] == 0 ? 1 : 0;
             if (occurs[1 - side][number] == 0)
                 continue;

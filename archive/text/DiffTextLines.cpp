@@ -15,7 +15,7 @@ std::string_view ViewOf(KivVcs::KivStringT<char> const& text) {
     return {text.GetString(), static_cast<std::size_t>(text.GetLength())};
 }
 
-/// "3", "3,4"; an empty range is given by the line before it.
+/// Such as "3" or "3,4". An empty range is named by the line before it.
 std::string RangeText(std::size_t begin, std::size_t end) {
     const std::string number = std::to_string(begin == end ? begin : begin + 1);
     return end - begin == 1 ? number : number + "," + std::to_string(end - begin);
@@ -29,7 +29,7 @@ public:
         Append(text_, std::string(ViewOf(options.newLabel)).append("\n"));
     }
 
-    /// Writes changes whose contexts touch, as one hunk.
+    /// Writes changes whose contexts overlap or touch, as one hunk.
     void Write(std::vector<LineChange>::const_iterator first, std::vector<LineChange>::const_iterator last) {
         LineChange const& end = *(last - 1);
         const std::size_t ahead = std::min(context_, first->oldBegin);

@@ -6,7 +6,7 @@
 
 namespace KivArchive {
 
-/// A content as lines. Refers to the buffer that it was made of.
+/// A content as lines. Refers to the buffer that it was made from.
 class Lines {
 public:
     /// Nothing if the content is no text.
@@ -34,14 +34,14 @@ private:
     explicit Lines(KivVcs::Buffer const& content) : content_(&content) {}
 
     KivVcs::Buffer const* content_;
-    /// Filled only where the content is not one chunk already.
+    /// Filled only if the content is not in one chunk already.
     std::vector<char> joined_;
     std::string_view text_;
     /// One for each line, and one for the end.
     std::vector<std::size_t> begins_;
 };
 
-/// The changes that make @p after of @p before.
+/// The changes that turn @p before into @p after.
 std::vector<LineChange> CompareLines(Lines const& before, Lines const& after);
 
 } // namespace KivArchive

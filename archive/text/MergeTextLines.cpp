@@ -7,7 +7,7 @@ namespace KivArchive {
 
 namespace {
 
-/// One side of a merge: its lines, and the changes that it made of the base.
+/// One side of a merge: its lines, and its changes to the base.
 class Side {
 public:
     Side(Lines const& base, Lines const& lines) : lines_(lines), changes_(CompareLines(base, lines)) {}
@@ -17,7 +17,7 @@ public:
     /// Where in the base the next change begins. @pre !IsAtEnd()
     [[nodiscard]] std::size_t NextBegin() const noexcept { return changes_[next_].oldBegin; }
 
-    /// Takes the next change if it overlaps or touches the base's lines up to @p end, which then reaches to its end.
+    /// Takes the next change if it overlaps or touches the base's lines up to @p end, and moves @p end to its end.
     bool Take(std::size_t& end) {
         if (IsAtEnd() || NextBegin() > end)
             return false;
@@ -26,7 +26,8 @@ public:
         return true;
     }
 
-    /// Where the base's line is, which lies before the next change, and behind or at the end of all that were taken.
+    /// The line of this side that a line of the base is. @pre it is before the next change, and not before the end of
+    /// those taken
     [[nodiscard]] std::size_t LineOf(std::size_t baseLine) const noexcept {
         return next_ == 0 ? baseLine : changes_[next_ - 1].newEnd + (baseLine - changes_[next_ - 1].oldEnd);
     }
@@ -65,7 +66,7 @@ public:
     }
 
 private:
-    /// Merges all changes that hang together from line @p begin of the base on, and returns where they end.
+    /// Merges all changes that overlap or touch each other from line @p begin of the base on. @return where they end
     std::size_t MergeFrom(std::size_t begin) {
         const std::size_t leftBegin = left_.LineOf(begin);
         const std::size_t rightBegin = right_.LineOf(begin);
