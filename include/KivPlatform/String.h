@@ -70,9 +70,9 @@ public:
     KivStringT(T const& text) = delete; // for UTF-16 text write u"..." or call FromUtf8(text)
 
     /// Replaces the text by @p format with its directives filled in from @p arguments in order, as printf does. After a
-    /// percent sign, "s" takes NUL-terminated text (null counts as empty), ".*s" a length and text, "d", "u" and "lu" any
-    /// integer; a width ("5d", "02d") pads with blanks or zeros; two percent signs write one. A directive without an
-    /// argument writes nothing.
+    /// percent sign, "s" takes NUL-terminated text (null counts as empty), ".*s" a length and text, "d", "u" and "lu"
+    /// any integer; a width ("5d", "02d") pads with blanks or zeros; two percent signs write one. A directive without
+    /// an argument writes nothing.
     template <class... Arguments>
     void FormatInternal(View format, Arguments const&... arguments) {
         const std::array<FormatArgument<C>, sizeof...(arguments)> list{FormatArgument<C>(arguments)...};
@@ -86,7 +86,7 @@ public:
     [[nodiscard]] const C* GetString() const noexcept { return text_ ? Characters() : &terminator; }
     operator const C*() const noexcept { return GetString(); }
 
-    /// Whether both are copies of one text, so that they are equal without a look at the characters.
+    /// Whether both are copies of one text, and so equal without comparing characters.
     [[nodiscard]] bool IsSharedWith(KivStringT const& other) const noexcept { return text_ == other.text_; }
 
     /// @pre 0 <= @p index <= GetLength(); the terminating NUL is at GetLength().
@@ -204,7 +204,7 @@ KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringT<char16_t
 KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringViewT<char> const& text);
 KIVVCS_EXPORT std::ostream& operator<<(std::ostream& stream, KivStringViewT<char16_t> const& text);
 
-// A DLL exports no inline members: there every program makes its own.
+// Not for DLLs, which export no inline members: every program instantiates its own.
 #if !defined(_WIN32)
 extern template class KivStringT<char>;
 extern template class KivStringT<char16_t>;
@@ -212,7 +212,7 @@ extern template class KivStringT<char16_t>;
 
 } // namespace KivPlatform
 
-// Both transparent, so that tables of strings are searched by views and literals without making a string of them.
+// Both are transparent, so that tables of strings are searched for views and literals without making strings.
 
 template <class C>
 struct std::hash<KivPlatform::KivStringT<C>> {

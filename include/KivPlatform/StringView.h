@@ -27,9 +27,10 @@ enum class CompareCase : std::int32_t { Exact = 0 };
 
 /// 8-bit text of the standard library or the language: a literal, `std::string`, `std::string_view`.
 ///
-/// UTF-16 texts and views are not made of such text, since it does not say its encoding: the constructors that would take it
-/// are deleted and the operators assert, so that the compiler names the function to call, `FromUtf8`, right away. Functions
-/// that a host overloads for `std::string_view` and for UTF-16 text take the latter by a template on what converts to it.
+/// UTF-16 texts and views are not made of such text, since it does not say its encoding: the constructors that would
+/// take it are deleted and the operators assert, so that the compiler names the function to call, `FromUtf8`, right
+/// away. Functions that a host overloads for `std::string_view` and for UTF-16 text take the latter by a template on
+/// what converts to it.
 template <class T>
 concept StandardEightBitText =
     std::convertible_to<T const&, std::string_view> && !std::same_as<std::remove_cvref_t<T>, std::nullptr_t>;
@@ -92,7 +93,7 @@ public:
         return length_ < other.length_ ? -1 : static_cast<int>(length_ > other.length_);
     }
 
-    /// Whether `Compare` gives 0, without looking at the texts if their lengths differ.
+    /// Whether `Compare` returns 0; does not read the texts if their lengths differ.
     [[nodiscard]] constexpr bool HasSameText(KivStringViewT other) const noexcept {
         return length_ == other.length_ && std::equal(begin(), end(), other.begin());
     }
@@ -111,7 +112,7 @@ public:
 
 private:
     static constexpr int CompareUnits(const C* left, const C* right, int count) noexcept {
-        // Equal beginnings are passed over by the word: names of one directory often have long ones.
+        // Equal beginnings are skipped a word at a time: names in one directory often have long ones.
         if (!std::is_constant_evaluated()) {
             constexpr int unitsOfWord = sizeof(std::uint64_t) / sizeof(C);
             for (; count >= unitsOfWord && std::memcmp(left, right, sizeof(std::uint64_t)) == 0; count -= unitsOfWord) {
@@ -181,8 +182,8 @@ template <class L, class R>
     return KivStringViewT<char16_t>(left).Compare(KivStringViewT<char16_t>(right)) <=> 0;
 }
 
-/// The same order once more: without this operator, `std::less<>` and `std::ranges::less` compare two strings as the
-/// pointers that they convert to.
+/// The same order. Without this operator, `std::less<>` and `std::ranges::less` would compare the pointers that two
+/// strings convert to.
 template <class L, class R>
     requires TextPair<L, R, char>
 [[nodiscard]] bool operator<(L const& left, R const& right) noexcept {

@@ -1,7 +1,7 @@
 #pragma once
 
 /// @file
-/// The one way in which things are shared: a count that they carry, and the handle that keeps it.
+/// How objects are shared: each carries a count of its handles.
 
 #include <atomic>
 #include <cstdint>
@@ -20,8 +20,8 @@ public:
     reference_counted& operator=(reference_counted const&) noexcept { return *this; }
 
     void add_reference() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
-    /// The same for an object that may be new. Nobody else has a reference to one that has none, so that it takes no atomic
-    /// exchange.
+    /// The same for an object that may be new. One without references is nobody else's, so that counting the first
+    /// takes no atomic exchange.
     void add_first_reference() const noexcept {
         if (references_.load(std::memory_order_relaxed) == 0)
             references_.store(1, std::memory_order_relaxed);

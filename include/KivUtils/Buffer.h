@@ -39,7 +39,7 @@ private:
     std::size_t count_ = 0;
 };
 
-/// What containers of bytes hold.
+/// The types that stand for bytes.
 template <class T>
 concept OneByte = std::same_as<T, std::byte> || std::same_as<T, char> || std::same_as<T, unsigned char>;
 
@@ -77,10 +77,10 @@ public:
         return result;
     }
 
-    /// A buffer of the bytes that @p bytes owns, which are not copied: they move in with all of the container's capacity, and
-    /// stay until no buffer shares them. What is appended later goes elsewhere. Fewer than 512 bytes are copied after all,
-    /// since that takes less memory. Either way @p bytes is empty then.
-    /// @throws std::bad_alloc; @p bytes is as before then
+    /// A buffer of the bytes that @p bytes owns, which are not copied: they are taken over with all of the container's
+    /// capacity, and stay until no buffer shares them. Bytes appended later are stored elsewhere. Fewer than 512 bytes
+    /// are copied after all, since that takes less memory. Either way @p bytes is empty afterwards.
+    /// @throws std::bad_alloc, leaving @p bytes as it was
     template <OneByte Byte, class Allocator>
     [[nodiscard]] static Buffer Adopt(std::vector<Byte, Allocator>&& bytes) {
         return AdoptFrom(bytes, bytes.size(), [](auto const& owned) { return owned.data(); });
@@ -112,7 +112,7 @@ public:
 private:
     enum class Kind : std::uint32_t { Block, Adopted, Chain };
 
-    /// What a buffer points to: one block of bytes, which are its own or adopted, or a chain of pieces of blocks.
+    /// What a buffer points to: one block of bytes of its own, one of adopted bytes, or a chain of pieces of blocks.
     struct Content : KivPlatform::reference_counted {
         Content(Kind what, std::uint64_t bytes, std::size_t further) noexcept
             : kind(what), room(further & maximumRoom), size(bytes) {}
@@ -124,7 +124,7 @@ private:
         std::uint32_t room : 30;
         std::uint64_t size;
     };
-    /// What adopted bytes live in.
+    /// Owns adopted bytes.
     struct Owner {
         Owner() noexcept = default;
         Owner(Owner const&) = delete;

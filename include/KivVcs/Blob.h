@@ -21,7 +21,8 @@ public:
     /// A blob with the content of @p data, whose chunks it shares.
     explicit Blob(Buffer data) noexcept : data_(std::move(data)) {}
 
-    /// A blob with a copy of @p text, whose bytes are taken as they are, of @p bytes, or of the @p size bytes at @p data.
+    /// A blob with a copy of @p text, whose bytes are taken as they are, of @p bytes, or of the @p size bytes at @p
+    /// data.
     /// @throws std::bad_alloc; std::length_error for a size that memory cannot hold
     [[nodiscard]] static Blob CopyText(std::string_view text);
     [[nodiscard]] static Blob CopyBytes(std::span<std::byte const> bytes);
@@ -65,13 +66,14 @@ public:
     [[nodiscard]] bool IsOfHostClass() const noexcept final;
 
 protected:
-    /// For a host's class that knows the identifier of its content and gets the content when `GetData` is asked: trees
-    /// hold and show such a blob as fast as any, by @p digest and as "100644 blob", without asking it. The digest stays as
-    /// long as the object lives, assignment included; that of a copy is what the host's copy constructor hands to this one.
+    /// For a host's class that knows the identifier of its content and gets the content when `GetData` is called: trees
+    /// hold and pack such a blob as fast as any, by @p digest and as "100644 blob", without calling it. The digest
+    /// stays as long as the object lives, assignment included; that of a copy is what the host's copy constructor
+    /// passes to this one.
     explicit Blob(Id::Digest const& digest) noexcept : Object(digest) {}
 
-    /// A copy of an object of a host's class, which nobody else holds; by default a `Blob` with what `GetData` gives. The
-    /// library does not ask objects of exactly this class.
+    /// A copy of an object of a host's class, which nobody else holds; by default a `Blob` with what `GetData` returns.
+    /// Not called for objects of exactly this class.
     [[nodiscard]] virtual cow_ptr<Blob> Copy() const;
 
 private:

@@ -11,9 +11,9 @@ namespace KivVcs {
 
 /// A root tree, at most one parent, author, description, and the time and time-zone bias of committing.
 ///
-/// A commit is built on its parent or in its parent's place, edited, handed to `IRepository::DoCommit`, which stamps
-/// and stores a copy, and from then on read through shared pointers. Every edit of the files stores the new trees at
-/// once.
+/// A commit is made on top of its parent or in its parent's place, edited, and passed to `IRepository::DoCommit`, which
+/// stamps it and stores a copy. From then on it is read through shared pointers. Every edit of the files stores the new
+/// trees at once.
 ///
 /// Parent and root may be deferred: given as an identifier and a function that fetches the object when somebody first
 /// asks for it, a walk of this library included (`DeferParent`, `DeferRoot`).
@@ -24,7 +24,7 @@ namespace KivVcs {
 /// Threads: all `const` operations may run concurrently on one commit. A change needs exclusive use of the commit.
 class KIVVCS_EXPORT Commit : public Object {
 public:
-    /// Everything empty, null or zero; unlike after the other constructors there is no tree holder either.
+    /// Everything empty, null or zero. Unlike the other constructors, makes no tree holder.
     Commit() noexcept;
     /// A new commit on top of @p parent, sharing its tree; or, if @p amend, one in its place: with its parent, tree,
     /// author and description. A missing tree becomes an empty holder. A null parent makes a root commit.
@@ -72,28 +72,29 @@ public:
     void SetCommitTimezoneBias(TimeDelta const& bias);
     void SetParent(cow_ptr<Commit> parent);
 
-    /// Functions that fetch what is deferred: they are given the identifier and return the one living object that has it.
+    /// Functions that fetch what is deferred: they are given the identifier and return the one living object that has
+    /// it.
     using FetchCommit = PortableVersion::Delegate<cow_ptr<Commit>(Id const&)>;
     using FetchTree = PortableVersion::Delegate<cow_ptr<Tree>(Id const&)>;
 
     /// Makes the commit of identifier @p id the parent without having it; each calls `ResetState`. The first operation
     /// that needs the parent itself calls @p fetch, once, and the commit holds what it returns from then on. The
-    /// identifier, the text, copying, comparing, purging and destroying never fetch, and what is not fetched is not held.
-    /// The null identifier stands for no parent.
+    /// identifier, the text, copying, comparing, purging and destroying never fetch, and what is not fetched is not
+    /// held. The null identifier stands for no parent.
     ///
-    /// A function that throws, returns null or an object of another identifier leaves the parent deferred, so that it is
-    /// called again; the one who asked gets an exception, never "no parent". It must not ask the same commit for what it
-    /// is to fetch. It may store what it fetches, which is up to it (nothing in this library iterates over a storage while
-    /// it is called), has to keep alive what it needs itself, and is kept by every copy of the commit.
+    /// A function that throws, or returns null or an object with another identifier, leaves the parent deferred, and is
+    /// called again the next time. Whoever asked for the parent gets an exception, never "no parent". The function must
+    /// not ask the same commit for what it is to fetch. It may store what it fetches: nothing in this library iterates
+    /// over a storage while it is called. It has to keep alive what it needs, and every copy of the commit keeps it.
     ///
     /// Cost: what walks a whole history (common bases, fast-forward, simplifying, joining, deleting) fetches all of it.
-    /// Threads: concurrent readers may ask; one of them calls @p fetch while the others wait for it.
+    /// Threads: any number may ask concurrently; one of them calls @p fetch while the others wait for it.
     void DeferParent(Id const& id, FetchCommit fetch);
     /// The same for the root tree, which gets a holder of its own; a commit made on top of this one takes the deferral
     /// over.
     void DeferRoot(Id const& id, FetchTree fetch);
 
-    /// Takes author and description over from @p other; time and bias stay.
+    /// Copies author and description from @p other; time and bias stay.
     void ResetPropertiesForAmend(Commit const& other);
 
     /// Adds to, or removes from, the commit's files, as the operations of `CommitTree`; then replaces the root by the
@@ -110,8 +111,8 @@ public:
     /// A new holder of the subtree at @p path; null if there is none.
     [[nodiscard]] cow_ptr<CommitTree> GetTree(KivStringViewT<char16_t> path) const;
 
-    /// Replaces the whole root tree, then `RebuildTree`. An identifier or text that is known stays until the next
-    /// `ResetState`, of both operations.
+    /// Replaces the whole root tree, and calls `RebuildTree`. With both operations, a known identifier or text stays
+    /// until the next `ResetState`.
     void ReplaceRoot(IRepository* repo, cow_ptr<Tree> root);
     /// Makes the root the storage's instance of itself, storing it if the storage has none. A null @p repo changes
     /// nothing.
@@ -148,8 +149,8 @@ public:
     [[nodiscard]] bool IsOfHostClass() const noexcept final;
 
 protected:
-    /// A copy of an object of a host's class, which nobody else holds; by default a `Commit` with the same fields. The
-    /// library does not ask objects of exactly this class.
+    /// A copy of an object of a host's class, which nobody else holds; by default a `Commit` with the same fields. Not
+    /// called for objects of exactly this class.
     [[nodiscard]] virtual cow_ptr<Commit> Copy() const;
 
 private:
@@ -160,7 +161,7 @@ private:
     void ListParts(detail::OpenObjects& parts) const final;
     template <class Add>
     auto EditTree(IRepository* repo, Add add);
-    /// The one way to the parent for walks: as `GetParent`, without a share of it, which this commit has.
+    /// How walks get to the parent: as `GetParent`, but without another handle, since this commit holds it.
     [[nodiscard]] Commit const* Parent() const { return parent_ ? parent_.get() : DeferredParent(); }
     [[nodiscard]] Commit const* DeferredParent() const;
     [[nodiscard]] bool HasParent() const noexcept { return parent_ || deferred_.ParentId() != nullptr; }
@@ -182,8 +183,8 @@ private:
     detail::Published<Buffer> data_;
 };
 
-/// A copy that the caller owns alone: of an object of a host's class the one that its `Copy` makes, or a `Commit` if that
-/// is null or somebody else's.
+/// A copy that the caller owns alone: of an object of a host's class the one that its `Copy` makes, or a `Commit` if
+/// that is null or somebody else's.
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Commit> CopyOf(Commit const& commit);
 
 [[nodiscard]] KIVVCS_EXPORT cow_ptr<Commit> dll_wrapped_shared(std::unique_ptr<Commit> commit);

@@ -20,7 +20,7 @@ public:
     CommitTree() noexcept = default;
     explicit CommitTree(cow_ptr<Tree> root) noexcept : root_(std::move(root)) {}
 
-    /// A holder of what `Tree::Deserialize` gives; null if that is null.
+    /// A holder of what `Tree::Deserialize` returns; null if that is null.
     static cow_ptr<CommitTree> Deserialize(Id const& id, IRepository* repo,
                                            PortableVersion::Delegate<StreamIO(Id const&)> loader);
 

@@ -17,8 +17,8 @@ enum class ConflictSettlement : std::int32_t {
     Right = 2,
     /// As it was before either side changed it.
     Root = 3,
-    /// By something that neither side had: merged content, or both kept under two names. Resolvers of this library cannot
-    /// answer so; merges that stand on it may.
+    /// By something that neither side had: merged content, or both kept under two names. No merge of this library
+    /// settles conflicts so; merges built on it may.
     Combined = 4,
 };
 
@@ -43,14 +43,14 @@ struct MergeConflict {
     ConflictSettlement settlement = ConflictSettlement::Undecided;
 };
 
-/// The conflict at @p path, given as components counted from the top of @p trees: what a resolver that is asked about it
-/// looks at. An empty path means the trees themselves.
+/// The conflict at @p path, given as components from the top of @p trees on, as resolvers are asked about it. An empty
+/// path stands for the trees themselves.
 [[nodiscard]] KIVVCS_EXPORT MergeConflict DescribeConflict(array_view<KivStringViewT<char16_t> const> path,
                                                            MergeTrees const& trees, bool isDirectory,
                                                            ConflictSettlement settlement);
 
-/// The paths about which `ThreeWayMerge` would ask its blob resolver if its tree resolver always answered `Merge`, in that
-/// order, undecided. Merges, stores and fetches nothing: for a look before a merge.
+/// The paths about which `ThreeWayMerge` would ask its blob resolver if its tree resolver always answered `Merge`, in
+/// that order, undecided. Merges, stores and fetches nothing, so that hosts can look before they merge.
 /// @complexity as of the merge @throws std::bad_alloc, and what hosts' objects throw
 [[nodiscard]] KIVVCS_EXPORT std::vector<MergeConflict> FindConflicts(MergeTrees trees);
 

@@ -38,24 +38,24 @@ struct DifferenceOptions {
     /// Pairs files that were removed with files of equal content that were added: those that kept their name first,
     /// then in the order of their paths.
     bool findRenames = false;
-    /// Ends the search at that many differences or directories entered, whichever comes first: versions of unknown origin
-    /// can name one directory very often.
+    /// Ends the search after this many differences or entered directories, whichever comes first: versions of unknown
+    /// origin can name one directory very many times.
     std::size_t atMost = std::numeric_limits<std::size_t>::max();
 };
 
-/// Makes every file that was removed and one of equal content that was added one renamed file, as
-/// `DifferenceOptions::findRenames` asks for; for lists that were made elsewhere.
+/// Replaces each pair of a removed file and an added one with equal content by one renamed file, as
+/// `DifferenceOptions::findRenames` does, in a list that was made elsewhere.
 /// @param differences ordered by path
-/// @throws std::bad_alloc, leaving them in some order of their own
+/// @throws std::bad_alloc, leaving them in any order
 KIVVCS_EXPORT void PairRenames(std::vector<Difference>& differences);
 
 /// The files that differ between two trees, ordered by path, each path once:
 ///
 ///     for (auto const& difference : Differences(before->GetCommitTree(), after->GetCommitTree()))
 ///
-/// The paths are those of `Tree::GetDeepBlobDiffs`. Where a directory became a file, or a file a directory, the path itself
-/// and the files below it are listed. Null trees count as empty. Subtrees with equal identifiers are not entered, and no
-/// content is asked for.
+/// The paths are those of `Tree::GetDeepBlobDiffs`. Where a directory became a file, or a file a directory, the path
+/// itself and the files below it are listed. Null trees count as empty. Subtrees with equal identifiers are not
+/// entered, and no content is asked for.
 class KIVVCS_EXPORT Differences {
 public:
     /// @complexity as of `GetLocalBlobDiffs` and `GetLocalTreeDiffs` in every directory that differs

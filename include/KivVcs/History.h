@@ -17,8 +17,8 @@ namespace KivVcs {
 ///
 ///     for (auto const& commit : History(repository.GetHead()).Changing(u"docs").First(10))
 ///
-/// Parents are asked for as the walk goes on, so that only what is looked at is fetched, and nothing is kept of what lies
-/// behind: a history may have any length. Null is a history without commits.
+/// Parents are asked for as the walk goes on, so that only commits that it reaches are fetched, and none is held once
+/// the walk has passed it: a history may have any length. Null is a history without commits.
 ///
 /// Threads: a value. A walk reads commits as their `const` operations do.
 class KIVVCS_EXPORT History {
@@ -27,9 +27,8 @@ public:
 
     explicit History(cow_ptr<Commit> head) noexcept : head_(std::move(head)) {}
 
-    /// Only the commits in which @p path holds something else than in their parent: a file or directory that came, went
-    /// or has another identifier. What the first commit of all holds came with it. The path without components is the
-    /// whole tree.
+    /// Only the commits in which @p path differs from their parent: a file or directory was added, was removed or has
+    /// another identifier. A root commit adds all that it holds. The path without components is the whole tree.
     [[nodiscard]] History Changing(KivStringViewT<char16_t> path) const;
 
     /// At most the @p count newest of these commits.
@@ -45,7 +44,8 @@ private:
     std::uint64_t count_ = std::numeric_limits<std::uint64_t>::max();
 };
 
-/// A position in a history. An input iterator: the commit that it shows is its own, and may be kept by copying the pointer.
+/// A position in a history. An input iterator: the commit that it shows is its own, and may be kept by copying the
+/// pointer.
 class KIVVCS_EXPORT History::Iterator {
 public:
     using iterator_category = std::input_iterator_tag;

@@ -49,13 +49,14 @@ public:
     /// stored anew, linked to each other in their old order, their branches moved, and unused objects purged. A root
     /// commit, and null, are left alone. Descendants of @p commit keep their old parents in memory.
     /// @return false without storage.
-    /// @throws what allocation and the host's operations throw; what has been deleted, stored or moved by then stays so.
+    /// @throws what allocation and the host's operations throw; what has been deleted, stored or moved by then stays
+    /// so.
     virtual bool DeleteCommits(cow_ptr<Commit> commit) = 0;
     /// Rewrites the history of all branches so that it keeps only their heads and the common bases of every two heads,
     /// each linked to the nearest kept ancestor; purges unused objects at the end if @p purge. Content stays.
     /// @return false without storage.
-    /// @complexity proportional to the histories and their heads; in a repository of a host's class every two heads are
-    /// asked about by `GetCommonBase`
+    /// @complexity proportional to the histories and their heads; in a repository of a host's class, `GetCommonBase` is
+    /// called for every two heads
     /// @throws as `DeleteCommits`
     virtual bool SimplifyCommitGraph(bool purge) = 0;
     /// Purges the objects that nothing references.
@@ -76,9 +77,9 @@ public:
     virtual bool MoveBranchTo(KivStringViewT<char16_t> branch, cow_ptr<Commit> commit) = 0;
     /// Removes an existing branch, the current one too, which stays current by name.
     virtual bool RemoveBranch(KivStringViewT<char16_t> branch) = 0;
-    /// Makes two branches share an ancestor: unless they do, puts each history that does not contain it on top of the
-    /// head of @p rootBranch, which is made with an empty commit "Root commit" if it has no head. A branch without
-    /// commits is put at the root itself.
+    /// Makes two branches share an ancestor. Unless they do already, each of them whose history has no common base with
+    /// the head of @p rootBranch is put on top of that head; the root branch is made, with an empty commit "Root
+    /// commit", if it has no head. A branch without commits is pointed at the root itself.
     /// @return false if the root branch cannot be made or a branch cannot be moved; what was stored before stays
     /// stored, and a branch that was moved before stays there.
     /// @throws as `DeleteCommits`

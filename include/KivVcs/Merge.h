@@ -43,8 +43,8 @@ enum class TreeConflictChoice : std::int32_t {
     Undecided = 4,
 };
 
-/// Settles a conflict. It is given the path of the disputed entry as components, counted from the top of the merge, and
-/// the three whole trees of the merge, in which it can look the entry up. The path is valid during the call.
+/// Settles a conflict. It is given the path of the disputed entry, as components from the top of the merge on, and the
+/// three whole trees of the merge, in which it can look the entry up. The path is valid during the call only.
 using BlobConflictResolver = std::function<ConflictChoice(array_view<KivStringViewT<char16_t> const>, MergeTrees)>;
 /// The same for directories; the path is empty for the trees of the merge themselves.
 using TreeConflictResolver = std::function<TreeConflictChoice(array_view<KivStringViewT<char16_t> const>, MergeTrees)>;
@@ -85,12 +85,13 @@ struct Resolvers {
 /// which are not copied for each. Contents are never merged, nor asked for. Unchanged subtrees are shared
 /// with the inputs, which stay as they are. New trees are stored in @p repo as they are made.
 ///
-/// A name may be a file on one side and a directory on the other. Nobody is asked about it, or the answer does not hold,
-/// in four cases: where one side adds a file and the other a directory, the file is gone; where one side changed a file
-/// that the other made a directory, the directory is taken, whatever is answered; where a directory became a file while the
-/// other side changed something in it, both may come to be under one name, of which the packed form shows the file; where
-/// one side made a directory a file and the other removed it, both are gone. Hosts that care let the tree resolver answer
-/// `Left` or `Right` there, or merge with the archive's `MergeAgain`, which asks.
+/// A name may be a file on one side and a directory on the other. In four cases nobody is asked about it, or the answer
+/// is not followed: where one side adds a file and the other a directory, the file is gone; where one side changed a
+/// file
+/// that the other made a directory, the directory is taken, whatever is answered; where a directory became a file while
+/// the other side changed something in it, both may come to be under one name, of which the packed form shows the file;
+/// where one side made a directory a file and the other removed it, both are gone. Hosts that care let the tree
+/// resolver answer `Left` or `Right` there, or merge with the archive's `MergeAgain`, which asks.
 /// @return the merged tree; null if @p repo is null, a resolver that was needed is empty or undecided, or no side has a
 /// tree.
 /// @complexity proportional to the entries that differ and to the size of the directories that hold them.

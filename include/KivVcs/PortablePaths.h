@@ -33,16 +33,17 @@ struct PathProblem {
     KivStringT<char16_t> component;
 };
 
-/// The first thing that keeps @p path, split at "/" with empty components dropped, from being written to disks of common
-/// systems (Linux, macOS, Windows); nothing if every component is fine. Whether the whole path is too long for one of them
-/// depends on where it goes, and is not looked at.
+/// The first thing that keeps @p path, split at "/" with empty components dropped, from being written to disks of
+/// common systems (Linux, macOS, Windows); nothing if every component is fine. Whether the whole path is too long
+/// depends on where it is written, and is not checked.
 /// @throws std::bad_alloc
 [[nodiscard]] KIVVCS_EXPORT optional<PathProblem> PortablePathProblem(KivStringViewT<char16_t> path);
 
 /// The paths, of files and directories, that a disk which ignores case cannot keep apart: each group has at least two
-/// names of one directory that differ in case only, by Unicode's simple case folding whatever the locale, in their order.
-/// The groups are ordered by their first paths. A directory that is named more than once is searched, and reported, once.
-/// Names that differ only in how an accent is composed are no collision here, although some disks take them for one.
+/// names of one directory that differ in case only, by Unicode's simple case folding whatever the locale, in their
+/// order. The groups are ordered by their first paths. A directory that is named more than once is searched, and
+/// reported, once. Names that differ only in how an accent is composed are no collision here, although some disks take
+/// them for one.
 /// @complexity proportional to the entries of all distinct directories
 /// @throws std::bad_alloc; std::length_error for a path that is longer than a text can be
 [[nodiscard]] KIVVCS_EXPORT std::vector<PathList> FindCaseCollisions(cow_ptr<Tree> const& tree);

@@ -66,9 +66,9 @@ public:
     cow_ptr<Commit> MergelessRebase(KivStringViewT<char16_t> branch, KivStringViewT<char16_t> ontoBranch);
 
 protected:
-    /// Called by `SimplifyCommitGraph`, `DeleteCommits`, `MergelessRebase` and what calls them whenever they have stored
-    /// a commit anew on top of another parent: before a branch moves to @p rebuilt, and before anything is purged. @p old
-    /// still has its whole history. Not called if both have the same identifier.
+    /// Called by `SimplifyCommitGraph`, `DeleteCommits`, `MergelessRebase` and what calls them whenever they have
+    /// stored a commit anew on top of another parent: before a branch moves to @p rebuilt, and before anything is
+    /// purged. @p old still has its whole history. Not called if both have the same identifier.
     ///
     /// Does nothing. What an override throws ends the operation; what has been stored or moved by then stays so.
     virtual void CommitRewritten(cow_ptr<Commit> old, cow_ptr<Commit> rebuilt);
@@ -80,7 +80,7 @@ private:
 
     std::unique_ptr<IObjectsStorage> storage_;
     KivStringT<char16_t> currentBranch_;
-    /// What `GetCommonBase` looks at first while the commit graph is being simplified; null otherwise.
+    /// The index in which `GetCommonBase` looks first while the commit graph is being simplified; null otherwise.
     CommonBaseIndex const* commonBases_ = nullptr;
 };
 

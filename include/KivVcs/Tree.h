@@ -59,9 +59,10 @@ public:
     [[nodiscard]] KivStringT<char> GetHeader() const override;
     /// "40000"
     [[nodiscard]] KivStringT<char> GetStoragePrefix() const override;
-    /// The entries in name order, each as mode, blank, type, blank, name in UTF-8, a zero byte and identifier: the
-    /// `GetStoragePrefix`, `GetHeader` and `GetId` of its object, which are asked of objects of hosts' classes and are 64
-    /// digits of identifier at the end for all others. @throws what hosts' objects throw
+    /// The entries in name order, each as mode, blank, type word, blank, name in UTF-8, a zero byte and identifier.
+    /// Mode, type word and identifier are the `GetStoragePrefix`, `GetHeader` and `GetId` of its object, which are
+    /// called for objects of hosts' classes only; the identifiers of all others have 64 digits. @throws what hosts'
+    /// objects throw
     Buffer const& GetData() const override;
     void ResetState() override;
 
@@ -87,16 +88,16 @@ public:
     /// neither.
     cow_ptr<Object> AddObject(IRepository* repo, KivStringViewT<char16_t> path, Id const& id);
 
-    /// Adds many blobs. Afterwards the entries, and those of the directories below, are what `AddBlob` of one pair after the
-    /// other makes them; the last pair of a path stays. The versions of directories in between are neither made nor stored.
-    /// Pairs of a null blob or a path without components are left out.
+    /// Adds many blobs. Afterwards the entries, and those of the directories below, are what `AddBlob` of one pair
+    /// after the other makes them; the last pair of a path stays. The versions of directories in between are neither
+    /// made nor stored. Pairs of a null blob or a path without components are left out.
     ///
-    /// Asks @p repo as `AddBlob` does: for all blobs, in the given order, then for the directories on their ways, each after
-    /// those in it, in the order of their names. What is stored if the storage has none is the given blob itself. Identifiers
-    /// are computed as by `Identify`.
+    /// Asks @p repo as `AddBlob` does: for all blobs, in the given order, then for the directories on their ways, each
+    /// after those in it, in the order of their names. What is stored if the storage has none is the given blob itself.
+    /// Identifiers are computed as by `Identify`.
     /// @return whether a blob was added; false, changing nothing, if @p repo is null.
-    /// @complexity linear in the blobs, if those of a directory come together in the order of their names and the directory
-    /// is new, with a factor O(log n) otherwise; plus hashing
+    /// @complexity linear in the blobs, if those of a directory come together in the order of their names and the
+    /// directory is new, with a factor O(log n) otherwise; plus hashing
     bool AddBlobs(IRepository* repo, array_view<BlobAtPath const> blobs);
 
     /// `AddBlob` and `AddTree` with the path given as components. An empty last component adds nothing and returns
@@ -150,11 +151,11 @@ public:
 
     /// The tree of identifier @p id: the one that @p repo holds already, otherwise read through @p loader with
     /// everything below it. Blobs and subtrees that cannot be loaded are left out. A tree that names itself, directly
-    /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable. An entry whose name holds "/" is
-    /// added by that path, as `AddBlob` and `AddTree` do, each time storing the directories on its way. A packed form is
-    /// read once however often it is named. Blobs are looked up and loaded in the order of the entries, up to 32 or
-    /// 512 KiB of one directory before those are identified together and stored. Large forms of streams on buffers are
-    /// shared; a loader may use its own buffer again.
+    /// or not, or that lies deeper than `deepestLoadedNesting`, counts as not loadable. An entry whose name holds "/"
+    /// is added by that path, as `AddBlob` and `AddTree` do, each time storing the directories on its way. A packed
+    /// form is read once however often it is named. Blobs are looked up and loaded in the order of the entries, up to
+    /// 32 or 512 KiB of one directory before those are identified together and stored. Large forms of streams on
+    /// buffers are shared; a loader may use its own buffer again.
     /// @return null if @p repo is null, @p id or @p loader is empty, or the packed form has a header that does not
     /// begin with "tree", no entries, or an entry that is neither tree nor blob.
     /// @throws what @p loader and @p repo throw
@@ -164,8 +165,8 @@ public:
     [[nodiscard]] bool IsOfHostClass() const noexcept final;
 
 protected:
-    /// A copy of an object of a host's class, which nobody else holds; by default a `Tree` with the same entries. The
-    /// library does not ask objects of exactly this class.
+    /// A copy of an object of a host's class, which nobody else holds; by default a `Tree` with the same entries. Not
+    /// called for objects of exactly this class.
     [[nodiscard]] virtual cow_ptr<Tree> Copy() const;
 
 private:
@@ -175,7 +176,7 @@ private:
     using PathComponentsView = array_view<KivStringViewT<char16_t> const>;
 
     /// Makes the storage's instance of @p object the entry @p name and returns it; null, doing nothing, for an empty
-    /// name. @p own gives what is stored if the storage has none.
+    /// name. @p own returns what is stored if the storage has none.
     template <class T, class Own>
     cow_ptr<T> SetLocal(IRepository& repo, KivStringViewT<char16_t> name, T const& object, Own own);
     void EraseLocal(KivStringViewT<char16_t> name);

@@ -7,8 +7,8 @@
 
 namespace KivVcs {
 
-/// Goes from a commit to its parent, and on. A parent that is deferred is fetched, which may throw. Each commit holds its
-/// parent, so that the first one keeps alive what is visited.
+/// Goes from a commit to its parent, and on. A parent that is deferred is fetched, which may throw. Each commit holds
+/// its parent, so that the first one keeps alive what is visited.
 class AncestorIterator {
 public:
     using value_type = Commit;
@@ -40,8 +40,8 @@ private:
     Commit const* commit_ = nullptr;
 };
 
-/// A commit and its ancestors, newest first, down to but without the one that @p until is; down to the root if that is
-/// null or no ancestor. For range-based loops.
+/// A commit and its ancestors, newest first, down to but without @p until; down to the root if @p until is null or no
+/// ancestor. For range-based loops.
 class Ancestors {
 public:
     explicit Ancestors(Commit const* newest, Commit const* until = nullptr) noexcept : newest_(newest), until_(until) {}

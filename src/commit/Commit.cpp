@@ -46,9 +46,9 @@ bool Commit::IsOfHostClass() const noexcept {
 }
 
 void Commit::ReleaseHistory() noexcept {
-    // Ancestors that nobody else holds die here one after the other: left to their own destructors, they would take stack
-    // for every commit of the history. Those of a host's class stay whole until their destructor has run: it finds the
-    // parent held by this loop, too, and leaves it alone.
+    // Ancestors that nobody else holds die here one after the other: left to their own destructors, they would take
+    // stack for every commit of the history. One of a host's class stays whole until its destructor has run, which
+    // leaves the parent alone since this loop holds it, too.
     cow_ptr<Commit> oldest = std::move(parent_);
     if (!oldest && deferred_) {
         oldest = GetHeldParent();
@@ -193,7 +193,7 @@ void AnchorRoot(cow_ptr<CommitTree>& tree, IRepository& repo) {
 
 template <class Edit>
 auto Commit::EditTree(IRepository* repo, Edit edit) {
-    // Edited aside and taken over when everything is done, so that an exception half-way leaves the commit as it was.
+    // A copy is edited, which takes the place of the tree in the end, so that an exception leaves the commit as it was.
     cow_ptr<CommitTree> edited = GetCommitTree();
     auto result = edit(*edited.write());
     if (result) {
@@ -237,8 +237,8 @@ cow_ptr<CommitTree> Commit::GetTree(KivStringViewT<char16_t> path) const {
 }
 
 void Commit::KeepText() const {
-    // An identifier stays when the root is replaced. The packed form that is asked for later must be the one that it was
-    // computed from, and can only be made now.
+    // An identifier stays when the root is replaced. The packed form that is asked for later must be the one that it
+    // was computed from, and can only be made now.
     if (IsIdentified())
         static_cast<void>(GetPackedData());
 }

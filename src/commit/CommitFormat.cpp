@@ -13,7 +13,7 @@ namespace {
 constexpr std::int64_t ticksPerHour = 36'000'000'000;
 constexpr std::int64_t ticksPerMinute = 600'000'000;
 
-/// The bias that an offset such as "+0545" stands for.
+/// The time-zone bias that an offset such as "+0545" stands for.
 TimeDelta BiasFromOffset(KivStringT<char16_t> const& offset) {
     const std::int64_t sign = offset.StartsWith(u"+") ? 1 : -1;
     const std::int64_t hours = String::IntFromString(offset.Mid(1, 2));
@@ -21,7 +21,7 @@ TimeDelta BiasFromOffset(KivStringT<char16_t> const& offset) {
     return TimeDelta(hours * sign * ticksPerHour + minutes * sign * ticksPerMinute);
 }
 
-/// What an author's line says.
+/// The parts of an author's line.
 struct Signature {
     explicit Signature(KivStringT<char> const& line) {
         const int emailStart = line.Find("<");
@@ -40,7 +40,7 @@ struct Signature {
     TimeDelta bias;
 };
 
-/// An identifier as the lines of a commit show it.
+/// A line of a commit's text that shows an identifier.
 KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
     KivStringT<char> line = key.ToString();
     if (Id::Digest const* const digest = id.GetDigest())
@@ -50,7 +50,7 @@ KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
     return line += "\n";
 }
 
-/// The text of @p commit. A parent is shown also if its identifier is the null one.
+/// The text of @p commit. A parent is shown even if its identifier is null.
 KivStringT<char> TextOf(Commit const& commit, bool hasParent) {
     const KivStringT<char16_t> author =
         Commit::GetAuthorInfo(u"author", commit.GetAuthorName(), commit.GetAuthorEmail(), commit.GetCommitTime(),
@@ -82,8 +82,8 @@ KivStringT<char> Commit::GetStoragePrefix() const {
 }
 
 void Commit::IdentifyAncestors() const {
-    // Oldest first: asked from the newest on, each commit would ask its parent in turn, one call deeper for every commit.
-    // Only the library's own commits do that; the identifier of a deferred parent is known.
+    // Oldest first: asked from the newest on, each commit would ask its parent in turn, one call deeper for every
+    // commit. Only commits of exactly the library's class do that, and the identifier of a deferred parent is known.
     std::vector<Commit const*> unidentified;
     for (Commit const* ancestor = parent_.get();
          ancestor != nullptr && ancestor->GetKnownDigest() == nullptr && !ancestor->IsOfHostClass();

@@ -17,8 +17,8 @@ cow_ptr<CommitTree> HoldFetched(cow_ptr<Tree> root) {
     return immu::make<CommitTree>(std::move(root));
 }
 
-/// An identifier, the function that fetches the object of that identifier, and what holds the object once it is there.
-/// Unset with the null identifier.
+/// An identifier, the function that fetches the object with that identifier, and what holds the object once it has been
+/// fetched. A link with the null identifier is unset.
 template <class Holder, class Fetched>
 class DeferredLink {
 public:
@@ -59,10 +59,10 @@ public:
     }
 
 private:
-    // Of the size that platforms can wait on without a table of their own.
+    // 32 bits, which platforms can wait on directly.
     enum class State : std::int32_t { NotFetched, Fetching, Held };
 
-    /// The turn of the one thread that fetches. The others wait, and the next one tries again if it fails.
+    /// Held by the one thread that fetches, while the others wait. If it fails, another one tries.
     class Fetching {
     public:
         explicit Fetching(DeferredLink const& link) noexcept : link_(link) {}
@@ -74,7 +74,7 @@ private:
         DeferredLink const& link_;
     };
 
-    /// Whether it is this thread that has to fetch; false once another one has done so.
+    /// Whether this thread has to fetch; false once another one has done so.
     [[nodiscard]] bool BeginToFetch() const noexcept {
         for (;;) {
             State state = State::NotFetched;

@@ -11,7 +11,7 @@ namespace {
 
 using Path = array_view<KivStringViewT<char16_t> const>;
 
-/// What a tree holds at the place of a conflict.
+/// What a tree holds at the path of a conflict.
 struct Held {
     Id id;
     bool isTree = false;

@@ -6,14 +6,14 @@ namespace KivVcs {
 
 /// The names of one directory that either side of a merge changed, sorted and disjoint.
 struct DiffCategories {
-    /// What both sides changed, to different states.
+    /// Both sides changed these, to different states.
     PathList conflicting;
     PathList identical;
     PathList leftOnly;
     PathList rightOnly;
 };
 
-/// What both sides changed of the blobs, or of the subtrees, right in the root of @p trees. @pre there is a root
+/// Categorizes the changes to the blobs, or to the subtrees, of the topmost directory of @p trees. @pre there is a root
 [[nodiscard]] DiffCategories CategorizeBlobDiffs(MergeTrees const& trees);
 [[nodiscard]] DiffCategories CategorizeTreeDiffs(MergeTrees const& trees);
 

@@ -9,7 +9,7 @@ namespace {
 
 void UseChangeFrom(IRepository* repo, cow_ptr<Tree>& result, cow_ptr<Tree> const& from,
                    KivStringT<char16_t> const& name) {
-    // The removal makes way for an entry of the other kind, which would stay beside the new one otherwise.
+    // Removes both kinds: an entry of the other kind would stay beside the new one.
     result.write()->RemoveObject(repo, name);
     if (!from)
         return;
@@ -29,7 +29,7 @@ void DoTrivialChanges(IRepository* repo, cow_ptr<Tree>& result, MergeTrees const
         UseChangeFrom(repo, result, trees.left, name);
 }
 
-/// The host's resolvers together with the place of the merge that they are asked about.
+/// The host's resolvers, and the path of the directory that they are asked about.
 class PlacedResolvers {
 public:
     PlacedResolvers(MergeTrees trees, Resolvers resolvers)
@@ -58,8 +58,7 @@ private:
     std::vector<KivStringViewT<char16_t>> path_;
 };
 
-/// Merges level by level. The levels that are being merged stand on a stack of their own, since directories may be
-/// nested deeper than calls can be.
+/// Merges directory by directory, with a stack of its own, since directories may be nested deeper than calls.
 class LevelByLevelMerge {
 public:
     LevelByLevelMerge(IRepository* repo, PlacedResolvers resolvers) : repo_(repo), resolvers_(std::move(resolvers)) {}
@@ -78,7 +77,7 @@ public:
     }
 
 private:
-    /// What became of one directory: settled, possibly to no tree at all; given up; or, if neither, opened as a new
+    /// The result for one directory: settled, possibly to no tree at all; given up; or, if neither, opened as a new
     /// level.
     struct Outcome {
         bool gaveUp = false;

@@ -8,8 +8,8 @@ namespace {
 
 using Path = array_view<KivStringViewT<char16_t> const>;
 
-/// The trees that a path leads through, from the top on, up to the first that is missing: one walk down instead of one
-/// for every level that is tried.
+/// The trees that a path leads through, from the top to the first that is missing, so that trying all levels takes one
+/// walk.
 std::vector<cow_ptr<Tree>> TreesAlong(cow_ptr<Tree> top, Path path) {
     std::vector<cow_ptr<Tree>> trees;
     auto component = path.begin();
@@ -31,7 +31,8 @@ public:
         const auto left = TreesAlong(std::move(trees.left), path);
         const auto right = TreesAlong(std::move(trees.right), path);
         for (std::size_t depth = path.size() + 1; depth-- > 0;) {
-            // The left side first: arguments would be evaluated in any order, and hosts see which stamp is read when.
+            // The left side first, in a statement of its own: arguments are evaluated in any order, which hosts would
+            // notice.
             const auto leftTime = TimeAt(left, depth);
             const ConflictChoice choice = Compare(leftTime, TimeAt(right, depth));
             if (choice != ConflictChoice::Undecided)
@@ -42,7 +43,7 @@ public:
 
 private:
     static ConflictChoice Compare(optional<Time> left, optional<Time> right) noexcept {
-        // Nothing comes before every time, and times are ordered by their unsigned ticks.
+        // No time comes before every time, and times are ordered by their unsigned ticks.
         if (left == right)
             return ConflictChoice::Undecided;
         return left > right ? ConflictChoice::Left : ConflictChoice::Right;

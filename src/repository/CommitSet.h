@@ -10,15 +10,16 @@
 namespace KivVcs {
 
 /// Commits, each identifier once. Holds no references, so that walking neither touches use counts nor keeps anything
-/// alive, and allocates nothing for the first few commits. At most 64 bytes a commit otherwise, also while it grows.
+/// alive. Allocates nothing for the first few commits, and takes at most 64 bytes for each further one, also while it
+/// grows.
 class CommitSet {
 public:
     CommitSet() noexcept = default;
     CommitSet(CommitSet const&) = delete;
     CommitSet& operator=(CommitSet const&) = delete;
 
-    /// @return the commit of the same identifier that is there already; null if there was none, and @p commit is there
-    /// now.
+    /// @return the commit with the same identifier that is there already; null if there was none and @p commit has been
+    /// inserted
     /// @pre @p commit outlives the set
     Commit const* Insert(Commit const& commit) {
         const std::uint64_t prefix = commit.GetIdPrefix();

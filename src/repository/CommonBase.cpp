@@ -34,7 +34,7 @@ bool Repository::FastForwardMerge(cow_ptr<Commit> commit) {
         return false;
     const auto head = GetHead();
     const auto base = GetCommonBase(head, commit);
-    // Identity of objects: a branch without a head, where both are null, goes forward to anything.
+    // Compares objects. A branch without a head, for which both are null, moves forward to any commit.
     return base == head && MoveBranchTo(Repository::GetCurentBranch(), std::move(commit));
 }
 

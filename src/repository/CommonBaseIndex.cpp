@@ -18,10 +18,11 @@ CommonBaseIndex::CommonBaseIndex(std::vector<cow_ptr<Commit>> const& heads) {
     }
 }
 
-/// Every commit at which the way down from a head meets that of another one is the base of two heads, and every base is
-/// one of these or a head itself, since an identifier determines the identifiers of all ancestors: ways that meet stay
+/// Every commit at which two heads' histories meet is the common base of these heads, and every common base is such a
+/// commit or a head itself: an identifier determines those of all ancestors, so that histories that have met stay
 /// together.
-/// @return false if there are two objects of one identifier: which of them is a base depends on who asks.
+/// @return false if there are two objects with one identifier: which of them is a base depends on the two commits asked
+/// about
 bool CommonBaseIndex::AddJunctions(std::vector<cow_ptr<Commit>> const& heads) {
     CommitSet visited;
     for (auto const& head : heads) {

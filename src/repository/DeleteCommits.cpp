@@ -14,8 +14,8 @@ struct KeptHeads {
     std::vector<std::vector<KivStringT<char16_t>>> branches;
 };
 
-/// Takes the history out of the storage. Of the old commits other than heads, one at a time is held, that of the position,
-/// so that they die as soon as nobody else holds them.
+/// Takes the history out of the storage. Of the old commits that are no heads, only the one that the walk has reached
+/// is held, so that each dies as soon as nobody else holds it.
 KeptHeads DeleteChain(IObjectsStorage& storage, cow_ptr<Commit> newest) {
     KeptHeads kept;
     for (auto position = History(std::move(newest)).begin(); position != History::Iterator(); ++position) {
@@ -50,8 +50,8 @@ bool Repository::DeleteCommits(cow_ptr<Commit> commit) {
                 break;
         }
     }
-    // What is held here survives the purge, which is right for the commits that were stored anew, even where a branch did
-    // not move, and would be wrong for the old ones.
+    // The purge must remove the old commits, and so nothing here may hold them. It must not remove those that were
+    // stored anew, even where a branch did not move.
     kept.former.clear();
     UpdateStorage();
     return true;

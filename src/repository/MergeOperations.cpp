@@ -24,7 +24,7 @@ bool Repository::Merge(cow_ptr<Commit> commit, Resolvers resolvers) {
         return false;
     if (!GetHead())
         return MoveBranchTo(GetCurentBranch(), std::move(commit));
-    // Directly: a merge means what this class does, whatever a host makes of the two operations on their own.
+    // Not as virtual calls: a merge does what this class does, even if a host overrides these two operations.
     return Repository::FastForwardMerge(commit) || Repository::Merge3Way(std::move(commit), std::move(resolvers));
 }
 

@@ -11,12 +11,12 @@ namespace {
 
 using Path = array_view<KivStringViewT<char16_t> const>;
 
-/// Stands between a merge and the host's resolvers, and keeps what was asked and answered.
+/// Passes a merge's questions on to the host's resolvers, and records questions and answers.
 class ConflictRecorder {
 public:
     explicit ConflictRecorder(Resolvers resolvers) : resolvers_(std::move(resolvers)) {}
 
-    /// Valid as long as this recorder.
+    /// The resolvers for the merge. Valid as long as this recorder lives.
     [[nodiscard]] Resolvers MakeResolvers() {
         return {[this](Path path, MergeTrees const& trees) { return AskAboutBlob(path, trees); },
                 [this](Path path, MergeTrees const& trees) { return AskAboutTree(path, trees); }};
@@ -25,8 +25,8 @@ public:
     [[nodiscard]] bool GaveUp() const noexcept { return gaveUp_; }
     [[nodiscard]] bool ChoseNoTree() const noexcept { return choseNoTree_; }
 
-    /// Everything recorded, followed by those of @p all that are not recorded and not below a directory that was settled as
-    /// a whole.
+    /// All conflicts recorded, followed by those of @p all that were not recorded and are not below a directory that
+    /// was settled as a whole.
     [[nodiscard]] std::vector<MergeConflict> TakeWithTheRestOf(std::vector<MergeConflict> all) {
         PathList known;
         for (auto const& conflict : conflicts_)
@@ -66,7 +66,7 @@ private:
         choseNoTree_ = choseNoTree_ || (path.empty() && !chosen);
     }
 
-    /// Whether the path, or how it begins, is among @p known, which ends directories with "/".
+    /// Whether @p known has the path, or a directory above it. Directories in @p known end with "/".
     static bool IsCovered(KivStringT<char16_t> const& path, PathList const& known) {
         if (std::binary_search(known.begin(), known.end(), path) || (!known.empty() && known.front().IsEmpty()))
             return true;

@@ -10,7 +10,7 @@ Repository::~Repository() = default;
 cow_ptr<Commit> Repository::DoCommit(Commit& commit) {
     if (storage_ == nullptr || (commit.IsAmend() && !GetHead()))
         return nullptr;
-    // Whole seconds, which is all that a commit's text stores.
+    // A commit's text stores whole seconds only.
     const Time now = Time::FromTimeT(Time::Now().ToTimeT(TimeZone::Utc), TimeZone::Utc);
     commit.SetCommitTime(now);
     commit.SetCommitTimezoneBias(DateTime::GetCurrentTimezoneBias(now));
@@ -18,13 +18,13 @@ cow_ptr<Commit> Repository::DoCommit(Commit& commit) {
     cow_ptr<Commit> stored = GetCommitFromStorage(commit.GetId());
     if (!stored)
         stored = SyncWithStorage(CopyOf(commit));
-    // A current branch that has been removed is not moved; the commit is stored all the same.
+    // If the current branch has been removed none is moved, but the commit is stored all the same.
     storage_->UpdateBranch(Repository::GetCurentBranch(), stored);
     return stored;
 }
 
 cow_ptr<Commit> Repository::GetHead() const {
-    // A copy of the name: what is called may make another branch current.
+    // With a copy of the name, since an override may make another branch current.
     return GetHead(Repository::GetCurentBranch());
 }
 

@@ -18,7 +18,7 @@ struct Branch {
     cow_ptr<Commit> head;
 };
 
-/// What is known of a commit of the simplified graph.
+/// A commit of the simplified graph.
 struct KeptCommit {
     /// The branches whose head it is.
     std::vector<Branch const*> branches;
@@ -29,7 +29,7 @@ struct KeptCommit {
     bool isLinked = false;
 };
 
-/// Takes the beginning of the digest as it is.
+/// Hashes an identifier by the beginning of its digest, which is random enough as it is.
 struct HashByDigest {
     std::size_t operator()(Id const& id) const noexcept {
         Id::Digest const* const digest = id.GetDigest();
@@ -64,9 +64,9 @@ public:
         return heads;
     }
 
-    /// Keeps every commit at which the way down from a head meets that of another one: the common bases of every two
-    /// heads, as long as equal commits have equal ancestors, so that ways that meet stay together.
-    /// @return false, keeping none, if they have not: identifiers of a host's classes are what the host says.
+    /// Keeps every commit at which the histories of two heads meet. These are the common bases of every two heads as
+    /// long as commits with equal identifiers have equal ancestors, so that histories that have met stay together.
+    /// @return false, keeping none, if they do not, as may be with the identifiers of hosts' classes
     bool KeepMeetings() {
         if (kept_.size() < 2)
             return true;
@@ -89,7 +89,7 @@ public:
         return true;
     }
 
-    /// Keeps the common base of every two heads, as `GetCommonBase` gives it.
+    /// Keeps the common base of every two heads, as `GetCommonBase` returns it.
     void KeepCommonBases() {
         for (auto first = branches_.begin(); first != branches_.end(); ++first) {
             for (auto second = std::next(first); second != branches_.end(); ++second) {
@@ -99,7 +99,7 @@ public:
         }
     }
 
-    /// Links every kept commit on the way down from a stored head to the nearest kept one below it.
+    /// Links every kept commit in the history of a stored head to its nearest kept ancestor.
     void Link() {
         for (auto kept = kept_.begin(); kept != kept_.end(); ++kept) {
             if (kept->second.branches.empty())
@@ -193,7 +193,7 @@ private:
 
 namespace {
 
-/// Lets a repository answer from an index while this lives.
+/// Lets a repository look common bases up in an index as long as this object lives.
 class CommonBaseLease {
 public:
     CommonBaseLease(CommonBaseIndex const*& current, CommonBaseIndex const& index) noexcept
@@ -215,9 +215,9 @@ bool Repository::SimplifyCommitGraph(bool purge) {
     {
         GraphSimplification simplification(*this, *storage_);
         if (typeid(*this) != typeid(Repository) || !simplification.KeepMeetings()) {
-            // A host may override `GetCommonBase` and is asked about every pair. Its override may ask this class, which
-            // finds the index nowhere but in the repository itself; following each pair's histories would take time in
-            // proportion to their length.
+            // A host's `GetCommonBase` is called for every pair, and may call that of this class. Without an index,
+            // each call would follow both histories; and the only place from which that call can get the index is the
+            // repository.
             const CommonBaseIndex index(simplification.Heads());
             const CommonBaseLease lease(commonBases_, index);
             simplification.KeepCommonBases();
