@@ -121,6 +121,11 @@ BadInputGetsOneLineAndChangesNothing() {
     equal "$("$vault" log | head -n 1 | wc -l)" 1
     ends 3 '' log -n 2
     equal "$(wc -l <out)" 2
+    ends 3 '' log master~14 -2
+    equal "$(sed 's/.*  //' out | xargs) $("$vault" show "$("$vault" log | head -c 9)~:f")" "3 2 16"
+    equal "$("$vault" diff master~16 ~1 f --text | grep '^[-+][0-9]' | xargs)" "-1 +16"
+    refused 'only 16 versions before' show master~17
+    refused 'no such revision' show nowhere~1
     "$vault" show master:f >/dev/full 2>err && fail "a full disk went unnoticed"
     matches "$(cat err)" 'output could not be written'
     matches "$("$vault" --help)" 'vault save' 'Exit status' 'nothing is encrypted'

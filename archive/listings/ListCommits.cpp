@@ -1,4 +1,5 @@
 #include "Changes.h"
+#include "Digits.h"
 #include "listings/ReadTrees.h"
 
 #include <KivUtils/Utf8.h>
@@ -228,6 +229,24 @@ bool HandOver(IArchive& archive, std::span<const Ancestry> commits, CommitReceiv
     return std::all_of(records.begin(), records.end(), receiver);
 }
 
+/// The identifier whose digits begin with @p digits and go on with @p rest; null if there is none.
+Id Completed(std::string_view digits, char rest) {
+    if (digits.empty() || digits.size() > digitCount)
+        return {};
+    std::string all(digits);
+    all.resize(digitCount, rest);
+    return Id::Parse(all).value_or(Id());
+}
+
+/// The identifier before @p id in their order; null for the first one.
+Id Before(Id const& id) {
+    Id::Digest digest = *id.GetDigest();
+    for (auto byte = digest.rbegin(); byte != digest.rend(); ++byte)
+        if ((*byte)-- != 0)
+            return Id::FromDigest(digest);
+    return {};
+}
+
 } // namespace
 
 void ListCommits(IArchive& archive, std::span<const Id> heads, CommitListOptions const& options,
@@ -275,6 +294,19 @@ std::vector<CommitRecord> ReadCommits(IArchive& archive, std::span<const Id> com
         rest = rest.subspan(batch.size());
     }
     return records;
+}
+
+std::vector<Id> FindCommits(IArchive& archive, std::string_view digits, std::size_t atMost) {
+    Id const first = Completed(digits, '0');
+    Id const last = Completed(digits, 'f');
+    if (first.IsEmpty())
+        return {};
+    std::vector<Id> found;
+    for (Ancestry const& facts :
+         archive.ListAncestry(Before(first), first == last ? std::min<std::size_t>(atMost, 1) : atMost))
+        if (first <= facts.commit && facts.commit <= last)
+            found.push_back(facts.commit);
+    return found;
 }
 
 } // namespace KivArchive

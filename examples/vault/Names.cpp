@@ -124,6 +124,8 @@ bool ComesBefore(std::string_view left, std::string_view right) noexcept {
 }
 
 std::string PrintableName(std::string_view storedPath) {
+    if (std::all_of(storedPath.begin(), storedPath.end(), [](char c) { return c >= 0x20 && c < 0x7F && c != '\\'; }))
+        return std::string(storedPath);
     std::string text;
     const auto appendEscaped = [&text](unsigned char byte) {
         text += "\\x";

@@ -59,13 +59,16 @@ std::string JsonCommit(CommitRecord const& commit) {
 }
 
 bool IsTerminal() noexcept {
-    return isatty(STDOUT_FILENO) == 1;
+    static const bool isTerminal = isatty(STDOUT_FILENO) == 1;
+    return isTerminal;
 }
 
 std::string Coloured(std::string_view text, Colour colour) {
+    if (!IsTerminal())
+        return std::string(text);
     // NOLINTNEXTLINE(concurrency-mt-unsafe): nobody changes the environment
     auto const* const noColour = std::getenv("NO_COLOR");
-    if (!IsTerminal() || (noColour != nullptr && *noColour != '\0'))
+    if (noColour != nullptr && *noColour != '\0')
         return std::string(text);
     return "\x1b[" + std::to_string(static_cast<int>(colour)) + 'm' + std::string(text) + "\x1b[0m";
 }

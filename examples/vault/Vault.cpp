@@ -11,6 +11,7 @@
 
 #include <KivArchive/SqliteArchive.h>
 #include <algorithm>
+#include <charconv>
 #include <fstream>
 #include <sstream>
 #include <sys/stat.h>
@@ -25,18 +26,13 @@ constexpr char16_t const* currentBranchRecord = u"vault/branch";
 /// Of an identifier's beginning; shorter ones are rather names, of directories or of branches that are not there.
 constexpr std::size_t leastDigits = 4;
 
-/// The greatest identifier before all that begin with @p digits; null if there is none.
-Id Before(std::string digits) {
-    digits.resize(64, '0');
-    const auto first = Id::Parse(digits);
-    if (!first || first->GetDigest() == nullptr)
-        return {};
-    auto digest = *first->GetDigest();
-    for (auto byte = digest.rbegin(); byte != digest.rend(); ++byte) {
-        if ((*byte)-- != 0)
-            return Id::FromDigest(digest);
-    }
-    return {};
+/// As many as are told apart where a beginning is not unique.
+constexpr std::size_t mostFound = 16;
+
+CommitRecord RequireSound(CommitRecord commit) {
+    if (commit.state != KivArchive::CommitState::Sound)
+        throw Problem("version " + DigitsOf(commit.id) + " is damaged or missing", findingsExitStatus);
+    return commit;
 }
 
 /// Who is writing to a vault, or nobody that can be seen from here. SQLite's own files are not opened for that: the locks of
@@ -90,8 +86,6 @@ Vault::Vault(VaultPlace const& place, Access access)
     if (isThere && S_ISDIR(status.st_mode))
         throw Problem(PrintableName(StoredName(place.file)) + " is a directory, not a vault file");
     isMadeHere_ = !isThere;
-    if (isThere)
-        UpgradeOldVault(file_, place.wait);
     KivArchive::SqliteOptions options;
     options.create = access == Access::Create;
     options.wait = place.wait;
@@ -99,7 +93,14 @@ Vault::Vault(VaultPlace const& place, Access access)
         if (!hasTold_.test_and_set())
             TellWhoWrites(file_, wait);
     };
-    archive_ = std::make_shared<KivArchive::SqliteArchive>(file_, options);
+    try {
+        archive_ = std::make_shared<KivArchive::SqliteArchive>(file_, options);
+    } catch (KivArchive::ArchiveError const& error) {
+        if (error.GetKind() != KivArchive::Failure::Foreign)
+            throw;
+        UpgradeOldVault(file_, place.wait);
+        archive_ = std::make_shared<KivArchive::SqliteArchive>(file_, options);
+    }
     stored_ = archive_;
 }
 
@@ -160,38 +161,64 @@ Id Vault::RequireBranch(std::string const& name) const {
 }
 
 CommitRecord Vault::Find(std::string const& revision) const {
-    const auto name = revision.empty() ? CurrentBranch() : RequireUtf8(revision, "the revision");
-    Id id = HeadOf(name);
-    const auto isIdentifier = [&revision](std::size_t least) {
-        return revision.size() >= least && revision.size() <= 64 &&
-               revision.find_first_not_of(hexDigits) == std::string::npos;
-    };
-    if (id.IsEmpty() && !isIdentifier(64) && (revision.empty() || name == CurrentBranch()))
-        throw Problem("branch " + Printable(name) + " has no versions yet");
-    if (id.IsEmpty() && isIdentifier(leastDigits)) {
-        std::vector<Id> found;
-        for (auto const& facts : archive_->ListAncestry(Before(revision), 16)) {
-            if (DigitsOf(facts.commit).starts_with(revision))
-                found.push_back(facts.commit);
-        }
-        const auto missing = archive_->FindMissing(found);
-        if (missing.size() == found.size() && !found.empty())
-            throw Problem("version " + Printable(revision) + " has been forgotten");
-        std::erase_if(found,
-                      [&](Id const& one) { return std::find(missing.begin(), missing.end(), one) != missing.end(); });
-        if (found.size() > 1)
-            throw Problem("ambiguous revision: " + Printable(revision) + " begins " + std::to_string(found.size()) +
-                          " identifiers");
-        if (!found.empty())
-            id = found.front();
-    }
-    if (id.IsEmpty())
-        throw Problem("no such revision: " + Printable(revision) +
-                      " (a branch or an identifier, with :PATH behind it for a file of a version)");
-    auto commits = KivArchive::ReadCommits(*archive_, std::span(&id, 1));
-    if (commits.empty() || commits.front().state != KivArchive::CommitState::Sound)
-        throw Problem("version " + DigitsOf(id) + " is damaged or missing", findingsExitStatus);
-    return std::move(commits.front());
+    if (auto found = TryFind(revision))
+        return *std::move(found);
+    throw Problem("no such revision: " + Printable(revision) +
+                  " (a branch or an identifier, with :PATH behind it for a file of a version)");
+}
+
+std::optional<CommitRecord> Vault::TryFind(std::string const& revision) const {
+    const auto name = revision.empty() ? CurrentBranch() : FromUtf8(revision);
+    if (!name)
+        return std::nullopt;
+    const auto head = HeadOf(*name);
+    if (!head.IsEmpty())
+        return RequireSound(KivArchive::ReadCommits(*archive_, std::span(&head, 1)).front());
+    if (const auto earlier = ReadEarlier(revision))
+        return FindEarlier(*earlier);
+    const auto whole = Id::Parse(revision);
+    if (!whole && (revision.empty() || name == CurrentBranch()))
+        throw Problem("branch " + Printable(*name) + " has no versions yet");
+    std::vector<Id> ids;
+    if (whole)
+        ids.push_back(*whole);
+    else if (revision.size() >= leastDigits)
+        ids = KivArchive::FindCommits(*archive_, revision, mostFound);
+    auto commits = KivArchive::ReadCommits(*archive_, ids);
+    const auto isMissing = [](CommitRecord const& commit) { return commit.state == KivArchive::CommitState::Missing; };
+    const bool isForgotten =
+        std::any_of(commits.begin(), commits.end(), [](CommitRecord const& commit) { return !commit.tree.IsEmpty(); });
+    std::erase_if(commits, isMissing);
+    if (commits.size() > 1)
+        throw Problem("ambiguous revision: " + Printable(revision) + " begins " + std::to_string(commits.size()) +
+                      " identifiers");
+    if (!commits.empty())
+        return RequireSound(std::move(commits.front()));
+    if (isForgotten)
+        throw Problem("version " + Printable(revision) + " has been forgotten");
+    return std::nullopt;
+}
+
+std::optional<Vault::Earlier> Vault::ReadEarlier(std::string const& revision) {
+    const auto tilde = revision.rfind('~');
+    if (tilde == std::string::npos)
+        return std::nullopt;
+    Earlier earlier{revision.substr(0, tilde)};
+    auto const* const last = revision.data() + revision.size();
+    auto const* const first = revision.data() + tilde + 1;
+    const auto [end, error] = std::from_chars(first, last, earlier.steps);
+    return first == last || (error == std::errc() && end == last) ? std::optional(std::move(earlier)) : std::nullopt;
+}
+
+std::optional<CommitRecord> Vault::FindEarlier(Earlier const& earlier) const {
+    const auto later = TryFind(earlier.revision);
+    if (!later)
+        return std::nullopt;
+    const auto line = archive_->ReadAncestry(std::span(&later->id, 1), KivArchive::Follow::Parents, earlier.steps);
+    if (line.size() <= earlier.steps)
+        throw Problem("there are only " + std::to_string(line.size() - std::min<std::size_t>(line.size(), 1)) +
+                      " versions before " + Shortened(later->id));
+    return TryFind(DigitsOf(line[earlier.steps].commit));
 }
 
 Target Vault::FindTarget(std::string const& target) const {

@@ -8,6 +8,7 @@
 #include <atomic>
 #include <chrono>
 #include <memory>
+#include <optional>
 
 namespace vault {
 
@@ -61,13 +62,25 @@ public:
     [[nodiscard]] Id RequireBranch(std::string const& name) const;
 
     /// The commit that is the head of a branch of that name, or whose identifier it is, or begins with at least four
-    /// digits; the head of the current branch if @p revision is empty.
+    /// digits; or with "~N" behind that, the one N versions before; the head of the current branch if @p revision is empty.
     /// @throws Problem if there is none, more than one, or it is damaged
     [[nodiscard]] CommitRecord Find(std::string const& revision) const;
+    /// The same, but nothing if there is none.
+    [[nodiscard]] std::optional<CommitRecord> TryFind(std::string const& revision) const;
     /// What REVISION or REVISION:PATH leads to. @throws Problem
     [[nodiscard]] Target FindTarget(std::string const& target) const;
 
 private:
+    /// What is that many versions before another one.
+    struct Earlier {
+        std::string revision;
+        std::size_t steps = 1;
+    };
+
+    /// Splits "master~3", which is three versions before "master"; "master~" is one before.
+    [[nodiscard]] static std::optional<Earlier> ReadEarlier(std::string const& revision);
+    [[nodiscard]] std::optional<CommitRecord> FindEarlier(Earlier const& earlier) const;
+
     std::string file_;
     /// Whether it has been said whom this one waits for.
     std::atomic_flag hasTold_;

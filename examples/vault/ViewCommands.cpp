@@ -172,12 +172,8 @@ std::pair<CommitRecord, std::optional<std::string>> FindHistory(Vault const& vau
     const auto revision = target.substr(0, colon);
     if (colon != std::string::npos)
         return {vault.Find(revision), StoredPath(std::string_view(target).substr(colon + 1))};
-    try {
-        return {vault.Find(revision), std::nullopt};
-    } catch (Problem const& problem) {
-        if (revision.empty() || problem.ExitStatus() == findingsExitStatus)
-            throw;
-    }
+    if (auto found = vault.TryFind(revision))
+        return {*std::move(found), std::nullopt};
     // Not a revision: a path, then.
     auto head = vault.Find("");
     auto path = StoredPath(revision);

@@ -9,6 +9,7 @@
 #include <KivVcs/Differences.h>
 
 #include <limits>
+#include <string_view>
 
 namespace KivArchive {
 
@@ -62,6 +63,12 @@ KIVARCHIVE_EXPORT void ListCommits(IArchive& archive, std::span<const Id> heads,
 
 /// The same for these commits only, in the order given. Those without facts have the links of their packed form.
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<CommitRecord> ReadCommits(IArchive& archive, std::span<const Id> commits);
+
+/// The commits whose identifiers begin with @p digits, as people type them: hexadecimal ones of either case. Ordered by
+/// identifier, at most @p atMost; none for what is no beginning of an identifier, and for no digits at all. Commits of which
+/// only the facts are left are among them: `ReadCommits` tells them apart. One call of the archive.
+[[nodiscard]] KIVARCHIVE_EXPORT std::vector<Id> FindCommits(IArchive& archive, std::string_view digits,
+                                                            std::size_t atMost);
 
 /// What a directory holds under a name, or a version under a path: a file, or a directory.
 struct EntryRecord {

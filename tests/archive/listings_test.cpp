@@ -162,6 +162,22 @@ TEST_F(Listings, OfHistoriesShowWhatCommitsSay) {
         changing.resize(std::min<std::size_t>(7, changing.size()));
         EXPECT_EQ(List(head->GetId(), options), changing);
     }
+    std::set<std::string> digits;
+    for (auto const& commit : commits)
+        digits.insert(DigitsOf(commit->GetId()));
+    std::string const some = *std::next(digits.begin(), 700);
+    for (std::string const& begun : {std::string("0"), std::string("00"), std::string("7"), std::string("f"),
+                                     std::string("ff"), some.substr(0, 2), some.substr(0, 9), some}) {
+        std::vector<std::string> found;
+        for (Id const& id : FindCommits(archive_, begun, 50))
+            found.push_back(DigitsOf(id));
+        std::vector<std::string> wanted(digits.lower_bound(begun), digits.lower_bound(begun + 'g'));
+        wanted.resize(std::min<std::size_t>(50, wanted.size()));
+        EXPECT_EQ(found, wanted) << begun;
+    }
+    EXPECT_EQ(FindCommits(archive_, "F", 3), FindCommits(archive_, "f", 3));
+    for (std::string const& begun : {std::string(), std::string("g"), some + "0"})
+        EXPECT_TRUE(FindCommits(archive_, begun, 50).empty());
 }
 
 TEST_F(Listings, OfGraphsShowNoCommitBeforeOneThatLeadsToIt) {
