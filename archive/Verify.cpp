@@ -24,7 +24,7 @@ public:
             VerifyBatch(batch);
         }
         VerifyBranches();
-        ForgetWhatCameLater();
+        DropLaterObjects();
         return std::move(report_);
     }
 
@@ -106,7 +106,7 @@ private:
     }
 
     /// Drops what was stored while the objects were listed, which only seemed to be missing.
-    void ForgetWhatCameLater() {
+    void DropLaterObjects() {
         std::vector<Id> const ids(missing_.begin(), missing_.end());
         auto const missing = archive_.FindMissing(ids);
         std::unordered_set<Id> const still(missing.begin(), missing.end());

@@ -219,7 +219,7 @@ void KeepChanging(IArchive& archive, KivStringT<char16_t> const& path, std::vect
 }
 
 /// Passes the records of @p commits on. @return false if the receiver ended the listing
-bool HandOver(IArchive& archive, std::span<const Ancestry> commits, CommitReceiver const& receiver) {
+bool PassOn(IArchive& archive, std::span<const Ancestry> commits, CommitReceiver const& receiver) {
     std::vector<CommitRecord> records(commits.size());
     for (std::size_t i = 0; i < records.size(); ++i) {
         records[i].id = commits[i].commit;
@@ -268,7 +268,7 @@ void ListCommits(IArchive& archive, std::span<const Id> heads, CommitListOptions
             KeepChanging(archive, *options.changing, batch);
         batch.resize(static_cast<std::size_t>(std::min<std::uint64_t>(batch.size(), options.atMost - given)));
         given += batch.size();
-        if (!HandOver(archive, batch, receiver) || given == options.atMost)
+        if (!PassOn(archive, batch, receiver) || given == options.atMost)
             return;
         batchSize = std::min(2 * batchSize, listedAtOnce);
         if (!options.changing)

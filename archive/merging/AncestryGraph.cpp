@@ -29,7 +29,7 @@ void AncestryGraph::BeginWalk() {
     ++walk_;
 }
 
-void AncestryGraph::Learn(Ancestry const& facts) {
+void AncestryGraph::AddFacts(Ancestry const& facts) {
     Node const node = Enter(facts.commit);
     if (entries_[node].isRead)
         return;
@@ -53,7 +53,7 @@ void AncestryGraph::Read(std::span<const Node> nodes, std::size_t more) {
     for (Node const node : nodes)
         ids.push_back(CommitOf(node));
     for (Ancestry const& facts : read_(ids, more))
-        Learn(facts);
+        AddFacts(facts);
     // Those without facts are read as well: nothing is known of them.
     for (Node const node : nodes)
         entries_[node].isRead = true;

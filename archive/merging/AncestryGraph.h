@@ -78,7 +78,7 @@ private:
     [[nodiscard]] Mark& MarkOf(Node node) noexcept;
     void BeginWalk();
     void Read(std::span<const Node> nodes, std::size_t more);
-    void Learn(Ancestry const& facts);
+    void AddFacts(Ancestry const& facts);
     [[nodiscard]] std::vector<Node> Reach(Node from, std::uint8_t side);
     [[nodiscard]] std::vector<Node> OrderCommon(std::vector<Node> const& reached);
     /// @return the cycle of each, its smallest identifier first

@@ -69,8 +69,8 @@ cow_ptr<Tree> const& VersionTrees::DirectoryOf(Node version) {
 EntryBases::EntryBases(MergeSources const& sources, MergeSide const& left, MergeSide const& right)
     : graph_(sources.ancestry), versions_(sources, graph_),
       sides_(Ordered(graph_.Enter(left.commit), graph_.Enter(right.commit))) {
-    versions_.Give(graph_.Enter(left.commit), left.tree);
-    versions_.Give(graph_.Enter(right.commit), right.tree);
+    versions_.SetTree(graph_.Enter(left.commit), left.tree);
+    versions_.SetTree(graph_.Enter(right.commit), right.tree);
 }
 
 AncestryGraph::Meeting const* EntryBases::MeetingOf(Pair pair) {
@@ -138,15 +138,15 @@ BaseEntry EntryBases::Find(Pair pair, KivStringT<char16_t> const* name, Found& f
     // Finding it may lead back to this pair, for which there is no base then.
     found.entries.emplace(pair, BaseEntry());
     ++found.depth;
-    BaseEntry base = meeting->bases.empty() ? HeldEntry() : BringTogether(pair, meeting->arrivals, name, found);
+    BaseEntry base = meeting->bases.empty() ? HeldEntry() : CombineBases(pair, meeting->arrivals, name, found);
     --found.depth;
     found.entries.insert_or_assign(pair, base);
     return base;
 }
 
 // NOLINTNEXTLINE(misc-no-recursion): no deeper than `deepest`
-BaseEntry EntryBases::BringTogether(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
-                                    Found& found) {
+BaseEntry EntryBases::CombineBases(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
+                                   Found& found) {
     for (Node const base : bases)
         if (versions_.IsGone(base))
             return {};

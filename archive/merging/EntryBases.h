@@ -37,7 +37,7 @@ public:
     VersionTrees(MergeSources const& sources, AncestryGraph const& graph) : sources_(sources), graph_(graph) {}
 
     /// Sets the tree of a version, which is not asked for then.
-    void Give(AncestryGraph::Node version, cow_ptr<Tree> tree) { levels_.front().emplace(version, std::move(tree)); }
+    void SetTree(AncestryGraph::Node version, cow_ptr<Tree> tree) { levels_.front().emplace(version, std::move(tree)); }
 
     /// The view must stay valid until `Leave`.
     void Enter(KivStringT<char16_t> const& name);
@@ -94,8 +94,8 @@ private:
 
     [[nodiscard]] AncestryGraph::Meeting const* MeetingOf(Pair pair);
     [[nodiscard]] BaseEntry Find(Pair pair, KivStringT<char16_t> const* name, Found& found);
-    [[nodiscard]] BaseEntry BringTogether(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
-                                          Found& found);
+    [[nodiscard]] BaseEntry CombineBases(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name,
+                                         Found& found);
     [[nodiscard]] BaseEntry DecidedByBoth(Pair pair, std::vector<Node> const& bases, KivStringT<char16_t> const* name);
     [[nodiscard]] std::vector<Node> const& FirstWithAll(Node side, Node other, std::vector<Node> const& bases);
     [[nodiscard]] bool IsChangedBy(Node base, std::vector<Node> const& bases, KivStringT<char16_t> const* name,

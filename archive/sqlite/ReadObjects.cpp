@@ -58,7 +58,7 @@ Found ReadOne(FormReader& reader, Id const& id, ObjectRow const& row) {
 }
 
 /// Passes an object on if it matches its identifier. @return false if not
-bool HandOver(Found const& found, ObjectReceiver const& receiver) {
+bool PassOn(Found const& found, ObjectReceiver const& receiver) {
     if (found.form.owner == nullptr)
         return false;
     ObjectType const type = TypeOf(found.type);
@@ -145,7 +145,7 @@ ReadOutcome SqliteArchive::Read(std::span<const Id> ids, ObjectReceiver const& r
             transaction.Commit();
         }
         for (Found& found : window) {
-            if (!HandOver(found, receiver)) {
+            if (!PassOn(found, receiver)) {
                 store_->cache.Clear();
                 // It may have been collected since it was located.
                 bool const isThere = FindRow(connection->database, *found.id).has_value();

@@ -36,7 +36,7 @@ std::unique_ptr<Connection> SqliteStore::Take() {
     return made;
 }
 
-void SqliteStore::GiveBack(std::unique_ptr<Connection> connection) noexcept {
+void SqliteStore::ReturnConnection(std::unique_ptr<Connection> connection) noexcept {
     std::scoped_lock const lock(connectionsMutex);
     if (connections.size() < maximumIdle)
         connections.push_back(std::move(connection));

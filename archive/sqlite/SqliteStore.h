@@ -145,7 +145,7 @@ public:
         explicit Lease(SqliteStore& store) : store_(store), connection_(store.Take()) {}
         Lease(Lease const&) = delete;
         Lease& operator=(Lease const&) = delete;
-        ~Lease() { store_.GiveBack(std::move(connection_)); }
+        ~Lease() { store_.ReturnConnection(std::move(connection_)); }
 
         Connection& operator*() const noexcept { return *connection_; }
         Connection* operator->() const noexcept { return connection_.get(); }
@@ -156,7 +156,7 @@ public:
     };
 
     [[nodiscard]] std::unique_ptr<Connection> Take();
-    void GiveBack(std::unique_ptr<Connection> connection) noexcept;
+    void ReturnConnection(std::unique_ptr<Connection> connection) noexcept;
 
     /// Stores @p items with the rest of @p change, which has no objects of its own.
     [[nodiscard]] ChangeOutcome Store(std::vector<Item> const& items, Change const& change);

@@ -257,7 +257,7 @@ void FetchLarge(std::shared_ptr<IArchive> const& archive, std::string const& pat
 }
 
 /// Writes the most memory that this process has had, in MiB, where it is asked for.
-void TellPeak() {
+void WritePeak() {
     const char* const target = std::getenv("ARCHIVE_BENCH_PEAK"); // NOLINT(concurrency-mt-unsafe): one thread is left
     if (target == nullptr)
         return;
@@ -302,7 +302,7 @@ int Run(std::vector<std::string> const& arguments) {
     } else {
         throw std::invalid_argument("there is no command " + command);
     }
-    TellPeak();
+    WritePeak();
     return 0;
 }
 

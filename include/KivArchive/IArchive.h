@@ -158,7 +158,7 @@ struct Change {
 struct ChangeOutcome {
     /// False if the race was lost: nothing has been stored then.
     bool applied = false;
-    /// The branches that stood elsewhere than expected, with their heads now; null for none.
+    /// The branches that had another head than expected, with their heads now; null for none.
     std::vector<Branch> movedBranches;
     /// The records that had another value than expected, with their values now.
     std::vector<Record> changedRecords;
@@ -169,7 +169,7 @@ struct ArchiveStatistics {
     std::uint64_t blobs = 0;
     std::uint64_t trees = 0;
     std::uint64_t commits = 0;
-    /// The commits whose ancestry is known.
+    /// The commits that have facts.
     std::uint64_t ancestries = 0;
     std::uint64_t branches = 0;
     std::uint64_t records = 0;
@@ -242,8 +242,8 @@ public:
     /// The names of all records, ordered.
     [[nodiscard]] virtual std::vector<KivStringT<char16_t>> ListRecords() = 0;
 
-    /// The facts of those of @p commits that are known, and then those of up to @p more commits that they lead to,
-    /// nearest first, each once.
+    /// The facts of those of @p commits that have any, and then of up to @p more commits that these lead to, nearest
+    /// first, each once.
     [[nodiscard]] virtual std::vector<Ancestry> ReadAncestry(std::span<const Id> commits, Follow follow,
                                                              std::size_t more) = 0;
 

@@ -11,10 +11,11 @@
 #include <stdlib.h>
 #include <string>
 
-/// What the tests of archives in files share.
+/// Helpers for the tests of archives in files.
 namespace KivArchive {
 
-/// A directory for one test's files; in memory where the system has such a place, since the tests are not about disks.
+/// A directory for the files of one test; in memory where the system has such a place, since no test depends on the
+/// disk.
 class TemporaryDirectory {
 public:
     TemporaryDirectory() {
@@ -45,13 +46,13 @@ inline std::string ReadFile(std::string const& path) {
 }
 
 inline void WriteFile(std::string const& path, std::string const& bytes) {
-    // What belonged to another file of that name must not be taken for this one's.
+    // A log of an earlier file with that name must not be taken for this one's.
     for (const char* const suffix : {"", "-wal", "-shm", "-journal"})
         std::filesystem::remove(path + suffix);
     std::ofstream(path, std::ios::binary).write(bytes.data(), static_cast<std::streamsize>(bytes.size()));
 }
 
-/// What `Verify` finds wrong, in words; empty if nothing is.
+/// Describes what `Verify` finds wrong; empty for nothing.
 inline std::string ProblemsOf(IArchive& archive) {
     VerifyReport const report = Verify(archive, nullptr);
     if (report.IsSound())
@@ -66,10 +67,10 @@ inline Id HeadOf(IArchive& archive) {
     return branches.empty() ? Id() : branches.front().head;
 }
 
-/// Publishes versions on "master": each edits a text and a directory, every fourth brings a large content.
+/// Publishes versions on "master". Each edits a text and a directory; every fourth adds a large content.
 class SmallHost {
 public:
-    /// Goes on where the archive stands. @param seed what the edits depend on
+    /// Continues from the archive's head. @param seed the edits depend on it
     SmallHost(IArchive& archive, std::uint32_t seed)
         : archive_(archive), seed_(seed), head_(HeadOf(archive)), text_(Conformance::SomeText(seed, 30000)) {}
 
@@ -118,7 +119,7 @@ private:
     std::string text_;
 };
 
-/// A number that the environment sets, for trials that can be made longer.
+/// A number from the environment, for trials that can be made longer.
 inline int CountFromEnvironment(const char* name, int otherwise) {
     const char* const value = std::getenv(name);
     return value == nullptr ? otherwise : std::atoi(value);

@@ -6,19 +6,19 @@
 
 namespace KivArchive {
 
-/// SQLite's files, of which one access after the other can be made to fail. On one thread only.
+/// SQLite's files, with one access after the other made to fail. On one thread only.
 class FaultyFiles {
 public:
     struct Fault {
-        /// Which access fails, counted from 1; none for 0.
+        /// The number of the access that fails, from 1 on; 0 for none.
         long number = 0;
         int code = SQLITE_IOERR;
-        /// Whether later ones fail, too.
+        /// Whether all later accesses fail, too.
         bool staysSo = false;
         bool isOnlyWrites = false;
     };
 
-    /// Makes these the files that SQLite uses, over those that it used.
+    /// Lets SQLite use these files, which pass calls on to those that it used before.
     static void Install() {
         Own().plain = sqlite3_vfs_find(nullptr);
         Own().faulty = *Own().plain;
@@ -35,7 +35,7 @@ public:
         Own().isArmed = true;
     }
 
-    /// @return whether the access that was to fail has been made
+    /// @return whether an access has failed
     static bool Disarm() {
         Own().isArmed = false;
         return Own().made >= Own().fault.number;
@@ -50,7 +50,7 @@ private:
         bool isArmed = false;
     };
 
-    /// What SQLite opens: ours, and behind it the plain one.
+    /// What SQLite opens: this file, followed by the plain one.
     struct File {
         sqlite3_file base;
         sqlite3_file* Plain() noexcept { return reinterpret_cast<sqlite3_file*>(this + 1); }
@@ -61,7 +61,7 @@ private:
         return own;
     }
 
-    /// The failure of this access, if it is its turn.
+    /// Counts an access. @return its failure, if it is the one to fail
     static int Meet(bool isWrite) {
         State& own = Own();
         if (!own.isArmed || (own.fault.isOnlyWrites && !isWrite))
@@ -89,18 +89,18 @@ private:
         return Own().plain->xDelete(Own().plain, name, sync);
     }
 
-    /// Hands a call on to the plain file.
+    /// Passes a call on to the plain file.
     template <auto Method, class Result, class... Arguments>
-    static Result HandOn(sqlite3_file* file, Arguments... arguments) {
+    static Result PassOn(sqlite3_file* file, Arguments... arguments) {
         return (Plain(file)->pMethods->*Method)(Plain(file), arguments...);
     }
 
-    /// Hands a call on unless it is its turn to fail, with @p failure, or with @p full where the disk is full.
+    /// Passes a call on, unless it is the one to fail: with @p failure, or with @p full where the disk is full.
     template <auto Method, bool isWrite, int failure, int full = failure, class... Arguments>
     static int Try(sqlite3_file* file, Arguments... arguments) {
         if (int const code = Meet(isWrite); code != SQLITE_OK)
             return code == SQLITE_FULL ? full : failure;
-        return HandOn<Method, int>(file, arguments...);
+        return PassOn<Method, int>(file, arguments...);
     }
 
     static sqlite3_io_methods const& Methods() {
@@ -108,22 +108,22 @@ private:
         static IoMethods const methods = [] {
             IoMethods made{};
             made.iVersion = 2;
-            made.xClose = HandOn<&IoMethods::xClose>;
+            made.xClose = PassOn<&IoMethods::xClose>;
             made.xRead = Try<&IoMethods::xRead, false, SQLITE_IOERR_READ>;
             made.xWrite = Try<&IoMethods::xWrite, true, SQLITE_IOERR_WRITE, SQLITE_FULL>;
             made.xTruncate = Try<&IoMethods::xTruncate, true, SQLITE_IOERR_TRUNCATE>;
             made.xSync = Try<&IoMethods::xSync, true, SQLITE_IOERR_FSYNC, SQLITE_FULL>;
             made.xFileSize = Try<&IoMethods::xFileSize, false, SQLITE_IOERR_FSTAT>;
-            made.xLock = HandOn<&IoMethods::xLock>;
-            made.xUnlock = HandOn<&IoMethods::xUnlock>;
-            made.xCheckReservedLock = HandOn<&IoMethods::xCheckReservedLock>;
-            made.xFileControl = HandOn<&IoMethods::xFileControl>;
-            made.xSectorSize = HandOn<&IoMethods::xSectorSize>;
-            made.xDeviceCharacteristics = HandOn<&IoMethods::xDeviceCharacteristics>;
+            made.xLock = PassOn<&IoMethods::xLock>;
+            made.xUnlock = PassOn<&IoMethods::xUnlock>;
+            made.xCheckReservedLock = PassOn<&IoMethods::xCheckReservedLock>;
+            made.xFileControl = PassOn<&IoMethods::xFileControl>;
+            made.xSectorSize = PassOn<&IoMethods::xSectorSize>;
+            made.xDeviceCharacteristics = PassOn<&IoMethods::xDeviceCharacteristics>;
             made.xShmMap = Try<&IoMethods::xShmMap, true, SQLITE_IOERR_SHMMAP>;
-            made.xShmLock = HandOn<&IoMethods::xShmLock>;
-            made.xShmBarrier = HandOn<&IoMethods::xShmBarrier>;
-            made.xShmUnmap = HandOn<&IoMethods::xShmUnmap>;
+            made.xShmLock = PassOn<&IoMethods::xShmLock>;
+            made.xShmBarrier = PassOn<&IoMethods::xShmBarrier>;
+            made.xShmUnmap = PassOn<&IoMethods::xShmUnmap>;
             return made;
         }();
         return methods;

@@ -4,7 +4,7 @@
 
 namespace KivArchive {
 
-/// An archive that passes every call on to another one; what derives from it looks at the calls on their way.
+/// An archive that passes every call on to another one. Derived classes count or change calls.
 class ForwardingArchive : public IArchive {
 public:
     std::vector<Id> FindMissing(std::span<const Id> ids) override { return Reach().FindMissing(ids); }
@@ -45,7 +45,7 @@ public:
     ArchiveStatistics GetStatistics() override { return Reach().GetStatistics(); }
 
 protected:
-    /// The other one, for one call.
+    /// Returns the other archive, once for each call.
     virtual IArchive& Reach() = 0;
 };
 

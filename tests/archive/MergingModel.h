@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-/// Somebody who forgets nothing, beside parties that merge again and again.
+/// A plain model of merging again and again, which never forgets a version.
 
 namespace KivArchive {
 
@@ -26,10 +26,10 @@ inline bool AnyRelated(Paths const& paths, std::string const& path) {
     return std::any_of(paths.begin(), paths.end(), [&](auto const& one) { return AreRelated(one, path); });
 }
 
-/// What is true of a version, whoever knows of it.
+/// A version, whichever parties know it.
 struct ModelVersion {
     FilesByPath files;
-    /// Contents that came up with it.
+    /// The files with contents that no version had before.
     Paths written;
     /// What was edited or asked about, and what else differed between the sides that it merged.
     Paths decided;
@@ -52,7 +52,7 @@ inline Paths DifferingPaths(FilesByPath const& left, FilesByPath const& right) {
     return paths;
 }
 
-/// What versions contain, as far as somebody has been told.
+/// What versions contain, as far as one party knows.
 class Knowledge {
 public:
     using Id = KivVcs::Id;
@@ -84,7 +84,7 @@ private:
     std::map<Id, std::set<Id>> contained_;
 };
 
-/// Two versions as somebody sees them who is about to merge them.
+/// Two versions that a party is about to merge, with what it knows of them.
 class ModelMerge {
 public:
     using Id = KivVcs::Id;
@@ -105,11 +105,12 @@ public:
         return paths;
     }
 
-    /// Whether each side has decided about a path since the other one knew of it, or merged versions that differ there.
+    /// Whether each side has decided about a path where the other side does not contain the decision; with @p orMerged,
+    /// also whether it has merged versions that differ there.
     [[nodiscard]] bool BothChanged(std::string const& path, bool orMerged) const {
         return HasChanged(inLeft_, inRight_, path, orMerged) && HasChanged(inRight_, inLeft_, path, orMerged);
     }
-    /// Whether versions that contain each other have different things there, so that nobody can say which is older.
+    /// Whether versions that contain each other differ there, so that neither is the older one.
     [[nodiscard]] bool IsInDoubt(std::string const& path) const {
         for (Id const& one : inLeft_) {
             if (inRight_.count(one) == 0 || versions_.count(one) == 0)

@@ -15,7 +15,7 @@ namespace KivArchive {
 
 using namespace KivVcs;
 
-/// What a round has found: how often questions were asked and so on, faults, and what was done.
+/// The account of a round: counts of questions and other events, faults, and the steps taken.
 struct Account {
     std::map<std::string, std::uint64_t> counts;
     std::vector<std::string> faults;
@@ -34,7 +34,7 @@ inline std::string ShortId(Id const& id) {
     return files;
 }
 
-/// Commits at the times that it is told, so that the same steps give the same identifiers.
+/// Commits at given times, so that the same steps give the same identifiers.
 class TimedRepository : public ArchivedRepository {
 public:
     TimedRepository(std::shared_ptr<IArchive> archive, RepositoryOptions const& options, std::int64_t const& seconds)
@@ -48,7 +48,7 @@ public:
         return stored;
     }
 
-    /// What is known of a commit that has come up on the way to others.
+    /// The facts of a commit that others lead to.
     [[nodiscard]] std::vector<Ancestry> FactsOf(Id const& commit) const {
         return ReadAncestry({&commit, 1}, Follow::Everything, 0);
     }
@@ -64,7 +64,7 @@ private:
                       ContainedCommit{Containment::RewrittenFrom, version}) != 0;
 }
 
-/// Whether a version was put on a rewritten one, and that then gave way to another one with its tree.
+/// Whether a version was rebased onto a rewritten one, and then replaced by another commit with the same tree.
 [[nodiscard]] inline bool GaveWayRewritten(TimedRepository const& repo, Id const& version) {
     Ancestry const facts = repo.FactsOf(repo.GetHead()->GetId()).front();
     return std::any_of(facts.contains.begin(), facts.contains.end(), [&](ContainedCommit const& each) {
@@ -74,7 +74,7 @@ private:
     });
 }
 
-/// An archive, and what those know who share it.
+/// An archive, and what the parties that share it know.
 struct SharedArchive {
     std::shared_ptr<MemArchive> archive = std::make_shared<MemArchive>();
     Knowledge known;
@@ -83,16 +83,16 @@ struct SharedArchive {
 struct Party {
     std::shared_ptr<SharedArchive> at;
     std::unique_ptr<TimedRepository> repo;
-    /// What was not published.
+    /// What has not been published.
     Knowledge own;
     /// The trees of the heads last exchanged, by the other party.
     std::map<std::size_t, std::vector<Id>> exchanged;
 };
 
-/// Answers at random, and notes what was asked.
+/// Answers at random, and records what was asked.
 class RandomAnswers {
 public:
-    /// @param contents counts the contents that have been made up
+    /// @param contents counts the contents that have been invented
     RandomAnswers(std::mt19937& random, int& contents) : random_(random), contents_(contents) {
         resolvers.choices.treeResolver = [](auto, MergeTrees const&) { return TreeConflictChoice::Merge; };
         resolvers.choices.blobResolver = [this](auto path, MergeTrees const&) {
@@ -118,7 +118,7 @@ public:
 
     MergeResolvers resolvers;
     Paths asked;
-    /// Where files may have gone beside directories.
+    /// The paths at which files may have been kept beside directories.
     Paths beside;
 
 private:

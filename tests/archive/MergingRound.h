@@ -27,7 +27,7 @@ public:
         }
     }
 
-    /// Each step is a seed of its own, so that others may be left out.
+    /// Each step is a seed of its own, so that it stays the same if others are left out.
     void Run(std::vector<std::uint32_t> const& steps) {
         try {
             for (std::uint32_t const step : steps) {
@@ -71,7 +71,7 @@ private:
         Repo(i).Checkout(Wide(BranchOf(i)));
     }
 
-    /// The same first commit everywhere.
+    /// Makes the first commit, the same for all parties.
     void Begin(std::size_t i) {
         Commit first;
         first.AddBlob(&Repo(i), u"keep", MakeBlob("0"));
@@ -91,7 +91,7 @@ private:
         std::size_t const i = Below(parties_.size());
         std::size_t const j = (i + 1 + Below(parties_.size() - 1)) % parties_.size();
         std::size_t const what = Below(100);
-        // Much may happen within one second.
+        // Several steps may happen within one second.
         seconds_ += static_cast<std::int64_t>(Below(1 + pace_));
         if (what < 45)
             Edit(i);
@@ -113,7 +113,7 @@ private:
         ModelVersion version{versions_.at(before).files, {}, {}, {}};
         Commit commit(&Repo(i), false);
         commit.SetAuthorName(Wide("party " + std::to_string(i)));
-        // Directories and files take each other's place now and then only.
+        // Directories and files replace each other only now and then.
         std::string const path = paths[Below(Below(4) == 0 ? paths.size() : 5)];
         std::erase_if(version.files, [&](auto const& file) {
             bool const gives = AreRelated(file.first, path);
@@ -137,7 +137,7 @@ private:
         parties_[i].own.Learn(Head(i), before);
     }
 
-    /// A version may come up again: what was taken back within one second is the same as before.
+    /// A version may be made again: an edit that is taken back within one second gives the same commit as before.
     void Add(Id const& id, ModelVersion version) {
         ModelVersion& known = versions_[id];
         known.files = std::move(version.files);
@@ -146,7 +146,7 @@ private:
         known.merged.merge(version.merged);
     }
 
-    /// The other party's head, as far as the first one can have it.
+    /// The other party's head, if the first party can read it.
     cow_ptr<Commit> HeadOfOther(std::size_t i, std::size_t j) {
         Publish(j);
         if (sharing_ == Sharing::Nothing) {
@@ -178,7 +178,7 @@ private:
         Merge(j, other);
     }
 
-    /// Both remember what they had.
+    /// Both parties keep the heads that they exchanged.
     void Keep(std::size_t i, std::size_t j) {
         for (auto const& [one, other] : {std::pair{i, j}, std::pair{j, i}})
             parties_[one].exchanged[other] = {Repo(i).GetHead()->GetRootId(), Repo(j).GetHead()->GetRootId()};
@@ -210,7 +210,7 @@ private:
         Repo(i).MoveBranchTo(Wide(BranchOf(i)), tip);
         ++account_.counts["rebased"];
         Say(NameOf(i) + " rebased " + ShortId(before) + " onto " + ShortId(onto));
-        // What a commit has otherwise than the one that it was put on is its decision, taking back included.
+        // Every difference of a rebased commit to what it was rebased onto is its decision, also what it takes back.
         for (auto commit = Repo(i).GetHead(); !(commit->GetId() == onto); commit = commit->GetParent()) {
             FilesByPath files = FilesOf(*commit);
             Paths decided = DifferingPaths(files, FilesOf(*commit->GetParent()));
@@ -220,7 +220,7 @@ private:
         Derive(i, before, {before, onto});
     }
 
-    /// The head is a version with the files of another one.
+    /// Adds the head as a version with the files of another one.
     void Derive(std::size_t i, Id const& from, std::vector<Id> const& contains) {
         Add(Head(i), {versions_.at(from).files, {}, {}, {}});
         for (Id const& other : contains)
@@ -229,7 +229,7 @@ private:
         Publish(i);
     }
 
-    /// Below a commit lie others that were rewritten, too, and that somebody else may have rewritten alike.
+    /// Ancestors of a commit may have been rewritten, too, and alike by another party.
     void LearnOfRewritten(std::size_t i, Id const& commit) {
         std::set<Id> met;
         for (std::vector<Id> open{commit}; !open.empty();) {
@@ -254,7 +254,7 @@ private:
         for (std::size_t j = 0; j < parties_.size(); ++j) {
             if (parties_[j].at != parties_[i].at)
                 continue;
-            // A party with something unpublished relies on what it knows.
+            // A party with unpublished commits has only the facts that it has read.
             if (sharing_ == Sharing::Branch)
                 MergeShared(j);
             else
@@ -296,7 +296,7 @@ private:
         Check(i, KnowledgeOf(i), before, theirs->GetId(), report, answers);
     }
 
-    /// Compares what became of two heads with what should.
+    /// Compares the result of merging two heads with what the model allows.
     void Check(std::size_t i, Knowledge const& known, Id const& left, Id const& right, MergeReport const& report,
                RandomAnswers& answers) {
         Id const result = Head(i);
@@ -354,7 +354,7 @@ private:
         }
     }
 
-    /// Everybody merges everybody until nothing moves; then once more.
+    /// All parties merge each other's heads until no branch moves; and then once more.
     void Converge() {
         for (int times = 0; times < 20 && account_.faults.empty(); ++times) {
             std::vector<Id> const before = Heads();

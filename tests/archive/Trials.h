@@ -4,7 +4,7 @@
 #include "KivArchive/ArchivedRepository.h"
 #include "KivArchive/MemArchive.h"
 
-/// What the trials do beside what a small host does.
+/// Further operations for trials, beside those of `SmallHost`.
 namespace KivArchive {
 
 /// Publishes one more version of a branch of its own through a repository, which fetches what was there.
@@ -23,7 +23,7 @@ inline bool PublishByRepository(std::shared_ptr<IArchive> const& archive, std::s
     return repository.Publish(progress).published;
 }
 
-/// What every trial brings from another archive.
+/// What every trial synchronizes from another archive.
 inline SynchronizeOptions FromElsewhere() {
     SynchronizeOptions options;
     options.branches = {{u"master", u"theirs"}};

@@ -8,12 +8,12 @@
 #include <new>
 #include <utility>
 
-/// Operations during which one allocation, or one access to the disk, after the other fails. The archive must be whole
-/// after each, and the next operation must succeed.
+/// Runs operations while one allocation, access to the disk or callback after the other fails. The archive must be
+/// sound after each, and the next operation must succeed.
 
 namespace {
 
-/// What this program's operators `new` and `delete` do, and SQLite's allocations. On one thread only.
+/// The state of this program's operators `new` and `delete`, and of SQLite's allocations. On one thread only.
 struct Allocations {
     bool isCounting = false;
     long failing = 0;
@@ -78,10 +78,10 @@ struct Callbacks final : IProgress {
 };
 Callbacks callbacks;
 
-/// What synchronizing and repairing take from; made before anything fails.
+/// The source for synchronizing and repairing; made before anything fails.
 std::unique_ptr<MemArchive> elsewhere;
 
-/// What may be interrupted; each begins with the same archive.
+/// An operation that is interrupted. Each begins with the same archive.
 struct Operation {
     const char* name;
     void (*run)(std::string const& path);
@@ -142,8 +142,8 @@ void Copy(std::string const& path) {
     archive.Backup(path + ".copy", &callbacks);
 }
 
-/// Commits on what is fetched for that, publishes, walks and refreshes, while others publish. Goes on once after a failed
-/// publish, which must have left the repository as it was.
+/// Fetches, commits, publishes, walks and refreshes, while others publish. Tries once more after a failed publish,
+/// which must have left the repository as it was.
 void UseRepository(std::string const& path) {
     auto const archive = std::make_shared<SqliteArchive>(path, OneWorker());
     ArchivedRepository repository(archive);
@@ -180,7 +180,7 @@ constexpr Operation operations[] = {{"Open", Open},
                                     {"Repair", RepairAll, true, true},
                                     {"Copy", Copy, true}};
 
-/// An archive with versions that nothing reaches any more, beside some that are.
+/// Makes an archive with some versions that are reached and some that are not any more.
 std::string MakeStart(std::string const& path, bool isDamaged) {
     elsewhere = std::make_unique<MemArchive>();
     std::filesystem::remove(path);
@@ -211,7 +211,7 @@ std::string MakeStart(std::string const& path, bool isDamaged) {
     return ReadFile(path);
 }
 
-/// What `Report` makes of each fault, counted.
+/// Counts faults, and those that were reported.
 struct Outcomes {
     int faults = 0;
     int refused = 0;
@@ -219,8 +219,9 @@ struct Outcomes {
 
 class ArchiveFaults : public testing::TestWithParam<Operation> {
 protected:
-    /// Runs the operation with fault after fault until it meets none any more.
-    /// @param arm makes the given one fail @param disarm ends that, and says whether it has failed
+    /// Runs the operation with one fault after the other, until it runs without meeting the fault.
+    /// @param arm makes the access or call with the given number fail
+    /// @param disarm ends that, and returns whether it has failed
     template <class Arm, class Disarm>
     void TryAll(const char* kind, Arm arm, Disarm disarm) {
         std::string const path = directory_.Path("archive");
@@ -263,7 +264,7 @@ protected:
             ASSERT_EQ(ProblemsOf(archive), "") << kind << ": after fault " << fault;
             ASSERT_TRUE(SmallHost(archive, 5).Publish()) << kind << ": after fault " << fault;
         }
-        // A copy is there whole or not at all.
+        // A copy is complete or missing.
         if (std::filesystem::exists(path + ".copy")) {
             SqliteArchive copy(path + ".copy", OneWorker());
             ASSERT_EQ(ProblemsOf(copy), "") << kind << ": after fault " << fault;

@@ -59,7 +59,7 @@ TEST_P(ArchiveUpkeep, CollectRemovesWhatNothingReachesAfterItsTime) {
     CollectReport report = CollectNow(*archive);
     EXPECT_GT(report.marked, 0U);
     EXPECT_EQ(report.removed, 0U) << "what was just marked has its grace time";
-    // Somebody goes back to an old version meanwhile, and away again.
+    // Meanwhile the branch goes back to an old version, and away again.
     MoveHead(*archive, tenth, head);
     MoveHead(*archive, head, tenth);
     EXPECT_EQ(CollectNow(*archive, {head}).removed, 0U) << "what is kept stays";
@@ -70,7 +70,7 @@ TEST_P(ArchiveUpkeep, CollectRemovesWhatNothingReachesAfterItsTime) {
     EXPECT_EQ(archive->GetStatistics().commits, 5U);
     EXPECT_EQ(archive->GetStatistics().ancestries, 10U) << "facts stay";
     EXPECT_EQ(archive->FindMissing({&head, 1}).size(), 1U);
-    // What was collected can come back.
+    // What was collected can be stored again.
     SmallHost again(*archive, 2);
     for (int i = 0; i < 10; ++i)
         EXPECT_TRUE(again.Publish());
@@ -168,8 +168,7 @@ TEST_P(ArchiveUpkeep, WhatIsUsedOrNotDueKeepsWhatItNames) {
     EXPECT_EQ(ProblemsOf(*archive), "");
 }
 
-/// Publishes versions without parents on a branch of its own, going back to a few contents again and again, so that what is
-/// collected is used anew.
+/// Publishes root commits on a branch of its own, with few contents, so that what is collected is soon stored again.
 void PublishRepeatedly(IArchive& archive, std::uint32_t seed) {
     KivStringT<char16_t> const name(seed == 1 ? u"one" : u"two");
     std::mt19937 random(seed);
@@ -201,7 +200,7 @@ void PublishRepeatedly(IArchive& archive, std::uint32_t seed) {
     }
 }
 
-/// Two publish and go back to old versions while a third one collects with no grace time at all.
+/// Two threads publish and go back to old versions while a third one collects without any grace time.
 TEST_P(ArchiveUpkeep, PublishersAndCollectorsMayRunAtOnce) {
     auto const archive = Make();
     std::atomic<bool> isDone{false};

@@ -4,7 +4,7 @@
 #include <thread>
 #include <unordered_set>
 
-/// Versions of repositories over archives: published, fetched again, and brought together.
+/// Repositories over archives: publishing, fetching again and merging versions.
 
 namespace KivArchive {
 namespace {
@@ -62,7 +62,7 @@ TEST(ArchivedRepository, PublishesOnlyWhatIsNew) {
     EXPECT_EQ(ProblemsOf(*archive), "");
 }
 
-/// What a version came back to is as new as what it is put on does not have it, whatever the versions between had.
+/// A version may come back to what an earlier one had and the published version does not: that must be stored, too.
 TEST(ArchivedRepository, PublishesWhatVersionsCameBackTo) {
     auto const archive = std::make_shared<MemArchive>();
     ArchivedRepository here(archive);
@@ -164,7 +164,7 @@ TEST(ArchivedRepository, TakesTreesFromAnotherArchive) {
     EXPECT_TRUE(blob->CopyToString() == large);
 }
 
-/// Four hosts on one archive, each with a repository of its own, publish on one branch.
+/// Four hosts, each with a repository of its own over one archive, publish on one branch.
 TEST(ArchivedRepository, ManyMayShareAnArchive) {
     TemporaryDirectory const directory;
     for (std::shared_ptr<IArchive> const& archive :
@@ -193,7 +193,7 @@ TEST(ArchivedRepository, ManyMayShareAnArchive) {
         for (auto& thread : threads)
             thread.join();
         EXPECT_EQ(failed, 0);
-        // Readers of one repository, whose walks fetch at once.
+        // Threads that read one repository, whose walks fetch concurrently.
         ArchivedRepository last(archive);
         auto const newest = last.GetHead();
         threads.clear();

@@ -8,7 +8,7 @@
 
 #include <set>
 
-/// Listings beside what the objects say that they were packed from. The archives hold no contents, so that none is read.
+/// Compares listings with the objects that were packed. The archives hold no contents, so that none can be read.
 
 namespace KivArchive {
 namespace {
@@ -21,7 +21,7 @@ class Listings : public testing::Test {
 protected:
     std::size_t Below(std::size_t end) { return static_cast<std::size_t>(random_()) % end; }
 
-    /// Names whose order in UTF-8 is another one, and one that is the beginning of another.
+    /// Among the names are some that UTF-8 orders otherwise than UTF-16, and one that is the beginning of another.
     Text AnyPath() {
         static const Text names[] = {u"a", u"a.b", u"\xFFFF", u"\xD83D\xDE00", u"\xD83D", u"e\x301"};
         Text path = names[Below(6)];
@@ -30,7 +30,7 @@ protected:
         return path;
     }
 
-    /// Leaves no directory hidden by a file of its name, which packed forms do not show.
+    /// Leaves no directory that a file with its name hides, since packed forms do not show it.
     void Edit(KivVcs::Commit& commit) {
         for (std::size_t edits = Below(6); edits > 0; --edits) {
             Text const path = AnyPath();
@@ -144,7 +144,7 @@ TEST_F(Listings, OfHistoriesShowWhatCommitsSay) {
             again.SetDescription(record.description);
             again.SetCommitTime(record.time);
             again.SetCommitTimezoneBias(record.bias);
-            // Where a name ends and an address begins is not always told.
+            // It is not always clear where a name ends and the address begins.
             EXPECT_EQ(TextOf(again.GetData()).substr(6),
                       TextOf(commit.GetData()).substr(TextOf(commit.GetData()).find("author ")));
             return true;
@@ -238,8 +238,7 @@ TEST_F(Listings, OfHistoriesGoOnBehindDamage) {
     EXPECT_EQ(ReadCommits(archive_, twice)[2].description, Text(u"root"));
 }
 
-/// Sixty directories, each of which names the one before twice, so that there are 2^60 ways down to @p innermost, which
-/// comes first.
+/// @p innermost, and sixty directories, each of which names the one before twice: @p innermost has 2^60 paths.
 std::vector<NewObject> DoubledDirectories(NewObject const& innermost) {
     std::vector<NewObject> directories{innermost};
     for (int i = 0; i < 60; ++i) {

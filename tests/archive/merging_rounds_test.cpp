@@ -5,8 +5,8 @@
 #include <cstdlib>
 #include <iostream>
 
-/// Rounds of parties that merge again and again, beside somebody who forgets nothing. How many rounds is said by
-/// KIVVCS_MERGE_ROUNDS, how many parties by KIVVCS_MERGE_PARTIES, and the first seed by KIVVCS_MERGE_SEED.
+/// Rounds of parties that merge again and again, beside a plain model. KIVVCS_MERGE_ROUNDS sets the number of rounds,
+/// KIVVCS_MERGE_PARTIES that of parties, and KIVVCS_MERGE_SEED the first seed.
 
 namespace KivArchive {
 namespace {
@@ -22,12 +22,12 @@ Account RunRound(std::uint32_t seed, std::size_t parties, std::vector<std::uint3
     return account;
 }
 
-/// What is wrong, without where.
+/// The kind of the first fault, without its path.
 std::string KindOfFault(Account const& account) {
     return account.faults.empty() ? "" : account.faults.front().substr(0, account.faults.front().find(','));
 }
 
-/// Leaves out all steps without which a round goes wrong in the same way.
+/// Leaves out all steps that the round does not need to fail in the same way.
 Account Shrink(std::uint32_t seed, std::size_t parties, std::vector<std::uint32_t> steps, Account found) {
     for (std::size_t size = steps.size() / 2; size > 0; size /= 2)
         for (std::size_t begin = 0; begin + size <= steps.size();) {

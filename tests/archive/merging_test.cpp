@@ -5,7 +5,7 @@
 
 #include <gtest/gtest.h>
 
-/// Where histories meet, and merges against all the places where they do.
+/// Finding where histories meet, and merging against all of these bases.
 
 namespace KivArchive {
 namespace {
@@ -142,7 +142,7 @@ TEST(MergeAgain, AsksWhereFilesMeetDirectories) {
         {"directory", "n/a=0 n/b=0 n/c=1 z=0", "n=2 z=0", "n/a=0 n/b=0 n/c=1 z=0 | n 341", "n=2 z=0 | n 342"},
         {"directory", "n=1 z=0", "z=0", "n=1 z=0 | n 421", "z=0 | n 422"},
         {"file", "n/a=1 z=0", "z=0", "n/a=1 z=0 | n 521", "z=0 | n 522"},
-        // What only one side did is nobody's question.
+        // Nobody is asked about what only one side changed.
         {"file", "n=0 z=1", "n/a=2 z=0", "n/a=2 z=1", "n/a=2 z=1"},
         {"directory", "n/a=0 n/b=0 z=1", "n=2 z=0", "n=2 z=1", "n=2 z=1"},
         {"directory", "n/a=0 n/b=1 z=0", "z=0", "n/b=1 z=0 | n/b 321", "z=0 | n/b 322"},
@@ -210,7 +210,7 @@ TEST(MergeAgain, AssumesNothingWhereABaseIsLost) {
     EXPECT_EQ(versions.Merge("onAgain", "elsewhere"), "both=0 gone=1 x/y=0") << "nothing in common is no loss";
 }
 
-/// One party has come back from "later" to "earlier", another one has gone on from there.
+/// One party has gone back from "later" to "earlier", another one has gone on from "later".
 TEST(MergeAgain, AsksWhereNobodyCanSayWhatIsLater) {
     Versions versions;
     versions.Add("root", "back=0 same=0");

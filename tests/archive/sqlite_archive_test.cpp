@@ -8,7 +8,7 @@
 #include <thread>
 #include <unistd.h>
 
-/// Archives in files: what is no archive, damage, kills, copies and what differences cost.
+/// Archives in files: files that are no archives, damage, kills, copies and the size of differences.
 
 namespace KivArchive {
 namespace {
@@ -24,7 +24,7 @@ void RunSql(std::string const& path, std::string const& sql) {
     sqlite3_close(database);
 }
 
-/// The kind of failure that opening ends in; none if it succeeds.
+/// The kind of failure of opening a file; nothing if it succeeds.
 std::optional<Failure> FailureOf(std::string const& path, SqliteOptions const& options = {}) {
     try {
         SqliteArchive archive(path, options);
@@ -56,7 +56,7 @@ TEST(SqliteArchive, RefusesWhatIsNoArchiveOfIts) {
     EXPECT_EQ(FailureOf(directory.Path("other")), Failure::Foreign);
 
     std::string const sound = ReadFile(MakeArchive(directory.Path("archive"), 2));
-    // What an application of ill will would plant, and what only time can bring.
+    // What an attacker would plant, and a later format.
     for (const char* const change :
          {"CREATE TRIGGER t AFTER INSERT ON segments BEGIN DELETE FROM branches; END",
           "CREATE VIEW v AS WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) SELECT x FROM n",
@@ -126,7 +126,7 @@ TEST(SqliteArchive, CopiesOfAnOpenArchiveAreWholeAndOfOneMoment) {
     EXPECT_EQ(ProblemsOf(copy), "") << "what is there stays";
 }
 
-/// Sizes are what differences are for: an edit costs what it changes, whatever it is an edit of.
+/// An edit takes as many bytes as it changes, whatever the size of what it edits.
 TEST(SqliteArchive, VersionsCostWhatTheyChange) {
     TemporaryDirectory const directory;
     SqliteArchive archive(directory.Path("archive"));
@@ -152,7 +152,7 @@ TEST(SqliteArchive, VersionsCostWhatTheyChange) {
         blob = Object(ObjectType::Blob, text, blob.id);
     }
     EXPECT_LT((archive.GetStatistics().bytes - first) / edits, 1000U);
-    // Version 64 is one step from a whole one, 63 is six.
+    // Version 64 is one step away from one that is stored whole, version 63 six.
     EXPECT_EQ(ReadAll(archive, ids).size(), ids.size());
 }
 
@@ -165,7 +165,8 @@ private:
     std::mt19937 engine_;
 };
 
-/// Rows in each other's places, absurd numbers and sizes, and what would run: done by SQL, which a stranger may use, too.
+/// Rows in each other's places, absurd numbers and sizes, and what would run: damage by SQL, as an attacker could do
+/// it.
 const char* const rowDamages[] = {
     "UPDATE objects SET segment=segment+1 WHERE segment%3=0",
     "UPDATE objects SET member=9223372036854775807 WHERE segment%2=0",
@@ -184,7 +185,7 @@ const char* const rowDamages[] = {
     "CREATE VIEW v AS WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) SELECT x FROM n",
 };
 
-/// One kind of damage after the other; the seed decides where.
+/// Damages a file; the seed decides how and where.
 std::string Damage(std::string bytes, std::uint32_t seed) {
     Random random(seed);
     constexpr std::size_t page = 4096;
@@ -278,7 +279,7 @@ TEST(SqliteArchive, ReadsWhatIsPutRightWhileItIsOpen) {
         given = 0;
         return archive.Read(ids, [&given](ArchivedObject const& /*object*/) { ++given; }).damaged.size();
     };
-    // In what one version of the text inserts, and the next ones are made of.
+    // Damages what one version of the text inserts, and so all later ones that are differences to it.
     RunSql(path, "UPDATE segments SET form=CAST(substr(form, 1, instr(form, x'65646974') - 1) || x'65636974' || "
                  "substr(form, instr(form, x'65646974') + 4) AS BLOB) WHERE instr(form, x'65646974')>0");
     std::size_t const damaged = countDamaged();
@@ -293,7 +294,7 @@ TEST(SqliteArchive, ReadsWhatIsPutRightWhileItIsOpen) {
 }
 
 /// Publishes, synchronizes and collects until it is killed, and reports every head that it has published.
-[[noreturn]] void PublishForever(std::string const& path, std::uint32_t seed, int told) {
+[[noreturn]] void PublishForever(std::string const& path, std::uint32_t seed, int pipe) {
     try {
         auto const shared = std::make_shared<SqliteArchive>(path);
         SqliteArchive& archive = *shared;
@@ -308,7 +309,7 @@ TEST(SqliteArchive, ReadsWhatIsPutRightWhileItIsOpen) {
             }
             if (host.Publish()) {
                 Id::Digest const digest = *host.Head().GetDigest();
-                if (write(told, digest.data(), digest.size()) != static_cast<ssize_t>(digest.size()))
+                if (write(pipe, digest.data(), digest.size()) != static_cast<ssize_t>(digest.size()))
                     _exit(1);
             }
             if (i % 5 == 0) {
@@ -324,7 +325,7 @@ TEST(SqliteArchive, ReadsWhatIsPutRightWhileItIsOpen) {
 }
 
 /// The head that was reported last before the end.
-Id LastTold(int pipe) {
+Id LastReported(int pipe) {
     Id last;
     for (Id::Digest digest{}; read(pipe, digest.data(), digest.size()) == static_cast<ssize_t>(digest.size());)
         last = Id::FromDigest(digest);
@@ -339,7 +340,7 @@ TEST(SqliteArchive, KilledWritersLoseNothingAndLockNobodyOut) {
     Random random(4);
     int published = 0;
     for (int trial = 0; trial < trials; ++trial) {
-        // All of it is verified after each.
+        // Verifying after each trial takes the longer the more there is.
         if (trial % 10 == 0)
             WriteFile(path, start);
         int ends[2] = {};
@@ -354,7 +355,7 @@ TEST(SqliteArchive, KilledWritersLoseNothingAndLockNobodyOut) {
         int status = 0;
         waitpid(child, &status, 0);
         ASSERT_TRUE(WIFSIGNALED(status)) << "it failed before it was killed";
-        Id const told = LastTold(ends[0]);
+        Id const reported = LastReported(ends[0]);
         close(ends[0]);
 
         SqliteOptions options;
@@ -362,11 +363,11 @@ TEST(SqliteArchive, KilledWritersLoseNothingAndLockNobodyOut) {
         SqliteArchive archive(path, options);
         ASSERT_EQ(ProblemsOf(archive), "") << "after kill " << trial;
         Id const head = HeadOf(archive);
-        bool isKnown = told.IsEmpty();
+        bool isKnown = reported.IsEmpty();
         for (Ancestry const& facts : archive.ReadAncestry({&head, 1}, Follow::Parents, 1U << 20U))
-            isKnown = isKnown || facts.commit == told;
+            isKnown = isKnown || facts.commit == reported;
         EXPECT_TRUE(isKnown) << "a version that was published is lost";
-        published += told.IsEmpty() ? 0 : 1;
+        published += reported.IsEmpty() ? 0 : 1;
         EXPECT_TRUE(SmallHost(archive, static_cast<std::uint32_t>(trial + 1000)).Publish());
     }
     std::printf("%d kills, %d of them after something was published\n", trials, published);

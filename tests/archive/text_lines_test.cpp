@@ -17,7 +17,7 @@ namespace {
 using KivVcs::Buffer;
 
 Buffer Content(std::string_view text) {
-    // In two pieces, so that lines lie across chunks.
+    // In two pieces, so that a line lies across two chunks.
     Buffer content;
     content.Append(text.data(), text.size() / 2);
     Buffer rest;
@@ -54,7 +54,7 @@ TextMerge Merge(std::string const& base, std::string const& left, std::string co
     return MergeTextLines(Content(base), Content(left), Content(right), options);
 }
 
-/// What the merge gives: the text, "conflict" or "gave up".
+/// The result of a merge: the text, "conflict" or "gave up".
 std::string Merged(std::string const& base, std::string const& left, std::string const& right) {
     const auto merge = Merge(base, left, right);
     return merge.result == TextMergeResult::Merged      ? Text(merge.text)
@@ -69,7 +69,7 @@ TEST(TextLines, ChangesInDifferentPlacesAreTakenFromBothSides) {
     EXPECT_EQ(Merged(base, "", base), "");
     EXPECT_EQ(Merged(base, "1\nx\n3\n4\n5\n", "1\nx\n3\n4\ny\n"), "1\nx\n3\n4\ny\n");
     EXPECT_EQ(Merged("", "same\n", "same\n"), "same\n");
-    // Line ends of either kind, and a missing last one.
+    // Both kinds of line ends, and a missing last one.
     EXPECT_EQ(Merged("1\r\n2\r\n3", "0\r\n2\r\n3", "1\r\n2\r\n3\r\n"), "0\r\n2\r\n3\r\n");
     EXPECT_EQ(Merged("1\n2\n3\n", "1\n2\n3", "0\n2\n3\n"), "0\n2\n3");
 }
@@ -97,7 +97,7 @@ TEST(TextLines, WhatIsNoTextIsGivenUp) {
     EXPECT_TRUE(DiffTextLines(Content("a"), Content("a")).areTexts);
 }
 
-/// Random texts, and what the system's tools say of them.
+/// Random texts, and the results of the system's tools for them.
 class RandomTexts : public testing::Test {
 protected:
     int Below(int limit) { return std::uniform_int_distribution(0, limit - 1)(random_); }
@@ -171,7 +171,7 @@ TEST_F(RandomTexts, DifferAsDiffSays) {
         Write("after", after);
         const auto changes = DiffTextLines(Content(before), Content(after)).changes;
         ASSERT_EQ(Apply(changes, before, after), after);
-        // With different lines there is one shortest way only; otherwise it is at least as short.
+        // If all lines are different there is only one shortest difference; otherwise the tool's is as short.
         if (kinds == 0) {
             ASSERT_EQ(Text(UnifiedText(Content(before), Content(after)).value()),
                       Run("diff --minimal -U3 --label old --label new before after"));
@@ -189,7 +189,7 @@ TEST_F(RandomTexts, MergeAsDiff3Says) {
     for (int round = 0; round < 150; ++round) {
         const auto base = MakeLines(20 + Below(60), 0);
         const std::string left = Edit(base, Below(5), 0);
-        // Some changes in common.
+        // With some changes in common, now and then.
         const std::string right = Edit(Below(3) == 0 ? SplitLines(left) : base, Below(5), 0);
         Write("base", Join(base));
         Write("left", left);

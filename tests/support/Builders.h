@@ -7,7 +7,7 @@
 #include <random>
 #include <sstream>
 
-/// Objects made from short descriptions, and described again.
+/// Makes objects from short descriptions, and describes objects.
 
 namespace KivVcs {
 
@@ -31,7 +31,7 @@ void AddFiles(Holder& holder, IRepository& repo, std::string const& files) {
     }
 }
 
-/// A tree of such files; null for "-".
+/// A tree with such files; null for "-".
 inline cow_ptr<Tree> MakeTree(IRepository& repo, std::string const& files) {
     cow_ptr<Tree> tree;
     if (files != "-")
@@ -39,7 +39,7 @@ inline cow_ptr<Tree> MakeTree(IRepository& repo, std::string const& files) {
     return tree;
 }
 
-/// Edits a tree at random, among few names and contents, so that every shape of disagreement comes up.
+/// Edits a tree at random, with few names and contents, so that every kind of conflict comes up.
 inline cow_ptr<Tree> EditAtRandom(std::mt19937& random, IRepository& repo, cow_ptr<Tree> tree) {
     const auto below = [&random](unsigned limit) { return static_cast<unsigned>(random() % limit); };
     for (unsigned edits = below(6); edits-- > 0;) {
@@ -67,7 +67,7 @@ inline void ListFiles(Tree const& tree, std::string const& prefix, std::vector<s
     }
 }
 
-/// The inverse of `MakeTree`, sorted; an empty directory shows as "name/".
+/// The inverse of `MakeTree`, sorted; an empty directory is written as "name/".
 inline std::string Files(cow_ptr<Tree> const& tree) {
     if (!tree)
         return "-";
@@ -77,17 +77,17 @@ inline std::string Files(cow_ptr<Tree> const& tree) {
     return Joined(files);
 }
 
-/// The description of a commit, by which the tests call it.
+/// The description of a commit, which is its name in tests.
 inline std::string NameOf(cow_ptr<Commit> const& commit) {
     return commit ? Narrow(commit->GetDescription()) : "-";
 }
 
-/// Grows commits with the given names as descriptions, each with a file of its name on top of its parent's files.
+/// Makes commits with their names as descriptions, each with its parent's files and a file of its own name.
 class GrownHistory {
 public:
     explicit GrownHistory(Repository& repo) : repo_(repo) {}
 
-    /// Commits written as "root child:root other:root", each stored.
+    /// Stores commits written as "root child:root other:root".
     void Grow(std::string const& graph) {
         std::istringstream words(graph);
         for (std::string word; words >> word;) {
@@ -100,7 +100,7 @@ public:
         }
     }
 
-    /// Branches written as "master=child topic=other", made if there are none of that name.
+    /// Points branches, written as "master=child topic=other", at commits; makes those that do not exist.
     void Point(std::string const& branches) {
         std::istringstream words(branches);
         for (std::string word; words >> word;) {
@@ -114,7 +114,7 @@ public:
 
     cow_ptr<Commit> const& operator[](std::string const& name) const { return commits_.at(name); }
 
-    /// Lets go of all commits.
+    /// Releases all commits.
     void Forget() { commits_.clear(); }
 
     /// Every branch with the line of commits below it, newest first: "master=c/b/a topic=d/a".

@@ -4,11 +4,11 @@
 
 #include <functional>
 
-/// Objects of classes that a host derives, which count what they are asked.
+/// Objects of hosts' classes, which count calls.
 
 namespace KivVcs {
 
-/// A blob that knows its identifier and gets its content when somebody asks for it.
+/// A blob that knows its identifier and fetches its content when asked for it.
 class LazyBlob final : public Blob {
 public:
     /// @param fetched counts how often the content is asked for
@@ -27,7 +27,7 @@ private:
     int* fetched_;
 };
 
-/// A blob that shows in trees what a host says, and fetches its content when somebody asks for it.
+/// A blob that a host says how to pack, and that fetches its content when asked for it.
 class HostBlob : public Blob {
 public:
     HostBlob(std::string const& knownId, std::function<std::string()> fetch)
@@ -50,7 +50,7 @@ private:
     mutable Buffer fetched_;
 };
 
-/// A directory that shows itself to a host before it is gone.
+/// A directory that passes itself to a host in its destructor.
 class HostTree : public Tree {
 public:
     HostTree(Tree const& entries, std::function<void(Tree const&)> leave) : Tree(entries), leave_(std::move(leave)) {}
@@ -64,8 +64,7 @@ private:
     std::function<void(Tree const&)> leave_;
 };
 
-/// A commit whose identifier is what it is told to be, which counts how often it is asked for it and looks at its parent
-/// as it dies.
+/// A commit with a given identifier, which counts how often it is asked for it, and reads its parent in its destructor.
 class NamedCommit : public Commit {
 public:
     struct Log {

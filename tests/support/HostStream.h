@@ -7,7 +7,7 @@
 #include <string>
 #include <utility>
 
-/// A host's stream: holds bytes, may claim another size than they have, and keeps what is written to it up to a limit.
+/// A host's stream: holds bytes, may claim to be of another size, and accepts writes up to a limit.
 class HostStream final : public KivUtils::IStream {
 public:
     explicit HostStream(std::string bytes, std::uint64_t claimed, std::size_t room = 0)

@@ -5,13 +5,13 @@
 #include <exception>
 #include <stdexcept>
 
-/// A host whose storage, repository and objects fail in the middle of what the library does.
+/// A host whose storage, repository and objects fail in the middle of the library's operations.
 
 namespace KivVcs {
 
 struct Interruption : std::exception {};
 
-/// Counts the calls to a host, and throws at the given one, unless that is 0.
+/// Counts the calls to a host, and throws at one of them; at none for 0.
 class HostCalls {
 public:
     void InterruptAt(unsigned call) { left_ = call; }
@@ -19,7 +19,7 @@ public:
         if (left_ != 0 && --left_ == 0)
             throw Interruption();
     }
-    /// Whether content may be asked for.
+    /// Sets whether contents may be asked for.
     void PermitContent(bool isPermitted) { isContentPermitted_ = isPermitted; }
     void CountContent() {
         if (!isContentPermitted_)
@@ -67,7 +67,7 @@ private:
     HostCalls* calls_;
 };
 
-/// Most of what a repository does asks its storage; the rest is counted here.
+/// Counts those operations of a repository that do not call its storage.
 class InterruptingRepository : public Repository {
 public:
     InterruptingRepository(std::unique_ptr<IObjectsStorage>&& storage, HostCalls& calls)
@@ -85,7 +85,7 @@ private:
     HostCalls* calls_;
 };
 
-/// A blob that knows its identifier, and fetches its content when it is asked for it.
+/// A blob that knows its identifier and fetches its content when asked for it.
 class FetchedBlob final : public Blob {
 public:
     FetchedBlob(std::string const& content, HostCalls& calls)
@@ -103,7 +103,7 @@ private:
     HostCalls* calls_;
 };
 
-/// A tree or a commit of a host's class, which does what the library's does.
+/// A tree or a commit of a host's class that changes nothing.
 template <class Base>
 class HostsOwn final : public Base {
 public:

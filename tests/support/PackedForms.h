@@ -5,7 +5,7 @@
 
 #include <map>
 
-/// Packed forms put together byte by byte, to compare with those of the library, and a host that hands them out.
+/// Packed forms built byte by byte, to compare with the library's, and a host that loads them.
 
 namespace KivVcs {
 
@@ -24,7 +24,7 @@ inline std::string Entry(std::string const& type, std::string const& name, std::
     return (type == "tree" ? "40000 " : "100644 ") + type + " " + name + '\0' + id;
 }
 
-/// Packed forms by identifier, and how often they were asked for.
+/// Packed forms by identifier, and how often each was loaded.
 struct Packed {
     std::map<std::string, std::string> forms;
     int loads = 0;
@@ -46,7 +46,7 @@ struct Packed {
     }
 };
 
-/// A host that hands out the packed forms of what a repository stores.
+/// A host that loads the packed forms of what a repository stores.
 class PackedFormsOf {
 public:
     explicit PackedFormsOf(Repository const& repo) : repo_(repo) {}

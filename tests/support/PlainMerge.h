@@ -4,16 +4,16 @@
 
 namespace KivVcs {
 
-/// A merge as it is described: level by level, the files of a level before its directories.
+/// A merge as documented: directory by directory, the files of each before its directories.
 class PlainMerge {
 public:
-    /// Settles the conflict at a path by a number of the library's choices.
+    /// Settles the conflict at a path; returns the number of one of the library's choices.
     using Ask = std::function<int(std::string const& path, bool isTree)>;
     using Side = optional<PlainTree>;
 
     PlainMerge(PlainRepository& repository, Ask ask) : repository_(repository), ask_(std::move(ask)) {}
 
-    /// Nothing if it gave up, too.
+    /// Nothing if there is no tree, or if the merge gave up.
     Side Run(Side const& left, Side const& root, Side const& right) {
         try {
             return Merge(left, root, right, "");

@@ -27,8 +27,8 @@ struct PlainCommit {
     }
 };
 
-/// What a repository should do, with the plainest tables. A tree is stored with what its blobs hide, which its
-/// identifier does not cover: the first one of an identifier takes the place of all others.
+/// What a repository should do, with the plainest tables. A tree is stored with the subtrees that its blobs hide, which
+/// its identifier does not cover: of trees with one identifier, the first takes the place of all others.
 class PlainRepository {
 public:
     using Pointer = PlainCommit::Pointer;
@@ -148,8 +148,8 @@ public:
         return !kept.empty();
     }
 
-    /// @return false if the outcome depends on the order in which commits are visited, which is anybody's choice: a commit
-    /// that is kept but not stored stops the rebuild above it, unless a rebuilt one takes its place first.
+    /// @return false if the outcome depends on the order in which commits are visited, which is not specified: a commit
+    /// that is kept but not stored stops the rebuild above it, unless a rebuilt one takes its place first
     bool Simplify() {
         const auto former = branches;
         std::set<std::string> kept;
@@ -190,7 +190,7 @@ public:
     }
 
     /// @param open the commits that the host holds
-    /// @param held the trees that it holds, themselves not stored
+    /// @param held the trees that it holds, which are not stored themselves
     void Purge(std::vector<Pointer> open, std::vector<PlainTree const*> held) {
         for (auto const& [name, head] : branches)
             open.push_back(head);

@@ -9,7 +9,7 @@
 
 namespace KivVcs {
 
-/// What a tree should hold, kept in the plainest way.
+/// What a tree should hold, in the plainest containers.
 struct PlainTree {
     std::map<std::string, std::string> blobs;
     std::map<std::string, PlainTree> trees;
@@ -70,7 +70,7 @@ inline std::set<std::string> DeepDiffs(PlainTree const& left, PlainTree const& r
     return paths;
 }
 
-/// Adds a content or a tree; every tree that is added or changed becomes what @p stored gives for it.
+/// Adds a content or a tree. Every tree that is added or changed is replaced by what @p stored returns for it.
 template <class T, class Stored = std::identity>
 void Add(PlainTree& tree, std::span<std::string const> path, T const& added, Stored stored = {}) {
     if (path.size() > 1) {
@@ -84,7 +84,7 @@ void Add(PlainTree& tree, std::span<std::string const> path, T const& added, Sto
     }
 }
 
-/// Removes both kinds and what that leaves empty; false, changing nothing, if nothing is there.
+/// Removes a blob, a subtree or both, and the directories that this leaves empty. @return false if nothing was there
 template <class Stored = std::identity>
 bool Remove(PlainTree& tree, std::span<std::string const> path, Stored stored = {}) {
     auto const below = tree.trees.find(path[0]);

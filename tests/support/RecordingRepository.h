@@ -8,14 +8,14 @@
 
 namespace KivVcs {
 
-/// Records in order which overridable operations are called, and fails on request.
+/// Records the calls of virtual operations in order, and fails on request.
 class RecordingRepository : public Repository {
 public:
     using Repository::Repository;
 
     /// The calls since the last time.
     std::string TakeCalls() { return Joined(std::exchange(calls_, {})); }
-    /// The operation of that name throws from now on; none for the empty text.
+    /// Lets the operation with that name throw from now on; none for the empty text.
     void Break(std::string operation) { broken_ = std::move(operation); }
 
     using Repository::SyncWithStorage;
@@ -66,7 +66,7 @@ private:
     std::string broken_;
 };
 
-/// Tests of a repository whose calls are recorded, with a history to grow in it.
+/// Tests with a repository whose calls are recorded, and a builder of histories in it.
 class WithHistory : public testing::Test {
 protected:
     IObjectsStorage& Storage() { return *repo.GetStorage(); }

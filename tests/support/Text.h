@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-/// Texts and bytes of the library as the standard library's.
+/// Converts texts and bytes of the library to those of the standard library.
 
 namespace KivVcs {
 

@@ -3,7 +3,7 @@
 
 #include <sqlite3.h>
 
-/// Bringing versions from one archive to another, and repairing one from another.
+/// Synchronizing archives, and repairing one from another.
 
 namespace KivArchive {
 namespace {
@@ -43,7 +43,7 @@ struct Source {
     NewCommit merge;
 };
 
-/// Synchronizes, interrupted again and again, and gone on with. @return how many interruptions there were
+/// Synchronizes, is interrupted, and goes on, until it is done. @return the number of interruptions
 int SynchronizeInParts(IArchive& from, IArchive& to) {
     struct Stop final : IProgress {
         bool Report(Progress const& /*progress*/) override { return --rest > 0; }
@@ -83,7 +83,6 @@ TEST_P(Synchronizing, BringsHistoriesFactsAndRecords) {
     EXPECT_EQ(Synchronize(from.archive, *to, Everything(), nullptr).objects, 0U) << "what is there is not copied";
 }
 
-/// Later merges are made against what was brought last, also when its commit is gone.
 TEST(ArchiveSynchronize, AsksForManyVersionsAtOnce) {
     struct Counting final : ForwardingArchive {
         IArchive& Reach() override { return ++calls, archive; }
@@ -106,6 +105,7 @@ TEST(ArchiveSynchronize, AsksForManyVersionsAtOnce) {
     EXPECT_LT(from.calls + to.calls, 40U);
 }
 
+/// Later merges are made against what was brought last, even if its commit has been collected.
 TEST_P(Synchronizing, KeepsTheTreeOfTheHeadExchangedLast) {
     Source from(directory_.Path("from"));
     auto const to = Make();

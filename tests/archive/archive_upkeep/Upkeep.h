@@ -5,7 +5,7 @@
 
 #include <gtest/gtest.h>
 
-/// What the tests of looking after archives share.
+/// Helpers for the tests of verifying, collecting, synchronizing and repairing.
 
 namespace KivArchive {
 

@@ -1,11 +1,11 @@
 #include "archived_repository/Versions.h"
 
-/// What cannot be read, shown or had, and hosts that get in the way.
+/// Objects that cannot be read or stored, and hosts that fail or refuse.
 
 namespace KivArchive {
 namespace {
 
-/// Stores a commit of the given tree data as the head of a branch. @return the tree's identifier
+/// Stores a commit with the given tree as the head of a branch. @return the tree's identifier
 Id StoreForeign(IArchive& archive, KivStringT<char16_t> const& branch, NewObject const& tree) {
     auto const commit = Conformance::Commit(tree.id, {}, "foreign");
     Change change;
@@ -50,14 +50,14 @@ TEST(ArchivedRepository, DamageIsLocal) {
     EXPECT_EQ(FailureOf([&] { static_cast<void>(repository.GetHead(u"wrong")); }), Failure::Damaged);
     EXPECT_EQ(FailureOf([&] { static_cast<void>(repository.GetHead(u"child")->GetParent()); }), Failure::Damaged);
     EXPECT_EQ(repository.GetTreeCount(), 1U) << "nothing of what could not be read has entered";
-    // What cannot be read is not taken for removed, and stays until somebody moves the branch.
+    // A branch whose head cannot be read is not taken for removed, and stays until somebody moves it.
     EXPECT_TRUE(repository.Publish().published && repository.Refresh().diverged.empty());
     EXPECT_EQ(archive->ReadBranches().size(), 8U);
     EXPECT_TRUE(repository.MoveBranchTo(u"wrong", repository.GetHead(u"sound")) && repository.Publish().published);
     EXPECT_EQ(ArchivedRepository(archive).GetHead(u"wrong")->GetId(), repository.GetHead(u"sound")->GetId());
 }
 
-/// A blob of a host's that shows another type word.
+/// A host's blob with another type word.
 class Link final : public Blob {
 public:
     explicit Link(Blob const& blob) : Blob(blob) {}
@@ -164,7 +164,7 @@ TEST(ArchivedRepository, ABranchThatIsNotLetMoveTakesNothingBack) {
     EXPECT_EQ(HeadOf(*archive), theirs.GetHead()->GetId()) << "what others have published stays";
 }
 
-/// A file of a host's, whose content cannot be had a number of times.
+/// A host's blob whose content cannot be read a number of times.
 class FailingBlob final : public Blob {
 public:
     FailingBlob(std::string const& content, int& failures) : Blob(MakeBlob(content)), failures_(&failures) {}
@@ -213,7 +213,7 @@ TEST(ArchivedRepository, WhatFailsIsNotVisibleAndCanBeTriedAgain) {
     EXPECT_TRUE(!late.GetHead() && late.GetTreeCount() == 0);
 }
 
-/// Removes "master", whose head that is, and collects everything.
+/// Removes "master", which has that head, and collects everything.
 void RemoveAll(IArchive& archive, Id const& head) {
     Change change;
     change.branches = {{u"master", head, {}}};
@@ -236,7 +236,7 @@ TEST(ArchivedRepository, WhatOthersCollectedComesBackWhereItIsHeld) {
     EXPECT_EQ(ProblemsOf(*archive), "");
     EXPECT_EQ(Line(ArchivedRepository(archive).GetHead()), "after before");
 
-    // What is only known by its identifier does not.
+    // A commit of which only the identifier is known cannot be stored again.
     ArchivedRepository other(archive);
     CommitFiles(other, "d=4", "on what goes");
     RemoveAll(*archive, repository.GetHead()->GetId());

@@ -3,7 +3,7 @@
 
 #include <atomic>
 
-/// What is asked of the archive when, and which objects come of it.
+/// When the archive is asked for what, and which objects that makes.
 
 namespace KivArchive {
 namespace {
@@ -71,7 +71,7 @@ TEST_F(LivingObjects, AreHandedOutOnceWhereverTheyAreAskedFor) {
     EXPECT_EQ(head->GetCommitTree()->GetRoot()->GetLocalBlob(u"a"),
               parent->GetCommitTree()->GetRoot()->GetLocalBlob(u"a"));
 
-    // Deleted here, it lives on where it is held, and does not come back.
+    // A deleted commit stays alive where it is held, and does not enter the storage again.
     repository->GetStorage()->DeleteCommit(parent);
     EXPECT_FALSE(repository->GetCommitFromStorage(parentId));
     EXPECT_EQ(repository->GetCommitCount(), 2U);
@@ -84,7 +84,7 @@ TEST_F(LivingObjects, AreHandedOutOnceWhereverTheyAreAskedFor) {
 }
 
 TEST_F(LivingObjects, OutliveTheirRepositoryAndComeFromTheArchive) {
-    // What only storages hold is purged; functions keep the archive alive, not the repository.
+    // What only storages hold is purged. Functions that fetch keep the archive alive, not the repository.
     EXPECT_EQ(side->GetParent()->GetId(), parentId);
     repository->RemoveBranch(u"side");
     repository->UpdateStorage();
@@ -97,7 +97,7 @@ TEST_F(LivingObjects, OutliveTheirRepositoryAndComeFromTheArchive) {
     EXPECT_EQ(other.GetCommitCount() + other.GetTreeCount() + other.GetBlobCount(), 3U + 1U + 2U);
 }
 
-/// Versions of nine files of 1,000 bytes, "f0" to "f8", whose readers hold no more than four.
+/// Nine files of 1,000 bytes, "f0" to "f8", in an archive whose readers cache at most four.
 class ArchivedContents : public testing::Test {
 protected:
     ArchivedContents() {

@@ -12,7 +12,7 @@
 
 #include <atomic>
 
-/// Builders of versions in archives, and an archive that counts.
+/// Builders of versions in archives, and an archive that counts calls.
 
 namespace KivArchive {
 
@@ -24,7 +24,7 @@ using KivVcs::NameOf;
 using KivVcs::Tree;
 using KivVcs::Wide;
 
-/// An archive that counts what it is asked for, by any thread.
+/// An archive that counts what any thread asks it for.
 class CountingArchive final : public ForwardingArchive {
 public:
     ReadOutcome Read(std::span<const Id> ids, ObjectReceiver const& receiver) override {
@@ -88,7 +88,7 @@ inline Resolvers TakingOurs() {
     return {KivVcs::AlwaysChooseLeft(), [](auto const&, auto const&) { return KivVcs::TreeConflictChoice::Merge; }};
 }
 
-/// How a call of an archive's fails; nothing if it does not. Its sentence goes to @p sentence.
+/// The kind of failure of a call; nothing if it does not fail. @param sentence receives the failure's sentence
 template <class Call>
 std::optional<Failure> FailureOf(Call call, std::string* sentence = nullptr) {
     try {

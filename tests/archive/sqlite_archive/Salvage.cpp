@@ -6,7 +6,7 @@
 #include <cstdio>
 #include <set>
 
-/// What is saved of archives' files that cannot be opened any more.
+/// Salvaging archives' files that cannot be opened any more.
 
 namespace KivArchive {
 namespace {
@@ -21,11 +21,11 @@ std::set<std::string> ObjectsOf(IArchive& archive) {
     return ids;
 }
 
-/// What `Salvage` makes of an archive with one page after the other overwritten.
+/// Salvages an archive with one page after the other overwritten.
 class Salvaging : public testing::Test {
 protected:
     static constexpr std::size_t page = 4096;
-    // In the order in which tables are made.
+    // Pages are in the order in which tables are made.
     static constexpr std::size_t beginOfBranches = 3 * page;
 
     /// Makes the archive, and salvages it as it is while it is open, when most of it is in the log.
@@ -47,7 +47,7 @@ protected:
         EXPECT_EQ(HeadOf(salvaged), head);
     }
 
-    /// How many objects are left.
+    /// Counts the objects that are left when a page is overwritten.
     std::size_t CountWithout(std::string bytes, std::size_t begin, bool isTable) {
         std::fill_n(bytes.begin() + static_cast<std::ptrdiff_t>(begin), page, '\xA5');
         WriteFile(path, bytes);
