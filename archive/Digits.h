@@ -4,8 +4,10 @@
 /// Digests as the 64 lowercase hexadecimal digits of packed forms.
 
 #include <array>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <string_view>
 
 namespace KivArchive {
@@ -25,8 +27,12 @@ inline bool ReadDigits(const char* digits, std::byte* digest) noexcept {
         wrong |= static_cast<std::uint8_t>(isNumber == 0 && letter >= 6);
         values[i] = isNumber != 0 ? number : static_cast<std::uint8_t>(letter + 10);
     }
+    // Two digits as one number, so that these are put together for several bytes at once, too.
+    constexpr bool isFirstLower = std::endian::native == std::endian::little;
+    std::array<std::uint16_t, digestSize> pairs{};
+    std::memcpy(pairs.data(), values.data(), values.size());
     for (std::size_t i = 0; i < digestSize; ++i)
-        digest[i] = static_cast<std::byte>(values[2 * i] << 4U | values[2 * i + 1]);
+        digest[i] = static_cast<std::byte>(isFirstLower ? pairs[i] << 4U | pairs[i] >> 8U : pairs[i] >> 4U | pairs[i]);
     return wrong == 0;
 }
 

@@ -163,8 +163,10 @@ std::uint64_t SegmentBuilder::Add(Member const& member, ByteView own) {
 }
 
 Bytes SegmentBuilder::Make(Compressor& compressor) const {
+    // Some numbers for each member.
+    constexpr std::size_t headSize = 32;
     Bytes form(checkSize);
-    form.reserve(checkSize + static_cast<std::size_t>(size_));
+    form.reserve(checkSize + headSize * (members_.size() + 1) + static_cast<std::size_t>(size_));
     Append(form, formatOfSegments);
     AppendNumber(form, members_.size());
     for (Member const& member : members_)

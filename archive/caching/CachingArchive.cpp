@@ -45,15 +45,27 @@ struct CachingArchive::State {
         }
     }
 
-    /// The same, or `otherwise()` while it cannot be reached.
-    template <class Ask, class Otherwise>
-    auto AskFarOr(Ask ask, Otherwise otherwise) {
+    /// The same, or what `seen()` gives while it cannot be reached. Where that is none, nothing is known.
+    template <class Ask, class Seen>
+    auto AskFarOr(Ask ask, Seen seen) {
         try {
             return AskFar(ask);
         } catch (ArchiveError const& error) {
             if (error.GetKind() != Failure::Unavailable)
                 throw;
-            return otherwise();
+            if (auto answer = TrySeen(seen))
+                return *std::move(answer);
+            throw;
+        }
+    }
+
+    /// None if the near archive fails, too.
+    template <class Seen>
+    static auto TrySeen(Seen seen) -> decltype(seen()) {
+        try {
+            return seen();
+        } catch (ArchiveError const&) {
+            return std::nullopt;
         }
     }
 

@@ -5,7 +5,10 @@
 
 #include <algorithm>
 #include <array>
+#include <cstring>
 #include <exception>
+#include <set>
+#include <string_view>
 #include <unordered_set>
 
 namespace KivArchive {
@@ -43,14 +46,19 @@ KivStringT<char16_t> NameOfUses(std::size_t number) {
 }
 
 KivStringT<char16_t> NameOfRecord(KivStringT<char16_t> const& name) {
-    Bytes bytes{std::byte{'r'}, std::byte{'/'}};
+    static constexpr std::string_view prefix = "record/";
+    Bytes bytes;
+    Append(bytes, std::as_bytes(std::span(prefix)));
     Append(bytes, BytesOfName(name));
     return NameOfBytes(bytes);
 }
 
 constexpr char16_t const* nameOfBranches = u"branches";
+/// What a record begins with that the far archive had, or was seen not to have.
+constexpr std::byte isThere{1};
+constexpr std::byte isMissing{0};
 
-Buffer BufferOf(Bytes const& bytes) {
+Buffer BufferOf(ByteView bytes) {
     Buffer buffer;
     buffer.Append(bytes.data(), bytes.size());
     return buffer;
@@ -81,20 +89,26 @@ NearArchive::~NearArchive() {
     }
 }
 
-void NearArchive::Use(Id const& id) {
+std::size_t NearArchive::HashOfDigest::operator()(Id::Digest const& digest) const noexcept {
+    std::size_t hash = 0;
+    std::memcpy(&hash, digest.data(), sizeof hash);
+    return hash;
+}
+
+void NearArchive::Use(std::span<const Id> ids) {
     std::scoped_lock const lock(mutex_);
-    used_[id] = ++useCount_;
+    for (Id const& id : ids)
+        used_[id] = ++useCount_;
 }
 
 std::vector<Id> NearArchive::Read(std::span<const Id> ids, ObjectReceiver const& receiver) {
-    std::unordered_set<Id> given;
+    std::vector<Id> given;
+    given.reserve(ids.size());
     ReadOutcome outcome;
     std::exception_ptr thrown;
     bool const isRead = Try([&] {
         outcome = archive_->Read(ids, [&](ArchivedObject const& object) {
-            if (!given.insert(object.id).second)
-                return;
-            Use(object.id);
+            given.push_back(object.id);
             try {
                 receiver(object);
             } catch (...) {
@@ -106,12 +120,15 @@ std::vector<Id> NearArchive::Read(std::span<const Id> ids, ObjectReceiver const&
     // What the receiver throws, which may be a failure of another archive, is no failure of this one.
     if (!isRead && thrown)
         std::rethrow_exception(thrown);
+    Use(given);
     if (!outcome.damaged.empty())
         Drop(outcome.damaged);
     std::vector<Id> others;
-    std::unordered_set<Id> met;
+    if (isRead && outcome.missing.empty() && outcome.damaged.empty())
+        return others;
+    std::unordered_set<Id> met(given.begin(), given.end());
     for (Id const& id : ids)
-        if (given.count(id) == 0 && met.insert(id).second)
+        if (met.insert(id).second)
             others.push_back(id);
     return others;
 }
@@ -127,16 +144,18 @@ std::optional<Buffer> NearArchive::ReadContent(Id const& id, std::uint64_t offse
     if (!Try([&] { content = archive_->ReadContent(id, offset, size); }))
         Drop({&id, 1});
     if (content)
-        Use(id);
+        Use({&id, 1});
     return content;
 }
 
 void NearArchive::Keep(std::vector<NewObject> objects) {
     std::uint64_t size = 0;
-    for (NewObject& object : objects) {
+    std::vector<Id> ids;
+    for (NewObject const& object : objects) {
         size += object.data.GetSize();
-        Use(object.id);
+        ids.push_back(object.id);
     }
+    Use(ids);
     Change change;
     change.objects = std::move(objects);
     if (!change.objects.empty() && Try([&] { archive_->Apply(change); }))
@@ -149,7 +168,7 @@ bool NearArchive::KeepContent(Id const& id, StreamIO& content) {
     Try([&] { isStored = archive_->StoreContent(id, content, {}, nullptr); });
     if (!isStored)
         return false;
-    Use(id);
+    Use({&id, 1});
     NoteStored(size);
     return true;
 }
@@ -245,6 +264,7 @@ NearArchive::Uses NearArchive::ReadUses() {
     Uses uses;
     for (Record const& record : archive_->ReadRecords(names)) {
         Buffer const value = Joined(*record.value);
+        uses.reserve(uses.size() + BytesOf(value).size() / sizeof(Id::Digest));
         try {
             for (ByteReader reader(BytesOf(value)); !reader.Rest().empty();) {
                 Id::Digest const digest = TakeDigest(reader);
@@ -287,17 +307,17 @@ void NearArchive::SaveUses() {
         WriteUses(uses);
 }
 
-void NearArchive::KeepRecord(KivStringT<char16_t> const& name, std::optional<Buffer> value) {
-    {
-        std::scoped_lock const lock(mutex_);
-        auto const known = knownRecords_.find(name);
-        if (known != knownRecords_.end() && SameValue(known->second, value))
+void NearArchive::KeepRecord(KivStringT<char16_t> const& name, Bytes const& value) {
+    Try([&] {
+        // Most of the time nothing has changed, and reading must not write.
+        auto const kept = archive_->ReadRecords({&name, 1});
+        std::optional<Buffer> const wanted(BufferOf(value));
+        if (!kept.empty() && SameValue(kept.front().value, wanted))
             return;
-        knownRecords_[name] = value;
-    }
-    Change change;
-    change.records.push_back({{name, std::move(value)}, false, {}});
-    Try([&] { archive_->Apply(change); });
+        Change change;
+        change.records.push_back({{name, wanted}, false, {}});
+        archive_->Apply(change);
+    });
 }
 
 void NearArchive::KeepBranches(std::vector<Branch> const& branches) {
@@ -308,22 +328,23 @@ void NearArchive::KeepBranches(std::vector<Branch> const& branches) {
         Append(bytes, name);
         AppendDigest(bytes, DigestOf(branch.head));
     }
-    KeepRecord(nameOfBranches, BufferOf(bytes));
+    KeepRecord(nameOfBranches, bytes);
 }
 
-std::vector<Branch> NearArchive::ReadBranches() {
-    std::vector<Branch> branches;
+std::optional<std::vector<Branch>> NearArchive::ReadBranches() {
     KivStringT<char16_t> const name(nameOfBranches);
-    for (Record const& record : archive_->ReadRecords({&name, 1})) {
-        Buffer const value = Joined(*record.value);
-        try {
-            for (ByteReader reader(BytesOf(value)); !reader.Rest().empty();) {
-                KivStringT<char16_t> branch = NameOfBytes(reader.Take(reader.TakeNumber()));
-                branches.push_back({std::move(branch), Id::FromDigest(TakeDigest(reader))});
-            }
-        } catch (Malformed const&) {
-            break;
+    auto const records = archive_->ReadRecords({&name, 1});
+    if (records.empty())
+        return std::nullopt;
+    Buffer const value = Joined(*records.front().value);
+    std::vector<Branch> branches;
+    try {
+        for (ByteReader reader(BytesOf(value)); !reader.Rest().empty();) {
+            KivStringT<char16_t> branch = NameOfBytes(reader.Take(reader.TakeNumber()));
+            branches.push_back({std::move(branch), Id::FromDigest(TakeDigest(reader))});
         }
+    } catch (Malformed const&) {
+        return std::nullopt;
     }
     return branches;
 }
@@ -332,39 +353,67 @@ void NearArchive::KeepRecords(std::span<const KivStringT<char16_t>> names, std::
     for (auto const& name : names) {
         auto const found =
             std::find_if(records.begin(), records.end(), [&name](Record const& record) { return record.name == name; });
-        KeepRecord(NameOfRecord(name), found == records.end() ? std::nullopt : found->value);
+        Bytes kept{found == records.end() ? isMissing : isThere};
+        if (found != records.end())
+            Append(kept, BytesOf(Joined(found->value.value_or(Buffer()))));
+        KeepRecord(NameOfRecord(name), kept);
     }
 }
 
-std::vector<Record> NearArchive::ReadRecords(std::span<const KivStringT<char16_t>> names) {
+std::optional<std::vector<Record>> NearArchive::ReadRecords(std::span<const KivStringT<char16_t>> names) {
     std::vector<Record> records;
-    for (auto const& name : names) {
+    for (std::set<KivStringT<char16_t>> const ordered(names.begin(), names.end()); auto const& name : ordered) {
         auto const nearName = NameOfRecord(name);
-        for (Record& record : archive_->ReadRecords({&nearName, 1}))
-            records.push_back({name, std::move(record.value)});
+        auto const kept = archive_->ReadRecords({&nearName, 1});
+        if (kept.empty())
+            return std::nullopt;
+        Buffer const joined = Joined(*kept.front().value);
+        ByteView const value = BytesOf(joined);
+        if (value.empty())
+            return std::nullopt;
+        if (value.front() == isThere)
+            records.push_back({name, BufferOf(value.subspan(1))});
     }
-    std::sort(records.begin(), records.end(),
-              [](Record const& left, Record const& right) { return left.name < right.name; });
     return records;
 }
 
 void NearArchive::KeepAncestry(std::vector<Ancestry> const& facts) {
-    Change change;
+    std::vector<Ancestry const*> unknown;
     {
         std::scoped_lock const lock(mutex_);
-        for (Ancestry const& one : facts)
-            if (auto const [known, isNew] = knownFacts_.try_emplace(one.commit, one.contains.size());
-                isNew || known->second < one.contains.size()) {
-                known->second = one.contains.size();
-                change.ancestry.push_back(one);
-            }
+        for (Ancestry const& one : facts) {
+            auto const known = knownFacts_.find(one.commit);
+            if (known == knownFacts_.end() || known->second < one.contains.size())
+                unknown.push_back(&one);
+        }
     }
-    if (!change.ancestry.empty())
-        Try([&] { archive_->Apply(change); });
+    if (unknown.empty())
+        return;
+    Try([&] {
+        Change change;
+        std::vector<Id> ids;
+        for (Ancestry const* const one : unknown)
+            ids.push_back(one->commit);
+        std::unordered_map<Id, std::size_t> kept;
+        for (Ancestry const& one : archive_->ReadAncestry(ids, Follow::Parents, 0))
+            kept.emplace(one.commit, one.contains.size());
+        for (Ancestry const* const one : unknown)
+            if (auto const found = kept.find(one->commit); found == kept.end() || found->second < one->contains.size())
+                change.ancestry.push_back(*one);
+        if (!change.ancestry.empty())
+            archive_->Apply(change);
+        std::scoped_lock const lock(mutex_);
+        for (Ancestry const* const one : unknown)
+            knownFacts_[one->commit] = one->contains.size();
+    });
 }
 
-std::vector<Ancestry> NearArchive::ReadAncestry(std::span<const Id> commits, Follow follow, std::size_t more) {
-    return archive_->ReadAncestry(commits, follow, more);
+std::optional<std::vector<Ancestry>> NearArchive::ReadAncestry(std::span<const Id> commits, Follow follow,
+                                                               std::size_t more) {
+    auto facts = archive_->ReadAncestry(commits, follow, more);
+    if (facts.empty() && !commits.empty())
+        return std::nullopt;
+    return facts;
 }
 
 } // namespace KivArchive

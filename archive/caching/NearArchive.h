@@ -3,9 +3,9 @@
 /// @file
 /// The near side of a `CachingArchive`: what is kept there, and what goes.
 
+#include "Bytes.h"
 #include "KivArchive/CachingArchive.h"
 
-#include <map>
 #include <mutex>
 #include <unordered_map>
 
@@ -33,17 +33,22 @@ public:
     /// Whether a content of so many bytes is worth keeping.
     [[nodiscard]] bool HasRoomFor(std::uint64_t size) const noexcept { return size <= maximumBytes_ / 4; }
 
-    /// What the far archive said last.
+    /// What the far archive said last; none if it was never asked, which is not the same as having nothing.
     void KeepBranches(std::vector<Branch> const& branches);
-    [[nodiscard]] std::vector<Branch> ReadBranches();
+    [[nodiscard]] std::optional<std::vector<Branch>> ReadBranches();
     void KeepRecords(std::span<const KivStringT<char16_t>> names, std::vector<Record> const& records);
-    [[nodiscard]] std::vector<Record> ReadRecords(std::span<const KivStringT<char16_t>> names);
+    [[nodiscard]] std::optional<std::vector<Record>> ReadRecords(std::span<const KivStringT<char16_t>> names);
     void KeepAncestry(std::vector<Ancestry> const& facts);
-    [[nodiscard]] std::vector<Ancestry> ReadAncestry(std::span<const Id> commits, Follow follow, std::size_t more);
+    /// None if no facts of @p commits are here.
+    [[nodiscard]] std::optional<std::vector<Ancestry>> ReadAncestry(std::span<const Id> commits, Follow follow,
+                                                                    std::size_t more);
 
 private:
+    struct HashOfDigest {
+        std::size_t operator()(Id::Digest const& digest) const noexcept;
+    };
     /// The hour of the last use.
-    using Uses = std::map<Id::Digest, std::uint64_t>;
+    using Uses = std::unordered_map<Id::Digest, std::uint64_t, HashOfDigest>;
     struct Candidate {
         std::uint64_t hour = 0;
         /// The number of the last use since this was made; 0 for none.
@@ -51,8 +56,8 @@ private:
         ObjectInfo info;
     };
 
-    void Use(Id const& id);
-    void KeepRecord(KivStringT<char16_t> const& name, std::optional<Buffer> value);
+    void Use(std::span<const Id> ids);
+    void KeepRecord(KivStringT<char16_t> const& name, Bytes const& value);
     void NoteStored(std::uint64_t bytes);
     [[nodiscard]] std::vector<Candidate> ListByUse();
     void RemoveOldest();
@@ -69,7 +74,6 @@ private:
     std::uint64_t useCount_ = 0;
     /// Of each commit whose facts are here, how many it contains.
     std::unordered_map<Id, std::size_t> knownFacts_;
-    std::map<KivStringT<char16_t>, std::optional<Buffer>> knownRecords_;
     /// How much may be stored before the size is looked at once more.
     std::uint64_t unwatched_ = 0;
     std::mutex removing_;

@@ -76,7 +76,10 @@ void Connection::Prepare(Statement statement) {
 void Connection::Execute(Statement statement, Parameters const& parameters) {
     std::vector<const char*> values;
     std::vector<int> sizes;
-    for (Bytes const& value : parameters.Values()) {
+    values.reserve(parameters.Count());
+    sizes.reserve(parameters.Count());
+    for (std::size_t i = 0; i < parameters.Count(); ++i) {
+        ByteView const value = parameters.At(i);
         // Without an address it would stand for NULL.
         values.push_back(value.empty() ? "" : reinterpret_cast<const char*>(value.data()));
         sizes.push_back(static_cast<int>(value.size()));

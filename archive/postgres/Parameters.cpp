@@ -2,6 +2,9 @@
 
 #include "Changes.h"
 
+#include <algorithm>
+#include <string_view>
+
 namespace KivArchive::Postgres {
 
 namespace {
@@ -14,8 +17,10 @@ constexpr std::uint32_t typeShort = 21;
 /// Numbers travel with their highest byte first.
 template <class Number>
 void AppendBigEndian(Bytes& bytes, Number number) {
-    for (std::size_t shift = sizeof(Number) * 8; shift > 0; shift -= 8)
-        Append(bytes, static_cast<std::byte>(number >> (shift - 8) & 0xFFU));
+    std::array<std::byte, sizeof(Number)> written{};
+    for (std::size_t i = 0; i < written.size(); ++i)
+        written[i] = static_cast<std::byte>(number >> (8 * (written.size() - 1 - i)) & 0xFFU);
+    Append(bytes, written);
 }
 
 /// The header of an array with one dimension, which begins at 1.
@@ -29,33 +34,36 @@ void AppendArrayHeader(Bytes& bytes, std::uint32_t type, std::size_t count) {
     AppendBigEndian(bytes, std::uint32_t{1});
 }
 
+/// Makes room as vectors grow, so that appending many takes no time that grows with their number.
+void MakeRoom(Bytes& bytes, std::size_t more) {
+    constexpr std::size_t least = 1024;
+    if (bytes.capacity() - bytes.size() < more)
+        bytes.reserve(std::max({least, 2 * bytes.capacity(), bytes.size() + more}));
+}
+
 template <class Values, class View>
-Bytes ArrayOfBytes(Values const& values, View view) {
+void AppendArrayOfBytes(Bytes& array, Values const& values, View view) {
     constexpr std::size_t headerSize = 20;
     constexpr std::size_t lengthSize = 4;
     std::size_t size = headerSize;
     for (auto const& value : values)
         size += lengthSize + view(value).size();
-    Bytes array;
-    array.reserve(size);
+    MakeRoom(array, size);
     AppendArrayHeader(array, typeBytes, values.size());
     for (auto const& value : values) {
         ByteView const bytes = view(value);
         AppendBigEndian(array, static_cast<std::uint32_t>(bytes.size()));
         Append(array, bytes);
     }
-    return array;
 }
 
 template <class Unsigned, class Number>
-Bytes ArrayOfNumbers(std::uint32_t type, std::span<const Number> numbers) {
-    Bytes array;
+void AppendArrayOfNumbers(Bytes& array, std::uint32_t type, std::span<const Number> numbers) {
     AppendArrayHeader(array, type, numbers.size());
     for (Number const number : numbers) {
         AppendBigEndian(array, static_cast<std::uint32_t>(sizeof(Number)));
         AppendBigEndian(array, static_cast<Unsigned>(number));
     }
-    return array;
 }
 
 ByteView ViewOf(Id const& id) {
@@ -64,9 +72,18 @@ ByteView ViewOf(Id const& id) {
 
 } // namespace
 
-Parameters& Parameters::With(ByteView bytes) {
-    values_.emplace_back(bytes.begin(), bytes.end());
+Parameters& Parameters::EndOne() {
+    constexpr std::size_t mostUsual = 16;
+    if (ends_.empty())
+        ends_.reserve(mostUsual);
+    ends_.push_back(bytes_.size());
     return *this;
+}
+
+Parameters& Parameters::With(ByteView bytes) {
+    MakeRoom(bytes_, bytes.size());
+    Append(bytes_, bytes);
+    return EndOne();
 }
 
 Parameters& Parameters::With(Id const& id) {
@@ -74,8 +91,8 @@ Parameters& Parameters::With(Id const& id) {
 }
 
 Parameters& Parameters::With(std::int64_t number) {
-    AppendBigEndian(values_.emplace_back(), static_cast<std::uint64_t>(number));
-    return *this;
+    AppendBigEndian(bytes_, static_cast<std::uint64_t>(number));
+    return EndOne();
 }
 
 Parameters& Parameters::With(std::string const& text) {
@@ -83,28 +100,33 @@ Parameters& Parameters::With(std::string const& text) {
 }
 
 Parameters& Parameters::With(std::span<const Id> ids) {
-    values_.push_back(ArrayOfBytes(ids, ViewOf));
-    return *this;
+    AppendArrayOfBytes(bytes_, ids, ViewOf);
+    return EndOne();
 }
 
 Parameters& Parameters::With(std::span<const ByteView> values) {
-    values_.push_back(ArrayOfBytes(values, [](ByteView value) { return value; }));
-    return *this;
+    AppendArrayOfBytes(bytes_, values, [](ByteView value) { return value; });
+    return EndOne();
 }
 
 Parameters& Parameters::With(std::span<const Bytes> values) {
-    values_.push_back(ArrayOfBytes(values, [](Bytes const& value) { return ByteView(value); }));
-    return *this;
+    AppendArrayOfBytes(bytes_, values, [](Bytes const& value) { return ByteView(value); });
+    return EndOne();
 }
 
 Parameters& Parameters::With(std::span<const std::int16_t> numbers) {
-    values_.push_back(ArrayOfNumbers<std::uint16_t>(typeShort, numbers));
-    return *this;
+    AppendArrayOfNumbers<std::uint16_t>(bytes_, typeShort, numbers);
+    return EndOne();
 }
 
 Parameters& Parameters::With(std::span<const std::int64_t> numbers) {
-    values_.push_back(ArrayOfNumbers<std::uint64_t>(typeLong, numbers));
-    return *this;
+    AppendArrayOfNumbers<std::uint64_t>(bytes_, typeLong, numbers);
+    return EndOne();
+}
+
+bool Rows::HasChanged() const noexcept {
+    const char* const count = PQcmdTuples(result_.get());
+    return *count != '\0' && std::string_view(count) != "0";
 }
 
 ByteView Rows::Value(int row, int column) const noexcept {

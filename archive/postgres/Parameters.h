@@ -11,7 +11,7 @@
 
 namespace KivArchive::Postgres {
 
-/// The parameters of one statement, in their order.
+/// The parameters of one statement, in their order, one behind the other.
 class Parameters {
 public:
     Parameters& With(ByteView bytes);
@@ -29,10 +29,17 @@ public:
     Parameters& With(std::span<const std::int16_t> numbers);
     Parameters& With(std::span<const std::int64_t> numbers);
 
-    [[nodiscard]] std::vector<Bytes> const& Values() const noexcept { return values_; }
+    [[nodiscard]] std::size_t Count() const noexcept { return ends_.size(); }
+    [[nodiscard]] ByteView At(std::size_t number) const noexcept {
+        std::size_t const begin = number == 0 ? 0 : ends_[number - 1];
+        return ByteView(bytes_).subspan(begin, ends_[number] - begin);
+    }
 
 private:
-    std::vector<Bytes> values_;
+    Parameters& EndOne();
+
+    Bytes bytes_;
+    std::vector<std::size_t> ends_;
 };
 
 /// What one statement gave.
@@ -42,6 +49,8 @@ public:
     explicit Rows(PGresult* result) noexcept : result_(result, &PQclear) {}
 
     [[nodiscard]] int Count() const noexcept { return result_ == nullptr ? 0 : PQntuples(result_.get()); }
+    /// Whether the statement has stored or changed a row.
+    [[nodiscard]] bool HasChanged() const noexcept;
     [[nodiscard]] bool IsNull(int row, int column) const noexcept {
         return PQgetisnull(result_.get(), row, column) != 0;
     }

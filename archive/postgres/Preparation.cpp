@@ -86,13 +86,13 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
     ForEachInParallel(prepared_.size(), workers, connection.compressor,
                       [this](std::size_t index, Compressor& own) { MakeStored(prepared_[index], own); });
     numbers_.clear();
-    std::sort(prepared_.begin(), prepared_.end(), [](Prepared const& left, Prepared const& right) {
-        return DigestOf(left.item->id) < DigestOf(right.item->id);
-    });
+    std::sort(prepared_.begin(), prepared_.end(),
+              [](Prepared const& left, Prepared const& right) { return IsBefore(left.item->id, right.item->id); });
 }
 
 void Preparation::Select(std::vector<Item> const& items) {
     prepared_.reserve(items.size());
+    numbers_.reserve(items.size());
     for (Item const& item : items)
         if (numbers_.emplace(item.id, prepared_.size()).second)
             prepared_.emplace_back().item = &item;
@@ -188,8 +188,11 @@ void Preparation::FindBase(Prepared& one, Compressor& compressor) {
         // Version v is a difference to version v & (v - 1), so that no version is more than log2(v) steps from one that
         // is whole.
         std::uint64_t const wanted = generation & (generation - 1);
+        std::vector<std::pair<Id, Id>> links;
         while (version.generation > wanted) {
             std::uint64_t const after = version.generation;
+            if (numbers_.find(at) == numbers_.end())
+                links.emplace_back(at, version.base);
             at = version.base;
             version = VersionOf(at);
             if (version.generation >= after)
@@ -200,6 +203,7 @@ void Preparation::FindBase(Prepared& one, Compressor& compressor) {
         auto const prepared = numbers_.find(at);
         one.baseForm = prepared != numbers_.end() ? Form{std::make_shared<int>(), prepared_[prepared->second].form}
                                                   : forms_.FormOf(at, compressor);
+        links_.insert(links_.end(), links.begin(), links.end());
         one.base = std::move(at);
         one.generation = generation;
     } catch (Malformed const&) {
@@ -249,26 +253,30 @@ void Preparation::MakeDifferencesToRows(Connection& connection, unsigned workers
         close();
 }
 
-std::vector<Id> Preparation::Bases(std::unordered_set<Id> const& inherited) const {
-    std::unordered_map<Id, Prepared const*> own;
-    for (Prepared const& one : prepared_)
-        own.emplace(one.item->id, &one);
+std::vector<Id> Preparation::Bases(std::vector<Id> const& inherited) const {
+    auto const findOwn = [this](Id const& id) -> Prepared const* {
+        auto const found =
+            std::lower_bound(prepared_.begin(), prepared_.end(), id,
+                             [](Prepared const& one, Id const& wanted) { return IsBefore(one.item->id, wanted); });
+        return found != prepared_.end() && found->item->id == id ? &*found : nullptr;
+    };
     // What an earlier version is a difference to stays for as long as that does.
     auto const isInherited = [&](Prepared const& one) {
         Id const* earlier = &one.item->earlier;
-        for (std::size_t steps = 0; steps < prepared_.size(); ++steps) {
-            auto const found = own.find(*earlier);
-            if (found == own.end())
+        for (std::size_t steps = 0; steps < prepared_.size() && !earlier->IsEmpty(); ++steps) {
+            Prepared const* const own = findOwn(*earlier);
+            if (own == nullptr)
                 break;
-            earlier = &found->second->item->earlier;
+            earlier = &own->item->earlier;
         }
-        return inherited.count(*earlier) != 0;
+        return !earlier->IsEmpty() && Contains(inherited, *earlier);
     };
-    std::unordered_set<Id> bases;
+    std::vector<Id> bases;
     for (Prepared const& one : prepared_)
-        if (!one.base.IsEmpty() && own.count(one.base) == 0 && (inherited.empty() || !isInherited(one)))
-            bases.insert(one.base);
-    return {bases.begin(), bases.end()};
+        if (!one.base.IsEmpty() && findOwn(one.base) == nullptr && (inherited.empty() || !isInherited(one)))
+            bases.push_back(one.base);
+    SortUnique(bases);
+    return bases;
 }
 
 } // namespace KivArchive::Postgres

@@ -3,10 +3,12 @@
 /// @file
 /// Everything that is made of what is to be stored before the transaction that stores it.
 
+#include "Changes.h"
 #include "postgres/RecentRows.h"
 #include "postgres/Store.h"
 
-#include <unordered_set>
+#include <algorithm>
+#include <unordered_map>
 
 namespace KivArchive::Postgres {
 
@@ -20,6 +22,19 @@ struct Prepared : ItemForm {
     /// What the row holds.
     Bytes stored;
 };
+
+inline bool IsBefore(Id const& left, Id const& right) {
+    return DigestOf(left) < DigestOf(right);
+}
+
+inline bool Contains(std::vector<Id> const& sorted, Id const& id) {
+    return std::binary_search(sorted.begin(), sorted.end(), id, IsBefore);
+}
+
+inline void SortUnique(std::vector<Id>& ids) {
+    std::sort(ids.begin(), ids.end(), IsBefore);
+    ids.erase(std::unique(ids.begin(), ids.end()), ids.end());
+}
 
 class Preparation {
 public:
@@ -40,8 +55,11 @@ public:
     [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
     [[nodiscard]] std::vector<Id> const& Removed() const noexcept { return removed_; }
     /// The rows that items are differences to and that are not among them, each once.
-    /// @param inherited earlier versions whose bases need not be named
-    [[nodiscard]] std::vector<Id> Bases(std::unordered_set<Id> const& inherited) const;
+    /// @param inherited sorted; earlier versions whose bases need not be named
+    [[nodiscard]] std::vector<Id> Bases(std::vector<Id> const& inherited) const;
+    /// Rows and what they are differences to, as they were when they were read or stored: the steps that were taken to the
+    /// bases of the items. For as long as the server has them so, it keeps the last one for the first.
+    [[nodiscard]] std::vector<std::pair<Id, Id>> const& Links() const noexcept { return links_; }
     /// Keeps what has been stored, if it was new, and takes the forms of the items for that.
     void KeepStored();
 
@@ -66,6 +84,7 @@ private:
     std::unordered_map<Id, std::size_t> numbers_;
     std::vector<Id> present_;
     std::vector<Id> removed_;
+    std::vector<std::pair<Id, Id>> links_;
     bool areNew_ = false;
     /// The earlier versions looked at.
     Forms forms_;

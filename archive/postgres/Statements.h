@@ -56,6 +56,7 @@ enum class Statement : std::uint8_t {
     CheckNoHead,
     MoveBranch,
     MoveBranchToNew,
+    MoveBranchToNewIfBasesStand,
     FindAttempt,
     MakeBranch,
     RemoveBranch,

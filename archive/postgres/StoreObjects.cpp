@@ -14,19 +14,6 @@ constexpr std::size_t statementSize = 8 * largestWholeContent;
 /// A branch is held while a change of one statement is stored.
 constexpr std::size_t mostItemsOfShort = 64;
 
-bool IsBefore(Id const& left, Id const& right) {
-    return DigestOf(left) < DigestOf(right);
-}
-
-bool Contains(std::vector<Id> const& sorted, Id const& id) {
-    return std::binary_search(sorted.begin(), sorted.end(), id, IsBefore);
-}
-
-void SortUnique(std::vector<Id>& ids) {
-    std::sort(ids.begin(), ids.end(), IsBefore);
-    ids.erase(std::unique(ids.begin(), ids.end()), ids.end());
-}
-
 /// The bytes that stand for an identifier; none for null.
 ByteView BytesOfId(Id const& id) {
     return id.IsEmpty() ? ByteView() : std::as_bytes(std::span(DigestOf(id)));
@@ -40,6 +27,14 @@ struct ObjectColumns {
     std::vector<ByteView> bases;
     std::vector<ByteView> forms;
     std::size_t size = 0;
+
+    explicit ObjectColumns(std::size_t count) {
+        ids.reserve(count);
+        types.reserve(count);
+        sizes.reserve(count);
+        bases.reserve(count);
+        forms.reserve(count);
+    }
 
     void Add(Prepared const& one) {
         ids.push_back(BytesOfId(one.item->id));
@@ -93,7 +88,7 @@ struct Uses {
             used.insert(used.end(), items.begin(), items.end());
         }
         SortUnique(used);
-        bases = preparation.Bases({change.inherited.begin(), change.inherited.end()});
+        bases = preparation.Bases({});
         held = used;
         held.insert(held.end(), bases.begin(), bases.end());
         SortUnique(held);
@@ -125,8 +120,8 @@ public:
         static constexpr std::string_view divisionByZero = "22012";
         static constexpr std::string_view uniqueViolation = "23505";
         try {
-            trip_.Run();
-            return true;
+            auto const answers = trip_.Run();
+            return !isShort_ || answers.front().HasChanged();
         } catch (Refused const& refused) {
             if (hasToken_ && IsRepeated(refused, tokenPosition_))
                 return true;
@@ -139,20 +134,26 @@ public:
 private:
     /// Whether it is a little that is new, on top of one branch, and uses nothing but what that branch keeps.
     [[nodiscard]] bool IsShort() const {
-        if (change_.branches.size() != 1 || !change_.records.empty() || !uses_.held.empty() || !preparation_.AreNew() ||
+        if (change_.branches.size() != 1 || !change_.records.empty() || !uses_.used.empty() || !preparation_.AreNew() ||
             !facts_.contained.empty() || preparation_.Items().size() > mostItemsOfShort)
             return false;
+        std::vector<Id> inherited = change_.inherited;
+        SortUnique(inherited);
+        if (!preparation_.Bases(inherited).empty())
+            return false;
         BranchMove const& move = change_.branches.front();
-        std::unordered_set<Id> commits;
-        bool const areDistinct =
-            std::all_of(change_.ancestry.begin(), change_.ancestry.end(),
-                        [&commits](Ancestry const& facts) { return commits.insert(facts.commit).second; });
-        return !move.expected.IsEmpty() && areDistinct && commits.count(move.head) != 0;
+        std::vector<Id> commits;
+        for (Ancestry const& facts : change_.ancestry)
+            commits.push_back(facts.commit);
+        SortUnique(commits);
+        bool const areDistinct = commits.size() == change_.ancestry.size();
+        return !move.expected.IsEmpty() && areDistinct && Contains(commits, move.head);
     }
 
     void StoreInOneStatement(Token const& token) {
+        isShort_ = true;
         BranchMove const& move = change_.branches.front();
-        ObjectColumns columns;
+        ObjectColumns columns(preparation_.Items().size());
         for (Prepared const& one : preparation_.Items())
             columns.Add(one);
         // Who comes again finds it with the new head's facts, which are stored by nobody else.
@@ -163,7 +164,17 @@ private:
         parameters.With(BytesOfName(move.name)).With(move.expected).With(move.head);
         columns.AddTo(parameters);
         parameters.With(facts_.commits).With(facts_.parents).With(facts_.trees).With(tokens);
-        trip_.Add(Statement::MoveBranchToNew, parameters);
+        // A branch that was elsewhere in between keeps what its head reaches, stored in whatever way.
+        std::vector<ByteView> ids;
+        std::vector<ByteView> bases;
+        for (auto const& [id, base] : preparation_.Links()) {
+            ids.push_back(BytesOfId(id));
+            bases.push_back(BytesOfId(base));
+        }
+        if (ids.empty())
+            trip_.Add(Statement::MoveBranchToNew, parameters);
+        else
+            trip_.Add(Statement::MoveBranchToNewIfBasesStand, parameters.With(ids).With(bases));
     }
 
     void StoreInOrder(Token const& token) {
@@ -186,7 +197,7 @@ private:
     void AddObjects() {
         std::vector<Prepared> const& items = preparation_.Items();
         for (std::size_t next = 0; next < items.size();) {
-            ObjectColumns columns;
+            ObjectColumns columns(items.size() - next);
             for (; next < items.size() && columns.size < statementSize; ++next)
                 columns.Add(items[next]);
             Parameters parameters;
@@ -257,6 +268,7 @@ private:
     Change const& change_;
     Uses uses_;
     FactColumns facts_;
+    bool isShort_ = false;
     bool hasToken_ = false;
     std::size_t tokenPosition_ = 0;
 };
@@ -325,14 +337,16 @@ FoundReason FindReason(Connection& connection, Change const& change, std::vector
 
 /// What @p change relies on without bringing it.
 std::vector<Id> NeededBy(Change const& change, std::vector<Item> const& items) {
-    std::unordered_set<Id> brought;
+    std::vector<Id> brought;
+    brought.reserve(items.size());
     for (Item const& item : items)
-        brought.insert(item.id);
+        brought.push_back(item.id);
+    SortUnique(brought);
     std::vector<Id> needed = change.relied;
     for (BranchMove const& move : change.branches)
         if (!move.head.IsEmpty())
             needed.push_back(move.head);
-    std::erase_if(needed, [&brought](Id const& id) { return brought.count(id) != 0; });
+    std::erase_if(needed, [&brought](Id const& id) { return Contains(brought, id); });
     return needed;
 }
 

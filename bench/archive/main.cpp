@@ -35,7 +35,9 @@ double Seconds(std::chrono::steady_clock::time_point since) {
 
 Id HeadOf(IArchive& archive) {
     auto const branches = archive.ReadBranches();
-    return branches.empty() ? Id() : branches.front().head;
+    if (branches.empty())
+        throw std::runtime_error("there is no branch");
+    return branches.front().head;
 }
 
 Id IdOfDigits(std::string_view digits) {

@@ -31,6 +31,7 @@ inline void CheckArchiveConformance(ArchiveMaker const& makeEmpty, ConformanceFa
                              {"Ancestry", Conformance::CheckAncestry},
                              {"Marks", Conformance::CheckMarks},
                              {"RemovedEarlierVersions", Conformance::CheckRemovedEarlierVersions},
+                             {"Inherited", Conformance::CheckInherited},
                              {"Refusals", Conformance::CheckRefusals},
                              {"Threads", Conformance::CheckThreads}}) {
         Conformance::Trial trial(each.name, onFailure);

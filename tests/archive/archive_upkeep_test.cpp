@@ -127,16 +127,6 @@ TEST_P(ArchiveUpkeep, CollectKeepsWhatWasMergedAndEndsAtDamage) {
     EXPECT_THROW(CollectNow(*archive), ArchiveError);
 }
 
-/// What others do between two steps of a collection.
-struct Meanwhile final : IProgress {
-    bool Report(Progress const& progress) override {
-        if (progress.step == std::string_view("removing objects") && act)
-            std::exchange(act, nullptr)();
-        return true;
-    }
-    std::function<void()> act;
-};
-
 TEST_P(ArchiveUpkeep, WhatIsUsedOrNotDueKeepsWhatItNames) {
     auto const archive = Make();
     NewObject const blob = Object(ObjectType::Blob, "deep");
@@ -150,8 +140,7 @@ TEST_P(ArchiveUpkeep, WhatIsUsedOrNotDueKeepsWhatItNames) {
     std::vector<Id> const due{blob.id, inner.id, outer.id, youngBlob.id};
     archive->Mark(due);
 
-    Meanwhile meanwhile;
-    meanwhile.act = [&] {
+    Meanwhile meanwhile([&] {
         NewCommit const commit = Commit(outer.id, {}, "uses it");
         Change use;
         use.objects = {commit.object};
@@ -159,7 +148,7 @@ TEST_P(ArchiveUpkeep, WhatIsUsedOrNotDueKeepsWhatItNames) {
         use.ancestry = {commit.facts};
         use.branches = {{u"master", {}, commit.object.id}};
         archive->Apply(use);
-    };
+    });
     CollectOptions options;
     options.grace = noGrace;
     options.slice = 1;

@@ -38,12 +38,31 @@ protected:
     }
 };
 
+/// A file that counts what is stored in it.
+class NearFile final : public ForwardingArchive {
+public:
+    NearFile(std::string const& path, int& changes) : file_(path), changes_(changes) {}
+
+    ChangeOutcome Apply(Change const& change) override {
+        ++changes_;
+        return ForwardingArchive::Apply(change);
+    }
+
+protected:
+    IArchive& Reach() override { return file_; }
+
+private:
+    SqliteArchive file_;
+    int& changes_;
+};
+
 /// A cache of a file in front of a far archive.
 struct CachingArchiveTest : testing::Test {
     TemporaryDirectory directory;
     std::shared_ptr<FarArchive> far = std::make_shared<FarArchive>();
+    int changesOfNear = 0;
 
-    std::shared_ptr<IArchive> OpenNear() { return std::make_shared<SqliteArchive>(directory.Path("near")); }
+    std::shared_ptr<IArchive> OpenNear() { return std::make_shared<NearFile>(directory.Path("near"), changesOfNear); }
     CachingArchive OpenCache(std::uint64_t maximumBytes = 1U << 30U) {
         return {OpenNear(), far, {maximumBytes, std::chrono::milliseconds(0)}};
     }
@@ -150,6 +169,52 @@ TEST_F(CachingArchiveTest, ServesWhatItHasWhileTheFarArchiveIsAway) {
     EXPECT_TRUE(host.Publish());
     EXPECT_EQ(HeadOf(cache), host.Head()) << "branches are asked for anew";
     EXPECT_FALSE(cache.IsAway());
+}
+
+TEST_F(CachingArchiveTest, DoesNotTakeWhatItHasNotSeenForNothing) {
+    SmallHost host(*far, 9);
+    EXPECT_TRUE(host.Publish());
+    CachingArchive cache = OpenCache();
+    std::vector<KivStringT<char16_t>> const names{u"settings"};
+    auto const isUnavailable = [&far = *far](auto call) {
+        far.isAway = true;
+        try {
+            static_cast<void>(call());
+        } catch (ArchiveError const& error) {
+            return error.GetKind() == Failure::Unavailable;
+        }
+        return false;
+    };
+    auto const readBranches = [&] { return cache.ReadBranches().size(); };
+    auto const readRecords = [&] { return cache.ReadRecords(names).size(); };
+    auto const readFacts = [&] { return cache.ReadAncestry({&host.Head(), 1}, Follow::Parents, 9).size(); };
+    EXPECT_TRUE(isUnavailable(readBranches)) << "an archive without branches is another thing";
+    EXPECT_TRUE(isUnavailable(readRecords));
+    EXPECT_TRUE(isUnavailable(readFacts));
+    far->isAway = false;
+    EXPECT_EQ(readBranches() + readRecords() + readFacts(), 2U);
+    EXPECT_FALSE(isUnavailable(readBranches));
+    EXPECT_FALSE(isUnavailable(readRecords)) << "that there is none was seen";
+    EXPECT_FALSE(isUnavailable(readFacts));
+}
+
+TEST_F(CachingArchiveTest, ReadingWhatIsNearStoresNothing) {
+    SmallHost host(*far, 9);
+    EXPECT_TRUE(host.Publish());
+    auto const readAll = [&](CachingArchive& cache) {
+        Id const head = HeadOf(cache);
+        std::vector<KivStringT<char16_t>> const names{u"settings"};
+        return cache.ReadRecords(names).size() + cache.ReadAncestry({&head, 1}, Follow::Parents, 9).size() +
+               ReadAll(cache, {head}).size();
+    };
+    {
+        CachingArchive first = OpenCache();
+        EXPECT_EQ(readAll(first), 2U);
+    }
+    CachingArchive second = OpenCache();
+    int const before = changesOfNear;
+    EXPECT_EQ(readAll(second), 2U);
+    EXPECT_EQ(changesOfNear, before);
 }
 
 } // namespace

@@ -156,6 +156,41 @@ TEST(PostgresArchive, KeepsWhatIsUsedWhileOthersCollect) {
     EXPECT_EQ(ProblemsOf(*archive), "");
 }
 
+/// Another host goes back, collects what it has left with all that it was made from, and stores it again: whole this time.
+TEST(PostgresArchive, TakesNoNoticeOfRowsThatHaveBeenStoredAnew) {
+    using Conformance::TextVersion;
+    auto const archive = theServer->MakeArchive();
+    PostgresOptions options;
+    options.schema = theServer->LastSchema();
+    PostgresArchive other(theServer->Address(), options);
+    Conformance::Store(*archive, {Object(ObjectType::Blob, "")});
+    TextVersion const first(0, nullptr);
+    TextVersion const second(1, &first);
+    TextVersion const third(2, &second);
+    TextVersion const elsewhere(3, nullptr);
+    ASSERT_TRUE(archive->Apply(first.After(nullptr)).applied);
+    ASSERT_TRUE(archive->Apply(second.After(&first)).applied);
+
+    Id const head = second.commit.object.id;
+    Change away = elsewhere.After(nullptr);
+    away.branches.front().expected = head;
+    ASSERT_TRUE(other.Apply(away).applied);
+    for (int i = 0; i < 3; ++i)
+        Collect(other, {std::chrono::seconds(0), {}, 1000, 1000}, nullptr);
+    std::vector<Id> const collected = second.Ids();
+    ASSERT_EQ(other.FindMissing(collected).size(), 3U);
+    Change back = second.After(nullptr);
+    back.branches.front().expected = elsewhere.commit.object.id;
+    for (NewObject& object : back.objects)
+        object.earlier = {};
+    ASSERT_TRUE(other.Apply(back).applied);
+
+    // As the first host remembers it, the third version is a difference to the first one.
+    EXPECT_TRUE(archive->Apply(third.After(&second)).applied);
+    EXPECT_TRUE(third.IsIn(other));
+    EXPECT_EQ(ProblemsOf(other), "");
+}
+
 TEST(PostgresArchive, RolesMayReadOnlyOrWrite) {
     auto const archive = theServer->MakeArchive();
     SmallHost host(*archive, 3);
