@@ -34,12 +34,12 @@ STANDS_ON = {
 HEADERS = {
     "foundation": ("Foundation",),
     "identifiers": ("SHADigest256", "Id", "detail/Published", "detail/PublishedWord"),
-    "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/KeptForm"),
+    "objects": ("Object", "Helpers", "Blob", "detail/CachedId", "detail/KeptForm", "detail/ObjectTable"),
     "interface": ("IRepository",),
     "tree": ("Tree", "CommitTree", "Differences", "PortablePaths", "detail/DigestTrail", "detail/EntryTable"),
     "merge": ("Merge", "Conflicts"),
     "commit": ("Commit", "History", "detail/DeferredLinks"),
-    "storage": ("Storage", "ShortIds", "detail/ObjectTable"),
+    "storage": ("Storage", "ShortIds"),
     "repository": ("Repository", "MergeOutcome"),
     "core": ("KivVcs",),
 }

@@ -320,6 +320,32 @@ TEST_F(ReadingTrees, LeavesOutWhatCannotBeLoaded) {
     EXPECT_EQ(Files(packed.Read("long", &repo)), "x=1");
 }
 
+TEST_F(ReadingTrees, HaveTheIdentifierOfWhatTheyPackTo) {
+    const std::string entry = Entry("blob", "x", one);
+    const std::string other = packed.Add("blob", "2");
+    packed.forms[std::string(64, 'd')] = packed.forms[one];
+    std::string capitals = one;
+    for (char& digit : capitals)
+        digit = static_cast<char>(std::toupper(static_cast<unsigned char>(digit)));
+    packed.forms[capitals] = packed.forms[other];
+    const std::string tree = packed.Add("tree", entry);
+    const auto withMode = [&](std::string const& mode) { return mode + entry.substr(entry.find(' ')); };
+    // What is read is as long as what it packs to, or what differs makes up for it.
+    for (auto const& data :
+         {entry, Entry("blob", "a", other) + Entry("tree", "b", tree), Entry("blob", "\xED\x95\x9C", one),
+          withMode("100755"), withMode("040000"), Entry("blob", "y", other) + entry, entry + Entry("blob", "x", other),
+          Entry("blob", "x", capitals), Entry("blob", "x", std::string(64, 'd')),
+          Entry("blob", "a\xFF", one) + Entry("blob", "b\xED\xA0\xBD\xED\xB8\x80", one),
+          Entry("blob", "\xED\xA0\xBD\xED\xB8\x80\xFF", one), Entry("blob", "a/b", one),
+          Entry("blob", "/", one) + entry, entry + Entry("blob", "y", std::string(64, 'f')),
+          entry + Entry("blob", "y", one).substr(0, 40)}) {
+        const auto read = packed.Read(packed.Add("tree", data), &repo);
+        ASSERT_TRUE(read) << data;
+        EXPECT_EQ(IdText(*read), Identifier("tree", Bytes(read->GetData()))) << data;
+        EXPECT_TRUE(read->GetLocalBlob(u"x") == nullptr || IdText(*read->GetLocalBlob(u"x")) != std::string(64, 'd'));
+    }
+}
+
 TEST_F(ReadingTrees, ManyEntriesFromOneBufferThatIsUsedAgain) {
     for (const int count : {1, 32, 33, 1025}) {
         Tree tree;

@@ -29,6 +29,9 @@ public:
             add_reference();
     }
 
+    /// The same for the only holder of an object, which no other thread knows of: it takes no atomic exchange either.
+    void add_second_reference() const noexcept { references_.store(2, std::memory_order_relaxed); }
+
     /// True if that was the last reference; everything done through the other references happened before.
     [[nodiscard]] bool drop_reference() const noexcept {
         // A sole owner needs no atomic exchange: nobody else is left who could add a reference.

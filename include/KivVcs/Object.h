@@ -136,6 +136,7 @@ protected:
 
 private:
     friend class detail::Identification;
+    friend struct detail::DataToHash;
 
     /// What the identifier of an object of one of the library's classes is computed by. Never asked of others.
     [[nodiscard]] virtual Id ComputeId() const;

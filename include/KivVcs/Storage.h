@@ -12,6 +12,10 @@
 
 namespace KivVcs {
 
+namespace detail {
+struct OwnTables;
+}
+
 /// Objects by identifier and the table of branches. It never computes content: an object is held under the
 /// identifier that it reports when it is added, and returned as the same object. The order of the operations is
 /// part of the binary interface.
@@ -110,6 +114,8 @@ public:
     [[nodiscard]] std::vector<KivStringT<char16_t>> GetCommitBranches(cow_ptr<Commit> commit) const override;
 
 private:
+    friend struct detail::OwnTables;
+
     /// Every branch's head, which may be null, with the branch's name as the table of references holds it.
     using NamesByHead = std::set<std::pair<Commit const*, KivStringT<char16_t> const*>>;
 

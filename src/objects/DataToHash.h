@@ -15,6 +15,10 @@ struct DataToHash {
     Buffer own{};
 
     [[nodiscard]] Buffer const& Data() const noexcept { return kept == nullptr ? own : *kept; }
+    /// Gives the object the identifier that the digest of its packed form stands for.
+    void Identify(Id::Digest const& digest) const noexcept { object->id_.Keep(Id::FromDigest(digest), false); }
+    /// The same for one that has just been made, and that no other thread knows of.
+    void IdentifyNew(Id::Digest const& digest) const noexcept { object->id_.KeepFirst(digest); }
 };
 
 /// Objects that may have to be identified before others whose packed forms show their identifiers.

@@ -46,9 +46,7 @@ public:
         return false;
     }
 
-    void Take(DataToHash const& hashed, Id::Digest const& digest) noexcept override {
-        hashed.object->id_.Keep(Id::FromDigest(digest), false);
-    }
+    void Take(DataToHash const& hashed, Id::Digest const& digest) noexcept override { hashed.Identify(digest); }
 
 private:
     struct Found {

@@ -26,15 +26,17 @@ public:
     void Begin() noexcept {
         Buffer const& data = form.Data();
         state = Sha256::initialState;
-        chunks_ = data.LockForRead();
-        chunk_ = chunks_.begin();
-        rest_ = chunks_.size() == 0 ? Chunk() : *chunk_;
         auto* const begin = reinterpret_cast<char*>(staged_.data());
         const auto header = static_cast<std::size_t>(WritePackedHeader(form.word, data.GetSize(), begin) - begin);
         messageSize_ = header + data.GetSize();
-        isLastRun_ = false;
         // Only what is short is put together as a whole; the rest of what is long is hashed where it lies.
-        StageFrom(header, messageSize_ <= maximumStaged ? maximumStaged : blockSize);
+        if (messageSize_ <= maximumStaged)
+            return StageAll(header, data);
+        chunks_ = data.LockForRead();
+        chunk_ = chunks_.begin();
+        rest_ = *chunk_;
+        isLastRun_ = false;
+        StageFrom(header, blockSize);
     }
 
     /// The blocks that are there; none when the message has ended.
@@ -50,10 +52,12 @@ public:
 
     [[nodiscard]] Id::Digest Digest() const noexcept {
         Id::Digest digest;
-        auto* out = digest.data();
-        for (std::uint32_t const word : state) {
-            for (int shift = 24; shift >= 0; shift -= 8)
-                *out++ = static_cast<std::uint8_t>(word >> shift);
+        for (std::size_t index = 0; index < state.size(); ++index) {
+            const std::uint32_t word = state[index];
+            const std::array<std::uint8_t, 4> bytes{
+                static_cast<std::uint8_t>(word >> 24), static_cast<std::uint8_t>(word >> 16),
+                static_cast<std::uint8_t>(word >> 8), static_cast<std::uint8_t>(word)};
+            std::memcpy(digest.data() + sizeof bytes * index, bytes.data(), sizeof bytes);
         }
         return digest;
     }
@@ -62,6 +66,15 @@ private:
     using Chunk = Memory::BufferChunks::Chunk;
 
     static constexpr std::size_t maximumStaged = 8 * blockSize;
+
+    void StageAll(std::size_t staged, Buffer const& data) noexcept {
+        for (auto const& chunk : data.LockForRead()) {
+            std::memcpy(staged_.data() + staged, chunk.data(), chunk.size());
+            staged += chunk.size();
+        }
+        next_ = staged_.data();
+        blocks_ = Pad(staged) / blockSize;
+    }
 
     void FindBlocks() noexcept {
         if (rest_.size() < blockSize)

@@ -1,8 +1,10 @@
 #include "KivVcs/detail/ObjectTable.h"
 
 #include "KivVcs/Commit.h"
+#include "foundation/Prefetch.h"
 
 #include <algorithm>
+#include <array>
 #include <cstring>
 #include <memory>
 #include <stdexcept>
@@ -29,7 +31,7 @@ ObjectTable<T>::ObjectTable(ObjectTable const& other) {
     }
     list_ = other.list_;
     slots_ = other.slots_;
-    marks_ = other.marks_;
+    slotCount_ = other.slotCount_;
     size_ = other.size_;
     firstFree_ = other.firstFree_;
     for (std::size_t number = 0; number < list_.size(); ++number)
@@ -57,10 +59,7 @@ cow_ptr<T> ObjectTable<T>::Find(Id const& id) const noexcept {
         return found == table.end() ? nullptr : found->second;
     }
     Id::Digest const* const digest = id.GetDigest();
-    if (digest == nullptr || slots_.empty())
-        return nullptr;
-    const std::size_t slot = SlotOf(*digest);
-    return IsFree(slot) ? nullptr : cow_ptr<T>::share(ObjectAt(slots_[slot].number));
+    return digest == nullptr ? nullptr : cow_ptr<T>::share(PlaceOf(*digest).object);
 }
 
 template <class T>
@@ -90,7 +89,7 @@ void ObjectTable<T>::LeaveToTable() noexcept {
     shown->isHolder = true;
     list_ = {};
     slots_ = {};
-    marks_ = {};
+    slotCount_ = 0;
 }
 
 template <class T>
@@ -104,16 +103,34 @@ void ObjectTable<T>::Add(cow_ptr<T> object) {
         shown->table.try_emplace(std::move(id), std::move(object));
         return;
     }
-    std::size_t slot = slots_.empty() ? 0 : SlotOf(*own);
-    if (!slots_.empty() && !IsFree(slot))
-        return;
+    if (const Place place = PlaceOf(*own); place.object == nullptr)
+        AddAt(place, std::move(object));
+}
+
+template <class T>
+typename ObjectTable<T>::Place ObjectTable<T>::PlaceOf(Id::Digest const& digest) const noexcept {
+    if (slots_.empty())
+        return {};
+    const std::size_t slot = SlotOf(digest);
+    return {IsFree(slot) ? nullptr : ObjectAt(slots_[slot].number), slot};
+}
+
+template <class T>
+void ObjectTable<T>::AddAt(Place place, cow_ptr<T> object) {
+    Id::Digest const& digest = *object->GetKnownDigest();
     if (MakeRoom())
-        slot = SlotOf(*own);
+        place.slot = SlotOf(digest);
     const std::uint32_t number = firstFree_;
     firstFree_ = static_cast<std::uint32_t>(list_[number] >> 1U);
-    Fill(slot, {TagOf(*own), number});
+    Fill(place.slot, {TagOf(digest), number});
     list_[number] = reinterpret_cast<std::uintptr_t>(object.detach());
     ++size_;
+}
+
+template <class T>
+void ObjectTable<T>::Prefetch(Id::Digest const& digest) const noexcept {
+    if (!slots_.empty())
+        KivUtils::Prefetch(&Marks()[HomeOf(TagOf(digest), slotCount_)]);
 }
 
 template <class T>
@@ -153,15 +170,20 @@ cow_ptr<T> ObjectTable<T>::TakeNextUnused(Walk& walk) noexcept {
     while (walk.next < list_.size()) {
         T const* const object = ObjectAt(walk.next++);
         if (object != nullptr && object->reference_count() == 1)
-            return TakeOutOf(SlotOf(*object->GetKnownDigest()));
+            return TakeOutOf(SlotOf(*object->GetKnownDigest(), object));
     }
     return nullptr;
 }
 
 template <class T>
 cow_ptr<T> ObjectTable<T>::TakeOut(T const& object, Walk& walk) {
+    Shown* const shown = shown_.Get();
+    if (shown == nullptr && !object.IsOfHostClass() && object.GetKnownDigest() != nullptr) {
+        const std::size_t slot = slots_.empty() ? 0 : SlotOf(*object.GetKnownDigest(), &object);
+        return slots_.empty() || IsFree(slot) ? nullptr : TakeOutOf(slot);
+    }
     const Id id = object.GetId();
-    if (Shown* const shown = shown_.Get()) {
+    if (shown != nullptr) {
         const auto entry = shown->table.find(id);
         if (entry == shown->table.end() || entry->second.get() != &object)
             return nullptr;
@@ -186,39 +208,56 @@ std::uint32_t ObjectTable<T>::TagOf(Id::Digest const& digest) noexcept {
 }
 
 template <class T>
-std::size_t ObjectTable<T>::SlotOf(Id::Digest const& digest) const noexcept {
-    const std::uint32_t tag = TagOf(digest);
+template <class IsWanted>
+std::size_t ObjectTable<T>::FindSlot(std::uint32_t tag, IsWanted isWanted) const noexcept {
     const std::uint8_t mark = MarkOf(tag);
-    std::size_t slot = HomeOf(tag, slots_.size());
-    for (; !IsFree(slot); slot = Behind(slot)) {
-        if (marks_[slot] == mark && slots_[slot].tag == tag &&
-            *ObjectAt(slots_[slot].number)->GetKnownDigest() == digest)
-            break;
-    }
+    const std::uint8_t* const marks = Marks();
+    std::size_t slot = HomeOf(tag, slotCount_);
+    while (marks[slot] != 0 &&
+           (marks[slot] != mark || slots_[slot].tag != tag || !isWanted(ObjectAt(slots_[slot].number))))
+        slot = Behind(slot);
     return slot;
+}
+
+template <class T>
+std::size_t ObjectTable<T>::SlotOf(Id::Digest const& digest) const noexcept {
+    return FindSlot(TagOf(digest), [&digest](T const* object) { return *object->GetKnownDigest() == digest; });
+}
+
+template <class T>
+std::size_t ObjectTable<T>::SlotOf(Id::Digest const& digest, T const* object) const noexcept {
+    return FindSlot(TagOf(digest), [object](T const* other) { return other == object; });
 }
 
 template <class T>
 void ObjectTable<T>::Fill(std::size_t slot, Slot with) noexcept {
     slots_[slot] = with;
-    marks_[slot] = MarkOf(with.tag);
+    Marks()[slot] = MarkOf(with.tag);
 }
 
 template <class T>
 void ObjectTable<T>::AddSlots() {
     constexpr std::size_t fewest = 16;
-    const std::size_t count = std::max(2 * slots_.size(), fewest);
-    std::vector<Slot> slots(count);
-    std::vector<std::uint8_t> marks(count);
+    const std::size_t before = slotCount_;
+    const std::size_t count = std::max(2 * before, fewest);
+    std::vector<Slot> slots(count + count / sizeof(Slot));
     slots.swap(slots_);
-    marks.swap(marks_);
-    for (std::size_t old = 0; old < slots.size(); ++old) {
-        if (marks[old] == 0)
-            continue;
-        std::size_t slot = HomeOf(slots[old].tag, count);
-        while (!IsFree(slot))
-            slot = Behind(slot);
-        Fill(slot, slots[old]);
+    slotCount_ = count;
+    const auto* const marks = reinterpret_cast<const std::uint8_t*>(slots.data() + before);
+    for (std::size_t from = 0; from < before; from += fewest) {
+        // Which slots are free is as good as random, so that a branch for each would cost more than all the rest.
+        std::array<Slot, fewest> filled;
+        std::size_t filledCount = 0;
+        for (std::size_t old = from; old < from + fewest; ++old) {
+            filled[filledCount] = slots[old];
+            filledCount += marks[old] == 0 ? 0 : 1;
+        }
+        for (std::size_t index = 0; index < filledCount; ++index) {
+            std::size_t slot = HomeOf(filled[index].tag, count);
+            while (!IsFree(slot))
+                slot = Behind(slot);
+            Fill(slot, filled[index]);
+        }
     }
 }
 
@@ -231,7 +270,7 @@ bool ObjectTable<T>::MakeRoom() {
         list_.push_back(WordOfFree(nowhere));
         firstFree_ = static_cast<std::uint32_t>(list_.size() - 1);
     }
-    if (8 * (size_ + 1) <= 5 * slots_.size())
+    if (8 * (size_ + 1) <= 5 * slotCount_)
         return false;
     AddSlots();
     return true;
@@ -242,13 +281,13 @@ cow_ptr<T> ObjectTable<T>::TakeOutOf(std::size_t slot) noexcept {
     const std::uint32_t number = slots_[slot].number;
     // Those after it move up as far as they would have been put without it.
     const auto distance = [this](std::size_t from, std::size_t to) {
-        return to >= from ? to - from : to + slots_.size() - from;
+        return to >= from ? to - from : to + slotCount_ - from;
     };
     for (std::size_t next = Behind(slot); !IsFree(next); next = Behind(next)) {
-        if (distance(HomeOf(slots_[next].tag, slots_.size()), next) >= distance(slot, next))
+        if (distance(HomeOf(slots_[next].tag, slotCount_), next) >= distance(slot, next))
             Fill(std::exchange(slot, next), slots_[next]);
     }
-    marks_[slot] = 0;
+    Marks()[slot] = 0;
     auto object = cow_ptr<T>::attach(ObjectAt(number));
     list_[number] = WordOfFree(std::exchange(firstFree_, number));
     --size_;

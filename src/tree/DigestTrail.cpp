@@ -6,13 +6,11 @@ namespace KivVcs::detail {
 
 namespace {
 
-constexpr std::uint64_t smallestStep = 65536;
 constexpr std::uint64_t maximumSteps = 22;
 
 /// How far apart the states are of a form of @p size bytes.
-std::uint64_t StepOf(std::uint64_t size) noexcept {
-    return std::max(smallestStep,
-                    (size / maximumSteps + IdDigest::blockSize) / IdDigest::blockSize * IdDigest::blockSize);
+std::uint64_t StepOf(std::uint64_t size, std::uint64_t smallest) noexcept {
+    return std::max(smallest, (size / maximumSteps + IdDigest::blockSize) / IdDigest::blockSize * IdDigest::blockSize);
 }
 
 /// Where the leaf that holds @p name, or would, begins in what @p top packs.
@@ -77,11 +75,11 @@ void DigestTrail::NoteChange(Node const& top, KivStringViewT<char16_t> name) noe
 Id DigestTrail::ComputeId(Node const& top) const {
     const std::uint64_t size = top.Total().packedSize;
     IdDigest digest("tree", size);
-    if (size < 2 * smallestStep) {
+    if (!IsFor(size)) {
         PackEntries(top, [&digest](auto const&... piece) { digest.Feed(piece...); });
         return digest.Finish();
     }
-    const std::uint64_t step = StepOf(size);
+    const std::uint64_t step = StepOf(size, smallestStep);
     const std::uint64_t headerSize = digest.GetFed();
     Checkpoints passed;
     passed.packedSize = size;

@@ -173,6 +173,10 @@ struct TreeAccess {
     [[nodiscard]] static EntryTable& Entries(Tree& tree) noexcept { return tree.entries_; }
     [[nodiscard]] static EntryTable const& Entries(Tree const& tree) noexcept { return tree.entries_; }
 
+    /// Identifies a tree of nothing but the library's objects, whose packed form has the same data as @p form if it has the
+    /// same size.
+    static void IdentifyByForm(Tree const& tree, Buffer const& form);
+
     /// The storage's instance of @p object, which an entry then holds. If there is none yet, an object that only the caller
     /// holds is stored itself, any other as a copy.
     template <class T>

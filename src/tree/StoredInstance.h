@@ -1,11 +1,28 @@
 #pragma once
 
-#include "KivVcs/IRepository.h"
 #include "KivVcs/Tree.h"
-
-#include <type_traits>
+#include "tree/OwnTables.h"
 
 namespace KivVcs {
+
+/// The storage's instance of @p object, an object of one of the library's classes: what StoredInstance finds out, by one look
+/// at the table. Null if it takes the calls to find out.
+template <class T, class Own>
+cow_ptr<T> OwnStoredInstance(detail::ObjectTable<T>& table, T const& object, Own own) {
+    if (object.GetKnownDigest() == nullptr)
+        static_cast<void>(object.GetId());
+    Id::Digest const* const digest = object.GetKnownDigest();
+    // Another thread may be about to publish it.
+    if (digest == nullptr)
+        return nullptr;
+    const auto place = table.PlaceOf(*digest);
+    // One of a host's class would be asked for its identifier.
+    if (place.object != nullptr)
+        return place.object->IsOfHostClass() ? nullptr : cow_ptr<T>::share(place.object);
+    cow_ptr<T> stored = own();
+    table.AddAt(place, stored.share_from_sole_owner());
+    return stored;
+}
 
 /// The storage's instance of @p object: what is held under its identifier already, otherwise what @p own makes of it, a
 /// copy or the object itself, which is stored then.
@@ -15,6 +32,12 @@ namespace KivVcs {
 /// synchronises has the last word, even if that is null or something else.
 template <class T, class Own>
 cow_ptr<T> StoredInstance(IRepository& repo, T const& object, Own own) {
+    if (!object.IsOfHostClass()) {
+        if (auto* const table = detail::OwnTables::Behind(repo).Of<T>()) {
+            if (cow_ptr<T> stored = OwnStoredInstance(*table, object, own))
+                return stored;
+        }
+    }
     cow_ptr<T> stored;
     if constexpr (std::is_same_v<T, Blob>)
         stored = repo.GetBlobFromStorage(object.GetId());

@@ -95,6 +95,16 @@ Id Tree::ComputeId() const {
     return top == nullptr ? IdDigest("tree", 0).Finish() : trail_.ComputeId(*top);
 }
 
+void detail::TreeAccess::IdentifyByForm(Tree const& tree, Buffer const& form) {
+    Node const* const top = Top(tree).get();
+    // A large one computes its identifier itself, and keeps how that went on.
+    if (top == nullptr || top->Total().packedSize != form.GetSize() || DigestTrail::IsFor(form.GetSize()))
+        return;
+    IdDigest digest("tree", form.GetSize());
+    digest.Feed(form);
+    DataToHash{&tree}.Identify(*digest.Finish().GetDigest());
+}
+
 void Tree::ListParts(detail::OpenObjects& parts) const {
     detail::ForEachEntry(entries_.Top().get(), [&parts](Entry const& entry) { parts.Add(entry.held.Packed()); });
 }

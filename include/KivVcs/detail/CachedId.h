@@ -53,6 +53,12 @@ public:
         state_.Publish(isHosts ? State::Hosts : State::Own);
     }
 
+    /// Keeps the first identifier of a library's object that no other thread knows of yet: takes no atomic exchange.
+    void KeepFirst(Id::Digest const& digest) const noexcept {
+        digest_ = digest;
+        state_.Publish(State::Own);
+    }
+
     /// Takes along what @p other, that of an object of the given kind, has. @pre there is none here
     void Copy(CachedId const& other, bool isHosts) noexcept {
         if (isHosts ? !other.IsHosts() : !other.IsOwn() && !other.IsCopied())

@@ -22,10 +22,14 @@ public:
     void Reset() noexcept { trail_.Reset(); }
     [[nodiscard]] bool IsEmpty() const noexcept { return trail_.Get() == nullptr; }
 
+    /// Whether a packed form of that size is large enough for it.
+    [[nodiscard]] static bool IsFor(std::uint64_t size) noexcept { return size >= 2 * smallestStep; }
     /// The identifier of a tree of the entries below @p top, none of which show hosts' objects.
     [[nodiscard]] Id ComputeId(Node const& top) const;
 
 private:
+    static constexpr std::uint64_t smallestStep = 65536;
+
     /// The states of one form at every step.
     struct Checkpoints final : KivUtils::reference_counted {
         std::uint64_t packedSize = 0;

@@ -37,6 +37,22 @@ public:
     /// Holds the object under the identifier that it reports, unless there is one already.
     /// @throws std::bad_alloc and what the object's `GetId` throws; everything is as before then
     void Add(cow_ptr<T> object);
+
+    /// Where the object of a digest is held, or belongs; until the next change.
+    struct Place {
+        T const* object = nullptr;
+        std::size_t slot = 0;
+    };
+    /// Whether objects are found and held by their digests alone, which is so until hosts are shown the table.
+    [[nodiscard]] bool GoesByDigests() const noexcept { return shown_.Get() == nullptr; }
+    /// @pre `GoesByDigests()`, here and below
+    [[nodiscard]] Place PlaceOf(Id::Digest const& digest) const noexcept;
+    /// Holds an object of that digest, which has been identified, where it belongs; that place is free.
+    /// @throws std::bad_alloc; everything is as before then
+    void AddAt(Place place, cow_ptr<T> object);
+    /// Has the processor fetch what `PlaceOf` will look at.
+    void Prefetch(Id::Digest const& digest) const noexcept;
+
     void Remove(Id const& id) noexcept;
 
     /// How far a walk along all objects has come, on which any of them may be taken out.
@@ -79,14 +95,20 @@ private:
     static std::size_t HomeOf(std::uint32_t tag, std::size_t slots) noexcept {
         return static_cast<std::size_t>(std::uint64_t{tag} * slots >> 32U);
     }
-    [[nodiscard]] std::size_t Behind(std::size_t slot) const noexcept {
-        return slot + 1 == slots_.size() ? 0 : slot + 1;
+    [[nodiscard]] std::size_t Behind(std::size_t slot) const noexcept { return slot + 1 == slotCount_ ? 0 : slot + 1; }
+    [[nodiscard]] std::uint8_t* Marks() noexcept { return reinterpret_cast<std::uint8_t*>(slots_.data() + slotCount_); }
+    [[nodiscard]] const std::uint8_t* Marks() const noexcept {
+        return reinterpret_cast<const std::uint8_t*>(slots_.data() + slotCount_);
     }
-    [[nodiscard]] bool IsFree(std::size_t slot) const noexcept { return marks_[slot] == 0; }
+    [[nodiscard]] bool IsFree(std::size_t slot) const noexcept { return Marks()[slot] == 0; }
     void Fill(std::size_t slot, Slot with) noexcept;
     void AddSlots();
-    /// The slot of the object with that digest, or the free one where it would be. @pre there are slots
+    /// The slot of the object with that digest, or of this very object with it, or the free one where it would be.
+    /// @pre there are slots
     [[nodiscard]] std::size_t SlotOf(Id::Digest const& digest) const noexcept;
+    [[nodiscard]] std::size_t SlotOf(Id::Digest const& digest, T const* object) const noexcept;
+    template <class IsWanted>
+    [[nodiscard]] std::size_t FindSlot(std::uint32_t tag, IsWanted isWanted) const noexcept;
     [[nodiscard]] bool MakeRoom();
     [[nodiscard]] cow_ptr<T> TakeOutOf(std::size_t slot) noexcept;
 
@@ -98,10 +120,10 @@ private:
     }
 
     std::vector<std::uintptr_t> list_;
+    /// The slots, and behind them a mark for each, a byte: 0 if it is free, otherwise one that few tags have. Most lookups are
+    /// for objects that are new, and visit nothing else, all of which the processor keeps near.
     std::vector<Slot> slots_;
-    /// A byte for each slot: 0 if it is free, otherwise one that few tags have. Most lookups are for objects that are new, and
-    /// visit nothing else, all of which the processor keeps near.
-    std::vector<std::uint8_t> marks_;
+    std::size_t slotCount_ = 0;
     std::size_t size_ = 0;
     std::uint32_t firstFree_ = nowhere;
     PublishedWord<Shown*> shown_;

@@ -1,0 +1,12 @@
+#pragma once
+
+namespace KivUtils {
+
+/// Has the processor fetch the line of memory at @p address, which is read soon and need not be readable.
+inline void Prefetch([[maybe_unused]] const void* address) noexcept {
+#if defined(__GNUC__)
+    __builtin_prefetch(address);
+#endif
+}
+
+} // namespace KivUtils
