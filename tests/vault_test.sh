@@ -124,6 +124,7 @@ BadInputGetsOneLineAndChangesNothing() {
     ends 3 '' log master~14 -2
     equal "$(sed 's/.*  //' out | xargs) $("$vault" show "$("$vault" log | head -c 9)~:f")" "3 2 16"
     equal "$("$vault" diff master~16 ~1 f --text | grep '^[-+][0-9]' | xargs)" "-1 +16"
+    equal "$("$vault" diff master~16 --text | grep '^[-+][0-9]' | xargs)" "-1 +17"
     refused 'only 16 versions before' show master~17
     refused 'no such revision' show nowhere~1
     "$vault" show master:f >/dev/full 2>err && fail "a full disk went unnoticed"

@@ -74,7 +74,9 @@ void DescribeShow(CLI::App& command, Arguments& arguments) {
 void DescribeDiff(CLI::App& command, Arguments& arguments) {
     auto& diff = arguments.diff;
     command.add_option("BEFORE", diff.before, std::string(revisionHelp) + "; or a directory")->required();
-    command.add_option("AFTER", diff.after, "likewise; without it, the current version is compared with what is given");
+    command.add_option(
+        "AFTER", diff.after,
+        "likewise; without it, the current version, or for a directory alone, that after the current version");
     command.add_option("PATH", diff.path, "only what lies there");
     auto* const text = command.add_flag("--text", diff.text, "show the lines that differ");
     AddListingOptions(command, diff.listing);

@@ -17,22 +17,7 @@ using KivArchive::ArchivedRepository;
 namespace {
 
 constexpr std::string_view otherPrefix = "other/";
-constexpr std::size_t factsAtOnce = 10'000;
-
-/// The versions that were forgotten here and that the other vault would bring back.
-std::vector<Id> Forgotten(IArchive& ours, IArchive& theirs, std::vector<Id> const& heads) {
-    std::vector<Id> known;
-    for (auto const& facts : theirs.ReadAncestry(heads, KivArchive::Follow::Reachable, SIZE_MAX))
-        known.push_back(facts.commit);
-    std::vector<Id> forgotten;
-    for (std::size_t at = 0; at < known.size(); at += factsAtOnce) {
-        const auto some = std::span(known).subspan(at, std::min(factsAtOnce, known.size() - at));
-        const auto missing = ours.FindMissing(some);
-        for (auto const& facts : ours.ReadAncestry(missing, KivArchive::Follow::Parents, 0))
-            forgotten.push_back(facts.commit);
-    }
-    return forgotten;
-}
+constexpr std::size_t mostNamed = 20;
 
 bool AreOne(std::string const& vault, std::string const& other) {
     struct stat one {};
@@ -127,11 +112,14 @@ int Sync(VaultPlace const& place, std::string const& other, bool yes) {
         options.branches.push_back({name, RequireBranchName(std::string(otherPrefix) + shown)});
         heads.push_back(head);
     }
-    const auto forgotten = Forgotten(vault.Archive(), theirs.Archive(), heads);
+    const auto forgotten = KivArchive::FindForgotten(theirs.Archive(), vault.Archive(), heads);
     if (!forgotten.empty()) {
-        Warn("versions that were forgotten here and that this brings back:");
-        for (auto const& commit : KivArchive::ReadCommits(theirs.Archive(), forgotten))
+        Warn(Counted(forgotten.size(), "version") + " that were forgotten here and that this brings back:");
+        const auto named = std::span(forgotten).first(std::min(mostNamed, forgotten.size()));
+        for (auto const& commit : KivArchive::ReadCommits(theirs.Archive(), named))
             Warn("    " + Shortened(commit.id) + "  " + DescribeMessage(commit));
+        if (named.size() < forgotten.size())
+            Warn("    and " + std::to_string(forgotten.size() - named.size()) + " more");
         if (!Confirm("Bring them back?", yes))
             return 0;
     }
@@ -146,7 +134,7 @@ int Sync(VaultPlace const& place, std::string const& other, bool yes) {
     }
     for (auto const& [name, head] : report.heads)
         std::cout << otherPrefix << Printable(name) << "  " << DigitsOf(head) << '\n';
-    std::cout << report.objects << " objects brought in\n";
+    std::cout << Counted(report.objects, "object") << " brought in\n";
     return 0;
 }
 

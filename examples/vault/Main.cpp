@@ -28,6 +28,7 @@ Begin:
 Work with others:
   vault sync /mnt/stick/vault.db            brings their branches in as other/NAME
   vault merge other/master                  and their changes into the current branch
+  vault restore master ~/notes --force      and the files that it has now into the directory
   vault merge other/master --into merged    if there are conflicts: settle them in a directory, and
   vault save merged --merge other/master    make the version that records it
 

@@ -1,6 +1,6 @@
 #include "Commands.h"
 #include "Commit.h"
-#include "MergeAttributes.h"
+#include "MergeReport.h"
 #include "Names.h"
 #include "Output.h"
 #include "Overlay.h"
@@ -16,7 +16,6 @@
 namespace vault {
 
 using KivArchive::DisputedContents;
-using KivVcs::ChangeKind;
 using KivVcs::ConflictChoice;
 using KivVcs::ConflictSettlement;
 using KivVcs::cow_ptr;
@@ -31,11 +30,6 @@ using PathView = KivVcs::array_view<TextView const>;
 constexpr int mostAttempts = 20;
 /// What is put after the name of the other side's file.
 constexpr std::string_view theirsSuffix = "~theirs";
-
-void WriteJson(std::string_view result, Id const& head, std::string const& conflicts) {
-    std::cout << R"({"result":")" << result << R"(","head":")" << DigitsOf(head) << R"(","conflicts":)" << conflicts
-              << "}\n";
-}
 
 std::string Join(PathView path) {
     std::string joined;
@@ -56,56 +50,30 @@ KivVcs::optional<KivVcs::Time> ReadStamp(cow_ptr<KivVcs::Blob> const& blob) {
     return KivVcs::Time::FromTimeT(KivVcs::String::Int64FromString(digits), KivVcs::TimeZone::Utc);
 }
 
-std::string WordFor(ChangeKind kind) {
-    switch (kind) {
-    case ChangeKind::Added:
-        return "added it";
-    case ChangeKind::Removed:
-        return "removed it";
-    case ChangeKind::DirectoryBecameFile:
-        return "made it a file";
-    case ChangeKind::FileBecameDirectory:
-        return "made it a directory";
-    case ChangeKind::Unchanged:
-        return "left it as it was";
-    case ChangeKind::Changed:
-    case ChangeKind::Renamed:
-        break;
-    }
-    return "changed it";
-}
-
-std::string_view WordFor(ConflictSettlement settlement) noexcept {
-    switch (settlement) {
-    case ConflictSettlement::Left:
-        return "left";
-    case ConflictSettlement::Right:
-        return "right";
-    case ConflictSettlement::Root:
-        return "base";
-    case ConflictSettlement::Combined:
-        return "combined";
-    case ConflictSettlement::Undecided:
-        break;
-    }
-    return "undecided";
-}
+/// What is merged.
+struct Sides {
+    /// The current branch, whose head is the left side.
+    Text branch;
+    CommitRecord left;
+    CommitRecord right;
+    /// Where their histories met.
+    std::vector<Id> bases;
+};
 
 /// One merge: who decides, and what was decided.
 class Merger {
 public:
-    Merger(Vault& vault, MergeOptions const& options, CommitRecord const& left, CommitRecord const& right,
-           std::vector<Id> const& bases)
-        : vault_(vault), options_(options), left_(left), right_(right), repository_(vault.SharedArchive()),
+    Merger(Vault& vault, MergeOptions const& options, Sides const& sides)
+        : vault_(vault), options_(options), left_(sides.left), right_(sides.right), repository_(vault.SharedArchive()),
           reader_(vault.Archive()),
           newest_(KivVcs::ChainResolvers(KivVcs::TimeBasedConflictResolver({Text(u".vault-stamp")}, ReadStamp),
-                                         right.time > left.time ? KivVcs::AlwaysChooseRight()
-                                                                : KivVcs::AlwaysChooseLeft())) {
-        versions_.left = left.tree;
-        versions_.right = right.tree;
+                                         right_.time > left_.time ? KivVcs::AlwaysChooseRight()
+                                                                  : KivVcs::AlwaysChooseLeft())) {
+        versions_.left = left_.tree;
+        versions_.right = right_.tree;
         versions_.prefersRight = options.policy == ConflictPolicy::Right ||
-                                 (options.policy == ConflictPolicy::Newest && right.time > left.time);
-        for (auto const& base : KivArchive::ReadCommits(vault.Archive(), bases)) {
+                                 (options.policy == ConflictPolicy::Newest && right_.time > left_.time);
+        for (auto const& base : KivArchive::ReadCommits(vault.Archive(), sides.bases)) {
             if (base.tree.IsEmpty() || vault.Archive().FindMissing(std::span(&base.tree, 1)).empty())
                 versions_.bases.push_back(base.tree);
         }
@@ -140,45 +108,14 @@ public:
                                               [this](MergeConflict const& conflict) { return IsReal(conflict); });
     }
 
-    /// Lists every conflict with what both sides did and how it was settled.
-    void Describe() const {
-        for (auto const& conflict : conflicts_) {
-            const auto path = PrintableName(ToUtf8(conflict.path));
-            if (IsReal(conflict))
-                std::cout << Coloured("conflict ", Colour::Red) << path << ": left " << WordFor(conflict.leftChange)
-                          << ", right " << WordFor(conflict.rightChange) << "; " << Settlement(conflict) << '\n';
-            else
-                std::cout << Coloured("merged ", Colour::Green) << path << ": both changed it, in different lines\n";
-        }
-        for (auto const& conflict : modes_)
-            std::cout << Coloured("conflict ", Colour::Red) << PrintableName(conflict.path) << ": left "
-                      << conflict.left << ", right " << conflict.right << "; "
-                      << (isStopped_               ? "undecided"
-                          : versions_.prefersRight ? "took right"
-                                                   : "took left")
-                      << '\n';
-    }
-
-    [[nodiscard]] std::string Json() const {
-        std::string json = "[";
+    /// What became of every path that both sides changed.
+    [[nodiscard]] std::vector<MergedPath> Report() const {
+        std::vector<MergedPath> paths;
         for (auto const& conflict : conflicts_)
-            (json += json.size() == 1 ? "\n" : ",\n") +=
-                R"({"path":)" + JsonText(ToUtf8(conflict.path)) + R"(,"left":")" + WordFor(conflict.leftChange) +
-                R"(","right":")" + WordFor(conflict.rightChange) + R"(","taken":")" +
-                std::string(isStopped_ ? "undecided"
-                            : IsReal(conflict) && conflict.settlement == ConflictSettlement::Combined
-                                ? "marked"
-                                : WordFor(conflict.settlement)) +
-                R"("})";
+            paths.push_back(DescribeConflict(conflict, IsMarked(conflict), isStopped_));
         for (auto const& conflict : modes_)
-            (json += json.size() == 1 ? "\n" : ",\n") += R"({"path":)" + JsonText(conflict.path) + R"(,"left":")" +
-                                                         std::string(conflict.left) + R"(","right":")" +
-                                                         std::string(conflict.right) + R"(","taken":")" +
-                                                         (isStopped_               ? "undecided"
-                                                          : versions_.prefersRight ? "right"
-                                                                                   : "left") +
-                                                         R"("})";
-        return json + "\n]";
+            paths.push_back(DescribeConflict(conflict, versions_.prefersRight, isStopped_));
+        return paths;
     }
 
     /// Writes the merged version and, beside what is disputed and not in it, what the other side has.
@@ -209,9 +146,9 @@ private:
     [[noreturn]] void Stop(std::string const& reason) {
         isStopped_ = true;
         if (options_.json)
-            WriteJson("stopped", left_.id, Json());
+            WriteMergeJson("stopped", left_.id, Report());
         else
-            Describe();
+            ListMerged(Report());
         throw Problem(reason, findingsExitStatus);
     }
 
@@ -288,19 +225,12 @@ private:
 
     /// Whether somebody has to decide, rather than texts that were merged line by line.
     [[nodiscard]] bool IsReal(MergeConflict const& conflict) const {
-        return conflict.settlement != ConflictSettlement::Combined ||
-               std::find(marked_.begin(), marked_.end(), ToUtf8(conflict.path)) != marked_.end();
+        return conflict.settlement != ConflictSettlement::Combined || IsMarked(conflict);
     }
 
-    [[nodiscard]] std::string Settlement(MergeConflict const& conflict) const {
-        if (isStopped_ || conflict.settlement == ConflictSettlement::Undecided)
-            return "undecided";
-        if (conflict.settlement == ConflictSettlement::Combined)
-            return "marked in the file";
-        const auto& taken = conflict.settlement == ConflictSettlement::Left    ? conflict.leftId
-                            : conflict.settlement == ConflictSettlement::Right ? conflict.rightId
-                                                                               : conflict.rootId;
-        return "took " + std::string(WordFor(conflict.settlement)) + (taken.IsEmpty() ? ", which removed it" : "");
+    [[nodiscard]] bool IsMarked(MergeConflict const& conflict) const {
+        return conflict.settlement == ConflictSettlement::Combined &&
+               std::find(marked_.begin(), marked_.end(), ToUtf8(conflict.path)) != marked_.end();
     }
 
     Vault& vault_;
@@ -319,75 +249,77 @@ private:
 };
 
 void Finish(MergeOptions const& options, std::string_view result, std::string const& sentence, Id const& head,
-            Merger const* merger) {
+            std::span<MergedPath const> paths = {}) {
     if (options.json) {
-        WriteJson(result, head, merger == nullptr ? "[]" : merger->Json());
+        WriteMergeJson(result, head, paths);
         return;
     }
-    if (merger != nullptr)
-        merger->Describe();
+    ListMerged(paths);
     std::cout << sentence << '\n';
 }
 
 /// Of two versions with one tree both sides take the same.
-std::optional<int> Unite(Vault& vault, MergeOptions const& options, Text const& branch, CommitRecord const& left,
-                         CommitRecord const& right) {
-    const bool isLeft = left.id < right.id;
-    auto const& taken = isLeft ? left : right;
-    auto const& other = isLeft ? right : left;
+std::optional<int> Unite(Vault& vault, MergeOptions const& options, Sides const& sides) {
+    const bool isLeft = sides.left.id < sides.right.id;
+    auto const& taken = isLeft ? sides.left : sides.right;
+    auto const& other = isLeft ? sides.right : sides.left;
     KivArchive::Change change;
     change.ancestry.push_back({taken.id, taken.parent, taken.tree, {{KivArchive::Containment::FoundEqual, other.id}}});
-    change.relied = {left.id, right.id};
-    if (!MoveHead(vault, std::move(change), branch, left.id, taken.id))
+    change.relied = {sides.left.id, sides.right.id};
+    if (!MoveHead(vault, std::move(change), sides.branch, sides.left.id, taken.id))
         return std::nullopt;
-    Finish(options, "equal", "both are equal; the branch is at " + DigitsOf(taken.id), taken.id, nullptr);
+    Finish(options, "equal", "both are equal; the branch is at " + DigitsOf(taken.id), taken.id);
     return 0;
 }
 
-/// One try. @return the exit status, or nothing if somebody else has moved the branch meanwhile
-std::optional<int> TryMerge(Vault& vault, MergeOptions const& options, Author const& author) {
-    const auto branch = vault.CurrentBranch();
-    const auto right = vault.Find(options.revision);
-    const auto head = vault.HeadOf(branch);
-    const auto forward = [&]() -> std::optional<int> {
-        if (!MoveHead(vault, {}, branch, head, right.id))
-            return std::nullopt;
-        Finish(options, "forwarded", "moved forward to " + DigitsOf(right.id), right.id, nullptr);
-        return 0;
-    };
-    if (head.IsEmpty())
-        return forward();
-    const auto left = vault.Find(DigitsOf(head));
-    const auto bases = KivArchive::FindMergeBases(vault.Archive(), left.id, right.id);
-    if (std::find(bases.begin(), bases.end(), right.id) != bases.end() || left.id == right.id) {
-        Finish(options, "up to date",
-               "nothing to merge: the current branch holds " + Printable(options.revision) + " already", left.id,
-               nullptr);
-        return 0;
-    }
-    if (bases.size() == 1 && bases.front() == left.id)
-        return forward();
-    if (left.tree == right.tree)
-        return Unite(vault, options, branch, left, right);
-
-    Merger merger(vault, options, left, right, bases);
+/// Of two versions that both have something which the other one lacks. @return as `TryMerge`
+std::optional<int> MergeBoth(Vault& vault, MergeOptions const& options, Sides const& sides, Author const& author) {
+    Merger merger(vault, options, sides);
     auto merged = merger.Run();
     if (!options.into.empty()) {
         const auto disputed = merger.WriteInto(merged);
         const auto directory = Printable(StoredName(options.into));
         Finish(options, "written",
-               std::to_string(disputed) + " conflicts to settle in " + directory + "; then say: vault save " +
-                   directory + " --merge " + Printable(options.revision),
-               left.id, &merger);
+               Counted(disputed, "conflict") + " to settle in " + directory + "; then say: vault save " + directory +
+                   " --merge " + Printable(options.revision),
+               sides.left.id, merger.Report());
         return disputed == 0 ? 0 : findingsExitStatus;
     }
-    const auto commit =
-        MakeCommit(merged.tree, left.id, right.id, author, RequireLine("Merge " + options.revision, "a message"));
+    const auto commit = MakeCommit(merged.tree, sides.left.id, sides.right.id, author,
+                                   RequireLine("Merge " + options.revision, "a message"));
     commit.AddTo(merged.change);
-    if (!MoveHead(vault, std::move(merged.change), branch, left.id, commit.object.id))
+    if (!MoveHead(vault, std::move(merged.change), sides.branch, sides.left.id, commit.object.id))
         return std::nullopt;
-    Finish(options, "merged", "merged as " + DigitsOf(commit.object.id), commit.object.id, &merger);
+    Finish(options, "merged", "merged as " + DigitsOf(commit.object.id), commit.object.id, merger.Report());
     return 0;
+}
+
+/// One try. @return the exit status, or nothing if somebody else has moved the branch meanwhile
+std::optional<int> TryMerge(Vault& vault, MergeOptions const& options, Author const& author) {
+    Sides sides;
+    sides.branch = vault.CurrentBranch();
+    sides.right = vault.Find(options.revision);
+    const auto head = vault.HeadOf(sides.branch);
+    const auto forward = [&]() -> std::optional<int> {
+        if (!MoveHead(vault, {}, sides.branch, head, sides.right.id))
+            return std::nullopt;
+        Finish(options, "forwarded", "moved forward to " + DigitsOf(sides.right.id), sides.right.id);
+        return 0;
+    };
+    if (head.IsEmpty())
+        return forward();
+    sides.left = vault.Find(DigitsOf(head));
+    sides.bases = KivArchive::FindMergeBases(vault.Archive(), head, sides.right.id);
+    if (std::find(sides.bases.begin(), sides.bases.end(), sides.right.id) != sides.bases.end() ||
+        head == sides.right.id) {
+        Finish(options, "up to date",
+               "nothing to merge: the current branch holds " + Printable(options.revision) + " already", head);
+        return 0;
+    }
+    if (sides.bases.size() == 1 && sides.bases.front() == head)
+        return forward();
+    return sides.left.tree == sides.right.tree ? Unite(vault, options, sides)
+                                               : MergeBoth(vault, options, sides, author);
 }
 
 } // namespace

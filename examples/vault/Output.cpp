@@ -73,6 +73,10 @@ std::string Coloured(std::string_view text, Colour colour) {
     return "\x1b[" + std::to_string(static_cast<int>(colour)) + 'm' + std::string(text) + "\x1b[0m";
 }
 
+std::string Counted(std::uint64_t count, std::string_view noun) {
+    return std::to_string(count) + ' ' + std::string(noun) + (count == 1 ? "" : "s");
+}
+
 void Warn(std::string_view line) {
     std::cerr << "vault: " << line << '\n';
 }

@@ -26,6 +26,9 @@ enum class Colour { Yellow = 33, Green = 32, Red = 31, Cyan = 36 };
 /// The text in a colour, where that is wanted: on a terminal, unless NO_COLOR is set.
 [[nodiscard]] std::string Coloured(std::string_view text, Colour colour);
 
+/// "1 version", "2 versions".
+[[nodiscard]] std::string Counted(std::uint64_t count, std::string_view noun);
+
 /// Writes a line to standard error.
 void Warn(std::string_view line);
 

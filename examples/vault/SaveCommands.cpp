@@ -108,7 +108,8 @@ std::optional<int> TrySave(Vault& vault, SaveOptions const& options, Author cons
         return std::nullopt;
     KeepIndex(snapshot);
     Report(snapshot);
-    std::cout << DigitsOf(commit.object.id) << ' ' << snapshot.files << " files, " << stored << " new objects\n";
+    std::cout << DigitsOf(commit.object.id) << ' ' << Counted(snapshot.files, "file") << ", "
+              << Counted(stored, "new object") << '\n';
     return status;
 }
 

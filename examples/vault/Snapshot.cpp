@@ -38,13 +38,6 @@ std::uint32_t ModeOf(FileState const& state) noexcept {
     return state.mode & 07777U;
 }
 
-bool HaveSameEntries(std::vector<Entry> const& left, std::vector<Entry> const& right) {
-    return std::equal(left.begin(), left.end(), right.begin(), right.end(), [](Entry const& one, Entry const& other) {
-        return one.name == other.name && one.isDirectory == other.isDirectory && one.id == other.id &&
-               one.attributes == other.attributes;
-    });
-}
-
 class Snapshotter {
 public:
     Snapshotter(IArchive& archive, SnapshotOptions const& options, Progress& progress)
@@ -248,7 +241,7 @@ private:
         directory.own = Attributes{false, ModeOf(scanned.state), scanned.state.modified};
         auto const& previousOwn = state.previous->own;
         const bool isLike = previousOwn && previousOwn->IsLike(*directory.own) && !state.previousTree.IsEmpty();
-        if (isLike && HaveSameEntries(directory.entries, state.previous->entries)) {
+        if (isLike && directory.entries == state.previous->entries) {
             state.tree = state.previousTree;
             return;
         }
@@ -290,7 +283,7 @@ private:
         auto before = state.previous->entries;
         std::erase_if(before, isStamp);
         Entry stamp{std::string(stampName), false, {}, Attributes{false, 0644, *options_.stamp * 1'000'000'000}};
-        if (HaveSameEntries(before, directory.entries)) {
+        if (before == directory.entries) {
             auto const* const earlier = state.previous->Find(stampName);
             if (earlier == nullptr)
                 return;

@@ -50,6 +50,7 @@ struct Entry {
                : attributes && attributes->isLink ? EntryKind::Link
                                                   : EntryKind::File;
     }
+    friend bool operator==(Entry const&, Entry const&) noexcept = default;
 };
 
 /// A directory of a version. Its tree holds its entries under their names, and its attributes, and those of its files, in

@@ -7,6 +7,7 @@
 
 #include <KivArchive/SqliteArchive.h>
 #include <KivArchive/Upkeep.h>
+#include <KivVcs/History.h>
 #include <algorithm>
 #include <iostream>
 #include <set>
@@ -66,7 +67,9 @@ std::uint64_t SizeOf(VaultPlace const& place) {
 std::size_t CountCommits(ArchivedRepository const& repository) {
     std::set<Id> reached;
     for (auto const& [name, head] : repository.GetStorage()->GetRefs()) {
-        for (auto commit = head; commit && reached.insert(commit->GetId()).second; commit = commit->GetParent()) {
+        for (auto const& commit : KivVcs::History(head)) {
+            if (!reached.insert(commit->GetId()).second)
+                break;
         }
     }
     return reached.size();
@@ -131,7 +134,7 @@ int Forget(VaultPlace const& place, std::string const& revision, RemovalOptions 
         std::cout << "there is nothing below " << Printable(revision) << '\n';
         return 0;
     }
-    const auto count = std::to_string(below.size()) + (below.size() == 1 ? " version" : " versions");
+    const auto count = Counted(below.size(), "version");
     if (options.dryRun) {
         std::cout << count << " would be forgotten\n";
         return 0;
@@ -158,7 +161,7 @@ int Compact(VaultPlace const& place, RemovalOptions const& options) {
         const auto before = CountCommits(repository);
         repository.SimplifyCommitGraph(true);
         const auto gone = before - std::min(before, CountCommits(repository));
-        const auto count = std::to_string(gone) + " of " + std::to_string(before) + " versions";
+        const auto count = std::to_string(gone) + " of " + Counted(before, "version");
         if (options.dryRun) {
             std::cout << count << " would go\n";
             return 0;

@@ -78,14 +78,18 @@ void ShowCommit(CommitRecord const& commit) {
               << "root    " << DigitsOf(commit.tree) << '\n';
 }
 
+/// A directory is meant also where its name begins an identifier.
+bool IsDirectory(Vault const& vault, std::string const& what) {
+    struct stat status {};
+    return stat(what.c_str(), &status) == 0 && S_ISDIR(status.st_mode) &&
+           vault.HeadOf(KivVcs::FromUtf8(what)).IsEmpty();
+}
+
 /// One side of a comparison: a version, or a directory on the disk.
 class Side {
 public:
     Side(Vault& vault, Overlay& archive, std::string const& what, Id const& previous) : archive_(archive) {
-        // A directory may have a name that begins an identifier.
-        struct stat status {};
-        const bool isDirectory = stat(what.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
-        if (!isDirectory || !vault.HeadOf(KivVcs::FromUtf8(what)).IsEmpty()) {
+        if (!IsDirectory(vault, what)) {
             tree_ = vault.Find(what).tree;
             return;
         }
@@ -279,9 +283,10 @@ int Show(VaultPlace const& place, std::string const& target) {
 int Diff(VaultPlace const& place, DiffOptions const& options) {
     Vault vault(place);
     Overlay archive(vault.Archive());
-    const bool isAlone = options.after.empty();
-    const Side before(vault, archive, isAlone ? std::string() : options.before, {});
-    const Side after(vault, archive, isAlone ? options.before : options.after, before.Tree());
+    // Alone, a version is before the current one, and a directory after it.
+    const bool isReversed = options.after.empty() && IsDirectory(vault, options.before);
+    const Side before(vault, archive, isReversed ? std::string() : options.before, {});
+    const Side after(vault, archive, isReversed ? options.before : options.after, before.Tree());
     const auto changes = FindChanges(archive, before.Tree(), after.Tree(), StoredPath(options.path));
     if (!options.text)
         return ListChanges(changes, options.listing);

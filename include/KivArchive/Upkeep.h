@@ -147,6 +147,10 @@ struct ExchangedHead {
 KIVARCHIVE_EXPORT SynchronizeReport Synchronize(IArchive& from, IArchive& to, SynchronizeOptions const& options,
                                                 IProgress* progress);
 
+/// The commits that @p heads reach in @p from, and that @p to has forgotten: their facts are in it, they are not. What
+/// `Synchronize` would bring back, to ask somebody about. In the order in which `ReadAncestry` gives them.
+[[nodiscard]] KIVARCHIVE_EXPORT std::vector<Id> FindForgotten(IArchive& from, IArchive& to, std::span<const Id> heads);
+
 /// What was repaired, and what could not be.
 struct RepairReport {
     std::vector<Id> repaired;

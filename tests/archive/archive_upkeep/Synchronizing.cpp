@@ -109,7 +109,10 @@ TEST(ArchiveSynchronize, AsksForManyVersionsAtOnce) {
 TEST_P(Synchronizing, KeepsTheTreeOfTheHeadExchangedLast) {
     Source from(directory_.Path("from"));
     auto const to = Make();
+    std::vector<Id> const heads{from.merge.object.id};
+    EXPECT_TRUE(FindForgotten(from.archive, *to, heads).empty()) << "what was never known is not forgotten";
     Synchronize(from.archive, *to, Everything(), nullptr);
+    EXPECT_TRUE(FindForgotten(from.archive, *to, heads).empty());
     Id const parent = from.merge.facts.parent;
     MoveHead(from.archive, from.merge.object.id, parent);
     Synchronize(from.archive, *to, Everything(), nullptr);
@@ -119,6 +122,10 @@ TEST_P(Synchronizing, KeepsTheTreeOfTheHeadExchangedLast) {
     CollectNow(*to);
     CollectNow(*to);
     EXPECT_EQ(to->GetStatistics().commits, 0U);
+    std::vector<Id> reached;
+    for (Ancestry const& facts : from.archive.ReadAncestry(heads, Follow::Reachable, SIZE_MAX))
+        reached.push_back(facts.commit);
+    EXPECT_EQ(FindForgotten(from.archive, *to, heads), reached);
     ASSERT_EQ(ReadExchangedHeads(*to).size(), 1U);
     EXPECT_EQ(ReadExchangedHeads(*to)[0].commit, parent);
     Id const tree = from.archive.ReadAncestry({&parent, 1}, Follow::Parents, 0)[0].tree;
