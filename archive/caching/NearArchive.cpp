@@ -151,6 +151,7 @@ std::optional<Buffer> NearArchive::ReadContent(Id const& id, std::uint64_t offse
 void NearArchive::Keep(std::vector<NewObject> objects) {
     std::uint64_t size = 0;
     std::vector<Id> ids;
+    ids.reserve(objects.size());
     for (NewObject const& object : objects) {
         size += object.data.GetSize();
         ids.push_back(object.id);
@@ -392,6 +393,7 @@ void NearArchive::KeepAncestry(std::vector<Ancestry> const& facts) {
     Try([&] {
         Change change;
         std::vector<Id> ids;
+        ids.reserve(unknown.size());
         for (Ancestry const* const one : unknown)
             ids.push_back(one->commit);
         std::unordered_map<Id, std::size_t> kept;

@@ -143,6 +143,7 @@ private:
             return false;
         BranchMove const& move = change_.branches.front();
         std::vector<Id> commits;
+        commits.reserve(change_.ancestry.size());
         for (Ancestry const& facts : change_.ancestry)
             commits.push_back(facts.commit);
         SortUnique(commits);
@@ -167,6 +168,8 @@ private:
         // A branch that was elsewhere in between keeps what its head reaches, stored in whatever way.
         std::vector<ByteView> ids;
         std::vector<ByteView> bases;
+        ids.reserve(preparation_.Links().size());
+        bases.reserve(preparation_.Links().size());
         for (auto const& [id, base] : preparation_.Links()) {
             ids.push_back(BytesOfId(id));
             bases.push_back(BytesOfId(base));

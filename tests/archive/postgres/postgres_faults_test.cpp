@@ -106,6 +106,8 @@ private:
         Wait();
         isDone = true;
         client.join();
+        // What was left to pass before the cut must not meet the next client.
+        proxy_.CutAfter(LONG_MAX);
     }
 
     void KillWhile(Operation operation, std::uint32_t number) {
