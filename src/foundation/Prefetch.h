@@ -9,4 +9,11 @@ inline void Prefetch([[maybe_unused]] const void* address) noexcept {
 #endif
 }
 
+/// The same for a line that is written soon, which takes as long to come.
+inline void PrefetchToWrite([[maybe_unused]] const void* address) noexcept {
+#if defined(__GNUC__)
+    __builtin_prefetch(address, 1);
+#endif
+}
+
 } // namespace KivUtils

@@ -129,8 +129,12 @@ void ObjectTable<T>::AddAt(Place place, cow_ptr<T> object) {
 
 template <class T>
 void ObjectTable<T>::Prefetch(Id::Digest const& digest) const noexcept {
-    if (!slots_.empty())
-        KivUtils::Prefetch(&Marks()[HomeOf(TagOf(digest), slotCount_)]);
+    if (slots_.empty())
+        return;
+    const std::size_t home = HomeOf(TagOf(digest), slotCount_);
+    KivUtils::Prefetch(&Marks()[home]);
+    // Most objects are new, and are added near there.
+    KivUtils::PrefetchToWrite(&slots_[home]);
 }
 
 template <class T>
