@@ -15,7 +15,7 @@ namespace KivArchive {
 struct KnownBranch {
     /// Its head when it was last read; null for none.
     Id published;
-    /// The published head that the branch here was last moved to, and that publishing expects to find.
+    /// The published head that the branch here is based on, and that publishing expects to find.
     Id taken;
     /// Why the published head cannot be read. The branch here has no head then.
     std::optional<Failure> unreadable;

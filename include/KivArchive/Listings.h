@@ -51,7 +51,7 @@ struct CommitListOptions {
 /// Receives commits one at a time. @return false to end the listing
 using CommitReceiver = std::function<bool(CommitRecord const&)>;
 
-/// Passes @p heads and the commits that they lead to to @p receiver, each once, newest first along each line of
+/// Passes to @p receiver @p heads and all commits that they lead to, each once, newest first along each line of
 /// history. Null identifiers are skipped.
 ///
 /// Calls the archive twice for every 500 commits, for their facts and for their texts, and if `changing` is set once
@@ -64,9 +64,9 @@ KIVARCHIVE_EXPORT void ListCommits(IArchive& archive, std::span<const Id> heads,
 /// The same for these commits only, in the order given. Those without facts have the links of their packed form.
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<CommitRecord> ReadCommits(IArchive& archive, std::span<const Id> commits);
 
-/// The commits whose identifiers begin with @p digits, as people type them: hexadecimal ones of either case. Ordered by
-/// identifier, at most @p atMost; none for what is no beginning of an identifier, and for no digits at all. Commits of which
-/// only the facts are left are among them: `ReadCommits` tells them apart. One call of the archive.
+/// The commits whose identifiers begin with @p digits, hexadecimal digits of either case as people type them; at most
+/// @p atMost, ordered by identifier. None if @p digits is empty or no beginning of an identifier. Commits of which only
+/// the facts are left are among them; `ReadCommits` shows which. One call of the archive.
 [[nodiscard]] KIVARCHIVE_EXPORT std::vector<Id> FindCommits(IArchive& archive, std::string_view digits,
                                                             std::size_t atMost);
 
@@ -103,8 +103,8 @@ struct DifferenceList {
 
 /// What `KivVcs::Differences` gives for the trees of these identifiers, null for an empty one.
 ///
-/// Subtrees with equal identifiers are not entered; two subtrees are compared once, in however many places the one
-/// takes the place of the other. Reads the directories that differ level by level, 500 at a time; no content is read.
+/// Subtrees with equal identifiers are not entered; each pair of subtrees is compared once, in however many places it
+/// is. Reads the directories that differ level by level, 500 at a time; no content is read.
 /// @param progress may be null
 [[nodiscard]] KIVARCHIVE_EXPORT DifferenceList ListDifferences(IArchive& archive, Id const& before, Id const& after,
                                                                KivVcs::DifferenceOptions const& options,

@@ -88,7 +88,7 @@ struct SalvageReport {
     std::vector<Branch> branches;
     /// Those whose head is lost, or whose name another branch of the other archive has.
     std::vector<Branch> lostBranches;
-    /// Commits that no other one leads to, and so the heads of branches whose names are lost.
+    /// Commits that no other one leads to: among them are the heads of branches whose names are lost.
     std::vector<Id> lastCommits;
     std::uint64_t records = 0;
 };
