@@ -138,12 +138,12 @@ private:
     friend class detail::Identification;
     friend struct detail::DataToHash;
 
-    /// What the identifier of an object of one of the library's classes is computed by. Never asked of others.
+    /// Computes the identifier of an object of one of the library's classes; not called for objects of hosts' classes.
     [[nodiscard]] virtual Id ComputeId() const;
     /// Adds the objects whose identifiers the packed form shows, as far as this object holds them.
     virtual void ListParts(detail::OpenObjects& parts) const;
-    /// How much data the identifier of an object of one of the library's classes is computed from if that may be done
-    /// beside others, and these data; nothing if it is `ComputeId` that has to do it.
+    /// For objects of the library's classes: the size of the data that the identifier is computed from, if that may be done
+    /// beside others, and these data; nothing if `ComputeId` has to do it.
     [[nodiscard]] virtual optional<std::uint64_t> GetSizeToHash() const noexcept;
     virtual void GetDataToHash(detail::DataToHash& data) const;
 

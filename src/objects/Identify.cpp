@@ -59,7 +59,7 @@ private:
     /// The weight of what is asked for its identifier.
     static constexpr auto asked = static_cast<std::uint32_t>(-1);
 
-    /// An object that is found after those that it shows: they are what is open beyond a number.
+    /// An object whose parts are computed first: those of the open objects from `openBefore` on.
     struct Frame {
         Object const* object;
         std::size_t openBefore;

@@ -10,7 +10,7 @@ public:
     virtual ~DigestCustomer() = default;
     /// Fills in the next ones; false if there are none.
     virtual bool Next(detail::DataToHash& next) = 0;
-    /// Later ones may be ready before.
+    /// Called in the order in which they are ready, not in that in which they were given.
     virtual void Take(detail::DataToHash const& hashed, Id::Digest const& digest) noexcept = 0;
 };
 

@@ -10,9 +10,9 @@ namespace KivVcs::detail {
 /// An identifier that is computed on first use, by whichever thread comes first, and what kind of object it is that of:
 /// one of the library's classes, or one of a class that a host derived.
 ///
-/// A copy takes it along before anybody knows of which class the copy will be. It counts for an object of the kind that
-/// it is that of; for another it is never looked at, and gives way to the one that the object computes itself. One that a
-/// host has assigned stays with its object, and is not taken along.
+/// A copy takes it along before anybody knows of which class the copy will be. It is valid in an object of that kind only:
+/// an object of the other kind ignores it and replaces it by the one that it computes itself. An identifier that a host
+/// has assigned stays with its object and is not copied.
 class CachedId {
 public:
     CachedId() noexcept = default;

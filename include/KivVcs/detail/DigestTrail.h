@@ -11,7 +11,7 @@ namespace KivVcs::detail {
 class Node;
 
 /// What a large tree keeps of the computation of its identifier: the states of the digest on the way through its packed
-/// form. A copy is handed them, and goes on from the last one before the first entry that an edit has changed, as long as
+/// form. A copy takes them over, and goes on from the last one before the first entry that an edit has changed, as long as
 /// the form keeps its size. As large as a pointer, which is null for trees that have never been large.
 ///
 /// Threads: the `const` operations may run concurrently, and copies be made. Everything else needs exclusive use.
