@@ -336,8 +336,9 @@ TEST_F(ReadingTrees, HaveTheIdentifierOfWhatTheyPackTo) {
           withMode("100755"), withMode("040000"), Entry("blob", "y", other) + entry, entry + Entry("blob", "x", other),
           Entry("blob", "x", capitals), Entry("blob", "x", std::string(64, 'd')),
           Entry("blob", "a\xFF", one) + Entry("blob", "b\xED\xA0\xBD\xED\xB8\x80", one),
-          Entry("blob", "\xED\xA0\xBD\xED\xB8\x80\xFF", one), Entry("blob", "a/b", one),
-          Entry("blob", "/", one) + entry, entry + Entry("blob", "y", std::string(64, 'f')),
+          Entry("blob", "\xED\xA0\xBD\xED\xB8\x80\xFF", one), Entry("blob", "a\xFF", one),
+          Entry("blob", std::string(39, '\xFF'), one) + Entry("blob", "y", std::string(64, 'f')),
+          Entry("blob", "a/b", one), Entry("blob", "/", one) + entry, entry + Entry("blob", "y", std::string(64, 'f')),
           entry + Entry("blob", "y", one).substr(0, 40)}) {
         const auto read = packed.Read(packed.Add("tree", data), &repo);
         ASSERT_TRUE(read) << data;
