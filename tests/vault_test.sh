@@ -126,6 +126,7 @@ BadInputGetsOneLineAndChangesNothing() {
     equal "$("$vault" diff master~16 ~1 f --text | grep '^[-+][0-9]' | xargs)" "-1 +16"
     equal "$("$vault" diff master~16 --text | grep '^[-+][0-9]' | xargs)" "-1 +17"
     refused 'only 16 versions before' show master~17
+    refused 'only 16 versions before' show "$(printf 'master%020000d' 0 | tr 0 '~')"
     refused 'no such revision' show nowhere~1
     "$vault" show master:f >/dev/full 2>err && fail "a full disk went unnoticed"
     matches "$(cat err)" 'output could not be written'

@@ -13,6 +13,7 @@
 #include <algorithm>
 #include <charconv>
 #include <fstream>
+#include <limits>
 #include <sstream>
 #include <sys/stat.h>
 
@@ -168,14 +169,25 @@ CommitRecord Vault::Find(std::string const& revision) const {
 }
 
 std::optional<CommitRecord> Vault::TryFind(std::string const& revision) const {
+    auto name = revision;
+    std::size_t steps = 0;
+    // A branch may have such a name.
+    for (auto earlier = ReadEarlier(name); earlier && HeadOf(KivVcs::FromUtf8(name)).IsEmpty();
+         earlier = ReadEarlier(name)) {
+        steps += std::min(earlier->steps, std::numeric_limits<std::size_t>::max() - steps);
+        name = std::move(earlier->revision);
+    }
+    auto found = TryFindNamed(name);
+    return found && steps > 0 ? FindEarlier(found->id, steps) : std::move(found);
+}
+
+std::optional<CommitRecord> Vault::TryFindNamed(std::string const& revision) const {
     const auto name = revision.empty() ? CurrentBranch() : FromUtf8(revision);
     if (!name)
         return std::nullopt;
     const auto head = HeadOf(*name);
     if (!head.IsEmpty())
         return RequireSound(KivArchive::ReadCommits(*archive_, std::span(&head, 1)).front());
-    if (const auto earlier = ReadEarlier(revision))
-        return FindEarlier(*earlier);
     const auto whole = Id::Parse(revision);
     if (!whole && (revision.empty() || name == CurrentBranch()))
         throw Problem("branch " + Printable(*name) + " has no versions yet");
@@ -210,15 +222,12 @@ std::optional<Vault::Earlier> Vault::ReadEarlier(std::string const& revision) {
     return first == last || (error == std::errc() && end == last) ? std::optional(std::move(earlier)) : std::nullopt;
 }
 
-std::optional<CommitRecord> Vault::FindEarlier(Earlier const& earlier) const {
-    const auto later = TryFind(earlier.revision);
-    if (!later)
-        return std::nullopt;
-    const auto line = archive_->ReadAncestry(std::span(&later->id, 1), KivArchive::Follow::Parents, earlier.steps);
-    if (line.size() <= earlier.steps)
+CommitRecord Vault::FindEarlier(Id const& later, std::size_t steps) const {
+    const auto line = archive_->ReadAncestry(std::span(&later, 1), KivArchive::Follow::Parents, steps);
+    if (line.size() <= steps)
         throw Problem("there are only " + std::to_string(line.size() - std::min<std::size_t>(line.size(), 1)) +
-                      " versions before " + Shortened(later->id));
-    return TryFind(DigitsOf(line[earlier.steps].commit));
+                      " versions before " + Shortened(later));
+    return RequireSound(KivArchive::ReadCommits(*archive_, std::span(&line[steps].commit, 1)).front());
 }
 
 Target Vault::FindTarget(std::string const& target) const {

@@ -79,7 +79,10 @@ private:
 
     /// Splits "master~3", which is three versions before "master"; "master~" is one before.
     [[nodiscard]] static std::optional<Earlier> ReadEarlier(std::string const& revision);
-    [[nodiscard]] std::optional<CommitRecord> FindEarlier(Earlier const& earlier) const;
+    /// The same as `TryFind`, for what does not end with "~N".
+    [[nodiscard]] std::optional<CommitRecord> TryFindNamed(std::string const& revision) const;
+    /// @throws Problem if there are not so many
+    [[nodiscard]] CommitRecord FindEarlier(Id const& later, std::size_t steps) const;
 
     std::string file_;
     /// Whether it has been said whom this one waits for.
