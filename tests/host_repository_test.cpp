@@ -1,4 +1,5 @@
 #include "support/HostObjects.h"
+#include "support/PackedForms.h"
 #include "support/RecordingRepository.h"
 
 #include <gtest/gtest.h>
@@ -51,6 +52,42 @@ TEST(HostRepositories, AreGivenTheNameOfTheBranchThatIsCurrentAtTheMomentOfTheCa
     EXPECT_TRUE(repo.GetHead() == stored);
     EXPECT_TRUE(repo.FastForwardMerge(stored));
     EXPECT_EQ(Joined(storage.names), "first! second first! second first!");
+}
+
+TEST(HostRepositories, HaveTheirStoragesAskedForAllThatTreesTakeInOrRead) {
+    class Noting : public MemObjectsStorage {
+    public:
+        cow_ptr<Blob> GetBlob(Id const& id) const override {
+            calls += "blob? ";
+            return MemObjectsStorage::GetBlob(id);
+        }
+        cow_ptr<Tree> GetTree(Id const& id) const override {
+            calls += "tree? ";
+            return MemObjectsStorage::GetTree(id);
+        }
+        void AddBlob(cow_ptr<Blob> blob) override {
+            calls += "blob! ";
+            MemObjectsStorage::AddBlob(std::move(blob));
+        }
+        void AddTree(cow_ptr<Tree> tree) override {
+            calls += "tree! ";
+            MemObjectsStorage::AddTree(std::move(tree));
+        }
+        mutable std::string calls;
+    };
+    auto owned = std::make_unique<Noting>();
+    std::string const& calls = owned->calls;
+    Repository repo(std::move(owned));
+    Tree tree;
+    tree.AddBlob(&repo, u"d/x", MakeBlob("1"));
+    EXPECT_EQ(calls, "blob? blob? blob! tree? tree? tree! ");
+    auto other = std::make_unique<Noting>();
+    std::string const& read = other->calls;
+    Repository reader(std::move(other));
+    ASSERT_TRUE(repo.SyncWithStorage(immu::make<Tree>(tree)));
+    PackedFormsOf forms(repo);
+    EXPECT_TRUE(Tree::Deserialize(tree.GetId(), &reader, forms.Loader()));
+    EXPECT_EQ(read, "tree? tree? blob? blob? blob? blob! tree? tree! tree? tree? tree? tree! ");
 }
 
 TEST(HostRepositories, DecideWhatTheirOverridesAreAskedAbout) {
