@@ -90,6 +90,19 @@ TEST(HostRepositories, HaveTheirStoragesAskedForAllThatTreesTakeInOrRead) {
     EXPECT_EQ(read, "tree? tree? blob? blob? blob? blob! tree? tree! tree? tree? tree? tree! ");
 }
 
+TEST(HostRepositories, FindInATableThatTheyHaveAskedForWhatTreesTakeInAfterwards) {
+    Repository repo(std::make_unique<MemObjectsStorage>());
+    Tree tree;
+    for (auto const* path : {u"d/x", u"d/y", u"d/z"}) {
+        const auto blob = tree.AddBlob(&repo, path, MakeBlob(Narrow(path)));
+        auto const& table = repo.GetStorage()->GetBlobs();
+        ASSERT_TRUE(blob && table.contains(blob->GetId()));
+        EXPECT_TRUE(tree.AddBlob(&repo, u"again", MakeBlob(Narrow(path))) == blob);
+        EXPECT_EQ(repo.GetBlobCount(), table.size());
+    }
+    EXPECT_EQ(repo.GetBlobCount(), 3U);
+}
+
 TEST(HostRepositories, DecideWhatTheirOverridesAreAskedAbout) {
     class Claiming : public Repository {
     public:
