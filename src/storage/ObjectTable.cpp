@@ -103,6 +103,7 @@ void ObjectTable<T>::Add(cow_ptr<T> object) {
         shown->table.try_emplace(std::move(id), std::move(object));
         return;
     }
+    // NOLINTNEXTLINE(clang-analyzer-core.NonNullParamChecker): without a digest there is a table by now
     if (const Place place = PlaceOf(*own); place.object == nullptr)
         AddAt(place, std::move(object));
 }

@@ -6,19 +6,19 @@
 namespace KivVcs {
 
 /// The storage's instance of @p object, an object of one of the library's classes: what StoredInstance finds out, by one look
-/// at the table. Null if it takes the calls to find out.
+/// at the table. Nothing if it takes the calls to find out; @p own has not been called then.
 template <class T, class Own>
-cow_ptr<T> OwnStoredInstance(detail::ObjectTable<T>& table, T const& object, Own own) {
-    if (object.GetKnownDigest() == nullptr)
-        static_cast<void>(object.GetId());
+optional<cow_ptr<T>> OwnStoredInstance(detail::ObjectTable<T>& table, T const& object, Own own) {
     Id::Digest const* const digest = object.GetKnownDigest();
     // Another thread may be about to publish it.
     if (digest == nullptr)
-        return nullptr;
+        return {};
     const auto place = table.PlaceOf(*digest);
     // One of a host's class would be asked for its identifier.
+    if (place.object != nullptr && place.object->IsOfHostClass())
+        return {};
     if (place.object != nullptr)
-        return place.object->IsOfHostClass() ? nullptr : cow_ptr<T>::share(place.object);
+        return cow_ptr<T>::share(place.object);
     cow_ptr<T> stored = own();
     table.AddAt(place, stored.share_from_sole_owner());
     return stored;
@@ -33,9 +33,12 @@ cow_ptr<T> OwnStoredInstance(detail::ObjectTable<T>& table, T const& object, Own
 template <class T, class Own>
 cow_ptr<T> StoredInstance(IRepository& repo, T const& object, Own own) {
     if (!object.IsOfHostClass()) {
+        // Before the table is looked at, since hosts' objects in a tree are asked for theirs.
+        if (object.GetKnownDigest() == nullptr)
+            static_cast<void>(object.GetId());
         if (auto* const table = detail::OwnTables::Behind(repo).Of<T>()) {
-            if (cow_ptr<T> stored = OwnStoredInstance(*table, object, own))
-                return stored;
+            if (auto stored = OwnStoredInstance(*table, object, own))
+                return *std::move(stored);
         }
     }
     cow_ptr<T> stored;
