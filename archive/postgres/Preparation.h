@@ -23,14 +23,17 @@ struct Prepared : ItemForm {
     Bytes stored;
 };
 
+/// The order of the lists of identifiers that a change is compared with.
 inline bool IsBefore(Id const& left, Id const& right) {
     return DigestOf(left) < DigestOf(right);
 }
 
+/// Whether a list in that order has an identifier.
 inline bool Contains(std::vector<Id> const& sorted, Id const& id) {
     return std::binary_search(sorted.begin(), sorted.end(), id, IsBefore);
 }
 
+/// Puts a list into that order, each identifier once.
 inline void SortUnique(std::vector<Id>& ids) {
     std::sort(ids.begin(), ids.end(), IsBefore);
     ids.erase(std::unique(ids.begin(), ids.end()), ids.end());

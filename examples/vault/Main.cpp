@@ -122,7 +122,7 @@ int Run(CLI::App& app, char** program, std::span<char*> words) {
     const auto word = CommandWord(words);
     const bool wantsHelp = word == "help" || word == "-h" || word == "--help";
     auto const* const command = word == "help" ? nullptr : FindCommand(word);
-    // Each takes a while.
+    // No others: to describe them all is much of what a short command would do.
     for (auto const& one : Commands()) {
         if (&one == command || wantsHelp)
             Describe(app, one, arguments);
