@@ -10,6 +10,7 @@ namespace {
 /// What this program's operators `new` and `delete` do. The tests run on one thread.
 struct Allocations {
     long living = 0;
+    std::size_t requested = 0;
     /// The allocation that fails, counted from 1; none for 0.
     long failing = 0;
     bool laterOnesFailToo = false;
@@ -35,6 +36,7 @@ bool Fails() {
         return nullptr;
     }
     void* const memory = std::malloc(size == 0 ? 1 : size);
+    allocations.requested += size;
     allocations.living += memory == nullptr ? 0 : 1;
     return memory;
 }
@@ -141,6 +143,21 @@ TEST_P(AllocationFaults, LeaveEverythingAsItWasAndLeakNothing) {
     EXPECT_EQ(prototype.State(), before);
     RecordProperty("faults", std::to_string(faults));
     EXPECT_GT(faults, 0) << "nothing failed";
+}
+
+TEST(AllocationsOfBuffers, LeaveRoomInProportionToWhatIsWrittenBetweenSharedPieces) {
+#if defined(_WIN32)
+    GTEST_SKIP() << "the library has allocation functions of its own there";
+#endif
+    const Buffer shared = Buffer::Adopt(std::string(1500, 's'));
+    const std::string own(100, 'o');
+    Buffer buffer;
+    const std::size_t before = allocations.requested;
+    while (buffer.GetSize() < 16'000'000) {
+        buffer.Append(shared);
+        buffer.Append(own.data(), own.size());
+    }
+    EXPECT_LT(allocations.requested - before, 2 * buffer.GetSize());
 }
 
 INSTANTIATE_TEST_SUITE_P(Operations, AllocationFaults, testing::ValuesIn(AllOperations()),

@@ -14,8 +14,11 @@ namespace {
 /// A single block grows by copying up to this size; beyond it new bytes go into further blocks and nothing is copied.
 constexpr std::size_t largestCopiedBlock = 65536;
 
-std::size_t RoomForGrowth(std::uint64_t content) noexcept {
-    return static_cast<std::size_t>(std::clamp<std::uint64_t>(content / 8, 4096, 1U << 20U));
+/// Room for what follows @p written bytes at the end of @p content: it doubles, so that few bytes between pieces that are
+/// shared do not take room for many, up to a part of the whole.
+std::size_t RoomForGrowth(std::uint64_t content, std::uint64_t written) noexcept {
+    return static_cast<std::size_t>(
+        std::clamp<std::uint64_t>(2 * written, 512, std::clamp<std::uint64_t>(content / 8, 4096, 1U << 20U)));
 }
 
 } // namespace
@@ -90,6 +93,11 @@ struct Buffer::Chain final : Content {
             return 0;
         const auto* pieceEnd = chunks.back().data() + chunks.back().size();
         return pieceEnd == owners.back()->Bytes() + owners.back()->size ? owners.back()->room : 0;
+    }
+
+    /// The size of the last piece if nobody else has it.
+    [[nodiscard]] std::size_t OwnAtEnd() const noexcept {
+        return owners.empty() || owners.back().use_count() != 1 ? 0 : chunks.back().size();
     }
 
     void WriteAtEnd(const std::byte* data, std::size_t count) noexcept {
@@ -225,7 +233,7 @@ void Buffer::AppendOnce(const std::byte* data, std::size_t size) {
     Handle<Block> further;
     if (size > fitting) {
         const std::size_t rest = size - fitting;
-        further = Block::Make(rest, std::max(rest, RoomForGrowth(held)) - rest);
+        further = Block::Make(rest, std::max(rest, RoomForGrowth(held, chain.OwnAtEnd())) - rest);
         std::memcpy(further->OwnBytes(), data + fitting, rest);
     }
     if (fitting > 0)
