@@ -21,6 +21,14 @@ function(kivvcs_add_library target)
         VERSION ${PROJECT_VERSION}
         # Before 1.0 every minor version may change the binary interface.
         SOVERSION ${PROJECT_VERSION_MAJOR}.${PROJECT_VERSION_MINOR})
+    # What a library calls of its own is bound when it is built: nobody replaces a part of it, and its calls are too small for
+    # the way through a table. Compilers but GCC take that for granted; linkers do not.
+    if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+        target_compile_options(${target} PRIVATE -fno-semantic-interposition)
+    endif()
+    if(BUILD_SHARED_LIBS AND UNIX AND NOT APPLE)
+        target_link_options(${target} PRIVATE -Wl,-Bsymbolic-functions)
+    endif()
     # Companions find what they stand on beside themselves, wherever they are installed: a program that calls nothing of it
     # does not say where it is.
     if(UNIX AND NOT APPLE AND NOT arg_ALIAS STREQUAL KivVcs)

@@ -4,7 +4,10 @@
 #include "objects/DataToHash.h"
 #include "objects/PackedForm.h"
 
+#include <charconv>
 #include <cstdlib>
+#include <limits>
+#include <stdexcept>
 
 namespace KivVcs {
 
@@ -40,14 +43,32 @@ struct Signature {
     TimeDelta bias;
 };
 
-/// A line of a commit's text that shows an identifier.
-KivStringT<char> LineOfId(KivStringViewT<char> key, Id const& id) {
-    KivStringT<char> line = key.ToString();
+/// Writes a number in decimal, with zeros in front of fewer than @p width digits, and returns the end.
+char16_t* WriteNumber(std::int32_t number, char16_t* to, std::ptrdiff_t width = 1) {
+    std::array<char, 11> digits{};
+    const char* const end = std::to_chars(digits.data(), digits.data() + digits.size(), number).ptr;
+    to = std::fill_n(to, std::max<std::ptrdiff_t>(width - (end - digits.data()), 0), u'0');
+    return std::copy(static_cast<const char*>(digits.data()), end, to);
+}
+
+template <class C>
+KivStringT<C> Join(std::initializer_list<KivStringViewT<C>> pieces) {
+    std::int64_t length = 0;
+    for (KivStringViewT<C> piece : pieces)
+        length += piece.GetLength();
+    if (length > std::numeric_limits<int>::max())
+        throw std::length_error("commit longer than a signed 32-bit length can hold");
+    return KivStringT<C>::Build(static_cast<int>(length), [pieces](C* units) {
+        for (KivStringViewT<C> piece : pieces)
+            units = std::copy(piece.begin(), piece.end(), units);
+    });
+}
+
+/// An identifier as the text of a commit shows it.
+KivStringT<char> Shown(Id const& id) {
     if (Id::Digest const* const digest = id.GetDigest())
-        line += KivStringT<char>::Build(int{idLength}, [digest](char* digits) { WriteDigits(*digest, digits); });
-    else
-        line += DataEncoding::Utf8Encode(UntilZero(id.GetText()));
-    return line += "\n";
+        return KivStringT<char>::Build(int{idLength}, [digest](char* digits) { WriteDigits(*digest, digits); });
+    return DataEncoding::Utf8Encode(UntilZero(id.GetText()));
 }
 
 /// The text of @p commit. A parent is shown even if its identifier is null.
@@ -56,19 +77,12 @@ KivStringT<char> TextOf(Commit const& commit, bool hasParent) {
         Commit::GetAuthorInfo(u"author", commit.GetAuthorName(), commit.GetAuthorEmail(), commit.GetCommitTime(),
                               commit.GetCommitTimezoneBias());
     // The committer is always the author, at the same time.
-    const KivStringT<char> signature = DataEncoding::Utf8Encode(author.Mid(6));
-
-    KivStringT<char> text = LineOfId("tree ", commit.GetRootId());
-    if (hasParent)
-        text += LineOfId("parent ", commit.GetParentId());
-    for (KivStringViewT<char> role : {"author", "committer"}) {
-        text += role;
-        text += signature;
-        text += "\n";
-    }
-    text += "\n";
-    text += DataEncoding::Utf8Encode(UntilZero(commit.GetDescription()));
-    return text += "\n";
+    const KivStringT<char> signature = DataEncoding::Utf8Encode(KivStringViewT<char16_t>(author).Mid(6));
+    const KivStringT<char> root = Shown(commit.GetRootId());
+    const KivStringT<char> parent = hasParent ? Shown(commit.GetParentId()) : KivStringT<char>();
+    const KivStringT<char> description = DataEncoding::Utf8Encode(UntilZero(commit.GetDescription()));
+    return Join<char>({"tree ", root, "\n", hasParent ? "parent " : "", parent, hasParent ? "\n" : "", "author",
+                       signature, "\ncommitter", signature, "\n\n", description, "\n"});
 }
 
 } // namespace
@@ -122,13 +136,20 @@ Id Commit::ComputeId() const {
 
 KivStringT<char16_t> Commit::GetAuthorInfo(KivStringViewT<char16_t> role, KivStringViewT<char16_t> name,
                                            KivStringViewT<char16_t> email, Time time, TimeDelta bias) {
-    const std::int64_t hours = bias.GetTicks() / ticksPerHour;
-    const std::int64_t minutes = std::abs(bias.GetTicks() / ticksPerMinute) % 60;
-    KivStringT<char16_t> line;
-    line.FormatInternal(u"%s %s <%s> %d %s%02d%02d", role.ToString(), name.ToString(), email.ToString(),
-                        static_cast<std::int32_t>(time.ToTimeT(TimeZone::Utc)), hours < 0 ? u"-" : u"+",
-                        std::abs(hours), minutes);
-    return line;
+    const auto hours = static_cast<std::int32_t>(bias.GetTicks() / ticksPerHour);
+    const auto minutes = static_cast<std::int32_t>(std::abs(bias.GetTicks() / ticksPerMinute) % 60);
+    std::array<char16_t, 64> when{};
+    char16_t* end = WriteNumber(static_cast<std::int32_t>(time.ToTimeT(TimeZone::Utc)), when.data());
+    *end++ = u' ';
+    *end++ = hours < 0 ? u'-' : u'+';
+    end = WriteNumber(minutes, WriteNumber(std::abs(hours), end, 2), 2);
+    return Join<char16_t>({UntilZero(role),
+                           u" ",
+                           UntilZero(name),
+                           u" <",
+                           UntilZero(email),
+                           u"> ",
+                           {when.data(), static_cast<int>(end - when.data())}});
 }
 
 optional<KivStringT<char>> Commit::ParseCommitInfo(KivStringT<char> const& text, KivStringViewT<char> key,
