@@ -29,6 +29,11 @@ struct WriteTo {
     }
 };
 
+/// The packed entries of a tree without hosts' objects.
+Buffer PackedInOnePiece(Node const& top) {
+    return Buffer::Build(top.Total().packedSize, [&top](std::byte* out) { PackEntries(top, WriteTo{out}); });
+}
+
 /// @p data without the room that is left from appending to it.
 Buffer WithoutRoom(Buffer const& data) {
     if (data.GetSize() <= detail::pieceSize)
@@ -120,16 +125,21 @@ optional<std::uint64_t> Tree::GetSizeToHash() const noexcept {
 void Tree::GetDataToHash(detail::DataToHash& data) const {
     data.word = "tree";
     if (Node const* const top = entries_.Top().get())
-        data.own = Buffer::Build(top->Total().packedSize, [top](std::byte* out) { PackEntries(*top, WriteTo{out}); });
+        data.own = PackedInOnePiece(*top);
 }
 
 Buffer const& Tree::GetData() const {
     return data_.GetOrMake([this] {
+        Node const* const top = entries_.Top().get();
+        if (top == nullptr)
+            return Buffer();
+        // How much hosts' objects show is not known before they were asked.
+        if (!KeepsRuns(*top) && top->Total().hosts == 0)
+            return PackedInOnePiece(*top);
         Buffer data;
-        if (!IsEmpty())
-            PackEntries(*entries_.Top(), AppendTo{data});
+        PackEntries(*top, AppendTo{data});
         // Runs that are kept are shared.
-        return IsEmpty() || KeepsRuns(*entries_.Top()) ? data : WithoutRoom(data);
+        return KeepsRuns(*top) ? data : WithoutRoom(data);
     });
 }
 
