@@ -17,6 +17,21 @@ template <class Unit>
 /// Writes two digits for each byte, and returns the end of what was written.
 template <class Unit, std::size_t byteCount>
 Unit* WriteHexDigits(std::array<std::uint8_t, byteCount> const& bytes, Unit* out) noexcept {
+#if defined(__wasm__) && !defined(__wasm_simd128__)
+    // Without vectors, eight digits at a time in one word.
+    static_assert(byteCount % 4 == 0);
+    constexpr std::uint64_t ones = 0x0101010101010101U;
+    for (std::size_t index = 0; index < byteCount; index += 4) {
+        std::uint64_t word = 0;
+        for (std::size_t byte = 0; byte < 4; ++byte)
+            word |= std::uint64_t{bytes[index + byte]} << 16 * byte;
+        word = (word >> 4U & 0x000F000F000F000FU) | (word & 0x000F000F000F000FU) << 8U;
+        word += ones * '0' + ((word + ones * 6) >> 4U & ones) * ('a' - '0' - 10);
+        for (std::size_t digit = 0; digit < 8; ++digit)
+            *out++ = static_cast<Unit>(word >> 8 * digit & 0xFF);
+    }
+    return out;
+#else
     // Plain arithmetic in two loops of fixed length, which compilers turn into a few vector instructions.
     std::array<std::uint8_t, 2 * byteCount> numbers;
     for (std::size_t index = 0; index < byteCount; ++index) {
@@ -26,6 +41,7 @@ Unit* WriteHexDigits(std::array<std::uint8_t, byteCount> const& bytes, Unit* out
     for (std::size_t index = 0; index < numbers.size(); ++index)
         out[index] = static_cast<Unit>(numbers[index] + (numbers[index] > 9 ? 'a' - 10 : '0'));
     return out + numbers.size();
+#endif
 }
 
 /// Reads two lowercase digits for each byte; false if there is anything else among them.
