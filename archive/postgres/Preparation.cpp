@@ -124,6 +124,8 @@ void Preparation::KeepRead(Compressor& compressor) {
 void Preparation::KeepStored() {
     if (!areNew_)
         return;
+    for (auto const& [id, base] : links_)
+        recent_.Drop(id);
     for (Prepared& one : prepared_) {
         if (one.item->type == StoredType::Commit || one.item->size < worthDiffering)
             continue;

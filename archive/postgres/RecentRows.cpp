@@ -36,6 +36,15 @@ WholeRow const* RecentRows::Find(Id const& id) {
     return &current_.insert_or_assign(id, found->second).first->second;
 }
 
+void RecentRows::Drop(Id const& id) {
+    std::scoped_lock const lock(mutex_);
+    if (auto const found = current_.find(id); found != current_.end()) {
+        size_ -= found->second.form->size() + rowSize;
+        current_.erase(found);
+    }
+    before_.erase(id);
+}
+
 bool RecentRows::GiveAll(std::span<const Id> ids, Forms& forms) {
     std::scoped_lock const lock(mutex_);
     for (Id const& id : ids)

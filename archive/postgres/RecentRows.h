@@ -18,6 +18,9 @@ public:
     /// @return false, giving some of them, if one is not here
     [[nodiscard]] bool GiveAll(std::span<const Id> ids, Forms& forms);
 
+    /// For a row that the newest version is no difference to, nor the versions after that.
+    void Drop(Id const& id);
+
 private:
     [[nodiscard]] WholeRow const* Find(Id const& id);
 

@@ -139,8 +139,9 @@ bool Publishing::StoreDirectory(NewDirectory const& directory) {
 void Publishing::StoreCommit(Commit const& commit) {
     Id const id = commit.GetId();
     Buffer const data = Joined(commit.GetData());
-    if (id.GetDigest() == nullptr || !(Identify(ObjectType::Commit, data) == id) ||
-        !ReadCommit(id, BytesOf(data), {}, {}))
+    bool const isItself =
+        id.GetDigest() != nullptr && (!commit.IsOfHostClass() || Identify(ObjectType::Commit, data) == id);
+    if (!isItself || !ReadCommit(id, BytesOf(data), {}, {}))
         throw ArchiveError(Failure::Unrepresentable, {},
                            "The version \"" + KivVcs::ToUtf8(commit.GetDescription()) + "\" cannot be read back.");
     Ancestry const* const known = facts_.Find(id);
