@@ -413,7 +413,11 @@ void NearArchive::KeepAncestry(std::vector<Ancestry> const& facts) {
 std::optional<std::vector<Ancestry>> NearArchive::ReadAncestry(std::span<const Id> commits, Follow follow,
                                                                std::size_t more) {
     auto facts = archive_->ReadAncestry(commits, follow, more);
-    if (facts.empty() && !commits.empty())
+    std::unordered_set<Id> known;
+    for (Ancestry const& one : facts)
+        known.insert(one.commit);
+    // What is not near may well be far away: histories seem to meet elsewhere, if at all, for whoever is told otherwise.
+    if (!std::all_of(commits.begin(), commits.end(), [&known](Id const& id) { return known.contains(id); }))
         return std::nullopt;
     return facts;
 }

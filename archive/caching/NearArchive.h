@@ -39,7 +39,7 @@ public:
     void KeepRecords(std::span<const KivStringT<char16_t>> names, std::vector<Record> const& records);
     [[nodiscard]] std::optional<std::vector<Record>> ReadRecords(std::span<const KivStringT<char16_t>> names);
     void KeepAncestry(std::vector<Ancestry> const& facts);
-    /// None if no facts of @p commits are here.
+    /// None if the facts of one of @p commits are not here.
     [[nodiscard]] std::optional<std::vector<Ancestry>> ReadAncestry(std::span<const Id> commits, Follow follow,
                                                                     std::size_t more);
 

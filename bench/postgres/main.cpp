@@ -136,7 +136,10 @@ unsigned PublishMerging(std::shared_ptr<PostgresArchive> const& archive, std::st
 /// Files on the branch that clients have published on together.
 std::size_t CountFiles(std::shared_ptr<PostgresArchive> const& archive) {
     ArchivedRepository const repository(archive);
-    auto const root = repository.GetHead()->GetCommitTree()->GetRoot();
+    auto const head = repository.GetHead();
+    if (!head)
+        throw std::runtime_error("nobody has published on master");
+    auto const root = head->GetCommitTree()->GetRoot();
     std::size_t count = 0;
     for (auto const& name : root->GetLocalSubtreePaths())
         count += root->GetLocalTree(name)->GetLocalBlobPaths().size();

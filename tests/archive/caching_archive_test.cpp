@@ -2,6 +2,7 @@
 #include "ForwardingArchive.h"
 #include "KivArchive/CachingArchive.h"
 #include "KivArchive/MemArchive.h"
+#include "KivArchive/Merging.h"
 
 #include <gtest/gtest.h>
 
@@ -197,6 +198,14 @@ TEST_F(CachingArchiveTest, DoesNotTakeWhatItHasNotSeenForNothing) {
     EXPECT_FALSE(isUnavailable(readRecords));
     EXPECT_EQ(readRecords(), 0U) << "that there is none was seen";
     EXPECT_FALSE(isUnavailable(readFacts));
+    far->isAway = false;
+    Id const seen = host.Head();
+    EXPECT_TRUE(host.Publish());
+    auto const findBases = [&] { return FindMergeBases(cache, seen, host.Head()).size(); };
+    EXPECT_TRUE(isUnavailable(findBases)) << "versions that seem to have nothing in common would conflict everywhere";
+    far->isAway = false;
+    EXPECT_EQ(findBases(), 1U);
+    EXPECT_FALSE(isUnavailable(findBases));
 }
 
 TEST_F(CachingArchiveTest, ReadingWhatIsNearStoresNothing) {
