@@ -150,6 +150,7 @@ std::vector<Ancestry> PostgresArchive::ListAncestry(Id const& after, std::size_t
 std::vector<ObjectInfo> PostgresArchive::ListObjects(Id const& after, std::size_t limit) {
     Rows const rows = Ask(*store_, Statement::ListObjects, Parameters().With(after).With(LimitOf(limit)));
     std::vector<ObjectInfo> listed;
+    listed.reserve(static_cast<std::size_t>(rows.Count()));
     for (int i = 0; i < rows.Count(); ++i)
         listed.push_back({rows.Identifier(i, 0), ObjectTypeOf(RowOf(rows.Number(i, 1)).type),
                           static_cast<std::uint64_t>(rows.Number(i, 2))});

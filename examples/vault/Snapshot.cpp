@@ -380,12 +380,13 @@ private:
     /// The index, and what it is read from.
     std::string before_;
     StatIndex index_;
-    std::shared_future<void> indexed_;
     Scan scan_;
     std::vector<State> states_;
     Snapshot snapshot_;
     std::unordered_set<Id> pending_;
     std::uint64_t pendingBytes_ = 0;
+    /// Last: waits for what reads the index, which uses others, if something fails meanwhile.
+    std::shared_future<void> indexed_;
 };
 
 } // namespace

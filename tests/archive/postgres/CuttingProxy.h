@@ -23,16 +23,15 @@ public:
         sockaddr_un const own = AddressIn(directory);
         bind(listening_, reinterpret_cast<sockaddr const*>(&own), sizeof own);
         listen(listening_, 64);
-        threads_.emplace_back([this] { Accept(); });
+        accepting_ = std::thread([this] { Accept(); });
     }
     CuttingProxy(CuttingProxy const&) = delete;
     CuttingProxy& operator=(CuttingProxy const&) = delete;
     ~CuttingProxy() {
         isEnding_ = true;
-        // The first one makes the others.
-        threads_.front().join();
-        for (std::size_t i = 1; i < threads_.size(); ++i)
-            threads_[i].join();
+        accepting_.join();
+        for (std::thread& passing : passing_)
+            passing.join();
         close(listening_);
     }
 
@@ -58,7 +57,7 @@ private:
             int const client = accept(listening_, nullptr, nullptr);
             int const server = socket(AF_UNIX, SOCK_STREAM, 0);
             if (connect(server, reinterpret_cast<sockaddr const*>(&server_), sizeof server_) == 0) {
-                threads_.emplace_back([this, client, server] { Pass(client, server); });
+                passing_.emplace_back([this, client, server] { Pass(client, server); });
                 continue;
             }
             close(client);
@@ -108,7 +107,9 @@ private:
     std::atomic<bool> isEnding_{false};
     std::atomic<bool> losesAnswer_{false};
     std::atomic<long> rest_{LONG_MAX};
-    std::vector<std::thread> threads_;
+    std::thread accepting_;
+    /// One for each connection, made by the one that accepts them.
+    std::vector<std::thread> passing_;
 };
 
 } // namespace KivArchive
