@@ -161,6 +161,7 @@ ChangeOutcome CachingArchive::Apply(Change const& change) {
     if (outcome.applied) {
         state_->near.Keep(change.objects);
         state_->near.KeepAncestry(change.ancestry);
+        state_->near.KeepChanged(change);
     }
     return outcome;
 }

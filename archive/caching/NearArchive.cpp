@@ -7,6 +7,7 @@
 #include <array>
 #include <cstring>
 #include <exception>
+#include <map>
 #include <set>
 #include <string_view>
 #include <unordered_set>
@@ -359,6 +360,32 @@ void NearArchive::KeepRecords(std::span<const KivStringT<char16_t>> names, std::
             Append(kept, BytesOf(Joined(found->value.value_or(Buffer()))));
         KeepRecord(NameOfRecord(name), kept);
     }
+}
+
+void NearArchive::KeepChanged(Change const& change) {
+    for (RecordChange const& changed : change.records)
+        KeepRecords({&changed.record.name, 1},
+                    changed.record.value ? std::vector{changed.record} : std::vector<Record>());
+    if (change.branches.empty())
+        return;
+    std::optional<std::vector<Branch>> seen;
+    Try([&] { seen = ReadBranches(); });
+    if (!seen)
+        return;
+    std::map<KivStringT<char16_t>, Id> heads;
+    for (Branch& branch : *seen)
+        heads.emplace(std::move(branch.name), std::move(branch.head));
+    for (BranchMove const& move : change.branches) {
+        if (move.head.IsEmpty())
+            heads.erase(move.name);
+        else
+            heads[move.name] = move.head;
+    }
+    std::vector<Branch> branches;
+    branches.reserve(heads.size());
+    for (auto& [name, head] : heads)
+        branches.push_back({name, std::move(head)});
+    KeepBranches(branches);
 }
 
 std::optional<std::vector<Record>> NearArchive::ReadRecords(std::span<const KivStringT<char16_t>> names) {

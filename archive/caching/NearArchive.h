@@ -37,6 +37,8 @@ public:
     void KeepBranches(std::vector<Branch> const& branches);
     [[nodiscard]] std::optional<std::vector<Branch>> ReadBranches();
     void KeepRecords(std::span<const KivStringT<char16_t>> names, std::vector<Record> const& records);
+    /// The branches and records of a change that the far archive has taken.
+    void KeepChanged(Change const& change);
     [[nodiscard]] std::optional<std::vector<Record>> ReadRecords(std::span<const KivStringT<char16_t>> names);
     void KeepAncestry(std::vector<Ancestry> const& facts);
     /// None if the facts of one of @p commits are not here.

@@ -48,7 +48,11 @@ std::string Address::Clean(std::string sentence) const {
         Replace(sentence, secret, "...");
     while (!sentence.empty() && (sentence.back() == '\n' || sentence.back() == '.'))
         sentence.pop_back();
-    Replace(sentence, "\n\t", " ");
+    // What the library advises stands on a line of its own.
+    for (auto at = sentence.find("\n\t"); at != std::string::npos; at = sentence.find("\n\t", at)) {
+        sentence.insert(std::min(sentence.find('\n', at + 1), sentence.size()), ")");
+        sentence.replace(at, 2, " (");
+    }
     Replace(sentence, "\n", "; ");
     return sentence;
 }

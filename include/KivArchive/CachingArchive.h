@@ -24,8 +24,8 @@ struct CachingOptions {
 /// what is missing there above all, and everything is stored there; what is stored is kept near, too. So only `Describe`,
 /// `Read` and `ReadContent` may do without the far archive, and may give what has been collected there meanwhile.
 ///
-/// While the far archive cannot be reached (`Failure::Unavailable`), reading calls go on with what is near, where they have
-/// seen it before: objects, branches, records and ancestry. `IsAway` says so. What is not near and everything that stores
+/// While the far archive cannot be reached (`Failure::Unavailable`), reading calls go on with what is near, where it was read
+/// or stored before: objects, branches, records and ancestry. `IsAway` says so. What is not near and everything that stores
 /// fails with the far archive's failure then.
 ///
 /// The near archive holds objects without what they name, so that it is good for nothing else. It may be thrown away at any

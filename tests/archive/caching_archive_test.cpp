@@ -167,8 +167,19 @@ TEST_F(CachingArchiveTest, ServesWhatItHasWhileTheFarArchiveIsAway) {
     EXPECT_THROW(cache.Apply({}), ArchiveError);
 
     far->isAway = false;
-    EXPECT_TRUE(host.Publish());
-    EXPECT_EQ(HeadOf(cache), host.Head()) << "branches are asked for anew";
+    SmallHost own(cache, 9);
+    EXPECT_TRUE(own.Publish());
+    Change settings;
+    settings.records.push_back({{u"settings", Conformance::BufferOf("dark")}, false, {}});
+    EXPECT_TRUE(cache.Apply(settings).applied);
+    far->isAway = true;
+    EXPECT_EQ(HeadOf(cache), own.Head()) << "what was stored through the cache has been seen";
+    std::vector<KivStringT<char16_t>> const names{u"settings"};
+    EXPECT_EQ(cache.ReadRecords(names).size(), 1U);
+    far->isAway = false;
+    SmallHost other(*far, 10);
+    EXPECT_TRUE(other.Publish());
+    EXPECT_EQ(HeadOf(cache), other.Head()) << "branches are asked for anew";
     EXPECT_FALSE(cache.IsAway());
 }
 
