@@ -42,7 +42,8 @@ TEST(Identify, GivesWhatOneStreamGivesAtAllLengthsAndInAllPieces) {
             blobs.emplace_back(contents[index]);
         for (Blob const& blob : blobs)
             pointers.push_back(&blob);
-        pointers.insert(pointers.end(), pointers.begin(), pointers.end());
+        const auto once = pointers;
+        pointers.insert(pointers.end(), once.begin(), once.end());
         Identify(pointers);
         for (std::size_t index = 0; index < count; ++index) {
             ASSERT_NE(blobs[index].GetKnownDigest(), nullptr);
