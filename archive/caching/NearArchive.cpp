@@ -443,7 +443,7 @@ std::optional<std::vector<Ancestry>> NearArchive::ReadAncestry(std::span<const I
     std::unordered_set<Id> known;
     for (Ancestry const& one : facts)
         known.insert(one.commit);
-    // What is not near may well be far away: histories seem to meet elsewhere, if at all, for whoever is told otherwise.
+    // The far archive may have facts that are not near. Without them two histories would seem to have nothing in common.
     if (!std::all_of(commits.begin(), commits.end(), [&known](Id const& id) { return known.contains(id); }))
         return std::nullopt;
     return facts;

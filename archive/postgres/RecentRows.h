@@ -18,7 +18,7 @@ public:
     /// @return false, giving some of them, if one is not here
     [[nodiscard]] bool GiveAll(std::span<const Id> ids, Forms& forms);
 
-    /// For a row that the newest version is no difference to, nor the versions after that.
+    /// Forgets a row: one that neither a newer version nor those after it will be differences to.
     void Drop(Id const& id);
 
 private:

@@ -385,7 +385,7 @@ private:
     Snapshot snapshot_;
     std::unordered_set<Id> pending_;
     std::uint64_t pendingBytes_ = 0;
-    /// Last: waits for what reads the index, which uses others, if something fails meanwhile.
+    /// The last member, so that it goes first: its destructor waits for the thread that reads the index into the others.
     std::shared_future<void> indexed_;
 };
 
