@@ -122,6 +122,8 @@ bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std:
     ByteView const between = form.subspan(begin, form.size() - begin - end);
     ByteView const replaced = base.subspan(begin, base.size() - begin - end);
     std::size_t const before = to.size();
+    constexpr std::size_t usualSize = 64;
+    to.reserve(before + usualSize);
     AppendNumber(to, begin);
     AppendNumber(to, end);
     Append(to, std::byte{1});

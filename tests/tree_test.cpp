@@ -127,6 +127,34 @@ TEST_P(RandomTrees, LargeDirectoriesFollowThePlainModel) {
         ASSERT_NO_FATAL_FAILURE(version.Check());
 }
 
+/// Around the sizes from which a directory that is edited keeps what its digest has passed, and its leaves what they packed.
+TEST_P(RandomTrees, EditsBelowADirectoryFollowThePlainModel) {
+    for (const int count : {30, 50, 90, 130, 300}) {
+        const std::string directory = "d" + std::to_string(count);
+        const auto put = [&](int number, int content) {
+            const std::string name = "n" + std::to_string(number);
+            now.model.trees[directory].blobs[name] = std::to_string(content);
+            now.tree.write()->AddBlob(&repo, Wide(directory + "/" + name), MakeBlob(std::to_string(content)));
+        };
+        for (int number = 0; number < count; ++number)
+            put(number, 0);
+        former = {now};
+        for (int round = 1; round < 60; ++round) {
+            if (Below(6) == 0)
+                now = former[random() % former.size()];
+            for (int few = Below(3); few >= 0; --few)
+                put(Below(Below(8) == 0 ? count + 3 : count), round);
+            if (Below(4) != 0) {
+                ASSERT_EQ(IdText(*now.tree), IdOf(now.model)) << count << ", " << round;
+            }
+            if (Below(3) == 0)
+                former.push_back(now);
+        }
+        for (Version const& version : former)
+            ASSERT_NO_FATAL_FAILURE(version.Check());
+    }
+}
+
 INSTANTIATE_TEST_SUITE_P(Seeds, RandomTrees, testing::Range(1, 5));
 
 } // namespace

@@ -85,7 +85,7 @@ public:
         trip.Run();
     }
 
-    /// Removes @p ids; what others are differences to stays for them. @param pieces are let go, too
+    /// Removes @p ids but for their facts; what others are differences to stays for them. @param pieces are let go, too
     void Remove(std::vector<Id> const& ids, std::vector<Id> const& pieces) {
         std::vector<Id> kept;
         std::vector<Id> gone;
@@ -99,6 +99,7 @@ public:
         if (!soon.empty())
             trip.Add(Statement::MarkForNow, Parameters().With(soon));
         if (!gone.empty()) {
+            trip.Add(Statement::KeepFacts, Parameters().With(gone));
             trip.Add(Statement::RemoveRows, Parameters().With(gone));
             trip.Add(Statement::DeleteMarks, Parameters().With(gone));
         }

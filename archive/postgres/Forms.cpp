@@ -6,8 +6,8 @@ namespace KivArchive::Postgres {
 
 namespace {
 
-/// A version is that many steps from one that is no difference at most, one for each bit of its number.
-constexpr std::size_t maximumSteps = 64;
+/// A version is that many steps from one that is no difference at most, three for each digit of its number to the base of 4.
+constexpr std::size_t maximumSteps = 96;
 constexpr std::uint64_t maximumMade = std::uint64_t{32} * 1024 * 1024;
 
 } // namespace

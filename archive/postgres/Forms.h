@@ -19,7 +19,7 @@ struct Form {
 /// A row of the table of objects.
 struct Row {
     StoredType type = StoredType::Blob;
-    /// Whether it is no object any more, and stays for those that are differences to it.
+    /// Whether it is no object any more, and stays for those that are differences to it, or for its facts.
     bool isRemoved = false;
     std::uint64_t size = 0;
     /// Null if it is no difference.
@@ -36,6 +36,15 @@ struct Version {
     std::uint64_t generation = 0;
     std::uint64_t formSize = 0;
 };
+
+/// Of version @p generation, which is not the first: what it is a difference to. That one's number has the last digit that is
+/// not zero one less, to the base of 4. No version is more than three steps for each digit from one that is whole, and three of
+/// four are differences to the version before.
+[[nodiscard]] inline std::uint64_t GenerationOfBase(std::uint64_t generation) noexcept {
+    constexpr std::uint64_t firstBits = 0x5555555555555555;
+    std::uint64_t const lowest = generation & (~generation + 1);
+    return generation - ((lowest & firstBits) != 0 ? lowest : lowest / 2);
+}
 
 /// A row with its form, which is no difference any more. Rows never change; whether the server still has one is for the
 /// server to say.
@@ -90,6 +99,11 @@ private:
 [[nodiscard]] Row RowOf(std::int64_t type);
 
 [[nodiscard]] ObjectType ObjectTypeOf(StoredType type) noexcept;
+
+/// Whether the row is what is left of a commit. No row is a difference to a commit.
+[[nodiscard]] inline bool HasFactsOnly(Row const& row) noexcept {
+    return row.isRemoved && row.type == StoredType::Commit;
+}
 
 /// Whether the row is an object of the archive, rather than a part of one.
 [[nodiscard]] inline bool IsObject(Row const& row) noexcept {

@@ -24,9 +24,9 @@ void AppendBigEndian(Bytes& bytes, Number number) {
 }
 
 /// The header of an array with one dimension, which begins at 1.
-void AppendArrayHeader(Bytes& bytes, std::uint32_t type, std::size_t count) {
+void AppendArrayHeader(Bytes& bytes, std::uint32_t type, std::size_t count, bool mayHaveNull = false) {
     AppendBigEndian(bytes, std::uint32_t{count == 0 ? 0U : 1U});
-    AppendBigEndian(bytes, std::uint32_t{0});
+    AppendBigEndian(bytes, std::uint32_t{mayHaveNull ? 1U : 0U});
     AppendBigEndian(bytes, type);
     if (count == 0)
         return;
@@ -41,19 +41,23 @@ void MakeRoom(Bytes& bytes, std::size_t more) {
         bytes.reserve(std::max({least, 2 * bytes.capacity(), bytes.size() + more}));
 }
 
+/// @param view returns the bytes of a value, or an optional of them
 template <class Values, class View>
 void AppendArrayOfBytes(Bytes& array, Values const& values, View view) {
     constexpr std::size_t headerSize = 20;
     constexpr std::size_t lengthSize = 4;
+    constexpr std::uint32_t lengthOfNull = UINT32_MAX;
+    constexpr bool mayHaveNull = !std::is_same_v<decltype(view(*values.begin())), ByteView>;
     std::size_t size = headerSize;
     for (auto const& value : values)
-        size += lengthSize + view(value).size();
+        size += lengthSize + std::optional<ByteView>(view(value)).value_or(ByteView()).size();
     MakeRoom(array, size);
-    AppendArrayHeader(array, typeBytes, values.size());
+    AppendArrayHeader(array, typeBytes, values.size(), mayHaveNull);
     for (auto const& value : values) {
-        ByteView const bytes = view(value);
-        AppendBigEndian(array, static_cast<std::uint32_t>(bytes.size()));
-        Append(array, bytes);
+        std::optional<ByteView> const bytes = view(value);
+        AppendBigEndian(array, bytes ? static_cast<std::uint32_t>(bytes->size()) : lengthOfNull);
+        if (bytes)
+            Append(array, *bytes);
     }
 }
 
@@ -111,6 +115,11 @@ Parameters& Parameters::With(std::span<const ByteView> values) {
 
 Parameters& Parameters::With(std::span<const Bytes> values) {
     AppendArrayOfBytes(bytes_, values, [](Bytes const& value) { return ByteView(value); });
+    return EndOne();
+}
+
+Parameters& Parameters::With(std::span<const std::optional<ByteView>> values) {
+    AppendArrayOfBytes(bytes_, values, [](std::optional<ByteView> const& value) { return value; });
     return EndOne();
 }
 

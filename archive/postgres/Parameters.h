@@ -8,6 +8,7 @@
 
 #include <libpq-fe.h>
 #include <memory>
+#include <optional>
 
 namespace KivArchive::Postgres {
 
@@ -26,6 +27,8 @@ public:
     Parameters& With(std::span<const Id> ids);
     Parameters& With(std::span<const ByteView> values);
     Parameters& With(std::span<const Bytes> values);
+    /// Nothing becomes NULL.
+    Parameters& With(std::span<const std::optional<ByteView>> values);
     Parameters& With(std::span<const std::int16_t> numbers);
     Parameters& With(std::span<const std::int64_t> numbers);
 

@@ -4,8 +4,8 @@
 #include "Parallel.h"
 
 #include <algorithm>
+#include <iterator>
 #include <numeric>
-#include <unordered_set>
 
 namespace KivArchive::Postgres {
 
@@ -17,18 +17,16 @@ constexpr std::uint64_t largestDifferenced = 16 * largestWholeContent;
 constexpr std::size_t worthwhile = 3;
 /// How much of earlier versions is fetched at once.
 constexpr std::uint64_t windowSize = 8 * largestWholeContent;
-/// What is smaller hardly becomes smaller still.
-constexpr std::size_t worthCompressing = 64;
 /// Who changes more at once will hardly go on with the same.
 constexpr std::size_t mostRowsKept = 256;
 /// Less is made sooner than another thread has begun.
 constexpr std::uint64_t worthSharing = std::uint64_t{128} * 1024;
-/// Of what is smaller, a difference saves less than a row takes beside its form.
-constexpr std::uint64_t worthDiffering = 512;
+/// Of what is smaller, a difference or compression saves less than a row takes beside its form.
+constexpr std::uint64_t worthMakingSmaller = 512;
 
 /// Whether it is stored as a difference, if that makes it much smaller.
 bool IsToDiffer(Item const& item) {
-    return !item.earlier.IsEmpty() && item.size >= worthDiffering;
+    return !item.earlier.IsEmpty() && item.size >= worthMakingSmaller;
 }
 
 void MakeDifference(Prepared& prepared, Compressor& compressor) {
@@ -73,7 +71,7 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
         Prepared& one = prepared_[index];
         MakeForm(one);
         // A log reads commits as they are.
-        if (one.item->type == StoredType::Commit || one.form.size() < worthCompressing)
+        if (one.item->type == StoredType::Commit || one.form.size() < worthMakingSmaller)
             one.member.encoding = Encoding::Plain;
     });
     if (hasEarlier)
@@ -86,6 +84,10 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
     ForEachInParallel(prepared_.size(), workers, connection.compressor,
                       [this](std::size_t index, Compressor& own) { MakeStored(prepared_[index], own); });
     numbers_.clear();
+    auto const first = std::partition(prepared_.begin(), prepared_.end(),
+                                      [this](Prepared const& one) { return !factsOnly_.contains(one.item->id); });
+    std::move(first, prepared_.end(), std::back_inserter(forFacts_));
+    prepared_.erase(first, prepared_.end());
     std::sort(prepared_.begin(), prepared_.end(),
               [](Prepared const& left, Prepared const& right) { return IsBefore(left.item->id, right.item->id); });
 }
@@ -124,10 +126,10 @@ void Preparation::KeepRead(Compressor& compressor) {
 void Preparation::KeepStored() {
     if (!areNew_)
         return;
-    for (auto const& [id, base] : links_)
+    for (Id const& id : passed_)
         recent_.Drop(id);
     for (Prepared& one : prepared_) {
-        if (one.item->type == StoredType::Commit || one.item->size < worthDiffering)
+        if (one.item->type == StoredType::Commit || one.item->size < worthMakingSmaller)
             continue;
         Version version{one.item->type, one.base, one.member.generation, one.member.formSize};
         auto form = std::make_shared<const Bytes>(one.member.isCompact ? std::move(one.compact)
@@ -154,9 +156,14 @@ void Preparation::Ask(Connection& connection) {
     std::unordered_set<Id> present;
     for (int i = 0; i < rows.Count(); ++i) {
         Id id = rows.Identifier(i, 0);
-        if (RowOf(rows.Number(i, 1)).isRemoved)
-            removed_.push_back(id);
+        Row const row = RowOf(rows.Number(i, 1));
         present_.push_back(id);
+        if (HasFactsOnly(row)) {
+            factsOnly_.insert(std::move(id));
+            continue;
+        }
+        if (row.isRemoved)
+            removed_.push_back(id);
         present.insert(std::move(id));
     }
     std::erase_if(prepared_, [&present](Prepared const& one) { return present.count(one.item->id) != 0; });
@@ -187,14 +194,12 @@ void Preparation::FindBase(Prepared& one, Compressor& compressor) {
         Id at = one.item->earlier;
         Version version = VersionOf(at);
         std::uint64_t const generation = 1 + version.generation;
-        // Version v is a difference to version v & (v - 1), so that no version is more than log2(v) steps from one that
-        // is whole.
-        std::uint64_t const wanted = generation & (generation - 1);
-        std::vector<std::pair<Id, Id>> links;
+        std::uint64_t const wanted = GenerationOfBase(generation);
+        std::vector<Id> passed;
         while (version.generation > wanted) {
             std::uint64_t const after = version.generation;
             if (numbers_.find(at) == numbers_.end())
-                links.emplace_back(at, version.base);
+                passed.push_back(at);
             at = version.base;
             version = VersionOf(at);
             if (version.generation >= after)
@@ -205,7 +210,9 @@ void Preparation::FindBase(Prepared& one, Compressor& compressor) {
         auto const prepared = numbers_.find(at);
         one.baseForm = prepared != numbers_.end() ? Form{std::make_shared<int>(), prepared_[prepared->second].form}
                                                   : forms_.FormOf(at, compressor);
-        links_.insert(links_.end(), links.begin(), links.end());
+        if (prepared == numbers_.end() && !passed.empty())
+            farBases_.emplace(at, version.base);
+        passed_.insert(passed_.end(), passed.begin(), passed.end());
         one.base = std::move(at);
         one.generation = generation;
     } catch (Malformed const&) {

@@ -9,6 +9,7 @@
 
 #include <algorithm>
 #include <unordered_map>
+#include <unordered_set>
 
 namespace KivArchive::Postgres {
 
@@ -57,12 +58,14 @@ public:
     /// The items that the server has, and those of them that are no objects there.
     [[nodiscard]] std::vector<Id> const& Present() const noexcept { return present_; }
     [[nodiscard]] std::vector<Id> const& Removed() const noexcept { return removed_; }
+    /// Those of which the server has facts only.
+    [[nodiscard]] std::vector<Prepared> const& ForFacts() const noexcept { return forFacts_; }
     /// The rows that items are differences to and that are not among them, each once.
     /// @param inherited sorted; earlier versions whose bases need not be named
     [[nodiscard]] std::vector<Id> Bases(std::vector<Id> const& inherited) const;
-    /// Rows and what they are differences to, as they were when they were read or stored: the steps that were taken to the
-    /// bases of the items. For as long as the server has them so, it keeps the last one for the first.
-    [[nodiscard]] std::vector<std::pair<Id, Id>> const& Links() const noexcept { return links_; }
+    /// Rows that items are differences to but that are not their earlier versions, and what these rows are differences to
+    /// themselves, as they were when they were read or stored.
+    [[nodiscard]] std::unordered_map<Id, Id> const& FarBases() const noexcept { return farBases_; }
     /// Keeps what has been stored, if it was new, and takes the forms of the items for that.
     void KeepStored();
 
@@ -87,7 +90,11 @@ private:
     std::unordered_map<Id, std::size_t> numbers_;
     std::vector<Id> present_;
     std::vector<Id> removed_;
-    std::vector<std::pair<Id, Id>> links_;
+    std::unordered_set<Id> factsOnly_;
+    std::vector<Prepared> forFacts_;
+    std::unordered_map<Id, Id> farBases_;
+    /// The rows that were passed on the way to the bases of the items.
+    std::vector<Id> passed_;
     bool areNew_ = false;
     /// The earlier versions looked at.
     Forms forms_;

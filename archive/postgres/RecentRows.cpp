@@ -47,14 +47,18 @@ void RecentRows::Drop(Id const& id) {
 
 bool RecentRows::GiveAll(std::span<const Id> ids, Forms& forms) {
     std::scoped_lock const lock(mutex_);
-    for (Id const& id : ids)
-        for (Id at = id; !at.IsEmpty() && !forms.IsTaken(at);) {
-            WholeRow const* const recent = Find(at);
-            if (recent == nullptr)
-                return false;
+    for (Id const& id : ids) {
+        WholeRow const* recent = Find(id);
+        std::uint64_t const wanted = recent == nullptr ? 0 : GenerationOfBase(recent->version.generation + 1);
+        for (Id at = id; recent != nullptr; recent = Find(at)) {
             forms.Take(at, *recent);
+            if (recent->version.generation <= wanted)
+                break;
             at = recent->version.base;
         }
+        if (recent == nullptr)
+            return false;
+    }
     return true;
 }
 

@@ -11,11 +11,12 @@ constexpr std::int64_t newestFormat = 1;
 
 /// In the order of their names; each column with its type.
 constexpr std::string_view expectedColumns =
-    "ancestry id bytea\nancestry parent bytea\nancestry tree bytea\nancestry token bytea\nattempts token bytea\n"
-    "attempts time bigint\nbranches name bytea\nbranches head bytea\ncontained id bytea\ncontained how "
+    "attempts token bytea\nattempts time bigint\nbranches name bytea\nbranches head bytea\ncontained id "
+    "bytea\ncontained how "
     "smallint\ncontained other bytea\n"
     "format version smallint\nmarks id bytea\nmarks time bigint\nobjects id bytea\nobjects type smallint\n"
-    "objects size bigint\nobjects base bytea\nobjects form bytea\nrecords name bytea\nrecords value bytea\n";
+    "objects size bigint\nobjects base bytea\nobjects form bytea\nobjects parent bytea\nobjects tree bytea\n"
+    "objects token bytea\nrecords name bytea\nrecords value bytea\n";
 
 std::string TextAt(Rows const& rows, int row, int column) {
     ByteView const bytes = rows.Value(row, column);

@@ -8,24 +8,32 @@ namespace KivArchive::Postgres {
 namespace {
 
 // "@" stands for the schema. Types of rows that are kept as bases only are 8 higher than those of objects, 3 is a piece of a
-// content. A check that does not hold divides by zero, which ends the transaction on the server: so all of it goes in one
-// round trip, whether it comes to its end or not. What is looked up row by row is fenced by OFFSET 0: joined, small tables would
-// be read whole for each step.
+// content, 10 is what is left of a commit that has been removed: its facts. A check that does not hold divides by zero, which
+// ends the transaction on the server: so all of it goes in one round trip, whether it comes to its end or not. What is looked up
+// row by row is fenced by OFFSET 0: joined, small tables would be read whole for each step.
 struct Template {
     Statement statement;
     std::string_view text;
+    std::string_view check = {};
 };
 
-// Stores nothing where the branch has not moved: who has lost the race changes no row. In braces: where rows $13 must still be
-// differences to $14. Arrays side by side take a tenth less of all this than a table of them.
+// Stores nothing where the branch has not moved: who has lost the race changes no row. "%" stands for what is checked besides.
+// Arrays side by side take a tenth less of all this than a table of them, and each takes its part: so $5 is 16 times the size and
+// the type, and what only the new head has comes alone.
 constexpr std::string_view moveBranchToNew =
-    "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
-    "{AND NOT EXISTS (SELECT 1 FROM unnest($13::bytea[], $14::bytea[]) AS known(id, base) WHERE NOT EXISTS "
-    "(SELECT 1 FROM @.objects o WHERE o.id = known.id AND o.base = known.base)) }"
-    "RETURNING name), facts AS (INSERT INTO @.ancestry(id, parent, tree, token) "
-    "SELECT unnest($9::bytea[]), unnest($10::bytea[]), unnest($11::bytea[]), unnest($12::bytea[]) FROM moved) "
-    "INSERT INTO @.objects(id, type, size, base, form) SELECT unnest($4::bytea[]), unnest($5::smallint[]), "
-    "unnest($6::bigint[]), unnest($7::bytea[]), unnest($8::bytea[]) FROM moved";
+    "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea %"
+    "RETURNING name), made AS NOT MATERIALIZED (SELECT unnest($4::bytea[]) AS id, unnest($5::bigint[]) AS kind, "
+    "unnest($6::bytea[]) AS base, unnest($7::bytea[]) AS form FROM moved) "
+    "INSERT INTO @.objects(id, type, size, base, form, parent, tree, token) "
+    "SELECT id, CAST(kind & 15 AS smallint), kind >> 4, base, form, CASE WHEN id = $3::bytea THEN $8::bytea END, "
+    "CASE WHEN id = $3::bytea THEN $9::bytea END, CASE WHEN id = $3::bytea THEN $10::bytea END FROM made";
+
+// Whether rows that others become differences to are as they were. They are held, so that nobody removes them before the end.
+constexpr std::string_view baseStands =
+    "AND EXISTS (SELECT 1 FROM @.objects WHERE id = $11::bytea AND base = $12::bytea FOR SHARE) ";
+constexpr std::string_view basesStand =
+    "AND (SELECT count(*) FROM (SELECT o.id FROM unnest($11::bytea[], $12::bytea[]) AS known(id, base) "
+    "JOIN @.objects o ON o.id = known.id AND o.base = known.base ORDER BY o.id FOR SHARE OF o) AS held) = $13::bigint ";
 
 constexpr std::array<Template, statementCount> templates{{
     {Statement::Begin, "BEGIN ISOLATION LEVEL READ COMMITTED"},
@@ -36,18 +44,19 @@ constexpr std::array<Template, statementCount> templates{{
      "FROM information_schema.columns WHERE table_schema = $1 ORDER BY table_name, ordinal_position"},
     {Statement::ReadFormat, "SELECT CAST(max(version) AS bigint) FROM @.format"},
     {Statement::MakeSchema, "CREATE SCHEMA IF NOT EXISTS @"},
-    {Statement::MakeAncestry,
-     "CREATE TABLE IF NOT EXISTS @.ancestry(id bytea PRIMARY KEY, parent bytea NOT NULL, tree bytea NOT NULL, "
-     "token bytea NOT NULL)"},
     {Statement::MakeAttempts, "CREATE TABLE IF NOT EXISTS @.attempts(token bytea PRIMARY KEY, time bigint NOT NULL)"},
     {Statement::MakeBranches, "CREATE TABLE IF NOT EXISTS @.branches(name bytea PRIMARY KEY, head bytea NOT NULL)"},
     {Statement::MakeContained, "CREATE TABLE IF NOT EXISTS @.contained(id bytea, how smallint, other bytea, "
                                "PRIMARY KEY(id, how, other))"},
     {Statement::MakeFormat, "CREATE TABLE IF NOT EXISTS @.format(version smallint PRIMARY KEY)"},
     {Statement::MakeMarks, "CREATE TABLE IF NOT EXISTS @.marks(id bytea PRIMARY KEY, time bigint NOT NULL)"},
-    {Statement::MakeObjects, "CREATE TABLE IF NOT EXISTS @.objects(id bytea PRIMARY KEY, type smallint NOT NULL, "
-                             "size bigint NOT NULL, base bytea NOT NULL, form bytea NOT NULL)"},
+    {Statement::MakeObjects,
+     "CREATE TABLE IF NOT EXISTS @.objects(id bytea PRIMARY KEY, type smallint NOT NULL, "
+     "size bigint NOT NULL, base bytea NOT NULL, form bytea NOT NULL, parent bytea, tree bytea, "
+     "token bytea)"},
     {Statement::MakeIndexOfBases, "CREATE INDEX IF NOT EXISTS objects_by_base ON @.objects(base) WHERE base <> '\\x'"},
+    {Statement::MakeIndexOfFacts,
+     "CREATE INDEX IF NOT EXISTS objects_with_facts ON @.objects(id) WHERE parent IS NOT NULL"},
     {Statement::MakeRecords, "CREATE TABLE IF NOT EXISTS @.records(name bytea PRIMARY KEY, value bytea NOT NULL)"},
     {Statement::AddFormat, "INSERT INTO @.format(version) VALUES(1) ON CONFLICT DO NOTHING"},
     {Statement::FindObjects,
@@ -76,58 +85,66 @@ constexpr std::array<Template, statementCount> templates{{
     {Statement::WalkParents,
      "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
      "LATERAL "
-     "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' OFFSET 0) l), "
+     "(SELECT parent AS link FROM @.objects WHERE id = w.id AND parent <> '\\x' OFFSET 0) l), "
      "near AS (SELECT id FROM walk LIMIT $2::bigint) "
      "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.objects WHERE id = n.id AND parent IS NOT NULL OFFSET 0) a ON true "
      "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true"},
     {Statement::WalkReachable,
      "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
      "LATERAL "
-     "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
+     "(SELECT parent AS link FROM @.objects WHERE id = w.id AND parent <> '\\x' UNION ALL "
      "SELECT other FROM @.contained WHERE id = w.id AND how = 0 OFFSET 0) l), "
      "near AS (SELECT id FROM walk LIMIT $2::bigint) "
      "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.objects WHERE id = n.id AND parent IS NOT NULL OFFSET 0) a ON true "
      "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true"},
     {Statement::WalkEverything,
      "WITH RECURSIVE walk(id) AS (SELECT unnest($1::bytea[]) UNION SELECT l.link FROM walk w CROSS JOIN "
      "LATERAL "
-     "(SELECT parent AS link FROM @.ancestry WHERE id = w.id AND parent <> '\\x' UNION ALL "
+     "(SELECT parent AS link FROM @.objects WHERE id = w.id AND parent <> '\\x' UNION ALL "
      "SELECT other FROM @.contained WHERE id = w.id OFFSET 0) l), "
      "near AS (SELECT id FROM walk LIMIT $2::bigint) "
      "SELECT n.id, a.parent, a.tree, CAST(c.how AS bigint), c.other FROM near n "
-     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.ancestry WHERE id = n.id OFFSET 0) a ON true "
+     "LEFT JOIN LATERAL (SELECT parent, tree FROM @.objects WHERE id = n.id AND parent IS NOT NULL OFFSET 0) a ON true "
      "LEFT JOIN LATERAL (SELECT how, other FROM @.contained WHERE id = n.id OFFSET 0) c ON true"},
     {Statement::ListAncestry,
      "SELECT a.id, a.parent, a.tree, CAST(c.how AS bigint), c.other "
-     "FROM (SELECT id, parent, tree FROM @.ancestry WHERE id > $1::bytea ORDER BY id LIMIT $2::bigint) a "
+     "FROM (SELECT id, parent, tree FROM @.objects WHERE id > $1::bytea AND parent IS NOT NULL ORDER BY id "
+     "LIMIT $2::bigint) a "
      "LEFT JOIN @.contained c ON c.id = a.id ORDER BY a.id"},
     {Statement::CountObjects,
      "SELECT CAST(type AS bigint), count(*), CAST(sum(octet_length(form)) AS bigint) FROM @.objects "
      "GROUP BY type"},
     {Statement::CountRows,
-     "SELECT (SELECT count(*) FROM @.ancestry), (SELECT count(*) FROM @.branches), "
+     "SELECT (SELECT count(*) FROM @.objects WHERE parent IS NOT NULL), (SELECT count(*) FROM @.branches), "
      "(SELECT count(*) FROM @.records), (SELECT count(*) FROM @.marks m JOIN @.objects o ON o.id = m.id "
      "WHERE o.type <> 3 AND o.type < 8)"},
     {Statement::RememberAttempt,
      "INSERT INTO @.attempts(token, time) VALUES($1::bytea, CAST(extract(epoch FROM now()) AS bigint))"},
     {Statement::ForgetAttempts,
      "DELETE FROM @.attempts WHERE time < CAST(extract(epoch FROM now()) AS bigint) - $1::bigint"},
-    {Statement::AddObjects, "INSERT INTO @.objects(id, type, size, base, form) "
-                            "SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[]) "
-                            "ON CONFLICT DO NOTHING"},
+    {Statement::AddObjects,
+     "INSERT INTO @.objects(id, type, size, base, form, parent, tree) SELECT * FROM "
+     "unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[], $6::bytea[], $7::bytea[]) "
+     "ON CONFLICT DO NOTHING"},
     {Statement::AddNewObjects,
-     "INSERT INTO @.objects(id, type, size, base, form) "
-     "SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[])"},
+     "INSERT INTO @.objects(id, type, size, base, form, parent, tree) SELECT * FROM "
+     "unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[], $6::bytea[], $7::bytea[])"},
+    {Statement::AddToFacts,
+     "UPDATE @.objects SET type = made.type, size = made.size, base = made.base, form = made.form "
+     "FROM unnest($1::bytea[], $2::smallint[], $3::bigint[], $4::bytea[], $5::bytea[]) "
+     "AS made(id, type, size, base, form) WHERE objects.id = made.id AND objects.type = 10"},
     {Statement::BringBack, "UPDATE @.objects SET type = type - 8 WHERE id = ANY($1::bytea[]) AND type >= 8"},
     {Statement::CheckUsed,
      "SELECT 1 / CASE count(*) WHEN $2::bigint THEN 1 ELSE 0 END FROM (SELECT id FROM @.objects "
      "WHERE id = ANY($1::bytea[]) AND (type < 8 OR id = ANY($3::bytea[])) ORDER BY id FOR SHARE) AS used"},
-    {Statement::AddAncestry,
-     "INSERT INTO @.ancestry(id, parent, tree, token) "
-     "SELECT id, parent, tree, '\\x' FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) AS facts(id, parent, tree) "
-     "ON CONFLICT DO NOTHING"},
+    {Statement::AddFacts,
+     "INSERT INTO @.objects(id, type, size, base, form, parent, tree) SELECT id, 10, 0, '\\x', '\\x', parent, tree "
+     "FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) AS facts(id, parent, tree) ON CONFLICT DO NOTHING"},
+    {Statement::SetFacts, "UPDATE @.objects SET parent = facts.parent, tree = facts.tree "
+                          "FROM unnest($1::bytea[], $2::bytea[], $3::bytea[]) AS facts(id, parent, tree) "
+                          "WHERE objects.id = facts.id AND objects.parent IS NULL"},
     {Statement::AddContained,
      "INSERT INTO @.contained(id, how, other) SELECT * FROM unnest($1::bytea[], $2::smallint[], $3::bytea[]) "
      "ON CONFLICT DO NOTHING"},
@@ -138,8 +155,9 @@ constexpr std::array<Template, statementCount> templates{{
      "WITH moved AS (UPDATE @.branches SET head = $3::bytea WHERE name = $1::bytea AND head = $2::bytea "
      "RETURNING name) SELECT 1 / count(*) FROM moved"},
     {Statement::MoveBranchToNew, moveBranchToNew},
-    {Statement::MoveBranchToNewIfBasesStand, moveBranchToNew},
-    {Statement::FindAttempt, "SELECT id FROM @.ancestry WHERE id = $1::bytea AND token = $2::bytea"},
+    {Statement::MoveBranchToNewIfBaseStands, moveBranchToNew, baseStands},
+    {Statement::MoveBranchToNewIfBasesStand, moveBranchToNew, basesStand},
+    {Statement::FindAttempt, "SELECT id FROM @.objects WHERE id = $1::bytea AND token = $2::bytea"},
     {Statement::MakeBranch, "INSERT INTO @.branches(name, head) VALUES($1::bytea, $2::bytea)"},
     {Statement::RemoveBranch,
      "WITH removed AS (DELETE FROM @.branches WHERE name = $1::bytea AND head = $2::bytea RETURNING name) "
@@ -164,7 +182,9 @@ constexpr std::array<Template, statementCount> templates{{
                             "ON CONFLICT(id) DO UPDATE SET time = 0"},
     {Statement::FindBases, "SELECT DISTINCT base FROM @.objects WHERE base = ANY($1::bytea[]) AND base <> '\\x'"},
     {Statement::KeepAsBases, "UPDATE @.objects SET type = type + 8 WHERE id = ANY($1::bytea[]) AND type < 8"},
-    {Statement::RemoveRows, "DELETE FROM @.objects WHERE id = ANY($1::bytea[])"},
+    {Statement::KeepFacts, "UPDATE @.objects SET type = 10, size = 0, base = '\\x', form = '\\x' "
+                           "WHERE id = ANY($1::bytea[]) AND parent IS NOT NULL"},
+    {Statement::RemoveRows, "DELETE FROM @.objects WHERE id = ANY($1::bytea[]) AND parent IS NULL"},
     {Statement::FindUnusedBases,
      "SELECT m.id, CAST(octet_length(o.form) AS bigint) FROM @.marks m JOIN @.objects o ON o.id = m.id "
      "WHERE o.type >= 8 AND NOT EXISTS (SELECT 1 FROM @.objects d WHERE d.base = m.id AND d.base <> '\\x') "
@@ -181,17 +201,12 @@ static_assert(std::all_of(templates.begin(), templates.end(), [next = std::size_
 } // namespace
 
 std::string TextOf(Statement statement, std::string const& schema) {
-    std::string text;
-    bool isLeftOut = false;
-    for (char const character : templates.at(static_cast<std::size_t>(statement)).text)
-        if (character == '{' || character == '}')
-            isLeftOut = character == '{' && statement == Statement::MoveBranchToNew;
-        else if (isLeftOut)
-            continue;
-        else if (character == '@')
-            text += schema;
-        else
-            text += character;
+    Template const& made = templates.at(static_cast<std::size_t>(statement));
+    std::string text(made.text);
+    if (std::size_t const check = text.find('%'); check != std::string::npos)
+        text.replace(check, 1, made.check);
+    for (std::size_t at = text.find('@'); at != std::string::npos; at = text.find('@', at + schema.size()))
+        text.replace(at, 1, schema);
     return text;
 }
 

@@ -17,7 +17,6 @@ enum class Statement : std::uint8_t {
     ReadColumns,
     ReadFormat,
     MakeSchema,
-    MakeAncestry,
     MakeAttempts,
     MakeBranches,
     MakeContained,
@@ -25,6 +24,7 @@ enum class Statement : std::uint8_t {
     MakeMarks,
     MakeObjects,
     MakeIndexOfBases,
+    MakeIndexOfFacts,
     MakeRecords,
     AddFormat,
 
@@ -48,14 +48,17 @@ enum class Statement : std::uint8_t {
     ForgetAttempts,
     AddObjects,
     AddNewObjects,
+    AddToFacts,
     BringBack,
     CheckUsed,
-    AddAncestry,
+    AddFacts,
+    SetFacts,
     AddContained,
     DeleteMarks,
     CheckNoHead,
     MoveBranch,
     MoveBranchToNew,
+    MoveBranchToNewIfBaseStands,
     MoveBranchToNewIfBasesStand,
     FindAttempt,
     MakeBranch,
@@ -73,6 +76,7 @@ enum class Statement : std::uint8_t {
     MarkForNow,
     FindBases,
     KeepAsBases,
+    KeepFacts,
     RemoveRows,
     FindUnusedBases,
     ListPieces,
@@ -83,9 +87,9 @@ inline constexpr std::size_t statementCount = static_cast<std::size_t>(Statement
 
 /// Those that make the tables, in order.
 inline constexpr std::array tableStatements{
-    Statement::MakeSchema,       Statement::MakeAncestry, Statement::MakeAttempts, Statement::MakeBranches,
-    Statement::MakeContained,    Statement::MakeFormat,   Statement::MakeMarks,    Statement::MakeObjects,
-    Statement::MakeIndexOfBases, Statement::MakeRecords,  Statement::AddFormat};
+    Statement::MakeSchema,       Statement::MakeAttempts, Statement::MakeBranches, Statement::MakeContained,
+    Statement::MakeFormat,       Statement::MakeMarks,    Statement::MakeObjects,  Statement::MakeIndexOfBases,
+    Statement::MakeIndexOfFacts, Statement::MakeRecords,  Statement::AddFormat};
 
 /// The text of a statement. @param schema quoted
 [[nodiscard]] std::string TextOf(Statement statement, std::string const& schema);

@@ -11,6 +11,8 @@ namespace {
 
 /// How much one statement brings.
 constexpr std::size_t statementSize = 8 * largestWholeContent;
+/// How many bits of a number that tells type and size are those of the type.
+constexpr unsigned typeBits = 4;
 /// A branch is held while a change of one statement is stored.
 constexpr std::size_t mostItemsOfShort = 64;
 
@@ -18,6 +20,45 @@ constexpr std::size_t mostItemsOfShort = 64;
 ByteView BytesOfId(Id const& id) {
     return id.IsEmpty() ? ByteView() : std::as_bytes(std::span(DigestOf(id)));
 }
+
+/// The facts of a change. Of several about one commit, the first count; what it contains adds up.
+class Facts {
+public:
+    explicit Facts(Change const& change) {
+        sorted_.reserve(change.ancestry.size());
+        for (Ancestry const& facts : change.ancestry) {
+            sorted_.push_back(&facts);
+            for (ContainedCommit const& other : facts.contains) {
+                containing_.push_back(BytesOfId(facts.commit));
+                hows_.push_back(static_cast<std::int16_t>(other.how));
+                contained_.push_back(BytesOfId(other.id));
+            }
+        }
+        std::stable_sort(sorted_.begin(), sorted_.end(), [](Ancestry const* left, Ancestry const* right) {
+            return IsBefore(left->commit, right->commit);
+        });
+        auto const isSame = [](Ancestry const* left, Ancestry const* right) { return left->commit == right->commit; };
+        sorted_.erase(std::unique(sorted_.begin(), sorted_.end(), isSame), sorted_.end());
+    }
+
+    /// In ascending order of the commits, each once.
+    [[nodiscard]] std::vector<Ancestry const*> const& All() const noexcept { return sorted_; }
+    /// Null if there are none of it.
+    [[nodiscard]] Ancestry const* Find(Id const& commit) const {
+        auto const found =
+            std::lower_bound(sorted_.begin(), sorted_.end(), commit,
+                             [](Ancestry const* one, Id const& wanted) { return IsBefore(one->commit, wanted); });
+        return found != sorted_.end() && (*found)->commit == commit ? *found : nullptr;
+    }
+    [[nodiscard]] bool ContainAny() const noexcept { return !contained_.empty(); }
+    void AddContainedTo(Parameters& parameters) const { parameters.With(containing_).With(hows_).With(contained_); }
+
+private:
+    std::vector<Ancestry const*> sorted_;
+    std::vector<ByteView> containing_;
+    std::vector<std::int16_t> hows_;
+    std::vector<ByteView> contained_;
+};
 
 /// Items as the columns of rows.
 struct ObjectColumns {
@@ -47,27 +88,22 @@ struct ObjectColumns {
     void AddTo(Parameters& parameters) const { parameters.With(ids).With(types).With(sizes).With(bases).With(forms); }
 };
 
-/// The facts of a change likewise.
+/// The facts of some commits, beside their rows.
 struct FactColumns {
-    explicit FactColumns(Change const& change) {
-        for (Ancestry const& facts : change.ancestry) {
-            commits.push_back(BytesOfId(facts.commit));
-            parents.push_back(BytesOfId(facts.parent));
-            trees.push_back(BytesOfId(facts.tree));
-            for (ContainedCommit const& other : facts.contains) {
-                containing.push_back(BytesOfId(facts.commit));
-                hows.push_back(static_cast<std::int16_t>(other.how));
-                contained.push_back(BytesOfId(other.id));
-            }
-        }
+    std::vector<std::optional<ByteView>> parents;
+    std::vector<std::optional<ByteView>> trees;
+
+    explicit FactColumns(std::size_t count) {
+        parents.reserve(count);
+        trees.reserve(count);
     }
 
-    std::vector<ByteView> commits;
-    std::vector<ByteView> parents;
-    std::vector<ByteView> trees;
-    std::vector<ByteView> containing;
-    std::vector<std::int16_t> hows;
-    std::vector<ByteView> contained;
+    /// @param facts null for what has none
+    void Add(Ancestry const* facts) {
+        parents.push_back(facts == nullptr ? std::nullopt : std::optional(BytesOfId(facts->parent)));
+        trees.push_back(facts == nullptr ? std::nullopt : std::optional(BytesOfId(facts->tree)));
+    }
+    void AddTo(Parameters& parameters) const { parameters.With(parents).With(trees); }
 };
 
 /// What a change uses without storing it anew, which must not be removed before the end of the transaction.
@@ -132,52 +168,70 @@ public:
     }
 
 private:
-    /// Whether it is a little that is new, on top of one branch, and uses nothing but what that branch keeps.
+    /// Whether it is one commit with a little that is new, on top of one branch, and uses nothing but what that branch keeps.
     [[nodiscard]] bool IsShort() const {
         if (change_.branches.size() != 1 || !change_.records.empty() || !uses_.used.empty() || !preparation_.AreNew() ||
-            !facts_.contained.empty() || preparation_.Items().size() > mostItemsOfShort)
+            facts_.ContainAny() || preparation_.Items().size() > mostItemsOfShort)
             return false;
         std::vector<Id> inherited = change_.inherited;
         SortUnique(inherited);
         if (!preparation_.Bases(inherited).empty())
             return false;
         BranchMove const& move = change_.branches.front();
-        std::vector<Id> commits;
-        commits.reserve(change_.ancestry.size());
-        for (Ancestry const& facts : change_.ancestry)
-            commits.push_back(facts.commit);
-        SortUnique(commits);
-        bool const areDistinct = commits.size() == change_.ancestry.size();
-        return !move.expected.IsEmpty() && areDistinct && Contains(commits, move.head);
+        return !move.expected.IsEmpty() && facts_.All().size() == 1 && facts_.Find(move.head) != nullptr &&
+               AreOfItems();
+    }
+
+    /// Whether all facts are of commits that are brought.
+    [[nodiscard]] bool AreOfItems() const {
+        auto const& items = preparation_.Items();
+        return facts_.All().size() ==
+               static_cast<std::size_t>(std::count_if(items.begin(), items.end(), [this](Prepared const& one) {
+                   return facts_.Find(one.item->id) != nullptr;
+               }));
     }
 
     void StoreInOneStatement(Token const& token) {
         isShort_ = true;
         BranchMove const& move = change_.branches.front();
         ObjectColumns columns(preparation_.Items().size());
-        for (Prepared const& one : preparation_.Items())
+        std::vector<std::int64_t> kinds;
+        kinds.reserve(preparation_.Items().size());
+        for (Prepared const& one : preparation_.Items()) {
             columns.Add(one);
-        // Who comes again finds it with the new head's facts, which are stored by nobody else.
-        std::vector<ByteView> tokens;
-        for (Ancestry const& facts : change_.ancestry)
-            tokens.push_back(facts.commit == move.head ? ByteView(token) : ByteView());
+            kinds.push_back(
+                static_cast<std::int64_t>(one.item->size << typeBits | static_cast<unsigned>(one.item->type)));
+        }
+        Ancestry const& facts = *facts_.Find(move.head);
         Parameters parameters;
         parameters.With(BytesOfName(move.name)).With(move.expected).With(move.head);
-        columns.AddTo(parameters);
-        parameters.With(facts_.commits).With(facts_.parents).With(facts_.trees).With(tokens);
-        // A branch that was elsewhere in between keeps what its head reaches, stored in whatever way.
-        std::vector<ByteView> ids;
-        std::vector<ByteView> bases;
-        ids.reserve(preparation_.Links().size());
-        bases.reserve(preparation_.Links().size());
-        for (auto const& [id, base] : preparation_.Links()) {
-            ids.push_back(BytesOfId(id));
-            bases.push_back(BytesOfId(base));
-        }
-        if (ids.empty())
+        parameters.With(columns.ids).With(kinds).With(columns.bases).With(columns.forms);
+        // Who comes again finds the token with the new head, which is stored by nobody else.
+        parameters.With(facts.parent).With(facts.tree).With(ByteView(token));
+        AddIfBasesStand(parameters);
+    }
+
+    /// A branch that was elsewhere in between keeps what its head reaches, stored in whatever way, and so perhaps not what was a
+    /// base several steps away.
+    void AddIfBasesStand(Parameters& parameters) {
+        auto const& bases = preparation_.FarBases();
+        if (bases.empty()) {
             trip_.Add(Statement::MoveBranchToNew, parameters);
-        else
-            trip_.Add(Statement::MoveBranchToNewIfBasesStand, parameters.With(ids).With(bases));
+            return;
+        }
+        if (bases.size() == 1) {
+            auto const& [id, base] = *bases.begin();
+            trip_.Add(Statement::MoveBranchToNewIfBaseStands, parameters.With(id).With(base));
+            return;
+        }
+        std::vector<Id> ids;
+        std::vector<Id> theirBases;
+        for (auto const& [id, base] : bases) {
+            ids.push_back(id);
+            theirBases.push_back(base);
+        }
+        trip_.Add(Statement::MoveBranchToNewIfBasesStand,
+                  parameters.With(ids).With(theirBases).With(std::uint64_t{ids.size()}));
     }
 
     void StoreInOrder(Token const& token) {
@@ -188,7 +242,7 @@ private:
         }
         AddObjects();
         CheckObjects();
-        AddAncestry();
+        AddFacts();
         ChangeRecords();
         MoveBranches();
         trip_.Add(Statement::Commit);
@@ -201,12 +255,24 @@ private:
         std::vector<Prepared> const& items = preparation_.Items();
         for (std::size_t next = 0; next < items.size();) {
             ObjectColumns columns(items.size() - next);
-            for (; next < items.size() && columns.size < statementSize; ++next)
+            FactColumns facts(items.size() - next);
+            for (; next < items.size() && columns.size < statementSize; ++next) {
                 columns.Add(items[next]);
+                facts.Add(facts_.Find(items[next].item->id));
+            }
             Parameters parameters;
             columns.AddTo(parameters);
+            facts.AddTo(parameters);
             trip_.Add(preparation_.AreNew() ? Statement::AddNewObjects : Statement::AddObjects, parameters);
         }
+        if (preparation_.ForFacts().empty())
+            return;
+        ObjectColumns columns(preparation_.ForFacts().size());
+        for (Prepared const& one : preparation_.ForFacts())
+            columns.Add(one);
+        Parameters parameters;
+        columns.AddTo(parameters);
+        trip_.Add(Statement::AddToFacts, parameters);
     }
 
     /// Holds what is used and what is a base until the end of the transaction, so that nobody removes it. Marks are
@@ -221,13 +287,27 @@ private:
             trip_.Add(Statement::DeleteMarks, Parameters().With(uses_.used));
     }
 
-    void AddAncestry() {
-        if (!facts_.commits.empty())
-            trip_.Add(Statement::AddAncestry,
-                      Parameters().With(facts_.commits).With(facts_.parents).With(facts_.trees));
-        if (!facts_.contained.empty())
-            trip_.Add(Statement::AddContained,
-                      Parameters().With(facts_.containing).With(facts_.hows).With(facts_.contained));
+    void AddFacts() {
+        if (!facts_.All().empty() && !(preparation_.AreNew() && AreOfItems())) {
+            // The server may have the commits, with their facts or without.
+            std::vector<ByteView> commits;
+            FactColumns columns(facts_.All().size());
+            commits.reserve(facts_.All().size());
+            for (Ancestry const* const facts : facts_.All()) {
+                commits.push_back(BytesOfId(facts->commit));
+                columns.Add(facts);
+            }
+            Parameters parameters;
+            parameters.With(commits);
+            columns.AddTo(parameters);
+            trip_.Add(Statement::AddFacts, parameters);
+            trip_.Add(Statement::SetFacts, parameters);
+        }
+        if (facts_.ContainAny()) {
+            Parameters parameters;
+            facts_.AddContainedTo(parameters);
+            trip_.Add(Statement::AddContained, parameters);
+        }
     }
 
     void ChangeRecords() {
@@ -270,7 +350,7 @@ private:
     Preparation const& preparation_;
     Change const& change_;
     Uses uses_;
-    FactColumns facts_;
+    Facts facts_;
     bool isShort_ = false;
     bool hasToken_ = false;
     std::size_t tokenPosition_ = 0;

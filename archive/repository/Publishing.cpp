@@ -64,7 +64,7 @@ bool Publishing::AreOnExpectedHeads(std::span<cow_ptr<Commit> const> commits) co
     return std::all_of(commits.begin(), commits.end(), [&](cow_ptr<Commit> const& commit) {
         Id const parent = commit->GetParentId();
         met.insert(commit->GetId());
-        return expected_.contains(parent) || met.contains(parent) || inChange_.contains(parent);
+        return expected_.contains(parent) || met.contains(parent) || IsInChange(parent);
     });
 }
 
@@ -110,7 +110,7 @@ bool Publishing::StoreFile(NewDirectory::File const& file) {
 bool Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content) {
     if (!archive_.StoreContent(file.id, content, file.earlier, progress_))
         return false;
-    stored_.insert(file.id);
+    stored_.emplace(file.id, byItself);
     ++storedCount_;
     return true;
 }
@@ -158,23 +158,27 @@ void Publishing::StoreCommit(Commit const& commit) {
     Add({id, ObjectType::Commit, data, {}});
 }
 
+bool Publishing::IsInChange(Id const& id) const {
+    auto const found = stored_.find(id);
+    return found != stored_.end() && found->second == changeNumber_;
+}
+
 void Publishing::RelyOn(Id const& id) {
-    if (!inChange_.contains(id) && relied_.insert(id).second)
+    if (!IsInChange(id) && relied_.insert(id).second)
         (expected_.contains(id) ? change_.inherited : change_.relied).push_back(id);
 }
 
 void Publishing::RelyOnEarlier(Id const& id) {
     if (!isOnExpected_)
         RelyOn(id);
-    else if (!inChange_.contains(id) && relied_.insert(id).second)
+    else if (!IsInChange(id) && relied_.insert(id).second)
         change_.inherited.push_back(id);
 }
 
 void Publishing::Add(NewObject object) {
     size_ += object.data.GetSize();
     ++storedCount_;
-    inChange_.insert(object.id);
-    stored_.insert(object.id);
+    stored_.insert_or_assign(object.id, changeNumber_);
     change_.objects.push_back(std::move(object));
     if (size_ >= changeSize)
         Flush();
@@ -190,7 +194,7 @@ void Publishing::Flush() {
     isOnExpected_ = false;
     earlierFiles_.clear();
     size_ = 0;
-    inChange_.clear();
+    ++changeNumber_;
     relied_.clear();
 }
 

@@ -41,6 +41,7 @@ private:
     void RelyOn(Id const& id);
     /// The same for an earlier version, which an expected head may keep.
     void RelyOnEarlier(Id const& id);
+    [[nodiscard]] bool IsInChange(Id const& id) const;
     void Add(NewObject object);
     void Flush();
 
@@ -55,9 +56,10 @@ private:
     Change change_;
     std::uint64_t size_ = 0;
     std::uint64_t storedCount_ = 0;
-    /// What the current change stores, and what all changes have stored.
-    std::unordered_set<Id> inChange_;
-    std::unordered_set<Id> stored_;
+    /// What has been stored, and with which change.
+    std::unordered_map<Id, std::uint64_t> stored_;
+    static constexpr std::uint64_t byItself = 0;
+    std::uint64_t changeNumber_ = byItself + 1;
     std::unordered_set<Id> relied_;
     /// Whether everything stored so far is on top of the expected heads, and in this change.
     bool isOnExpected_ = true;

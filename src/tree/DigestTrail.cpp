@@ -59,6 +59,11 @@ private:
 
 } // namespace
 
+void DigestTrail::NoteCopy(Node const* top) {
+    if (IsEmpty() && top != nullptr && top->Total().packedSize >= largeForEdits)
+        static_cast<void>(trail_.GetOrMake([] { return Trail(); }));
+}
+
 void DigestTrail::NoteChange(Node const& top, KivStringViewT<char16_t> name) noexcept {
     if (IsEmpty())
         return;
@@ -75,7 +80,8 @@ void DigestTrail::NoteChange(Node const& top, KivStringViewT<char16_t> name) noe
 Id DigestTrail::ComputeId(Node const& top) const {
     const std::uint64_t size = top.Total().packedSize;
     IdDigest digest("tree", size);
-    if (!IsFor(size)) {
+    Trail const* const trail = trail_.Get();
+    if (!IsFor(size) && (trail == nullptr || size < largeForEdits)) {
         PackEntries(top, [&digest](auto const&... piece) { digest.Feed(piece...); });
         return digest.Finish();
     }
@@ -86,7 +92,6 @@ Id DigestTrail::ComputeId(Node const& top) const {
     passed.states.reserve(static_cast<std::size_t>((headerSize + size) / step));
 
     std::uint64_t offset = 0;
-    Trail const* const trail = trail_.Get();
     if (trail != nullptr && trail->handed && trail->handed->packedSize == size) {
         const std::uint64_t same = std::min(trail->firstChanged, size - 1);
         auto const& states = trail->handed->states;

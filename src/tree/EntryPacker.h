@@ -12,11 +12,16 @@
 namespace KivVcs::detail {
 
 /// Trees with at least this many objects keep the packed form of each leaf with the leaf, so that a version that changes one
-/// entry packs one leaf anew; for smaller ones that would cost more memory than the entries themselves.
-inline constexpr std::uint64_t minObjectsWithKeptRuns = 256;
+/// entry packs one leaf anew; for smaller ones that would cost more memory than the time is worth.
+inline constexpr std::uint64_t minObjectsWithKeptRuns = 128;
+/// From this many objects on, the packed form of a tree shares them, too; a smaller one is sooner copied.
+inline constexpr std::uint64_t minObjectsWithSharedRuns = 256;
 
 inline bool KeepsRuns(Node const& top) noexcept {
     return top.Total().Objects() >= minObjectsWithKeptRuns;
+}
+inline bool SharesRuns(Node const& top) noexcept {
+    return top.Total().Objects() >= minObjectsWithSharedRuns;
 }
 
 /// Mode and type of our own objects, with the blanks after them. The copy of either takes as many bytes, the shorter one's

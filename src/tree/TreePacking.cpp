@@ -134,7 +134,7 @@ Buffer const& Tree::GetData() const {
         if (top == nullptr)
             return Buffer();
         // How much hosts' objects show is not known before they were asked.
-        if (!KeepsRuns(*top) && top->Total().hosts == 0)
+        if (!SharesRuns(*top) && top->Total().hosts == 0)
             return PackedInOnePiece(*top);
         Buffer data;
         PackEntries(*top, AppendTo{data});

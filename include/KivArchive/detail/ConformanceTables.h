@@ -118,6 +118,19 @@ inline void CheckAncestry(Trial& trial, IArchive& archive) {
                      archive.ListAncestry(archive.ListAncestry({}, 30).back().commit, 30).size() == 22 &&
                      archive.GetStatistics().ancestries == 52,
                  "all facts are listed");
+
+    NewCommit const late = Commit(tree.id, {}, "late");
+    Store(archive, {tree, Commit(tree.id, {}, "0").object, late.object});
+    trial.Expect(archive.ReadAncestry({&late.object.id, 1}, Follow::Parents, 0).empty() &&
+                     archive.ListAncestry({}, 100).size() == 52 && archive.FindMissing({ids.data(), 2}).size() == 1 &&
+                     ReadAll(archive, {ids[0]}).size() == 1,
+                 "facts come before their commit, or not at all");
+    change = {};
+    change.ancestry = {late.facts};
+    archive.Apply(change);
+    trial.Expect(archive.ReadAncestry({&late.object.id, 1}, Follow::Parents, 0).size() == 1 &&
+                     archive.ListAncestry({}, 100).size() == 53 && ReadAll(archive, {late.object.id}).size() == 1,
+                 "or behind it");
 }
 
 inline void CheckMarks(Trial& trial, IArchive& archive) {

@@ -10,25 +10,30 @@ namespace KivVcs::detail {
 
 class Node;
 
-/// What a large tree keeps of the computation of its identifier: the states of the digest on the way through its packed
-/// form. A copy takes them over, and goes on from the last one before the first entry that an edit has changed, as long as
-/// the form keeps its size. As large as a pointer, which is null for trees that have never been large.
+/// What a large tree keeps of the computation of its identifier, and a smaller one that was made by an edit of another: the
+/// states of the digest on the way through its packed form. A copy takes them over, and goes on from the last one before the
+/// first entry that an edit has changed, as long as the form keeps its size. As large as a pointer, which is null for trees that
+/// keep nothing.
 ///
 /// Threads: the `const` operations may run concurrently, and copies be made. Everything else needs exclusive use.
 class DigestTrail {
 public:
+    /// Says that the tree whose entries are below @p top is a copy that is going to be edited.
+    void NoteCopy(Node const* top);
     /// Says that the entry @p name below @p top shows another object, in as many bytes.
     void NoteChange(Node const& top, KivStringViewT<char16_t> name) noexcept;
     void Reset() noexcept { trail_.Reset(); }
     [[nodiscard]] bool IsEmpty() const noexcept { return trail_.Get() == nullptr; }
 
-    /// Whether a packed form of that size is large enough for it.
-    [[nodiscard]] static bool IsFor(std::uint64_t size) noexcept { return size >= 2 * smallestStep; }
+    /// Whether a packed form of that size is large enough for it, whether or not its tree was made by an edit.
+    [[nodiscard]] static bool IsFor(std::uint64_t size) noexcept { return size >= large; }
     /// The identifier of a tree of the entries below @p top, none of which show hosts' objects.
     [[nodiscard]] Id ComputeId(Node const& top) const;
 
 private:
-    static constexpr std::uint64_t smallestStep = 65536;
+    static constexpr std::uint64_t large = 131072;
+    static constexpr std::uint64_t largeForEdits = 4096;
+    static constexpr std::uint64_t smallestStep = 1024;
 
     /// The states of one form at every step.
     struct Checkpoints final : KivUtils::reference_counted {

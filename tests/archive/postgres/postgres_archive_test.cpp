@@ -57,7 +57,8 @@ TEST(PostgresArchive, TakesFewRoundTrips) {
         EXPECT_TRUE(repository.Publish().published);
         EXPECT_LE(trips(), 12 + size / (4 * largestWholeContent)) << "10,000 objects";
         for (int i = 0; i < 25; ++i) {
-            CommitFile(repository, "d1/sub/f1", std::to_string(i));
+            // The file is stored as a difference, as its directory is.
+            CommitFile(repository, "d1/sub/f1", SomeNoise(1, 2000) + std::to_string(i));
             trips();
             EXPECT_TRUE(repository.Publish().published);
             EXPECT_LE(trips(), i == 0 ? 6U : 1U) << "one edit";
@@ -164,30 +165,33 @@ TEST(PostgresArchive, TakesNoNoticeOfRowsThatHaveBeenStoredAnew) {
     options.schema = theServer->LastSchema();
     PostgresArchive other(theServer->Address(), options);
     Conformance::Store(*archive, {Object(ObjectType::Blob, "")});
-    TextVersion const first(0, nullptr);
-    TextVersion const second(1, &first);
-    TextVersion const third(2, &second);
-    TextVersion const elsewhere(3, nullptr);
-    ASSERT_TRUE(archive->Apply(first.After(nullptr)).applied);
-    ASSERT_TRUE(archive->Apply(second.After(&first)).applied);
+    std::vector<TextVersion> versions;
+    versions.reserve(4);
+    for (std::uint32_t number = 0; number < 4; ++number) {
+        TextVersion const* const before = versions.empty() ? nullptr : &versions.back();
+        TextVersion const& version = versions.emplace_back(number, before);
+        ASSERT_TRUE(archive->Apply(version.After(before)).applied);
+    }
+    TextVersion const& last = versions.back();
+    TextVersion const next(4, &last);
+    TextVersion const elsewhere(5, nullptr);
 
-    Id const head = second.commit.object.id;
     Change away = elsewhere.After(nullptr);
-    away.branches.front().expected = head;
+    away.branches.front().expected = last.commit.object.id;
     ASSERT_TRUE(other.Apply(away).applied);
-    for (int i = 0; i < 3; ++i)
+    for (int i = 0; i < 6; ++i)
         Collect(other, {std::chrono::seconds(0), {}, 1000, 1000}, nullptr);
-    std::vector<Id> const collected = second.Ids();
+    std::vector<Id> const collected = last.Ids();
     ASSERT_EQ(other.FindMissing(collected).size(), 3U);
-    Change back = second.After(nullptr);
+    Change back = last.After(nullptr);
     back.branches.front().expected = elsewhere.commit.object.id;
     for (NewObject& object : back.objects)
         object.earlier = {};
     ASSERT_TRUE(other.Apply(back).applied);
 
-    // As the first host remembers it, the third version is a difference to the first one.
-    EXPECT_TRUE(archive->Apply(third.After(&second)).applied);
-    EXPECT_TRUE(third.IsIn(other));
+    // As the first host remembers it, the fifth version is a difference to the first one.
+    EXPECT_TRUE(archive->Apply(next.After(&last)).applied);
+    EXPECT_TRUE(next.IsIn(other));
     EXPECT_EQ(ProblemsOf(other), "");
 }
 
