@@ -28,11 +28,20 @@ std::uint64_t OffsetOfLeaf(Node const& top, KivStringViewT<char16_t> name) noexc
 /// Feeds a digest what comes after the first @p known bytes, and notes its state at every step.
 class NotingDigest {
 public:
+    /// One that notes nothing.
+    explicit NotingDigest(IdDigest& digest) noexcept : digest_(digest) {}
     NotingDigest(IdDigest& digest, std::vector<IdDigest::State>& states, std::uint64_t step,
                  std::uint64_t known) noexcept
-        : digest_(digest), states_(states), step_(step), known_(known) {}
+        : digest_(digest), states_(&states), step_(step), known_(known) {}
 
+    void FeedEntries(Node const& top, Cursor from) {
+        PackEntries(top, from, [this](auto const&... piece) { Feed(piece...); });
+    }
+
+private:
     void Feed(const void* piece, std::size_t size) {
+        if (states_ == nullptr)
+            return digest_.Feed(piece, size);
         const auto skipped = static_cast<std::size_t>(std::min<std::uint64_t>(known_, size));
         known_ -= skipped;
         size -= skipped;
@@ -41,7 +50,7 @@ public:
             digest_.Feed(data, static_cast<std::size_t>(left));
             data += left;
             size -= static_cast<std::size_t>(left);
-            states_.push_back(digest_.GetState());
+            states_->push_back(digest_.GetState());
         }
         digest_.Feed(data, size);
     }
@@ -50,23 +59,33 @@ public:
             Feed(chunk.data(), chunk.size());
     }
 
-private:
     IdDigest& digest_;
-    std::vector<IdDigest::State>& states_;
-    std::uint64_t step_;
-    std::uint64_t known_;
+    std::vector<IdDigest::State>* states_ = nullptr;
+    std::uint64_t step_ = 0;
+    std::uint64_t known_ = 0;
 };
 
 } // namespace
 
-void DigestTrail::NoteCopy(Node const* top) {
-    if (IsEmpty() && top != nullptr && top->Total().packedSize >= largeForEdits)
-        static_cast<void>(trail_.GetOrMake([] { return Trail(); }));
+DigestTrail::Trail const& DigestTrail::Begin() const {
+    return trail_.GetOrMake([] { return Trail(); });
+}
+
+void DigestTrail::TryBegin() const noexcept {
+    try {
+        Begin();
+    } catch (std::bad_alloc const&) { // NOLINT(bugprone-empty-catch)
+        // The next identifier is computed from the beginning then, as this one.
+    }
 }
 
 void DigestTrail::NoteChange(Node const& top, KivStringViewT<char16_t> name) noexcept {
-    if (IsEmpty())
+    if (IsEmpty()) {
+        // Where one entry was replaced, mostly another one will be.
+        if (top.Total().packedSize >= largeForEdits)
+            TryBegin();
         return;
+    }
     // Only the tree that is being changed has this trail.
     auto& trail = const_cast<Trail&>(*trail_.Get());
     if (Checkpoints const* const own = trail.computed.Get()) {
@@ -82,7 +101,7 @@ Id DigestTrail::ComputeId(Node const& top) const {
     IdDigest digest("tree", size);
     Trail const* const trail = trail_.Get();
     if (!IsFor(size) && (trail == nullptr || size < largeForEdits)) {
-        PackEntries(top, [&digest](auto const&... piece) { digest.Feed(piece...); });
+        NotingDigest(digest).FeedEntries(top, Cursor(&top));
         return digest.Finish();
     }
     const std::uint64_t step = StepOf(size, smallestStep);
@@ -104,10 +123,9 @@ Id DigestTrail::ComputeId(Node const& top) const {
     }
 
     const Cursor from = Cursor::AtLeafOf(top, offset);
-    NotingDigest noting(digest, passed.states, step, offset);
-    PackEntries(top, from, [&noting](auto const&... piece) { noting.Feed(piece...); });
+    NotingDigest(digest, passed.states, step, offset).FeedEntries(top, from);
     const auto take = [&passed] { return std::move(passed); };
-    static_cast<void>(trail_.GetOrMake([] { return Trail(); }).computed.GetOrMake(take));
+    static_cast<void>(Begin().computed.GetOrMake(take));
     return digest.Finish();
 }
 

@@ -114,7 +114,6 @@ std::vector<cow_ptr<Tree>> Tree::CopyWay(Components names) const {
         else if (Tree* const copy = way[level].write(); above != nullptr) {
             copy->entries_ = above->entries_;
             copy->trail_ = above->trail_;
-            copy->trail_.NoteCopy(copy->entries_.Top().get());
         }
     }
     return way;

@@ -10,7 +10,7 @@ namespace KivVcs::detail {
 
 class Node;
 
-/// What a large tree keeps of the computation of its identifier, and a smaller one that was made by an edit of another: the
+/// What a large tree keeps of the computation of its identifier, and a smaller one of which an entry has been replaced: the
 /// states of the digest on the way through its packed form. A copy takes them over, and goes on from the last one before the
 /// first entry that an edit has changed, as long as the form keeps its size. As large as a pointer, which is null for trees that
 /// keep nothing.
@@ -18,8 +18,6 @@ class Node;
 /// Threads: the `const` operations may run concurrently, and copies be made. Everything else needs exclusive use.
 class DigestTrail {
 public:
-    /// Says that the tree whose entries are below @p top is a copy that is going to be edited.
-    void NoteCopy(Node const* top);
     /// Says that the entry @p name below @p top shows another object, in as many bytes.
     void NoteChange(Node const& top, KivStringViewT<char16_t> name) noexcept;
     void Reset() noexcept { trail_.Reset(); }
@@ -61,6 +59,10 @@ private:
         std::uint64_t firstChanged = std::numeric_limits<std::uint64_t>::max();
         Published<Checkpoints> computed;
     };
+
+    /// The trail, begun if there is none.
+    Trail const& Begin() const; // NOLINT(modernize-use-nodiscard)
+    void TryBegin() const noexcept;
 
     Published<Trail> trail_;
 };
