@@ -56,7 +56,7 @@ bool TakeIdentifier(std::string_view& text, std::string_view line, Bytes& digest
 } // namespace
 
 std::optional<Bytes> CompactTree(ByteView data) {
-    // Every entry shrinks: the form is never larger than the data, and mostly smaller by a third.
+    // Every entry shrinks: the form is never larger than the data. It is mostly smaller by a third, which need not be cleared.
     constexpr std::size_t step = 4096;
     Bytes form;
     form.reserve(data.size());

@@ -64,7 +64,6 @@ public:
     void Take(Rows const& rows);
     /// A row that was read or stored before.
     void Take(Id const& id, WholeRow const& whole);
-    [[nodiscard]] bool IsTaken(Id const& id) const { return whole_.count(id) != 0; }
     /// Every row that was read.
     [[nodiscard]] std::vector<Id> Ids() const;
 

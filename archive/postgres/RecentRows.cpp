@@ -50,11 +50,16 @@ bool RecentRows::GiveAll(std::span<const Id> ids, Forms& forms) {
     for (Id const& id : ids) {
         WholeRow const* recent = Find(id);
         std::uint64_t const wanted = recent == nullptr ? 0 : GenerationOfBase(recent->version.generation + 1);
-        for (Id at = id; recent != nullptr; recent = Find(at)) {
+        for (Id at = id; recent != nullptr;) {
             forms.Take(at, *recent);
-            if (recent->version.generation <= wanted)
+            std::uint64_t const generation = recent->version.generation;
+            if (generation <= wanted)
                 break;
             at = recent->version.base;
+            recent = Find(at);
+            // What came from a damaged database may go round in circles.
+            if (recent != nullptr && recent->version.generation >= generation)
+                return false;
         }
         if (recent == nullptr)
             return false;

@@ -14,7 +14,7 @@ namespace KivArchive::Postgres {
 class RecentRows {
 public:
     void Keep(Id const& id, WholeRow row);
-    /// Gives @p forms the rows of @p ids with all that they are differences to.
+    /// Gives @p forms the rows of @p ids, and of each those on the way to what its next version is a difference to.
     /// @return false, giving some of them, if one is not here
     [[nodiscard]] bool GiveAll(std::span<const Id> ids, Forms& forms);
 

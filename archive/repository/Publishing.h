@@ -56,10 +56,11 @@ private:
     Change change_;
     std::uint64_t size_ = 0;
     std::uint64_t storedCount_ = 0;
-    /// What has been stored, and with which change.
-    std::unordered_map<Id, std::uint64_t> stored_;
+    /// What stands for a change that stores one large content only.
     static constexpr std::uint64_t byItself = 0;
+    /// The current change, and with which one everything has been stored.
     std::uint64_t changeNumber_ = byItself + 1;
+    std::unordered_map<Id, std::uint64_t> stored_;
     std::unordered_set<Id> relied_;
     /// Whether everything stored so far is on top of the expected heads, and in this change.
     bool isOnExpected_ = true;

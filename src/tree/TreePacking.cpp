@@ -138,8 +138,7 @@ Buffer const& Tree::GetData() const {
             return PackedInOnePiece(*top);
         Buffer data;
         PackEntries(*top, AppendTo{data});
-        // Runs that are kept are shared.
-        return KeepsRuns(*top) ? data : WithoutRoom(data);
+        return SharesRuns(*top) ? data : WithoutRoom(data);
     });
 }
 

@@ -23,13 +23,14 @@ public:
     void Reset() noexcept { trail_.Reset(); }
     [[nodiscard]] bool IsEmpty() const noexcept { return trail_.Get() == nullptr; }
 
-    /// Whether a packed form of that size is large enough for it, whether or not its tree was made by an edit.
+    /// Whether a packed form of that size is large enough for it although no entry has been replaced.
     [[nodiscard]] static bool IsFor(std::uint64_t size) noexcept { return size >= large; }
     /// The identifier of a tree of the entries below @p top, none of which show hosts' objects.
     [[nodiscard]] Id ComputeId(Node const& top) const;
 
 private:
     static constexpr std::uint64_t large = 131072;
+    /// Large enough where an entry has been replaced.
     static constexpr std::uint64_t largeForEdits = 4096;
     static constexpr std::uint64_t smallestStep = 1024;
 
