@@ -76,7 +76,7 @@ std::optional<Bytes> CompactTree(ByteView data) {
             return std::nullopt;
         std::size_t const size = 1 + nameSize + digestSize;
         if (form.size() - used < size)
-            form.resize(used + std::max(size, step));
+            form.resize(std::min(data.size(), used + std::max(size, step)));
         std::byte* const to = form.data() + used;
         *to = static_cast<std::byte>(isDirectory);
         std::memcpy(to + 1, rest.data(), nameSize);
@@ -117,7 +117,9 @@ Bytes ExpandTree(ByteView form, std::uint64_t size) {
 
 std::optional<Bytes> CompactCommit(ByteView data) {
     std::string_view rest = TextOf(data);
-    Bytes form(1);
+    Bytes form;
+    form.reserve(data.size());
+    form.resize(1);
     if (!TakeIdentifier(rest, treeLine, form))
         return std::nullopt;
     if (TakeIdentifier(rest, parentLine, form))

@@ -1,6 +1,7 @@
 #include "Compression.h"
 
 #include <algorithm>
+#include <array>
 #include <bit>
 #include <cstring>
 #include <new>
@@ -20,24 +21,25 @@ void CheckMemory(std::size_t code) {
         throw std::bad_alloc();
 }
 
+/// What is compared at once, as long as it is the same.
+constexpr std::array<std::size_t, 4> steps{512, 64, 8, 1};
+
 /// How many equal bytes both begin with, at most @p limit.
 std::size_t CommonBeginning(const std::byte* left, const std::byte* right, std::size_t limit) noexcept {
     std::size_t same = 0;
-    while (same + sizeof(std::uint64_t) <= limit && std::memcmp(left + same, right + same, sizeof(std::uint64_t)) == 0)
-        same += sizeof(std::uint64_t);
-    while (same < limit && left[same] == right[same])
-        ++same;
+    for (std::size_t const step : steps)
+        while (step <= limit - same && std::memcmp(left + same, right + same, step) == 0)
+            same += step;
     return same;
 }
 
 std::size_t CommonEnd(ByteView left, ByteView right, std::size_t limit) noexcept {
     std::size_t same = 0;
-    constexpr std::size_t step = sizeof(std::uint64_t);
-    while (same + step <= limit &&
-           std::memcmp(left.data() + left.size() - same - step, right.data() + right.size() - same - step, step) == 0)
-        same += step;
-    while (same < limit && left[left.size() - same - 1] == right[right.size() - same - 1])
-        ++same;
+    std::byte const* const leftEnd = left.data() + left.size();
+    std::byte const* const rightEnd = right.data() + right.size();
+    for (std::size_t const step : steps)
+        while (step <= limit - same && std::memcmp(leftEnd - same - step, rightEnd - same - step, step) == 0)
+            same += step;
     return same;
 }
 
@@ -115,7 +117,8 @@ bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept {
     return size / maximumGrowth <= bytes.size() && ZSTD_getFrameContentSize(bytes.data(), bytes.size()) == size;
 }
 
-bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit, Bytes& to) {
+bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit, std::size_t mostPlain,
+                      Bytes& to) {
     std::size_t const shorter = std::min(base.size(), form.size());
     std::size_t const begin = CommonBeginning(base.data(), form.data(), shorter);
     std::size_t const end = CommonEnd(base, form, shorter - begin);
@@ -129,8 +132,7 @@ bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std:
     Append(to, std::byte{1});
     std::size_t const head = to.size() - before;
     // Bytes that are few, or do not become fewer, are stored as they are.
-    constexpr std::size_t worthTrying = 48;
-    if (between.size() > worthTrying &&
+    if (between.size() > mostPlain &&
         compressor.Compress(between, replaced, std::min(limit > head ? limit - head : 0, between.size()), to))
         return true;
     to.back() = std::byte{0};

@@ -5,22 +5,27 @@
 
 namespace KivArchive {
 
-void MakeForm(ItemForm& made) {
+void MakePlainForm(ItemForm& made) {
     Item const& item = *made.item;
-    ByteView const data = BytesOf(item.data);
-    made.form = data;
-    if (item.type == StoredType::Tree || item.type == StoredType::Commit) {
-        auto compact = item.type == StoredType::Tree ? CompactTree(data) : CompactCommit(data);
-        made.member.isCompact = compact.has_value();
-        if (compact) {
-            made.compact = std::move(*compact);
-            made.form = made.compact;
-        }
-    }
+    made.form = BytesOf(item.data);
     made.member.type = item.type;
     made.member.size = item.size;
     made.member.formSize = made.form.size();
     made.member.encoding = Encoding::Shared;
+}
+
+void MakeForm(ItemForm& made) {
+    MakePlainForm(made);
+    Item const& item = *made.item;
+    if (item.type != StoredType::Tree && item.type != StoredType::Commit)
+        return;
+    auto compact = item.type == StoredType::Tree ? CompactTree(made.form) : CompactCommit(made.form);
+    if (!compact)
+        return;
+    made.compact = std::move(*compact);
+    made.form = made.compact;
+    made.member.isCompact = true;
+    made.member.formSize = made.form.size();
 }
 
 } // namespace KivArchive

@@ -26,7 +26,9 @@ struct ItemForm {
     ByteView form;
 };
 
-/// Makes the form of `made.item`, for a member that shares the frame of its segment.
+/// Makes the form of `made.item`, for a member that shares the frame of its segment: a compact one of trees and commits.
 void MakeForm(ItemForm& made);
+/// The same, but always the item's data.
+void MakePlainForm(ItemForm& made);
 
 } // namespace KivArchive

@@ -3,8 +3,9 @@
 /// @file
 /// The order in which an archive takes objects: each after those that it names.
 
+#include "SmallTable.h"
+
 #include <span>
-#include <unordered_set>
 #include <utility>
 #include <vector>
 
@@ -18,7 +19,7 @@ namespace KivArchive {
 /// @param visit called with each key that was entered, once all that it names has been visited
 template <class Key, class Enter, class Visit>
 void VisitNamedFirst(std::span<Key const> roots, Enter const& enter, Visit const& visit) {
-    std::unordered_set<Key> entered;
+    SmallSet<Key> entered;
     std::vector<std::pair<Key, bool>> open;
     std::vector<Key> named;
     for (Key const& root : roots) {
@@ -31,9 +32,9 @@ void VisitNamedFirst(std::span<Key const> roots, Enter const& enter, Visit const
                 continue;
             }
             named.clear();
-            if (entered.contains(key) || !enter(key, named))
+            if (entered.Contains(key) || !enter(key, named))
                 continue;
-            entered.insert(key);
+            entered.Add(key);
             open.emplace_back(key, true);
             for (Key& each : named)
                 open.emplace_back(std::move(each), false);

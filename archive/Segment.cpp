@@ -88,6 +88,31 @@ Member TakeMember(ByteReader& reader, ByteView form) {
     return member;
 }
 
+Bytes MakeSegmentOf(std::span<const Member> members, std::uint64_t ownSize, Compressor& compressor) {
+    // Some numbers for each member.
+    constexpr std::size_t headSize = 32;
+    Bytes form;
+    form.reserve(checkSize + headSize * (members.size() + 1) + static_cast<std::size_t>(ownSize));
+    form.resize(checkSize);
+    Append(form, formatOfSegments);
+    AppendNumber(form, members.size());
+    for (Member const& member : members)
+        AppendMember(form, member);
+    std::size_t const flag = form.size();
+    Append(form, std::byte{0});
+    Bytes shared;
+    for (Member const& member : members)
+        Append(member.encoding == Encoding::Shared ? shared : form, member.own);
+    // What hardly becomes smaller is stored as it is, which is faster to read.
+    if (!shared.empty() && compressor.Compress(shared, {}, shared.size() - shared.size() / 16, form))
+        form[flag] = std::byte{1};
+    else
+        Append(form, shared);
+    Id::Digest const digest = Sha256(ByteView(form).subspan(checkSize));
+    std::copy_n(std::as_bytes(std::span(digest)).begin(), checkSize, form.begin());
+    return form;
+}
+
 } // namespace
 
 Id DigestOfBytes(ByteView bytes) {
@@ -163,27 +188,13 @@ std::uint64_t SegmentBuilder::Add(Member const& member, ByteView own) {
 }
 
 Bytes SegmentBuilder::Make(Compressor& compressor) const {
-    // Some numbers for each member.
-    constexpr std::size_t headSize = 32;
-    Bytes form(checkSize);
-    form.reserve(checkSize + headSize * (members_.size() + 1) + static_cast<std::size_t>(size_));
-    Append(form, formatOfSegments);
-    AppendNumber(form, members_.size());
-    for (Member const& member : members_)
-        AppendMember(form, member);
-    std::size_t const flag = form.size();
-    Append(form, std::byte{0});
-    Bytes shared;
-    for (Member const& member : members_)
-        Append(member.encoding == Encoding::Shared ? shared : form, member.own);
-    // What hardly becomes smaller is stored as it is, which is faster to read.
-    if (!shared.empty() && compressor.Compress(shared, {}, shared.size() - shared.size() / 16, form))
-        form[flag] = std::byte{1};
-    else
-        Append(form, shared);
-    Id::Digest const digest = Sha256(ByteView(form).subspan(checkSize));
-    std::copy_n(std::as_bytes(std::span(digest)).begin(), checkSize, form.begin());
-    return form;
+    return MakeSegmentOf(members_, size_, compressor);
+}
+
+Bytes MakeSegment(Member const& member, ByteView own, Compressor& compressor) {
+    Member whole = member;
+    whole.own = own;
+    return MakeSegmentOf({&whole, 1}, own.size(), compressor);
 }
 
 Bytes ExpandForm(Member const& member, ByteView form) {

@@ -110,6 +110,9 @@ private:
     std::uint64_t size_ = 0;
 };
 
+/// Makes the form of a segment of one member. @param own as above
+[[nodiscard]] Bytes MakeSegment(Member const& member, ByteView own, Compressor& compressor);
+
 /// The digest of bytes that are no object's: of a piece of a content.
 [[nodiscard]] Id DigestOfBytes(ByteView bytes);
 

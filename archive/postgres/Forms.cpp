@@ -54,7 +54,7 @@ void Forms::Take(Rows const& rows) {
 }
 
 void Forms::Take(Id const& id, WholeRow const& whole) {
-    whole_.emplace(id, whole);
+    whole_.Add(id, whole);
 }
 
 std::vector<Id> Forms::Ids() const {
@@ -99,15 +99,15 @@ Member const& Forms::MemberOf(Id const& id) {
 }
 
 Version Forms::VersionOf(Id const& id) {
-    if (auto const whole = whole_.find(id); whole != whole_.end())
-        return whole->second.version;
+    if (WholeRow const* const whole = whole_.Find(id))
+        return whole->version;
     Member const& member = MemberOf(id);
-    return {member.type, Find(id)->base, member.generation, member.formSize};
+    return {member.type, Find(id)->base, member.generation, member.formSize, member.isCompact};
 }
 
 Form Forms::FormOf(Id const& id, Compressor& compressor) {
-    if (auto const whole = whole_.find(id); whole != whole_.end())
-        return {whole->second.form, *whole->second.form};
+    if (WholeRow const* const whole = whole_.Find(id))
+        return whole->form;
     // Down to a form that is no difference or that is known, and back up.
     std::vector<Id> steps;
     Form form;

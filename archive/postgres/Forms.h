@@ -4,6 +4,7 @@
 /// Stored forms as the server gives them, with what they are differences to.
 
 #include "Segment.h"
+#include "SmallTable.h"
 #include "postgres/Connection.h"
 
 #include <unordered_map>
@@ -35,6 +36,7 @@ struct Version {
     Id base;
     std::uint64_t generation = 0;
     std::uint64_t formSize = 0;
+    bool isCompact = false;
 };
 
 /// Of version @p generation, which is not the first: what it is a difference to. That one's number has the last digit that is
@@ -50,7 +52,7 @@ struct Version {
 /// server to say.
 struct WholeRow {
     Version version;
-    std::shared_ptr<const Bytes> form;
+    Form form;
 };
 
 /// Rows that were read together. Used by one thread at a time.
@@ -87,7 +89,7 @@ private:
 
     std::vector<Rows> answers_;
     std::unordered_map<Id, Row> rows_;
-    std::unordered_map<Id, WholeRow> whole_;
+    SmallTable<Id, WholeRow> whole_;
     std::unordered_map<Id, std::shared_ptr<const Segment>> stored_;
     std::unordered_map<Id, std::shared_ptr<const Bytes>> made_;
     std::uint64_t madeSize_ = 0;

@@ -24,16 +24,38 @@ constexpr std::uint64_t worthSharing = std::uint64_t{128} * 1024;
 /// Of what is smaller, a difference or compression saves less than a row takes beside its form.
 constexpr std::uint64_t worthMakingSmaller = 512;
 
+/// Whether a row has it as it is, if it is no difference. A log reads commits so.
+bool IsStoredPlain(Item const& item) {
+    return item.type == StoredType::Commit || item.data.GetSize() < worthMakingSmaller;
+}
+
+bool MayDiffer(Item const& item) {
+    return item.type != StoredType::Commit && item.size >= worthMakingSmaller;
+}
+
 /// Whether it is stored as a difference, if that makes it much smaller.
 bool IsToDiffer(Item const& item) {
-    return !item.earlier.IsEmpty() && item.size >= worthMakingSmaller;
+    return !item.earlier.IsEmpty() && MayDiffer(item);
+}
+
+Form CopyOf(ByteView bytes) {
+    auto const copy = std::make_shared<const Bytes>(bytes.begin(), bytes.end());
+    return {copy, *copy};
+}
+
+/// The form of what may be a base, for as long as it takes.
+Form KeptForm(Item const& item) {
+    // A file's data may be a part of more memory than it needs.
+    if (item.type != StoredType::Tree)
+        return CopyOf(BytesOf(item.data));
+    auto const data = std::make_shared<const Buffer>(item.data);
+    return {data, BytesOf(*data)};
 }
 
 void MakeDifference(Prepared& prepared, Compressor& compressor) {
-    bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
-                         prepared.item->type != StoredType::Commit;
+    bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced;
     if (isTried && AppendDifference(compressor, prepared.baseForm.bytes, prepared.form,
-                                    prepared.form.size() / worthwhile, prepared.difference)) {
+                                    prepared.form.size() / worthwhile, worthMakingSmaller, prepared.difference)) {
         prepared.member.encoding = Encoding::Difference;
         prepared.member.generation = prepared.generation;
     } else {
@@ -43,10 +65,9 @@ void MakeDifference(Prepared& prepared, Compressor& compressor) {
 }
 
 void MakeStored(Prepared& prepared, Compressor& compressor) {
-    SegmentBuilder builder;
-    builder.Add(prepared.member,
-                prepared.member.encoding == Encoding::Difference ? ByteView(prepared.difference) : prepared.form);
-    prepared.stored = builder.Make(compressor);
+    bool const isDifference = prepared.member.encoding == Encoding::Difference;
+    prepared.stored =
+        MakeSegment(prepared.member, isDifference ? ByteView(prepared.difference) : prepared.form, compressor);
 }
 
 } // namespace
@@ -69,10 +90,13 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
     }
     ForEachInParallel(prepared_.size(), workers, connection.compressor, [this](std::size_t index, Compressor&) {
         Prepared& one = prepared_[index];
-        MakeForm(one);
-        // A log reads commits as they are.
-        if (one.item->type == StoredType::Commit || one.form.size() < worthMakingSmaller)
+        if (IsStoredPlain(*one.item)) {
+            MakeForm(one);
             one.member.encoding = Encoding::Plain;
+        } else {
+            // Compact trees would hardly become smaller by compression or as differences, and take longer to make.
+            MakePlainForm(one);
+        }
     });
     if (hasEarlier)
         MakeDifferencesToRows(connection, workers);
@@ -83,7 +107,7 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
         }
     ForEachInParallel(prepared_.size(), workers, connection.compressor,
                       [this](std::size_t index, Compressor& own) { MakeStored(prepared_[index], own); });
-    numbers_.clear();
+    numbers_.Clear();
     auto const first = std::partition(prepared_.begin(), prepared_.end(),
                                       [this](Prepared const& one) { return !factsOnly_.contains(one.item->id); });
     std::move(first, prepared_.end(), std::back_inserter(forFacts_));
@@ -94,9 +118,8 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
 
 void Preparation::Select(std::vector<Item> const& items) {
     prepared_.reserve(items.size());
-    numbers_.reserve(items.size());
     for (Item const& item : items)
-        if (numbers_.emplace(item.id, prepared_.size()).second)
+        if (numbers_.Add(item.id, prepared_.size()))
             prepared_.emplace_back().item = &item;
 }
 
@@ -116,25 +139,22 @@ void Preparation::KeepRead(Compressor& compressor) {
         try {
             Version version = forms_.VersionOf(id);
             ByteView const form = forms_.FormOf(id, compressor).bytes;
-            recent_.Keep(id, {std::move(version), std::make_shared<const Bytes>(form.begin(), form.end())});
+            recent_.Keep(id, {std::move(version), CopyOf(form)});
         } catch (Malformed const&) {
             // What is damaged is no base.
             continue;
         }
 }
 
-void Preparation::KeepStored() {
+void Preparation::KeepStored() const {
     if (!areNew_)
         return;
     for (Id const& id : passed_)
         recent_.Drop(id);
-    for (Prepared& one : prepared_) {
-        if (one.item->type == StoredType::Commit || one.item->size < worthMakingSmaller)
+    for (Prepared const& one : prepared_) {
+        if (!MayDiffer(*one.item))
             continue;
-        Version version{one.item->type, one.base, one.member.generation, one.member.formSize};
-        auto form = std::make_shared<const Bytes>(one.member.isCompact ? std::move(one.compact)
-                                                                       : Bytes(one.form.begin(), one.form.end()));
-        recent_.Keep(one.item->id, {std::move(version), std::move(form)});
+        recent_.Keep(one.item->id, {VersionOf(one), KeptForm(*one.item)});
     }
 }
 
@@ -167,25 +187,24 @@ void Preparation::Ask(Connection& connection) {
         present.insert(std::move(id));
     }
     std::erase_if(prepared_, [&present](Prepared const& one) { return present.count(one.item->id) != 0; });
-    numbers_.clear();
+    numbers_.Clear();
     for (std::size_t i = 0; i < prepared_.size(); ++i)
-        numbers_.emplace(prepared_[i].item->id, i);
+        numbers_.Add(prepared_[i].item->id, i);
     areNew_ = true;
 }
 
 Prepared const* Preparation::EarlierPrepared(Prepared const& one) const {
-    auto const found = IsToDiffer(*one.item) ? numbers_.find(one.item->earlier) : numbers_.end();
-    if (found == numbers_.end() || &prepared_[found->second] >= &one)
-        return nullptr;
-    return &prepared_[found->second];
+    std::size_t const* const found = IsToDiffer(*one.item) ? numbers_.Find(one.item->earlier) : nullptr;
+    return found == nullptr || &prepared_[*found] >= &one ? nullptr : &prepared_[*found];
 }
 
 Version Preparation::VersionOf(Id const& id) {
-    auto const found = numbers_.find(id);
-    if (found == numbers_.end())
-        return forms_.VersionOf(id);
-    Prepared const& one = prepared_[found->second];
-    return {one.member.type, one.base, one.member.generation, one.member.formSize};
+    std::size_t const* const found = numbers_.Find(id);
+    return found == nullptr ? forms_.VersionOf(id) : VersionOf(prepared_[*found]);
+}
+
+Version Preparation::VersionOf(Prepared const& one) {
+    return {one.member.type, one.base, one.member.generation, one.member.formSize, one.member.isCompact};
 }
 
 void Preparation::FindBase(Prepared& one, Compressor& compressor) {
@@ -198,19 +217,20 @@ void Preparation::FindBase(Prepared& one, Compressor& compressor) {
         std::vector<Id> passed;
         while (version.generation > wanted) {
             std::uint64_t const after = version.generation;
-            if (numbers_.find(at) == numbers_.end())
+            if (!numbers_.Contains(at))
                 passed.push_back(at);
             at = version.base;
             version = VersionOf(at);
             if (version.generation >= after)
                 throw Malformed();
         }
-        if (version.type != one.item->type || version.formSize > largestDifferenced)
+        if (version.type != one.item->type || version.isCompact != one.member.isCompact ||
+            version.formSize > largestDifferenced)
             return;
-        auto const prepared = numbers_.find(at);
-        one.baseForm = prepared != numbers_.end() ? Form{std::make_shared<int>(), prepared_[prepared->second].form}
-                                                  : forms_.FormOf(at, compressor);
-        if (prepared == numbers_.end() && !passed.empty())
+        std::size_t const* const prepared = numbers_.Find(at);
+        one.baseForm = prepared != nullptr ? Form{std::make_shared<int>(), prepared_[*prepared].form}
+                                           : forms_.FormOf(at, compressor);
+        if (prepared == nullptr && !passed.empty())
             farBases_.emplace(at, version.base);
         passed_.insert(passed_.end(), passed.begin(), passed.end());
         one.base = std::move(at);
@@ -262,18 +282,19 @@ void Preparation::MakeDifferencesToRows(Connection& connection, unsigned workers
         close();
 }
 
+Prepared const* Preparation::Find(Id const& id) const {
+    auto const found =
+        std::lower_bound(prepared_.begin(), prepared_.end(), id,
+                         [](Prepared const& one, Id const& wanted) { return IsBefore(one.item->id, wanted); });
+    return found != prepared_.end() && found->item->id == id ? &*found : nullptr;
+}
+
 std::vector<Id> Preparation::Bases(std::vector<Id> const& inherited) const {
-    auto const findOwn = [this](Id const& id) -> Prepared const* {
-        auto const found =
-            std::lower_bound(prepared_.begin(), prepared_.end(), id,
-                             [](Prepared const& one, Id const& wanted) { return IsBefore(one.item->id, wanted); });
-        return found != prepared_.end() && found->item->id == id ? &*found : nullptr;
-    };
     // What an earlier version is a difference to stays for as long as that does.
     auto const isInherited = [&](Prepared const& one) {
         Id const* earlier = &one.item->earlier;
         for (std::size_t steps = 0; steps < prepared_.size() && !earlier->IsEmpty(); ++steps) {
-            Prepared const* const own = findOwn(*earlier);
+            Prepared const* const own = Find(*earlier);
             if (own == nullptr)
                 break;
             earlier = &own->item->earlier;
@@ -282,7 +303,7 @@ std::vector<Id> Preparation::Bases(std::vector<Id> const& inherited) const {
     };
     std::vector<Id> bases;
     for (Prepared const& one : prepared_)
-        if (!one.base.IsEmpty() && findOwn(one.base) == nullptr && (inherited.empty() || !isInherited(one)))
+        if (!one.base.IsEmpty() && Find(one.base) == nullptr && (inherited.empty() || !isInherited(one)))
             bases.push_back(one.base);
     SortUnique(bases);
     return bases;

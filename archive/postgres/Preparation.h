@@ -53,6 +53,8 @@ public:
 
     /// What is to be stored, in ascending order of the identifiers.
     [[nodiscard]] std::vector<Prepared> const& Items() const noexcept { return prepared_; }
+    /// One of `Items`; null if it is none.
+    [[nodiscard]] Prepared const* Find(Id const& id) const;
     /// Whether the server has none of `Items`: it was asked, or they are taken for new unasked.
     [[nodiscard]] bool AreNew() const noexcept { return areNew_; }
     /// The items that the server has, and those of them that are no objects there.
@@ -66,8 +68,8 @@ public:
     /// Rows that items are differences to but that are not their earlier versions, and what these rows are differences to
     /// themselves, as they were when they were read or stored.
     [[nodiscard]] std::unordered_map<Id, Id> const& FarBases() const noexcept { return farBases_; }
-    /// Keeps what has been stored, if it was new, and takes the forms of the items for that.
-    void KeepStored();
+    /// Keeps what has been stored, if it was new.
+    void KeepStored() const;
 
 private:
     void Select(std::vector<Item> const& items);
@@ -84,10 +86,11 @@ private:
     void FindBase(Prepared& one, Compressor& compressor);
     /// Of an item or of a row that was read. @throws Malformed
     [[nodiscard]] Version VersionOf(Id const& id);
+    [[nodiscard]] static Version VersionOf(Prepared const& one);
 
     RecentRows& recent_;
     std::vector<Prepared> prepared_;
-    std::unordered_map<Id, std::size_t> numbers_;
+    SmallTable<Id, std::size_t> numbers_;
     std::vector<Id> present_;
     std::vector<Id> removed_;
     std::unordered_set<Id> factsOnly_;

@@ -14,10 +14,10 @@ constexpr std::uint64_t rowSize = 256;
 } // namespace
 
 void RecentRows::Keep(Id const& id, WholeRow row) {
-    if (row.form->size() > largestRow)
+    if (row.form.bytes.size() > largestRow)
         return;
     std::scoped_lock const lock(mutex_);
-    std::uint64_t const size = row.form->size() + rowSize;
+    std::uint64_t const size = row.form.bytes.size() + rowSize;
     if (size_ + size > maximumBytes) {
         before_ = std::exchange(current_, {});
         size_ = 0;
@@ -32,14 +32,14 @@ WholeRow const* RecentRows::Find(Id const& id) {
     auto const found = before_.find(id);
     if (found == before_.end())
         return nullptr;
-    size_ += found->second.form->size() + rowSize;
+    size_ += found->second.form.bytes.size() + rowSize;
     return &current_.insert_or_assign(id, found->second).first->second;
 }
 
 void RecentRows::Drop(Id const& id) {
     std::scoped_lock const lock(mutex_);
     if (auto const found = current_.find(id); found != current_.end()) {
-        size_ -= found->second.form->size() + rowSize;
+        size_ -= found->second.form.bytes.size() + rowSize;
         current_.erase(found);
     }
     before_.erase(id);

@@ -106,37 +106,22 @@ struct FactColumns {
     void AddTo(Parameters& parameters) const { parameters.With(parents).With(trees); }
 };
 
-/// What a change uses without storing it anew, which must not be removed before the end of the transaction.
-struct Uses {
-    Uses(Preparation const& preparation, Change const& change) : used(change.relied) {
-        for (BranchMove const& move : change.branches)
-            if (!move.head.IsEmpty())
-                used.push_back(move.head);
-        used.insert(used.end(), preparation.Present().begin(), preparation.Present().end());
-        std::vector<Id> items;
+/// What a change uses without storing it anew, which must not be removed before the end of the transaction; sorted.
+std::vector<Id> UsedBy(Change const& change, Preparation const& preparation) {
+    std::vector<Id> used = change.relied;
+    for (BranchMove const& move : change.branches)
+        if (!move.head.IsEmpty())
+            used.push_back(move.head);
+    used.insert(used.end(), preparation.Present().begin(), preparation.Present().end());
+    if (preparation.AreNew())
+        std::erase_if(used, [&preparation](Id const& id) { return preparation.Find(id) != nullptr; });
+    else
+        // Others may have stored some, or somebody may have removed them.
         for (Prepared const& one : preparation.Items())
-            items.push_back(one.item->id);
-        if (preparation.AreNew()) {
-            SortUnique(items);
-            std::erase_if(used, [&items](Id const& id) { return Contains(items, id); });
-        } else {
-            // Others may have stored some, or somebody may have removed them.
-            used.insert(used.end(), items.begin(), items.end());
-        }
-        SortUnique(used);
-        bases = preparation.Bases({});
-        held = used;
-        held.insert(held.end(), bases.begin(), bases.end());
-        SortUnique(held);
-        // Bases need not be objects, but for those that are used as well.
-        std::erase_if(bases, [this](Id const& id) { return Contains(used, id); });
-    }
-
-    std::vector<Id> used;
-    /// Used as bases only.
-    std::vector<Id> bases;
-    std::vector<Id> held;
-};
+            used.push_back(one.item->id);
+    SortUnique(used);
+    return used;
+}
 
 /// The transaction that stores a change, in one round trip.
 class Storing {
@@ -144,7 +129,8 @@ public:
     /// @param mayBeShort whether new objects on top of a branch may be taken for what nobody else knows
     Storing(Connection& connection, Preparation const& preparation, Change const& change, Token const& token,
             bool mayBeShort)
-        : trip_(connection), preparation_(preparation), change_(change), uses_(preparation, change), facts_(change) {
+        : trip_(connection), preparation_(preparation), change_(change), used_(UsedBy(change, preparation)),
+          facts_(change) {
         if (mayBeShort && IsShort())
             StoreInOneStatement(token);
         else
@@ -170,7 +156,7 @@ public:
 private:
     /// Whether it is one commit with a little that is new, on top of one branch, and uses nothing but what that branch keeps.
     [[nodiscard]] bool IsShort() const {
-        if (change_.branches.size() != 1 || !change_.records.empty() || !uses_.used.empty() || !preparation_.AreNew() ||
+        if (change_.branches.size() != 1 || !change_.records.empty() || !used_.empty() || !preparation_.AreNew() ||
             facts_.ContainAny() || preparation_.Items().size() > mostItemsOfShort)
             return false;
         std::vector<Id> inherited = change_.inherited;
@@ -280,11 +266,16 @@ private:
     void CheckObjects() {
         if (!preparation_.Removed().empty())
             trip_.Add(Statement::BringBack, Parameters().With(preparation_.Removed()));
-        if (!uses_.held.empty())
-            trip_.Add(Statement::CheckUsed,
-                      Parameters().With(uses_.held).With(std::uint64_t{uses_.held.size()}).With(uses_.bases));
-        if (!uses_.used.empty())
-            trip_.Add(Statement::DeleteMarks, Parameters().With(uses_.used));
+        std::vector<Id> bases = preparation_.Bases({});
+        std::vector<Id> held = used_;
+        held.insert(held.end(), bases.begin(), bases.end());
+        SortUnique(held);
+        // Bases need not be objects, but for those that are used as well.
+        std::erase_if(bases, [this](Id const& id) { return Contains(used_, id); });
+        if (!held.empty())
+            trip_.Add(Statement::CheckUsed, Parameters().With(held).With(std::uint64_t{held.size()}).With(bases));
+        if (!used_.empty())
+            trip_.Add(Statement::DeleteMarks, Parameters().With(used_));
     }
 
     void AddFacts() {
@@ -349,7 +340,7 @@ private:
     RoundTrip trip_;
     Preparation const& preparation_;
     Change const& change_;
-    Uses uses_;
+    std::vector<Id> used_;
     Facts facts_;
     bool isShort_ = false;
     bool hasToken_ = false;
@@ -437,7 +428,6 @@ std::vector<Id> NeededBy(Change const& change, std::vector<Item> const& items) {
 
 ChangeOutcome Store::Apply(std::vector<Item> const& items, Change const& change) {
     Token const token = MakeToken();
-    std::vector<Id> const needed = NeededBy(change, items);
     bool looksForPresent = false;
     Attempts attempts(options_, false);
     for (;;) {
@@ -447,7 +437,7 @@ ChangeOutcome Store::Apply(std::vector<Item> const& items, Change const& change)
                 preparation.KeepStored();
                 return ChangeOutcome{true, {}, {}};
             }
-            FoundReason reason = FindReason(connection, change, needed, token, Shown());
+            FoundReason reason = FindReason(connection, change, NeededBy(change, items), token, Shown());
             if (reason.isStored || !reason.outcome.applied)
                 return std::move(reason.outcome);
             // Others have stored or removed the same meanwhile.

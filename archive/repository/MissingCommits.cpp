@@ -3,6 +3,8 @@
 #include "NamedFirst.h"
 #include "repository/Unreadable.h"
 
+#include <unordered_set>
+
 namespace KivArchive {
 
 namespace {
@@ -24,7 +26,7 @@ std::vector<cow_ptr<Commit>> MissingCommits::LineToAskFor(cow_ptr<Commit> commit
     std::vector<cow_ptr<Commit>> line;
     for (; commit && line.size() < maximumAskedOfLine; commit = commit->GetHeldParent()) {
         Id const id = commit->GetId();
-        if (asked_.contains(id) || !MustAskFor(id))
+        if (asked_.Contains(id) || !MustAskFor(id))
             break;
         line.push_back(commit);
     }
@@ -38,11 +40,12 @@ void MissingCommits::Discover(std::vector<cow_ptr<Commit>> open) {
         for (auto const& commit : open) {
             lines.push_back(LineToAskFor(commit));
             for (auto const& asked : lines.back())
-                if (asked_.insert(asked->GetId()).second)
+                if (asked_.Add(asked->GetId()))
                     ids.push_back(asked->GetId());
         }
         open.clear();
-        std::vector<Id> const found = ids.size() <= maximumUnasked && !asksForAll_ ? ids : archive_.FindMissing(ids);
+        bool const areUnasked = ids.size() <= maximumUnasked && !asksForAll_;
+        std::vector<Id> const found = areUnasked ? std::vector<Id>() : archive_.FindMissing(ids);
         std::unordered_set<Id> const missing(found.begin(), found.end());
         std::vector<Id> unheld;
         for (auto const& line : lines) {
@@ -50,10 +53,10 @@ void MissingCommits::Discover(std::vector<cow_ptr<Commit>> open) {
             for (auto const& commit : line) {
                 Id const id = commit->GetId();
                 // A commit that is there has all that it names.
-                isWhollyMissing = missing.contains(id);
+                isWhollyMissing = areUnasked || missing.contains(id);
                 if (!isWhollyMissing)
                     break;
-                missing_.emplace(id, commit);
+                missing_.Add(id, commit);
                 for (auto const& merged : facts_.MergedBy(id))
                     open.push_back(merged);
             }
@@ -79,21 +82,25 @@ void MissingCommits::CheckUnheld(std::vector<Id> const& parents) const {
 std::vector<cow_ptr<Commit>> MissingCommits::InOrder(std::vector<cow_ptr<Commit>> const& heads) const {
     std::vector<Id> roots;
     roots.reserve(heads.size());
-    for (auto const& head : heads)
+    for (auto const& head : heads) {
         roots.push_back(head->GetId());
+        // The others are found from heads.
+        if (missing_.Count() == 1 && missing_.Contains(roots.back()))
+            return {head};
+    }
     std::vector<cow_ptr<Commit>> ordered;
     VisitNamedFirst<Id>(
         roots,
         [this](Id const& id, std::vector<Id>& named) {
-            auto const found = missing_.find(id);
-            if (found == missing_.end())
+            cow_ptr<Commit> const* const found = missing_.Find(id);
+            if (found == nullptr)
                 return false;
             for (auto const& merged : facts_.MergedBy(id))
                 named.push_back(merged->GetId());
-            named.push_back(found->second->GetParentId());
+            named.push_back((*found)->GetParentId());
             return true;
         },
-        [&](Id const& id) { ordered.push_back(missing_.at(id)); });
+        [&](Id const& id) { ordered.push_back(*missing_.Find(id)); });
     return ordered;
 }
 

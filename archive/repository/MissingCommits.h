@@ -3,10 +3,9 @@
 /// @file
 /// Which commits publishing has to store.
 
+#include "SmallTable.h"
 #include "repository/ArchivedStorage.h"
 #include "repository/LocalFacts.h"
-
-#include <unordered_set>
 
 namespace KivArchive {
 
@@ -32,8 +31,8 @@ private:
     LocalFacts const& facts_;
     IArchive& archive_;
     bool asksForAll_;
-    std::unordered_map<Id, cow_ptr<Commit>> missing_;
-    std::unordered_set<Id> asked_;
+    SmallTable<Id, cow_ptr<Commit>> missing_;
+    SmallSet<Id> asked_;
 };
 
 } // namespace KivArchive

@@ -7,6 +7,7 @@ namespace KivArchive {
 namespace {
 
 constexpr std::size_t maximumUnasked = 16;
+constexpr std::size_t usualDirectories = 4;
 constexpr std::uint64_t largestUnasked = std::uint64_t{64} * 1024;
 
 /// The null identifier for null.
@@ -32,13 +33,14 @@ void MissingTrees::Add(cow_ptr<Tree> root, cow_ptr<Tree> earlier) {
 
 void MissingTrees::Find(bool isNew) {
     if (isNew && AreFewAndSmall()) {
-        missing_.insert(toAskFor_.begin(), toAskFor_.end());
+        for (Id const& id : toAskFor_)
+            missing_.Add(id);
         toAskFor_.clear();
         return;
     }
     while (!toAskFor_.empty()) {
-        for (Id& id : archive_.FindMissing(std::exchange(toAskFor_, {})))
-            missing_.insert(std::move(id));
+        for (Id const& id : archive_.FindMissing(std::exchange(toAskFor_, {})))
+            missing_.Add(id);
         // Directories that this adds are asked for with the next batch before they are listed.
         for (std::size_t const end = directories_.size(); looked_ < end; ++looked_)
             if (IsMissing(directories_[looked_].id) && !directories_[looked_].isListed)
@@ -58,9 +60,12 @@ bool MissingTrees::AreFewAndSmall() const {
 }
 
 std::size_t MissingTrees::AddDirectory(NewDirectory directory) {
-    auto const [known, isNew] = numbers_.try_emplace(directory.id, directories_.size());
-    if (!isNew)
-        return known->second;
+    if (!numbers_.Add(directory.id, directories_.size()))
+        return *numbers_.Find(directory.id);
+    if (directories_.empty()) {
+        directories_.reserve(usualDirectories);
+        toAskFor_.reserve(maximumUnasked);
+    }
     if (directory.depth > KivVcs::deepestLoadedNesting)
         Refuse(directory.holder, directory.name, "lies too deep");
     toAskFor_.push_back(directory.id);
@@ -110,7 +115,7 @@ void MissingTrees::ListFiles(std::size_t number) {
         NewDirectory::File file{blob, blob->GetId(), {}, name};
         if (directory.earlier)
             file.earlier = IdOf(directory.earlier->GetLocalBlob(name));
-        if (asked_.insert(file.id).second)
+        if (asked_.Add(file.id))
             toAskFor_.push_back(file.id);
         directory.files.push_back(std::move(file));
     }

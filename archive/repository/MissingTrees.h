@@ -4,11 +4,9 @@
 /// Which directories and files publishing has to store.
 
 #include "KivArchive/IArchive.h"
+#include "SmallTable.h"
 
 #include <KivVcs/Commit.h>
-
-#include <unordered_map>
-#include <unordered_set>
 
 namespace KivArchive {
 
@@ -54,9 +52,9 @@ public:
     /// @param isNew whether a few small objects that differ from earlier versions are taken for missing without asking
     void Find(bool isNew);
 
-    [[nodiscard]] bool IsMissing(Id const& id) const { return missing_.contains(id); }
-    /// The number of a directory that was looked for.
-    [[nodiscard]] std::size_t NumberOf(Id const& id) const { return numbers_.at(id); }
+    [[nodiscard]] bool IsMissing(Id const& id) const { return missing_.Contains(id); }
+    /// The number of a directory, which must have been looked for.
+    [[nodiscard]] std::size_t NumberOf(Id const& id) const { return *numbers_.Find(id); }
     [[nodiscard]] NewDirectory const& At(std::size_t number) const { return directories_[number]; }
     /// Throws because an entry of a directory cannot be stored, naming its path.
     [[noreturn]] void Refuse(std::size_t directory, KivStringViewT<char16_t> name, const char* why) const;
@@ -76,10 +74,10 @@ private:
     std::vector<NewDirectory> directories_;
     /// How many directories `Find` has passed.
     std::size_t looked_ = 0;
-    std::unordered_map<Id, std::size_t> numbers_;
+    SmallTable<Id, std::size_t> numbers_;
     std::vector<Id> toAskFor_;
-    std::unordered_set<Id> asked_;
-    std::unordered_set<Id> missing_;
+    SmallSet<Id> asked_;
+    SmallSet<Id> missing_;
 };
 
 } // namespace KivArchive

@@ -77,7 +77,9 @@ struct ArchivedRepository::Moves {
 
 ArchivedRepository::Moves ArchivedRepository::PendingMoves(std::span<const KivStringT<char16_t>> branches) const {
     Moves pending;
-    std::set<KivStringT<char16_t>> const names(branches.begin(), branches.end());
+    std::vector<KivStringT<char16_t>> names(branches.begin(), branches.end());
+    std::sort(names.begin(), names.end());
+    names.erase(std::unique(names.begin(), names.end()), names.end());
     for (auto const& name : names) {
         auto const known = state_->branches.find(name);
         KnownBranch const branch = known == state_->branches.end() ? KnownBranch() : known->second;
@@ -124,7 +126,9 @@ bool ArchivedRepository::IsContained(Id const& commit, cow_ptr<Commit> const& in
 
 PublishOutcome ArchivedRepository::Publish(IProgress* progress) {
     std::vector<KivStringT<char16_t>> names;
-    for (auto const& [name, head] : state_->storage->GetRefs())
+    auto const& refs = state_->storage->GetRefs();
+    names.reserve(refs.size() + state_->branches.size());
+    for (auto const& [name, head] : refs)
         names.push_back(name);
     for (auto const& [name, known] : state_->branches)
         names.push_back(name);

@@ -3,7 +3,7 @@
 #include "Changes.h"
 #include "KivArchive/ArchivedBlob.h"
 #include "NamedFirst.h"
-#include "repository/CommitForm.h"
+#include "PackedForms.h"
 
 #include <algorithm>
 
@@ -14,6 +14,8 @@ namespace {
 /// How many bytes one change stores, and of how many commits the trees are looked for together.
 constexpr std::uint64_t changeSize = 8 * largestWholeContent;
 constexpr std::size_t commitsTogether = 256;
+/// An edit's commit, its file, and the directories above.
+constexpr std::size_t usualObjects = 8;
 
 constexpr const char* notItself = "is not what its identifier says";
 
@@ -24,7 +26,7 @@ Publishing::Publishing(IArchive& archive, KivVcs::IObjectsStorage const& storage
     : archive_(archive), storage_(storage), facts_(facts), moves_(moves), asksForAll_(asksForAll), progress_(progress) {
     for (BranchMove const& move : moves)
         if (!move.expected.IsEmpty())
-            expected_.insert(move.expected);
+            expected_.Add(move.expected);
 }
 
 void Publishing::Store(std::vector<cow_ptr<Commit>> const& commits) {
@@ -60,11 +62,11 @@ void Publishing::StoreTogether(std::span<cow_ptr<Commit> const> commits) {
 
 /// Whether each commit is on top of an expected head, of one before it, or of one in this change.
 bool Publishing::AreOnExpectedHeads(std::span<cow_ptr<Commit> const> commits) const {
-    std::unordered_set<Id> met;
+    SmallSet<Id> met;
     return std::all_of(commits.begin(), commits.end(), [&](cow_ptr<Commit> const& commit) {
         Id const parent = commit->GetParentId();
-        met.insert(commit->GetId());
-        return expected_.contains(parent) || met.contains(parent) || IsInChange(parent);
+        met.Add(commit->GetId());
+        return expected_.Contains(parent) || met.Contains(parent) || IsInChange(parent);
     });
 }
 
@@ -73,7 +75,7 @@ void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
         {&root, 1},
         [&](std::size_t number, std::vector<std::size_t>& named) {
             NewDirectory const& directory = trees.At(number);
-            if (!trees.IsMissing(directory.id) || stored_.contains(directory.id))
+            if (!trees.IsMissing(directory.id) || stored_.Contains(directory.id))
                 return false;
             StoreFiles(trees, number);
             named.assign(directory.subdirectories.rbegin(), directory.subdirectories.rend());
@@ -88,7 +90,7 @@ void Publishing::StoreTree(MissingTrees const& trees, std::size_t root) {
 
 void Publishing::StoreFiles(MissingTrees const& trees, std::size_t directory) {
     for (NewDirectory::File const& file : trees.At(directory).files)
-        if (trees.IsMissing(file.id) && !stored_.contains(file.id) && !StoreFile(file))
+        if (trees.IsMissing(file.id) && !stored_.Contains(file.id) && !StoreFile(file))
             trees.Refuse(directory, file.name, notItself);
 }
 
@@ -110,7 +112,7 @@ bool Publishing::StoreFile(NewDirectory::File const& file) {
 bool Publishing::StoreLarge(NewDirectory::File const& file, StreamIO content) {
     if (!archive_.StoreContent(file.id, content, file.earlier, progress_))
         return false;
-    stored_.emplace(file.id, byItself);
+    stored_.Add(file.id, byItself);
     ++storedCount_;
     return true;
 }
@@ -141,7 +143,7 @@ void Publishing::StoreCommit(Commit const& commit) {
     Buffer const data = Joined(commit.GetData());
     bool const isItself =
         id.GetDigest() != nullptr && (!commit.IsOfHostClass() || Identify(ObjectType::Commit, data) == id);
-    if (!isItself || !ReadCommit(id, BytesOf(data), {}, {}))
+    if (!isItself || !ReadPackedCommit(BytesOf(data)))
         throw ArchiveError(Failure::Unrepresentable, {},
                            "The version \"" + KivVcs::ToUtf8(commit.GetDescription()) + "\" cannot be read back.");
     Ancestry const* const known = facts_.Find(id);
@@ -159,26 +161,29 @@ void Publishing::StoreCommit(Commit const& commit) {
 }
 
 bool Publishing::IsInChange(Id const& id) const {
-    auto const found = stored_.find(id);
-    return found != stored_.end() && found->second == changeNumber_;
+    std::uint64_t const* const change = stored_.Find(id);
+    return change != nullptr && *change == changeNumber_;
 }
 
 void Publishing::RelyOn(Id const& id) {
-    if (!IsInChange(id) && relied_.insert(id).second)
-        (expected_.contains(id) ? change_.inherited : change_.relied).push_back(id);
+    if (!IsInChange(id) && relied_.Add(id))
+        (expected_.Contains(id) ? change_.inherited : change_.relied).push_back(id);
 }
 
 void Publishing::RelyOnEarlier(Id const& id) {
     if (!isOnExpected_)
         RelyOn(id);
-    else if (!IsInChange(id) && relied_.insert(id).second)
+    else if (!IsInChange(id) && relied_.Add(id))
         change_.inherited.push_back(id);
 }
 
 void Publishing::Add(NewObject object) {
     size_ += object.data.GetSize();
     ++storedCount_;
-    stored_.insert_or_assign(object.id, changeNumber_);
+    if (!stored_.Add(object.id, changeNumber_))
+        *stored_.Find(object.id) = changeNumber_;
+    if (change_.objects.empty())
+        change_.objects.reserve(usualObjects);
     change_.objects.push_back(std::move(object));
     if (size_ >= changeSize)
         Flush();
@@ -195,7 +200,7 @@ void Publishing::Flush() {
     earlierFiles_.clear();
     size_ = 0;
     ++changeNumber_;
-    relied_.clear();
+    relied_.Clear();
 }
 
 ChangeOutcome Publishing::Finish(std::vector<RecordChange> const& records) {

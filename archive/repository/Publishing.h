@@ -4,6 +4,7 @@
 /// Storing commits in an archive.
 
 #include "KivArchive/IArchive.h"
+#include "SmallTable.h"
 #include "repository/LocalFacts.h"
 #include "repository/MissingTrees.h"
 
@@ -50,7 +51,7 @@ private:
     LocalFacts const& facts_;
     std::vector<BranchMove> const& moves_;
     /// Heads that the branches still have when they are moved.
-    std::unordered_set<Id> expected_;
+    SmallSet<Id> expected_;
     bool asksForAll_;
     IProgress* progress_;
     Change change_;
@@ -60,8 +61,8 @@ private:
     static constexpr std::uint64_t byItself = 0;
     /// The current change, and with which one everything has been stored.
     std::uint64_t changeNumber_ = byItself + 1;
-    std::unordered_map<Id, std::uint64_t> stored_;
-    std::unordered_set<Id> relied_;
+    SmallTable<Id, std::uint64_t> stored_;
+    SmallSet<Id> relied_;
     /// Whether everything stored so far is on top of the expected heads, and in this change.
     bool isOnExpected_ = true;
     /// The files that those of the change replace, as long as `isOnExpected_`.

@@ -8,6 +8,8 @@ namespace {
 constexpr std::uint64_t largestDifferenced = 16 * largestWholeContent;
 /// A difference must be this many times smaller than the form.
 constexpr std::size_t worthwhile = 3;
+/// Of fewer bytes that differ, compressing saves nothing.
+constexpr std::size_t worthCompressing = 48;
 
 /// Goes back from @p place to the version of generation @p wanted, or to the nearest one before it.
 void FindStoredBase(Prepared& prepared, Place place, std::uint64_t wanted, FormReader& reader) {
@@ -65,7 +67,7 @@ void MakeDifference(Prepared& prepared, Compressor& compressor) {
     bool const isTried = prepared.baseForm.owner != nullptr && prepared.form.size() <= largestDifferenced &&
                          prepared.item->type != StoredType::Commit;
     if (isTried && AppendDifference(compressor, prepared.baseForm.bytes, prepared.form,
-                                    prepared.form.size() / worthwhile, prepared.difference)) {
+                                    prepared.form.size() / worthwhile, worthCompressing, prepared.difference)) {
         prepared.member.encoding = Encoding::Difference;
         prepared.member.generation = prepared.generation;
     } else {

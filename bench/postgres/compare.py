@@ -42,10 +42,15 @@ def run(program, *arguments):
     return subprocess.run([os.path.join(BENCH, program), *map(str, arguments)], capture_output=True, check=True, text=True).stdout
 
 
-def together(command, address, last):
-    """The numbers that CLIENTS processes print which run at once."""
-    processes = [subprocess.Popen([os.path.join(BENCH, "kivvcs_team_bench"), command, address, str(i), str(last)],
-                                  stdout=subprocess.PIPE, text=True) for i in range(CLIENTS)]
+def together(command, address, last, clients=range(CLIENTS)):
+    """The numbers that processes print, one for each of CLIENTS, which begin at once when all are ready."""
+    processes = [subprocess.Popen([os.path.join(BENCH, "kivvcs_team_bench"), command, address, str(client), str(last)],
+                                  stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True) for client in clients]
+    if any([process.stdout.readline() != "ready\n" for process in processes]):
+        sys.exit(f"failed: {command}")
+    for process in processes:
+        process.stdin.write("\n")
+        process.stdin.flush()
     outputs = [process.communicate()[0] for process in processes]
     if any(process.returncode != 0 for process in processes):
         sys.exit(f"failed: {command}")
@@ -71,8 +76,8 @@ def seconds_of(function):
 
 
 def rates(address):
-    bare, ours = medians(lambda n: float(run("kivvcs_team_bench", "bare", address, f"one{n}", SECONDS)),
-                         lambda n: float(run("kivvcs_team_bench", "edits", address, f"one{n}", SECONDS)))
+    bare, ours = medians(*(lambda n, command=command: together(command, address, SECONDS, [f"one{n}"])[0]
+                           for command in ("bare", "edits")))
     row("publish one small edit, one client", f"{bare:.0f}/s", f"{ours:.0f}/s", ours / bare, 0.5, True)
     return bare
 
@@ -81,7 +86,7 @@ def own_branches(parent):
     def fresh(command):
         def measure(number):
             with Database(parent, f"{command}{number}") as address:
-                run("kivvcs_team_bench", "edits", address, "first", 0)
+                together("edits", address, 0, ["first"])
                 return sum(together(command, address, SECONDS))
         return measure
 

@@ -1,4 +1,6 @@
 // What `scripts/bench.sh postgres` runs as clients of one database: kivvcs_team_bench COMMAND ADDRESS [ARGUMENT...]
+// The first three print "ready" when all is prepared, and wait for a line before they begin: so that none measures how the
+// others prepare themselves.
 //   bare ADDRESS CLIENT SECONDS        inserts, updates and commits through libpq, and prints the rate
 //   edits ADDRESS BRANCH SECONDS       publishes small edits on a branch, and prints the rate
 //   merging ADDRESS CLIENT EDITS       publishes edits of its own file on one branch with others, and prints the attempts
@@ -20,6 +22,13 @@ namespace {
 
 using namespace KivArchive;
 using Clock = std::chrono::steady_clock;
+
+void AwaitStart() {
+    std::puts("ready");
+    std::fflush(stdout);
+    if (std::getchar() == EOF)
+        throw std::runtime_error("nobody says when to begin");
+}
 
 double Seconds(Clock::time_point since) {
     return std::chrono::duration<double>(Clock::now() - since).count();
@@ -78,6 +87,7 @@ double RateOfBareTransactions(std::string const& address, std::string const& cli
                  "(name text PRIMARY KEY, head text); INSERT INTO heads" + client + " VALUES('b', '')");
     bare.Prepare("insert", "INSERT INTO bare" + client + " VALUES($1, repeat('content ', 50))");
     bare.Prepare("update", "UPDATE heads" + client + " SET head = $1 WHERE name = 'b'");
+    AwaitStart();
     return RateOf(seconds, [&bare](int number) {
         std::string const id = std::to_string(number);
         bare.Execute("BEGIN");
@@ -106,6 +116,7 @@ double RateOfEdits(std::shared_ptr<PostgresArchive> const& archive, std::string 
         CommitEdit(repository, branch + "/file" + std::to_string(i), i);
     if (!repository.Publish().published)
         throw std::runtime_error("the branch is there already");
+    AwaitStart();
     return RateOf(seconds, [&](int number) {
         CommitEdit(repository, branch + "/file7", number);
         if (!repository.Publish().published)
@@ -115,6 +126,7 @@ double RateOfEdits(std::shared_ptr<PostgresArchive> const& archive, std::string 
 
 unsigned PublishMerging(std::shared_ptr<PostgresArchive> const& archive, std::string const& client, int edits) {
     ArchivedRepository repository(archive);
+    AwaitStart();
     unsigned attempts = 0;
     for (int i = 0; i < edits; ++i) {
         CommitEdit(repository, "client" + client + "/file" + std::to_string(i), i);
