@@ -132,7 +132,8 @@ bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std:
     Append(to, std::byte{1});
     std::size_t const head = to.size() - before;
     // Bytes that are few, or do not become fewer, are stored as they are.
-    if (between.size() > mostPlain &&
+    bool const isWorthTrying = between.size() > mostPlain || head + between.size() >= limit;
+    if (isWorthTrying &&
         compressor.Compress(between, replaced, std::min(limit > head ? limit - head : 0, between.size()), to))
         return true;
     to.back() = std::byte{0};

@@ -35,7 +35,8 @@ private:
 [[nodiscard]] bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept;
 
 /// Appends the difference that turns @p base into @p form: how many bytes both begin and end with alike, and the bytes
-/// of @p form between, compressed with those of @p base as prefix if they are more than @p mostPlain.
+/// of @p form between, compressed with those of @p base as prefix if they are more than
+/// @p mostPlain, or too many otherwise.
 /// @return false, leaving @p to as it was, if that takes @p limit bytes or more
 [[nodiscard]] bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit,
                                     std::size_t mostPlain, Bytes& to);

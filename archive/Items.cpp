@@ -5,7 +5,7 @@
 
 namespace KivArchive {
 
-void MakePlainForm(ItemForm& made) {
+void MakePackedForm(ItemForm& made) {
     Item const& item = *made.item;
     made.form = BytesOf(item.data);
     made.member.type = item.type;
@@ -15,7 +15,7 @@ void MakePlainForm(ItemForm& made) {
 }
 
 void MakeForm(ItemForm& made) {
-    MakePlainForm(made);
+    MakePackedForm(made);
     Item const& item = *made.item;
     if (item.type != StoredType::Tree && item.type != StoredType::Commit)
         return;

@@ -28,7 +28,7 @@ struct ItemForm {
 
 /// Makes the form of `made.item`, for a member that shares the frame of its segment: a compact one of trees and commits.
 void MakeForm(ItemForm& made);
-/// The same, but always the item's data.
-void MakePlainForm(ItemForm& made);
+/// The same, but always the item's data, which is as it is packed.
+void MakePackedForm(ItemForm& made);
 
 } // namespace KivArchive

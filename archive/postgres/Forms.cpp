@@ -102,7 +102,7 @@ Version Forms::VersionOf(Id const& id) {
     if (WholeRow const* const whole = whole_.Find(id))
         return whole->version;
     Member const& member = MemberOf(id);
-    return {member.type, Find(id)->base, member.generation, member.formSize, member.isCompact};
+    return {member.type, Find(id)->base, member.generation, member.formSize};
 }
 
 Form Forms::FormOf(Id const& id, Compressor& compressor) {

@@ -36,7 +36,6 @@ struct Version {
     Id base;
     std::uint64_t generation = 0;
     std::uint64_t formSize = 0;
-    bool isCompact = false;
 };
 
 /// Of version @p generation, which is not the first: what it is a difference to. That one's number has the last digit that is

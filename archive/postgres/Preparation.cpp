@@ -24,11 +24,12 @@ constexpr std::uint64_t worthSharing = std::uint64_t{128} * 1024;
 /// Of what is smaller, a difference or compression saves less than a row takes beside its form.
 constexpr std::uint64_t worthMakingSmaller = 512;
 
-/// Whether a row has it as it is, if it is no difference. A log reads commits so.
+/// Whether a row has its form as it is, neither compressed nor a difference. A log reads commits so.
 bool IsStoredPlain(Item const& item) {
     return item.type == StoredType::Commit || item.data.GetSize() < worthMakingSmaller;
 }
 
+/// Whether it may be a difference, or the base of one. Of a content in pieces, `data` only lists these.
 bool MayDiffer(Item const& item) {
     return item.type != StoredType::Commit && item.size >= worthMakingSmaller;
 }
@@ -38,18 +39,10 @@ bool IsToDiffer(Item const& item) {
     return !item.earlier.IsEmpty() && MayDiffer(item);
 }
 
+/// Data may be a part of more memory than it needs.
 Form CopyOf(ByteView bytes) {
     auto const copy = std::make_shared<const Bytes>(bytes.begin(), bytes.end());
     return {copy, *copy};
-}
-
-/// The form of what may be a base, for as long as it takes.
-Form KeptForm(Item const& item) {
-    // A file's data may be a part of more memory than it needs.
-    if (item.type != StoredType::Tree)
-        return CopyOf(BytesOf(item.data));
-    auto const data = std::make_shared<const Buffer>(item.data);
-    return {data, BytesOf(*data)};
 }
 
 void MakeDifference(Prepared& prepared, Compressor& compressor) {
@@ -95,7 +88,7 @@ Preparation::Preparation(std::vector<Item> const& items, Connection& connection,
             one.member.encoding = Encoding::Plain;
         } else {
             // Compact trees would hardly become smaller by compression or as differences, and take longer to make.
-            MakePlainForm(one);
+            MakePackedForm(one);
         }
     });
     if (hasEarlier)
@@ -154,7 +147,7 @@ void Preparation::KeepStored() const {
     for (Prepared const& one : prepared_) {
         if (!MayDiffer(*one.item))
             continue;
-        recent_.Keep(one.item->id, {VersionOf(one), KeptForm(*one.item)});
+        recent_.Keep(one.item->id, {VersionOf(one), CopyOf(one.form)});
     }
 }
 
@@ -204,7 +197,7 @@ Version Preparation::VersionOf(Id const& id) {
 }
 
 Version Preparation::VersionOf(Prepared const& one) {
-    return {one.member.type, one.base, one.member.generation, one.member.formSize, one.member.isCompact};
+    return {one.member.type, one.base, one.member.generation, one.member.formSize};
 }
 
 void Preparation::FindBase(Prepared& one, Compressor& compressor) {
@@ -224,8 +217,7 @@ void Preparation::FindBase(Prepared& one, Compressor& compressor) {
             if (version.generation >= after)
                 throw Malformed();
         }
-        if (version.type != one.item->type || version.isCompact != one.member.isCompact ||
-            version.formSize > largestDifferenced)
+        if (version.type != one.item->type || version.formSize > largestDifferenced)
             return;
         std::size_t const* const prepared = numbers_.Find(at);
         one.baseForm = prepared != nullptr ? Form{std::make_shared<int>(), prepared_[*prepared].form}

@@ -7,7 +7,7 @@ namespace KivArchive::Postgres {
 namespace {
 
 constexpr std::uint64_t maximumBytes = std::uint64_t{2} * 1024 * 1024;
-constexpr std::uint64_t largestRow = maximumBytes / 8;
+constexpr std::uint64_t largestRow = maximumBytes / 4;
 /// What a row takes beside its form, about.
 constexpr std::uint64_t rowSize = 256;
 

@@ -84,7 +84,7 @@ std::vector<cow_ptr<Commit>> MissingCommits::InOrder(std::vector<cow_ptr<Commit>
     roots.reserve(heads.size());
     for (auto const& head : heads) {
         roots.push_back(head->GetId());
-        // The others are found from heads.
+        // What is missing was reached from a head that is: a single one is that head.
         if (missing_.Count() == 1 && missing_.Contains(roots.back()))
             return {head};
     }

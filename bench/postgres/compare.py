@@ -42,10 +42,10 @@ def run(program, *arguments):
     return subprocess.run([os.path.join(BENCH, program), *map(str, arguments)], capture_output=True, check=True, text=True).stdout
 
 
-def together(command, address, last, clients=range(CLIENTS)):
-    """The numbers that processes print, one for each of CLIENTS, which begin at once when all are ready."""
-    processes = [subprocess.Popen([os.path.join(BENCH, "kivvcs_team_bench"), command, address, str(client), str(last)],
-                                  stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True) for client in clients]
+def together(command, address, last, names=range(CLIENTS)):
+    """The numbers that processes print, one for each name, which begin at once when all are ready."""
+    processes = [subprocess.Popen([os.path.join(BENCH, "kivvcs_team_bench"), command, address, str(name), str(last)],
+                                  stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True) for name in names]
     if any([process.stdout.readline() != "ready\n" for process in processes]):
         sys.exit(f"failed: {command}")
     for process in processes:

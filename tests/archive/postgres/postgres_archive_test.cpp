@@ -33,7 +33,7 @@ void Execute(std::string const& sql) {
 cow_ptr<Commit> CommitFile(ArchivedRepository& repository, std::string const& path, std::string const& content) {
     Commit commit(&repository, false);
     commit.AddBlob(&repository, Wide(path), MakeBlob(content));
-    commit.SetDescription(Wide(path + " " + content));
+    commit.SetDescription(Wide(path));
     return repository.DoCommit(commit);
 }
 
@@ -73,6 +73,42 @@ TEST(PostgresArchive, TakesFewRoundTrips) {
     constexpr std::uint64_t depth = 3;
     EXPECT_TRUE(repository.GetHead()->GetCommitTree()->GetRoot()->GetDeepBlob(u"d3/sub/f3"));
     EXPECT_LE(trips(), depth + 2) << "a tree";
+}
+
+/// First it is small enough to be stored as it is, and compact; then it is stored whole once, and as differences from there on.
+TEST(PostgresArchive, StoresEachVersionOfADirectoryThatGrows) {
+    std::shared_ptr<PostgresArchive> const archive = theServer->MakeArchive();
+    {
+        ArchivedRepository repository(archive);
+        for (int i = 0; i < 40; ++i) {
+            CommitFile(repository, "d/f" + std::to_string(i), std::to_string(i));
+            EXPECT_TRUE(repository.Publish().published);
+        }
+    }
+    EXPECT_EQ(ProblemsOf(*archive), "");
+    // The versions of the directory take 64 KB as they are packed.
+    EXPECT_LT(archive->GetStatistics().bytes, 24'000U);
+    ArchivedRepository const repository(archive);
+    int count = 40;
+    for (cow_ptr<Commit> commit = repository.GetHead(); commit; commit = commit->GetParent(), --count)
+        EXPECT_EQ(commit->GetCommitTree()->GetRoot()->GetLocalTree(u"d")->GetLocalBlobPaths().size(),
+                  static_cast<std::size_t>(count));
+    EXPECT_EQ(count, 0);
+}
+
+TEST(PostgresArchive, StoresAFileThatChangesNearItsEndsAsADifference) {
+    std::shared_ptr<PostgresArchive> const archive = theServer->MakeArchive();
+    ArchivedRepository repository(archive);
+    std::string content = SomeNoise(1, 900);
+    CommitFile(repository, "f", content);
+    EXPECT_TRUE(repository.Publish().published);
+    std::uint64_t const before = archive->GetStatistics().bytes;
+    content[200] = '!';
+    content[650] = '!';
+    CommitFile(repository, "f", content);
+    EXPECT_TRUE(repository.Publish().published);
+    EXPECT_LT(archive->GetStatistics().bytes - before, content.size()) << "with a commit and its root";
+    EXPECT_EQ(ProblemsOf(*archive), "");
 }
 
 TEST(PostgresArchive, LooksUpChangesWhoseAnswersAreLost) {
