@@ -35,8 +35,8 @@ private:
 [[nodiscard]] bool CanDecompressTo(ByteView bytes, std::uint64_t size) noexcept;
 
 /// Appends the difference that turns @p base into @p form: how many bytes both begin and end with alike, and the bytes
-/// of @p form between, compressed with those of @p base as prefix if they are more than
-/// @p mostPlain, or too many otherwise.
+/// of @p form between: as they are up to @p mostPlain of them, if that stays below @p limit, otherwise compressed with
+/// those of @p base as prefix where that makes them fewer.
 /// @return false, leaving @p to as it was, if that takes @p limit bytes or more
 [[nodiscard]] bool AppendDifference(Compressor& compressor, ByteView base, ByteView form, std::size_t limit,
                                     std::size_t mostPlain, Bytes& to);
